@@ -1,0 +1,49 @@
+# One place for what every target of the project shares: warnings, sanitizers, include roots.
+
+add_library(lc_options INTERFACE)
+target_compile_options(lc_options INTERFACE
+  -Wall -Wextra -Wpedantic $<$<CXX_COMPILER_ID:GNU>:-Wshadow=local> $<$<CXX_COMPILER_ID:Clang>:-Wshadow> -Wnon-virtual-dtor -Woverloaded-virtual -Wimplicit-fallthrough -Werror
+  -fno-omit-frame-pointer -g)
+if(LC_SANITIZE)
+  target_compile_options(lc_options INTERFACE -fsanitize=${LC_SANITIZE} -fno-sanitize-recover=all)
+  target_link_options(lc_options INTERFACE -fsanitize=${LC_SANITIZE})
+  target_compile_definitions(lc_options INTERFACE LC_SANITIZED=1)
+endif()
+
+# lc_library(NAME DIR DEPS...): a static library of all .cpp files of one folder (not of the folders below it).
+function(lc_library name dir)
+  file(GLOB sources CONFIGURE_DEPENDS ${dir}/*.cpp)
+  if(sources)
+    add_library(${name} STATIC ${sources})
+    target_link_libraries(${name} PUBLIC ${ARGN} PRIVATE lc_options)
+    target_include_directories(${name} PUBLIC ${PROJECT_SOURCE_DIR}/src ${PROJECT_SOURCE_DIR})
+  else()
+    add_library(${name} INTERFACE)
+    target_link_libraries(${name} INTERFACE ${ARGN})
+    target_include_directories(${name} INTERFACE ${PROJECT_SOURCE_DIR}/src ${PROJECT_SOURCE_DIR})
+  endif()
+endfunction()
+
+# lc_pkg(NAME MODULES...): imported target PkgConfig::NAME for pkg-config modules, its headers as system headers.
+function(lc_pkg name)
+  pkg_check_modules(${name} REQUIRED IMPORTED_TARGET GLOBAL ${ARGN})
+endfunction()
+
+# lc_executable(NAME SOURCES... DEPS libs...)
+function(lc_executable name)
+  cmake_parse_arguments(arg "" "" "SOURCES;DEPS" ${ARGN})
+  add_executable(${name} ${arg_SOURCES})
+  target_link_libraries(${name} PRIVATE ${arg_DEPS} lc_options)
+  target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR}/src ${PROJECT_SOURCE_DIR})
+endfunction()
+
+# lc_test(NAME DIR DEPS...): one GoogleTest binary of all .cpp files below one folder.
+function(lc_test name dir)
+  file(GLOB_RECURSE sources CONFIGURE_DEPENDS ${dir}/*.cpp)
+  if(sources)
+    add_executable(${name} ${sources})
+    target_link_libraries(${name} PRIVATE ${ARGN} GTest::gtest GTest::gmock GTest::gtest_main lc_options)
+    target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR}/src ${PROJECT_SOURCE_DIR})
+    target_compile_definitions(${name} PRIVATE LC_SOURCE_DIR="${PROJECT_SOURCE_DIR}" LC_BINARY_DIR="${PROJECT_BINARY_DIR}")
+  endif()
+endfunction()

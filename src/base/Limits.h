@@ -1,0 +1,43 @@
+#pragma once
+// Every quantity that a peer controls, and its limit: the one table.
+
+#include <array>
+#include <cstdint>
+#include <string_view>
+
+namespace lumacast {
+
+enum class Limit : std::uint8_t {
+    MessageBytes,
+    MessageDepth,
+    HandlesPerMessage,
+    ConnectionsPerUser,
+    MessagesInFlight,
+    QueuedBytesPerReader,
+    ContextIdentifiersPerRequest,
+    HelloBytes,
+    PlanesLeased,
+};
+
+struct LimitRow {
+    Limit limit;
+    std::uint64_t value;
+    std::string_view meaning;
+};
+
+/// In the order of the enumeration.
+inline constexpr std::array kLimits{
+    LimitRow{Limit::MessageBytes, 1 << 20, "bytes of one message on the wire"},
+    LimitRow{Limit::MessageDepth, 16, "arrays and dictionaries nested in one message"},
+    LimitRow{Limit::HandlesPerMessage, 8, "descriptors that travel with one message"},
+    LimitRow{Limit::ConnectionsPerUser, 1200, "open connections of one user"},
+    LimitRow{Limit::MessagesInFlight, 64, "requests of one connection that wait for their reply"},
+    LimitRow{Limit::QueuedBytesPerReader, 4 << 20, "bytes waiting for one peer that does not read"},
+    LimitRow{Limit::ContextIdentifiersPerRequest, 64, "window layers named in one start request"},
+    LimitRow{Limit::HelloBytes, 64, "bytes a peer may send before its hello is complete"},
+    LimitRow{Limit::PlanesLeased, 4, "planes lent to one peer at a time"},
+};
+
+constexpr std::uint64_t limitOf(Limit limit) { return kLimits[static_cast<std::size_t>(limit)].value; }
+
+}  // namespace lumacast

@@ -1,0 +1,9 @@
+#pragma once
+#include <string_view>
+
+namespace lumacast {
+
+/// Whether `text` is well-formed UTF-8 (RFC 3629): no overlong forms, no surrogates, nothing above U+10FFFF.
+bool isValidUtf8(std::string_view text);
+
+}  // namespace lumacast

@@ -1,0 +1,25 @@
+#pragma once
+#include <cstdint>
+#include <functional>
+
+#include "base/Identifiers.h"
+
+namespace lumacast {
+
+/// What applications are doing. Questions are answered within 100 ms or as "nothing"; callable from the request lane.
+class AppStateMonitor {
+public:
+    /// The bit of an application that runs in the foreground.
+    static constexpr std::uint32_t kRunningForeground = 8;
+
+    /// An update about one application: its state value (1: it has ended), whether it is frontmost, its process.
+    using Handler = std::function<void(std::int64_t state, bool frontmost, ProcessID pid)>;
+
+    virtual ~AppStateMonitor() = default;
+    /// The application's state as a bit set; 0 for an unknown one.
+    virtual std::uint32_t applicationState(const BundleIdentifier& identifier) = 0;
+    /// Whom to tell of updates, on the main queue; an empty handler for nobody. One handler at a time.
+    virtual void setHandler(Handler handler) = 0;
+};
+
+}  // namespace lumacast
