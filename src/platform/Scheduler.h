@@ -26,6 +26,16 @@ public:
     virtual bool isCurrent() const = 0;
 };
 
+/// The process's main queue as the platform makes it: a serial queue whose tasks run in run(), on the thread that calls it,
+/// together with whatever else the platform waits for there.
+class MainLoop : public SerialQueue {
+public:
+    /// Runs tasks until requestStop.
+    virtual void run() = 0;
+    /// Lets run() return after the task in progress. Callable from any lane and from a signal's own thread.
+    virtual void requestStop() = 0;
+};
+
 /// The priorities of the global queues, whose tasks run concurrently with each other, in no promised order.
 enum class QueuePriority { Default, Background };
 
