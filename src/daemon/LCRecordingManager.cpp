@@ -1,0 +1,125 @@
+// Start-up, connections and the registry.
+
+#include "daemon/LCRecordingManager.h"
+
+#include <algorithm>
+
+#include "daemon/LCClientProxy.h"
+
+namespace lumacast {
+
+namespace {
+
+constexpr char kServiceName[] = "com.orvane.lumacastd";
+
+}  // namespace
+
+LCRecordingManager::LCRecordingManager(const SessionServices& services)
+    : services_(services), platform_(services.platform), log_(services.platform.log) {}
+
+std::shared_ptr<LCRecordingManager> LCRecordingManager::init(const SessionServices& services) {
+    std::shared_ptr<LCRecordingManager> manager(new LCRecordingManager(services));
+    services.tempStore._srSetupTempDirectory();
+    manager->publicListener_ = services.platform.ipc.listenerForService(kServiceName);
+    manager->publicListener_->setDelegate(manager);
+    return manager;
+}
+
+void LCRecordingManager::finishStartup() { publicListener_->resume(); }
+
+bool LCRecordingManager::listenerShouldAcceptNewConnection(IpcListener&, const std::shared_ptr<IpcConnection>& connection) {
+    log_.line("LCRecordingManager: shouldAcceptNewConnection:");
+    const ProcessID pid = connection->processIdentifier();
+    if (pid == ProcessID{0}) return false;
+    const auto bundleID = bundleIDOfProcess(pid);
+    if (!bundleID) {
+        log_.error("process %d belongs to no known application; its connection is refused", pid);
+        return false;
+    }
+    log_.line("accepted client connection PID: %d", pid);
+    connection->setExportedObject(weak_from_this());
+    connection->setExportedInterface(daemonProtocol());
+    connection->setRemoteInterface(clientProtocol());
+    connection->setInterruptionHandler([self = shared_from_this(), id = *bundleID] {
+        self->log_.line("connection INTERRUPTED");
+        self->applicationDisconnectedWithBundleID(id);
+    });
+    connection->setInvalidationHandler([self = shared_from_this(), id = *bundleID] {
+        self->log_.line("connection INVALID");
+        self->applicationDisconnectedWithBundleID(id);
+    });
+    const auto session = recordingSessionForBundleID(*bundleID);
+    if (const auto proxy = session->clientProxy()) {
+        if (const auto old = proxy->connection()) {
+            // Without its handlers, so that retiring it does not tear the session down.
+            old->setInvalidationHandler({});
+            old->setInterruptionHandler({});
+            old->invalidate();
+            proxy->setConnection(nullptr);
+        }
+    }
+    session->setClientProxy(std::make_shared<LCClientProxy>(log_, *bundleID, connection));
+    connection->resume();
+    return true;
+}
+
+void LCRecordingManager::applicationDisconnectedWithBundleID(const BundleIdentifier& bundleID) {
+    log_.line("LCRecordingManager: applicationDisconnected");
+    const auto session = registeredSession(bundleID);
+    if (!session) return;
+    if (session->isSystemRecording()) {
+        // A system recording deliberately goes on without its client.
+        if (const auto proxy = session->clientProxy()) proxy->setConnection(nullptr);
+        return;
+    }
+    const bool wasRecording = session->isRecording();
+    stopRecordingSession(session, 0, 0, {});
+    removeSessionForBundleID(bundleID);
+    // A stop that will never be answered (a failed trim, say) has left its transaction open.
+    if (!wasRecording && session->managerRecord.transactionOf) resetStatesForSession(session);
+}
+
+std::optional<BundleIdentifier> LCRecordingManager::bundleIDOfProcess(ProcessID pid) {
+    const auto bundle = services_.localization.bundleWithPID(pid);
+    auto identifier = bundle ? bundle->identifier() : std::nullopt;
+    return identifier && !identifier->text().empty() ? identifier : std::nullopt;
+}
+
+std::optional<BundleIdentifier> LCRecordingManager::getCallingConnectionBundleID() {
+    return callingConnection_ ? bundleIDOfProcess(callingConnection_->processIdentifier()) : std::nullopt;
+}
+
+std::shared_ptr<LCRecordingSession> LCRecordingManager::getCallingConnectionRecordingSession() {
+    const auto bundleID = getCallingConnectionBundleID();
+    return bundleID ? registeredSession(*bundleID) : nullptr;
+}
+
+std::shared_ptr<LCRecordingSession> LCRecordingManager::registeredSession(const BundleIdentifier& bundleID) const {
+    for (const auto& [id, session] : bundleIDToRecordingSessionLookup_)
+        if (id == bundleID) return session;
+    return nullptr;
+}
+
+std::shared_ptr<LCRecordingSession> LCRecordingManager::recordingSessionForBundleID(const BundleIdentifier& bundleID) {
+    log_.line("LCRecordingManager:recordingSessionForBundleID");
+    if (auto session = registeredSession(bundleID)) return session;
+    log_.line("no session, creating a new one");
+    auto session = std::make_shared<LCRecordingSession>(services_, bundleID);
+    bundleIDToRecordingSessionLookup_.emplace_back(bundleID, session);
+    return session;
+}
+
+void LCRecordingManager::removeSessionForBundleID(const BundleIdentifier& bundleID) {
+    log_.line("LCRecordingManager:removeSessionForBundleID");
+    std::erase_if(bundleIDToRecordingSessionLookup_, [&](const auto& entry) { return entry.first == bundleID; });
+}
+
+void LCRecordingManager::onRequestLane(Task task) {
+    SerialQueue& lane = platform_.scheduler.mainQueue();
+    if (lane.isCurrent())
+        task();
+    else
+        lane.async(std::move(task));
+}
+
+}  // namespace lumacast

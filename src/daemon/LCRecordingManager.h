@@ -1,0 +1,126 @@
+#pragma once
+// The daemon's one central object.
+
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "base/Identifiers.h"
+#include "base/MessageTables.h"
+#include "platform/Platform.h"
+#include "session/LCRecordingSession.h"
+
+namespace lumacast {
+
+/// What a start request asks for.
+struct StartRequest {
+    std::vector<ContextID> windowLayerContextIDs;
+    Size windowSize;
+    bool microphoneEnabled = false;
+    bool cameraEnabled = false;
+    bool broadcast = false;
+    bool systemRecording = false;
+    bool captureEnabled = false;
+};
+
+/// Owns the sessions, one per client application, and everything that clients ask of them. Everything here runs on the request
+/// lane (the main queue); what comes from other lanes hops there first. One file per concern.
+class LCRecordingManager final : public IpcListenerDelegate,
+                                 public IpcExportedObject,
+                                 public LCRecordingSessionDelegate,
+                                 public std::enable_shared_from_this<LCRecordingManager> {
+public:
+    using StartHandler = std::function<void(std::optional<Error>, bool microphoneRecording, bool cameraRecording)>;
+    using StopHandler = std::function<void(std::optional<URL>, std::optional<Error>)>;
+    using Handler = std::function<void()>;
+
+    /// `init` — sets up the temporary directory and the listener, which is not resumed yet.
+    static std::shared_ptr<LCRecordingManager> init(const SessionServices& services);
+
+    /// `finishStartup` — from now on connections are accepted.
+    void finishStartup();
+
+    /// `listener:shouldAcceptNewConnection:`
+    bool listenerShouldAcceptNewConnection(IpcListener& listener, const std::shared_ptr<IpcConnection>& connection) override;
+    void receiveMessage(const std::shared_ptr<IpcConnection>& connection, std::uint16_t message, Array arguments,
+                        IpcReply reply) override;
+
+    /// `recordingSessionForBundleID:` — the registered session, or a new idle one, registered.
+    std::shared_ptr<LCRecordingSession> recordingSessionForBundleID(const BundleIdentifier& bundleID);
+    /// `removeSessionForBundleID:`
+    void removeSessionForBundleID(const BundleIdentifier& bundleID);
+    /// The registered session, or null; creates nothing.
+    std::shared_ptr<LCRecordingSession> registeredSession(const BundleIdentifier& bundleID) const;
+
+    /// Sessions and their recordings, for the administrator.
+    Dictionary snapshot() const;
+
+    // LCRecordingSessionDelegate; from any lane.
+    void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
+                                          const std::optional<Error>& error) override;
+    void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<LCRecordingSession>& session,
+                                              const Dictionary& info) override;
+    /// Deliberately does nothing.
+    void broadcastSessionDidUpdateDuration(LCRecordingSession&, double) override {}
+
+private:
+    explicit LCRecordingManager(const SessionServices& services);
+
+    // Connections.
+    void applicationDisconnectedWithBundleID(const BundleIdentifier& bundleID);
+    std::optional<BundleIdentifier> bundleIDOfProcess(ProcessID pid);
+    std::optional<BundleIdentifier> getCallingConnectionBundleID();
+    std::shared_ptr<LCRecordingSession> getCallingConnectionRecordingSession();
+
+    // Requests.
+    void startRecording(const StartRequest& request, StartHandler handler);
+    void stopRecordingWithHandler(StopHandler handler);
+    void stopRecordingWithStartClipDuration(double startClipDuration, double endClipDuration, StopHandler handler);
+    void pauseRecording();
+    void resumeRecordingWithWindowLayerContextID(ContextID contextID);
+    void discardRecordingWithHandler(Handler handler);
+    std::optional<Dictionary> synchronousGetCurrentState();
+
+    // Starting.
+    bool checkContextIDsMatch(const std::vector<ContextID>& contextIDs);
+    void startProper(const std::shared_ptr<LCRecordingSession>& session, const StartRequest& request, std::uint64_t number,
+                     StartHandler handler);
+    void refuse(std::uint64_t number, RecordingErrorCode code, std::string_view reason, const StartHandler& handler);
+    void stopCurrentRecordingSessionWithHandler(Handler handler);
+    void interruptOtherRecordingSessionAgainstSession(const std::shared_ptr<LCRecordingSession>& session);
+    bool isApplicationInForegroundWithBundleIdentifier(const BundleIdentifier& bundleID);
+
+    // Stopping.
+    void stopRecordingSession(const std::shared_ptr<LCRecordingSession>& session, double startClipDuration,
+                              double endClipDuration, StopHandler handler);
+    void resetStatesForSession(const std::shared_ptr<LCRecordingSession>& session);
+    void resetAfterStop(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation);
+    void discardInterruptedRecording(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation,
+                                     const std::optional<URL>& movieURL);
+    void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
+                                          const std::optional<Error>& error, const std::optional<URL>& movieURL);
+    void recordingSessionInterrupted(const std::shared_ptr<LCRecordingSession>& session, const std::optional<Error>& error,
+                                     const std::optional<URL>& movieURL);
+
+    void beginTransaction() { platform_.keepAlive.beginTransaction(); }
+    void endTransaction() { platform_.keepAlive.endTransaction(); }
+    /// Runs `task` on the request lane: at once when already there.
+    void onRequestLane(Task task);
+
+    const SessionServices services_;
+    const Platform platform_;
+    Log& log_;
+
+    std::shared_ptr<IpcListener> publicListener_;
+    std::vector<std::pair<BundleIdentifier, std::shared_ptr<LCRecordingSession>>> bundleIDToRecordingSessionLookup_;
+    bool didAcceptResume_ = false;
+    bool microphoneRecording_ = false, cameraRecording_ = false;
+
+    /// The connection whose message is being handled; only then.
+    std::shared_ptr<IpcConnection> callingConnection_;
+    std::uint64_t requestNumber_ = 0;
+};
+
+}  // namespace lumacast

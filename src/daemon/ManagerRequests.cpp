@@ -1,0 +1,125 @@
+// What clients ask: from message to operation.
+
+#include "daemon/LCRecordingManager.h"
+
+namespace lumacast {
+
+namespace {
+
+// The arguments were checked against the message's declaration before they came here.
+template <class T>
+const T& argument(const Array& arguments, std::size_t index) {
+    return *arguments[index].as<T>();
+}
+
+StartRequest startRequest(const Array& arguments) {
+    StartRequest request;
+    for (const Value& id : argument<Array>(arguments, 0))
+        request.windowLayerContextIDs.push_back(ContextID{static_cast<std::uint32_t>(*id.as<std::uint64_t>())});
+    const Array& size = argument<Array>(arguments, 1);
+    request.windowSize = {*size[0].as<double>(), *size[1].as<double>()};
+    request.microphoneEnabled = argument<bool>(arguments, 2);
+    request.cameraEnabled = argument<bool>(arguments, 3);
+    request.broadcast = argument<bool>(arguments, 4);
+    request.systemRecording = argument<bool>(arguments, 5);
+    request.captureEnabled = argument<bool>(arguments, 6);
+    return request;
+}
+
+}  // namespace
+
+void LCRecordingManager::receiveMessage(const std::shared_ptr<IpcConnection>& connection, std::uint16_t message,
+                                        Array arguments, IpcReply reply) {
+    struct Calling {
+        std::shared_ptr<IpcConnection>& slot;
+        ~Calling() { slot = nullptr; }
+    } calling{callingConnection_};
+    callingConnection_ = connection;
+
+    const auto withSession = [this](auto change) {
+        if (const auto session = getCallingConnectionRecordingSession()) change(*session);
+    };
+    const StopHandler stopped = [reply](std::optional<URL> url, std::optional<Error> error) {
+        reply({Value(std::move(url)), Value(std::move(error))});
+    };
+    switch (static_cast<DaemonMessage>(message)) {
+        case DaemonMessage::StartRecording:
+            startRecording(startRequest(arguments),
+                           [reply](std::optional<Error> error, bool microphoneRecording, bool cameraRecording) {
+                               reply({Value(std::move(error)), microphoneRecording, cameraRecording});
+                           });
+            break;
+        case DaemonMessage::StopRecording: stopRecordingWithHandler(stopped); break;
+        case DaemonMessage::StopRecordingWithClipDurations:
+            stopRecordingWithStartClipDuration(argument<double>(arguments, 0), argument<double>(arguments, 1), stopped);
+            break;
+        case DaemonMessage::PauseRecording: pauseRecording(); break;
+        case DaemonMessage::ResumeRecording:
+            resumeRecordingWithWindowLayerContextID(
+                ContextID{static_cast<std::uint32_t>(argument<std::uint64_t>(arguments, 0))});
+            break;
+        case DaemonMessage::DiscardRecording: discardRecordingWithHandler([reply] { reply({}); }); break;
+        case DaemonMessage::SynchronousGetCurrentState: reply({Value(synchronousGetCurrentState())}); break;
+        case DaemonMessage::SetHasUserConsentForCamera:
+            withSession([&](LCRecordingSession& s) { s.setHasUserConsentForCamera(argument<bool>(arguments, 0)); });
+            break;
+        case DaemonMessage::SetHasUserConsentForMicrophone:
+            withSession([&](LCRecordingSession& s) { s.setHasUserConsentForMicrophone(argument<bool>(arguments, 0)); });
+            break;
+        case DaemonMessage::SetBroadcastURL:
+            withSession([&](LCRecordingSession& s) {
+                s.setBroadcastURL(arguments[0].isNull() ? std::nullopt : std::optional(argument<URL>(arguments, 0)));
+            });
+            break;
+        case DaemonMessage::SetMicrophoneEnabledPersistent:
+            withSession([&](LCRecordingSession& s) { s.setMicrophoneEnabledPersistent(argument<bool>(arguments, 0)); });
+            break;
+        case DaemonMessage::ReportCameraUsage: break;  // deliberately accepted and ignored
+        default:
+            log_.error("message %d is declared, but this daemon does not serve it", message);
+            break;
+    }
+}
+
+void LCRecordingManager::pauseRecording() {
+    log_.line("LCRecordingManager:pauseRecording");
+    const auto session = getCallingConnectionRecordingSession();
+    if (session && !session->isSystemRecording() && session->isRecording() && !session->isPaused()) session->pauseSession();
+}
+
+void LCRecordingManager::resumeRecordingWithWindowLayerContextID(ContextID contextID) {
+    const auto session = getCallingConnectionRecordingSession();
+    if (!session) return;
+    // Nothing ever accepts the resume of a broadcast: it deliberately ends here, paused or not.
+    if (session->isBroadcasting() && session->isRecording() && !session->isSystemRecording() && !didAcceptResume_) return;
+    didAcceptResume_ = false;
+    const bool resumable = !session->isSystemRecording() && session->isRecording() && session->isPaused();
+    if (checkContextIDsMatch({contextID})) {
+        log_.line("LCRecordingManager: resumeRecording");
+        if (resumable) session->resumeSessionWithContextID(contextID);
+    } else if (resumable) {
+        stopRecordingSession(session, 0, 0, [self = shared_from_this(), session](std::optional<URL> url, std::optional<Error>) {
+            self->recordingSessionStoppedWithError(
+                session, self->services_.errors._lcUserErrorForCode(RecordingErrorCode::NoContextIDMatch), url);
+        });
+    }
+}
+
+std::optional<Dictionary> LCRecordingManager::synchronousGetCurrentState() {
+    const auto session = getCallingConnectionRecordingSession();
+    if (!session) return std::nullopt;
+    Dictionary state{
+        {"isRecording", session->isRecording()},
+        {"isBroadcasting", session->isBroadcasting()},
+        {"microphoneEnabled", session->microphoneEnabled()},
+        {"isSystemRecording", session->isSystemRecording()},
+        {"hasUserConsentForMicrophone", session->hasUserConsentForMicrophone()},
+        {"hasUserConsentForCamera", session->hasUserConsentForCamera()},
+        {"microphoneEnabledPersistent", session->microphoneEnabledPersistent()},
+    };
+    // Deliberately left out when there is none.
+    if (const auto url = session->broadcastURL()) state.set("broadcastURL", *url);
+    return state;
+}
+
+}  // namespace lumacast

@@ -1,0 +1,166 @@
+// Starting a recording: from the request's first check to the client's reply.
+
+#include "daemon/LCRecordingManager.h"
+
+namespace lumacast {
+
+namespace {
+
+constexpr std::string_view kSystemRecordingEntitlement = "com.orvane.private.luma-cast";
+
+}  // namespace
+
+bool LCRecordingManager::checkContextIDsMatch(const std::vector<ContextID>& contextIDs) {
+    const auto caller = getCallingConnectionBundleID();
+    for (const ContextID contextID : contextIDs) {
+        const auto port = platform_.renderServer.clientPort(contextID);
+        if (!port) return false;
+        const auto pid = port->processIdentifier();
+        if (!pid) return false;
+        const auto owner = bundleIDOfProcess(*pid);
+        if (!owner || owner != caller) return false;  // an absent identifier matches nobody
+    }
+    return true;  // an empty list deliberately passes
+}
+
+void LCRecordingManager::refuse(std::uint64_t number, RecordingErrorCode code, std::string_view reason,
+                                const StartHandler& handler) {
+    log_.line("start request %lu refused with %d: %@", number, code, reason);
+    handler(services_.errors._lcUserErrorForCode(code), false, false);
+}
+
+void LCRecordingManager::startRecording(const StartRequest& request, StartHandler handler) {
+    const std::uint64_t number = ++requestNumber_;
+    const auto session = getCallingConnectionRecordingSession();
+    if (request.systemRecording) {
+        const auto proxy = session ? session->clientProxy() : nullptr;
+        const auto connection = proxy ? proxy->connection() : nullptr;
+        const auto granted = connection ? connection->valueForEntitlement(kSystemRecordingEntitlement) : std::nullopt;
+        const bool* entitled = granted ? granted->as<bool>() : nullptr;
+        if (!entitled || !*entitled)
+            return refuse(number, RecordingErrorCode::Entitlements, "the application lacks the entitlement", handler);
+        return refuse(number, RecordingErrorCode::FailedToStart, "this daemon does not record the whole display", handler);
+    }
+    if (!checkContextIDsMatch(request.windowLayerContextIDs))
+        return refuse(number, RecordingErrorCode::FailedToStart, "a window layer is not the application's own", handler);
+    log_.line(
+        "LCRecordingManager:startRecordingWindowLayerContextID:windowSize:microphoneEnabled:streaming:withHandler:");
+    stopCurrentRecordingSessionWithHandler([this, session, &request, number, &handler] {
+        if (!session)
+            return refuse(number, RecordingErrorCode::FailedToStart, "the application has no session any more", handler);
+        startProper(session, request, number, std::move(handler));
+    });
+}
+
+void LCRecordingManager::startProper(const std::shared_ptr<LCRecordingSession>& session, const StartRequest& request,
+                                     std::uint64_t number, StartHandler handler) {
+    if (!services_.tempStore._srDeviceHasSufficientFreeSpaceForRecording()) {
+        log_.line("insufficient disk space for recording, calling handler with error");
+        return refuse(number, RecordingErrorCode::InsufficientStorage, "100 MB must be free", handler);
+    }
+    if (!isApplicationInForegroundWithBundleIdentifier(session->bundleID())) {
+        log_.line("app is not in the foreground, calling handler with error");
+        return refuse(number, RecordingErrorCode::FailedToStart, "the application is not in the foreground", handler);
+    }
+    microphoneRecording_ = request.microphoneEnabled;
+    cameraRecording_ = request.cameraEnabled;
+    const auto preference = platform_.preferences.value(kPreferenceDomain, "LCSuppressAlert");
+    const bool* suppressAlert = preference ? preference->as<bool>() : nullptr;
+    log_.line("LCRecordingManager: suppressAlert=%d", suppressAlert && *suppressAlert);
+    if (!suppressAlert || !*suppressAlert)
+        return refuse(number, RecordingErrorCode::UserDeclined,
+                      "this daemon can't ask the user; the preference LCSuppressAlert is not set", handler);
+    if (request.captureEnabled)
+        return refuse(number, RecordingErrorCode::FailedToStart, "this daemon does not hand samples to clients", handler);
+
+    log_.line("starting...");
+    // A stop that will never be answered may have left an older transaction open.
+    if (session->managerRecord.transactionOf) resetStatesForSession(session);
+    const std::uint64_t generation = ++session->managerRecord.startGeneration;
+    session->managerRecord.transactionOf = generation;
+    beginTransaction();
+    if (request.broadcast) {
+        log_.line("broadcast requested");
+        log_.line("attempted to start broadcast without a session, bailing out");
+        resetStatesForSession(session);
+        // Deliberately without user info, so without description.
+        handler(Error(std::string(kRecordingErrorDomain),
+                      static_cast<std::int64_t>(RecordingErrorCode::InvalidBroadcastSession)),
+                false, false);
+        return;
+    }
+    log_.line("broadcast disabled");
+    session->disableBroadcast();
+    session->setRecording(true);
+    session->setIsBroadcasting(request.broadcast);
+    interruptOtherRecordingSessionAgainstSession(session);
+    session->setSystemRecording(request.systemRecording);
+    session->setContextIDs(request.windowLayerContextIDs);
+    session->setWindowSize(request.windowSize);
+    session->setMicrophoneEnabled(microphoneRecording_);
+    session->setDelegate(weak_from_this());
+    session->setCaptureRecording(request.captureEnabled);
+    session->startSessionWithHandler([self = shared_from_this(), handler = std::move(handler)] {
+        self->log_.line("recording session started");
+        handler(std::nullopt, self->microphoneRecording_, self->cameraRecording_);
+    });
+    platform_.appStateMonitor.setHandler({});
+}
+
+bool LCRecordingManager::isApplicationInForegroundWithBundleIdentifier(const BundleIdentifier& bundleID) {
+    return (platform_.appStateMonitor.applicationState(bundleID) & AppStateMonitor::kRunningForeground) != 0;
+}
+
+void LCRecordingManager::stopCurrentRecordingSessionWithHandler(Handler handler) {
+    log_.line("LCRecordingManager:stopCurrentRecordingSession:");
+    const auto sessions = bundleIDToRecordingSessionLookup_;
+    for (const auto& [id, session] : sessions) {
+        if (!session->isRecording()) continue;
+        const std::uint64_t generation = session->managerRecord.startGeneration;
+        stopRecordingSession(session, 0, 0, [self = shared_from_this(), session, generation](std::optional<URL> url,
+                                                                                         std::optional<Error>) {
+            self->discardInterruptedRecording(session, generation, url);
+        });
+    }
+    // Deliberately without waiting for the stops to complete.
+    if (handler) handler();
+}
+
+void LCRecordingManager::discardInterruptedRecording(const std::shared_ptr<LCRecordingSession>& session,
+                                                     std::uint64_t generation, const std::optional<URL>& movieURL) {
+    auto tellClient = [self = shared_from_this(), session] {
+        self->onRequestLane([self, session] {
+            if (const auto proxy = session->clientProxy())
+                proxy->stopRecordingWithError(self->services_.errors._lcUserErrorForCode(RecordingErrorCode::Interrupted),
+                                              std::nullopt);
+        });
+    };
+    if (session->managerRecord.startGeneration == generation) {
+        session->finishAndCleanupSessionFilesWithHandler(std::move(tellClient));
+        return;
+    }
+    // The application has started anew meanwhile: only this stop's own movie goes, where the new writer has another path.
+    const auto writer = session->movieWriter();
+    if (movieURL && !(writer && writer->outputURL() == *movieURL)) services_.tempStore._srRemoveFile(*movieURL, {});
+    tellClient();
+}
+
+void LCRecordingManager::interruptOtherRecordingSessionAgainstSession(const std::shared_ptr<LCRecordingSession>& session) {
+    log_.line("LCRecordingManager:interruptRecordingSessions");
+    const auto sessions = bundleIDToRecordingSessionLookup_;
+    for (const auto& [id, other] : sessions) {
+        if (id == session->bundleID()) continue;
+        // Idle sessions are asked too: they stay silent.
+        other->finishSessionWithHandler([self = shared_from_this(), other = other](std::optional<URL> url,
+                                                                                   std::optional<Error> error) {
+            self->onRequestLane([self, other, url, error] {
+                self->log_.line("interrupted session");
+                self->recordingSessionInterrupted(other, error, url);
+                other->setInterruptedMovieURL(url);
+                self->resetStatesForSession(other);
+            });
+        });
+    }
+}
+
+}  // namespace lumacast

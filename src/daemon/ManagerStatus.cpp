@@ -1,0 +1,47 @@
+// What the administrator sees of the manager.
+
+#include "daemon/LCRecordingManager.h"
+
+namespace lumacast {
+
+namespace {
+
+Dictionary describeRecording(const LCRecordingSession& session) {
+    Dictionary recording{{"paused", session.isPaused()}, {"elapsedSeconds", session.activeDuration()}};
+    if (const auto writer = session.movieWriter()) {
+        recording.set("path", writer->outputPath());
+        recording.set("width", writer->windowSize().width);
+        recording.set("height", writer->windowSize().height);
+        if (const auto file = writer->assetWriter()) recording.set("bytes", file->bytesWritten());
+    }
+    if (const auto agent = session.reportingAgent()) recording.set("frames", agent->metrics().videoFrameCount);
+    if (const auto source = session.screenCaptureController()) {
+        const auto counters = source->counters();
+        recording.set("framesDelivered", counters.delivered);
+        recording.set("framesDropped", counters.dropped);
+    }
+    return recording;
+}
+
+}  // namespace
+
+Dictionary LCRecordingManager::snapshot() const {
+    Array sessions;
+    for (const auto& [id, session] : bundleIDToRecordingSessionLookup_) {
+        const auto proxy = session->clientProxy();
+        const auto connection = proxy ? proxy->connection() : nullptr;
+        Dictionary entry{{"bundleID", id.text()},
+                         {"connected", connection != nullptr},
+                         {"recording", session->isRecording()},
+                         {"transactionOpen", session->managerRecord.transactionOf.has_value()}};
+        if (connection) entry.set("pid", number(connection->processIdentifier()));
+        if (session->isRecording()) entry.set("current", describeRecording(*session));
+        sessions.emplace_back(std::move(entry));
+    }
+    return {{"service", "com.orvane.lumacastd"},
+            {"temporaryDirectory", services_.tempStore._srTempPath()},
+            {"freeBytes", services_.tempStore._srDeviceFreeDiskSpace()},
+            {"sessions", std::move(sessions)}};
+}
+
+}  // namespace lumacast

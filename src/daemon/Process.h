@@ -1,0 +1,35 @@
+#pragma once
+#include <memory>
+
+#include "capture/LCCaptureManager.h"
+#include "daemon/LCRecordingManager.h"
+#include "platform/Platform.h"
+#include "support/Localization.h"
+#include "support/RecordingErrors.h"
+#include "support/TempStore.h"
+
+namespace lumacast {
+
+/// Owns what there is one of in the process. A test makes a fresh one per case. The platform must outlive it, and the
+/// platform's lanes must have come to rest before it is destroyed.
+class Process {
+public:
+    explicit Process(const Platform& platform);
+
+    /// Sends the manager `finishStartup` and opens the administrator's service. On the main queue's thread.
+    void start();
+
+    LCRecordingManager& manager() { return *manager_; }
+    TempStore& tempStore() { return tempStore_; }
+    LCCaptureManager& captureManager() { return captureManager_; }
+
+private:
+    const Platform platform_;
+    TempStore tempStore_;
+    Localization localization_;
+    RecordingErrors errors_;
+    LCCaptureManager captureManager_;
+    std::shared_ptr<LCRecordingManager> manager_;
+};
+
+}  // namespace lumacast

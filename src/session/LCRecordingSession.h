@@ -1,0 +1,198 @@
+#pragma once
+// One client's recording, from start to end.
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "base/Guarded.h"
+#include "base/Identifiers.h"
+#include "broadcast/LCBroadcastConfiguration.h"
+#include "capture/LCCaptureManager.h"
+#include "platform/Platform.h"
+#include "session/LCClientProtocol.h"
+#include "session/LCRecordingSessionDelegate.h"
+#include "support/LCReportingAgent.h"
+#include "support/Localization.h"
+#include "support/RecordingErrors.h"
+#include "support/TempStore.h"
+#include "writer/LCMovieWriter.h"
+
+namespace lumacast {
+
+/// What every session of a process uses. Borrowed; outlives the sessions' work.
+struct SessionServices {
+    const Platform& platform;
+    TempStore& tempStore;
+    Localization& localization;
+    RecordingErrors& errors;
+    LCCaptureManager& captureManager;
+    /// Where the continuation of a start runs; null lets it run where it stands.
+    SerialQueue* requestLane = nullptr;
+};
+
+/// How a session's samples leave it.
+enum class BroadcastProcessMode : std::int64_t { MovieClips = 0, SampleBuffers = 1 };
+
+/// One recording session per client application, kept by the manager under its bundle identifier. Held by shared_ptr: its own
+/// work keeps it alive after the registry has let it go.
+///
+/// Lanes: the manager's requests on the request lane; frames on the capture source's frame lane; source failures on the request
+/// lane. Flags are atomics; times and objects that cross lanes sit behind leaf locks.
+class LCRecordingSession : public DisplayCaptureDelegate, public std::enable_shared_from_this<LCRecordingSession> {
+public:
+    using Handler = std::function<void()>;
+    using FinishHandler = std::function<void(std::optional<URL> movieURL, std::optional<Error> error)>;
+
+    /// `initWithBundleID:`
+    LCRecordingSession(const SessionServices& services, BundleIdentifier bundleID);
+
+    // Properties.
+    const BundleIdentifier& bundleID() const { return bundleID_; }
+    std::shared_ptr<LCClientProtocol> clientProxy() const { return clientProxy_.get(); }
+    void setClientProxy(std::shared_ptr<LCClientProtocol> proxy) { clientProxy_.set(std::move(proxy)); }
+    void setDelegate(std::weak_ptr<LCRecordingSessionDelegate> delegate) { delegate_.set(std::move(delegate)); }
+    bool isRecording() const { return recording_; }
+    void setRecording(bool recording) { recording_ = recording; }
+    bool isPaused() const { return paused_; }
+    void setPaused(bool paused) { paused_ = paused; }
+    bool isSystemRecording() const { return systemRecording_; }
+    void setSystemRecording(bool systemRecording) { systemRecording_ = systemRecording; }
+    bool isBroadcasting() const { return isBroadcasting_; }
+    void setIsBroadcasting(bool broadcasting) { isBroadcasting_ = broadcasting; }
+    bool isCapturing() const { return captureRecording_; }
+    void setCaptureRecording(bool capturing) { captureRecording_ = capturing; }
+    bool microphoneEnabled() const { return microphoneEnabled_; }
+    void setMicrophoneEnabled(bool enabled) { microphoneEnabled_ = enabled; }
+    bool microphoneEnabledPersistent() const { return microphoneEnabledPersistent_; }
+    void setMicrophoneEnabledPersistent(bool enabled) { microphoneEnabledPersistent_ = enabled; }
+    bool hasUserConsentForCamera() const { return hasUserConsentForCamera_; }
+    void setHasUserConsentForCamera(bool consent) { hasUserConsentForCamera_ = consent; }
+    bool hasUserConsentForMicrophone() const { return hasUserConsentForMicrophone_; }
+    void setHasUserConsentForMicrophone(bool consent) { hasUserConsentForMicrophone_ = consent; }
+    std::optional<URL> broadcastURL() const { return broadcastURL_; }
+    void setBroadcastURL(std::optional<URL> url) { broadcastURL_ = std::move(url); }
+    std::optional<URL> interruptedMovieURL() const { return interruptedMovieURL_; }
+    void setInterruptedMovieURL(std::optional<URL> url) { interruptedMovieURL_ = std::move(url); }
+    void setContextIDs(std::vector<ContextID> contextIDs) { contextIDs_ = std::move(contextIDs); }
+    const std::vector<ContextID>& contextIDs() const { return contextIDs_; }
+    /// `setWindowSize:` — keeps the size as given and stores it capped as the capture size.
+    void setWindowSize(Size size);
+    Size windowSize() const { return windowSize_; }
+    Size originalWindowSize() const { return originalWindowSize_; }
+    std::shared_ptr<LCMovieWriter> movieWriter() const { return movieWriter_.get(); }
+    std::shared_ptr<DisplayCaptureSource> screenCaptureController() const { return screenCaptureController_.get(); }
+    std::shared_ptr<LCReportingAgent> reportingAgent() const { return reportingAgent_.get(); }
+    std::optional<Date> captureStartTime() const { return captureStartTime_.get(); }
+    /// How often startSessionWithHandler was called: tells reports of an older start from the current one's. Any lane.
+    std::uint64_t startCount() const { return starts_; }
+    /// Seconds of active capture of the current recording so far: the finished stretches and the running one.
+    double activeDuration() const;
+
+    // File naming: recomputed at each call, deliberately, so that a system recording's path names the second of the call.
+    std::string outputPath() const;
+    std::string trimmedOutputPath() const;
+    URL outputURL() const { return URL::file(outputPath()); }
+    URL trimmedOutputURL() const { return URL::file(trimmedOutputPath()); }
+
+    // Lifecycle.
+    /// `startSessionWithHandler:` — makes the writer and begins to capture; the handler is always called, whatever came of it.
+    void startSessionWithHandler(Handler handler);
+    /// `pauseSession` — only when not paused.
+    void pauseSession();
+    /// `resumeSessionWithContextID:` — only when paused.
+    void resumeSessionWithContextID(ContextID contextID);
+    void stopAllCapture();
+    /// `stopRecordingWithNotification:error:` — only while recording. Callable from the frame lane.
+    void stopRecordingWithNotification(bool notification, const std::optional<Error>& error);
+    /// `finishSessionWithHandler:` — the whole movie.
+    void finishSessionWithHandler(FinishHandler handler) { finishSessionWithStartClipDuration(0, 0, std::move(handler)); }
+    /// `finishSessionWithStartClipDuration:endClipDuration:handler:` — only while recording; otherwise the handler is
+    /// deliberately never called, nor when trimming fails. Seconds; both above 0 give a clip.
+    void finishSessionWithStartClipDuration(double startClipDuration, double endClipDuration, FinishHandler handler);
+    /// `finishAndCleanupSessionFilesWithHandler:` — stops and removes the movie, unless a later writer has its path. The
+    /// handler is called on the store's background queue.
+    void finishAndCleanupSessionFilesWithHandler(Handler handler);
+    /// `getRecordedFileSize` — bytes; 0 for anything but a plain recording.
+    std::uint64_t getRecordedFileSize();
+    void notifyRecordingMayBeStopped();
+    void notifyRecordingResumed();
+    /// `disableBroadcast`
+    void disableBroadcast();
+
+    // Usage reporting.
+    std::string _serviceNameForReporting() const;
+    void reportSummaryEvent(std::int64_t endReason);
+    /// `sessionReportCameraUsage:` — 1 back, 2 front.
+    void sessionReportCameraUsage(std::int32_t cameraPosition);
+
+    // The frame pipeline.
+    void screenCaptureControllerDidReceiveSampleBuffer(DisplayCaptureSource& source, const SampleRef& sample,
+                                                       std::uint32_t transformFlags) override;
+    void screenCaptureControllerDidFailWithStatus(DisplayCaptureSource& source, std::int32_t status) override;
+    void screenCaptureControllerWasPreempted(DisplayCaptureSource& source) override;
+    void screenCaptureControllerMediaServicesWereReset(DisplayCaptureSource& source) override;
+
+    /// `_maximumSizeWithSize:` — the capture-size cap.
+    Size _maximumSizeWithSize(Size size);
+
+    /// The manager's bookkeeping of this session, touched on the request lane only.
+    struct ManagerRecord {
+        std::uint64_t startGeneration = 0;  ///< counts this session's starts; completions of older ones leave it alone
+        std::optional<std::uint64_t> transactionOf;  ///< the start whose keep-alive transaction is open
+    };
+    ManagerRecord managerRecord;
+
+private:
+    static bool isNativeScreenOrientationPortrait() { return true; }  // deliberately fixed; kept so that the rule stays general
+    void continueStart(std::uint64_t start, std::uint64_t stops, const Handler& handler);
+    void _resumeOrStartSession();
+    void finishMovie(double startClipDuration, double endClipDuration, FinishHandler handler);
+
+    void updateDuartionWithSample(const SampleRef& sample);
+    void _processSampleBuffer(const SampleRef& sample, std::uint32_t transformFlags);
+    void _updateSampleBufferWithOffset(const SampleRef& sample, const std::function<void(const SampleRef&)>& handler);
+    SampleRef _copySampleBufferFromSourceBuffer(const SampleRef& sample, MediaTime updatedTimeStamp);
+    void deliver(const SampleRef& sample, std::uint32_t transformFlags, MediaTime originalTime);
+    std::int64_t chipId();
+
+    const SessionServices services_;
+    Log& log_;
+    const BundleIdentifier bundleID_;
+    const std::shared_ptr<SerialQueue> broadcastServiceInfoQueue_;
+
+    Guarded<std::shared_ptr<LCClientProtocol>> clientProxy_;
+    Guarded<std::weak_ptr<LCRecordingSessionDelegate>> delegate_;
+    std::atomic<bool> recording_{false}, paused_{false}, systemRecording_{false}, isBroadcasting_{false},
+        captureRecording_{false}, microphoneEnabled_{false}, microphoneEnabledPersistent_{false},
+        hasUserConsentForCamera_{false}, hasUserConsentForMicrophone_{false}, sessionWasResumed_{false};
+    std::optional<URL> broadcastURL_, interruptedMovieURL_;
+    std::vector<ContextID> contextIDs_;
+    Size windowSize_, originalWindowSize_;
+    Guarded<std::shared_ptr<LCMovieWriter>> movieWriter_;
+    Guarded<std::shared_ptr<DisplayCaptureSource>> screenCaptureController_;
+    Guarded<std::shared_ptr<LCReportingAgent>> reportingAgent_;
+    Guarded<std::optional<Date>> captureStartTime_;
+    Guarded<MediaTime> firstSampleTimestamp_{kZeroMediaTime}, lastSampleTimestamp_{kInvalidMediaTime},
+        sampleTimeOffset_{kZeroMediaTime};
+    std::atomic<std::int64_t> broadcastProcessMode_{0};
+    std::optional<LCBroadcastConfiguration> broadcastConfiguration_;
+    std::int64_t chipId_ = 0;
+
+    /// The claim of this session's last writer on its path, see TempStore::claimPath.
+    std::uint64_t pathClaim_ = 0;
+    std::atomic<std::uint64_t> starts_{0};  ///< counts startSessionWithHandler
+    std::atomic<std::uint64_t> stops_{0};  ///< counts stops of a running recording
+    std::atomic<bool> stopIsRunning_{false};  ///< the frame lane and the request lane may both stop; one does
+    bool startIsPending_ = false;      ///< the continuation of the last start has not run yet
+
+    /// Deliberately left held on the paused path of the frame pipeline; see _processSampleBuffer.
+    const std::unique_ptr<OwnerlessLock> shouldStopLock_;
+    std::atomic<bool> shouldStop_{false};
+};
+
+}  // namespace lumacast

@@ -1,0 +1,25 @@
+#pragma once
+#include <memory>
+#include <optional>
+
+#include "base/Value.h"
+
+namespace lumacast {
+
+class LCRecordingSession;
+
+/// Told by a session what happens to it, on whatever lane that happens; must not block it.
+class LCRecordingSessionDelegate {
+public:
+    virtual ~LCRecordingSessionDelegate() = default;
+    /// `recordingSession:stoppedWithError:` — the session stopped by itself, or was told to stop with notification.
+    virtual void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
+                                                  const std::optional<Error>& error) = 0;
+    /// `broadcastSession:didUpdateServiceInfo:`
+    virtual void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<LCRecordingSession>& session,
+                                                      const Dictionary& info) = 0;
+    /// `broadcastSession:didUpdateDuration:` — sent for every captured sample, from its lane.
+    virtual void broadcastSessionDidUpdateDuration(LCRecordingSession& session, double seconds) = 0;
+};
+
+}  // namespace lumacast
