@@ -1,0 +1,57 @@
+#pragma once
+#include <atomic>
+#include <cstdint>
+#include <memory>
+#include <string>
+
+#include "linux/system/FileDescriptor.h"
+#include "platform/LogSink.h"
+
+namespace lumacast {
+
+/// Where a sink writes. The defaults are those of a daemon; a test names its own.
+struct LogSinkTargets {
+    int standardError = 2;
+    int standardOutput = 1;
+    std::string journalStream;  ///< $JOURNAL_STREAM: "device:inode" of the standard error that leads to the journal
+    std::string journalSocket = "/run/systemd/journal/socket";
+};
+
+/// Log lines to standard error as `level text`, or, when standard error leads to the journal, as datagrams of its native
+/// protocol with PRIORITY and MESSAGE; `Print` lines to standard output. Never waits: a line the reader has no room for
+/// is dropped, and the next one that gets through is preceded by how many were. Lines are cut at 4000 bytes; control
+/// characters become blanks, so that no text can pretend to be a line of its own. Callable from any lane.
+class LinuxLogSink final : public LogSink {
+public:
+    explicit LinuxLogSink(const LogSinkTargets& targets);
+
+    void write(LogLevel level, std::string_view text) override;
+
+    /// Lines dropped since the start.
+    std::uint64_t droppedLines() const { return dropped_; }
+
+private:
+    /// One of the two streams, written to without waiting, whatever it is.
+    class Stream {
+    public:
+        explicit Stream(int number);
+        bool write(std::string_view bytes) const;
+
+    private:
+        enum class Kind { Ordinary, Pollable, Reopened, Socket };
+        int number_;
+        Kind kind_ = Kind::Ordinary;
+        FileDescriptor reopened_;
+    };
+
+    bool deliver(LogLevel level, const std::string& text);
+    bool sendToJournal(LogLevel level, std::string_view text) const;
+
+    const Stream error_;
+    const Stream output_;
+    FileDescriptor journal_;
+    std::atomic<std::uint64_t> dropped_{0};
+    std::atomic<std::uint64_t> unreported_{0};
+};
+
+}  // namespace lumacast

@@ -1,0 +1,38 @@
+#pragma once
+#include <chrono>
+#include <cstdint>
+#include <memory>
+#include <string>
+
+#include "platform/TelemetryReporter.h"
+
+namespace lumacast {
+
+/// Writes each event as one line of JSON to a file on this device; nothing leaves it. When the file would grow beyond its
+/// limit it becomes `<file>.1` (the one before is gone) and a new one begins. A thread of its own writes, so a caller
+/// never waits for the disk; at most 64 events wait for it, further ones are refused.
+class LinuxTelemetry final : public TelemetryReporter {
+public:
+    static constexpr std::uint64_t kDefaultLimit = 1024 * 1024;
+
+    /// `path` is the file, usually telemetry.jsonl in the state directory, whose folder is made when it is missing.
+    explicit LinuxTelemetry(std::string path, std::uint64_t maximumBytes = kDefaultLimit);
+    /// Waits at most 2 s until what was handed over is written.
+    ~LinuxTelemetry() override;
+
+    std::optional<Error> send(const TelemetrySession& session, const TelemetryUser& user, std::int64_t category,
+                              std::int64_t type, const Dictionary& payload) override;
+
+    /// Waits until everything handed over was written or refused by the disk; false when `limit` passed first.
+    bool flush(std::chrono::milliseconds limit);
+    /// Events that the disk refused.
+    std::uint64_t lostEvents() const;
+
+private:
+    struct State;
+    static void write(const std::shared_ptr<State>& state);
+
+    const std::shared_ptr<State> state_;
+};
+
+}  // namespace lumacast

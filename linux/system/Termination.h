@@ -1,0 +1,35 @@
+#pragma once
+#include <chrono>
+#include <functional>
+#include <thread>
+
+#include "linux/system/FileDescriptor.h"
+
+namespace lumacast {
+
+/// Ends the process on SIGTERM or SIGINT: calls `onTerminate` on a thread of its own, waits for it at most `limit`, and
+/// leaves with status 0, without running destructors (every other lane may be in the middle of its work). It waits for
+/// no lane itself. `onTerminate` is called at most once; later signals change nothing.
+///
+/// The signals are blocked in the thread that constructs this and so in every thread it starts afterwards: construct it
+/// before any other thread. Who starts another program must give it an empty signal mask.
+class Termination final {
+public:
+    explicit Termination(std::function<void()> onTerminate, std::chrono::milliseconds limit = std::chrono::seconds(8));
+    /// Ends the waiting. The signals stay blocked: a signal that came meanwhile must not kill a process that is ending.
+    ~Termination();
+    Termination(const Termination&) = delete;
+    Termination& operator=(const Termination&) = delete;
+
+    /// Whether the signals can be waited for; false only when the system has no descriptors left.
+    bool isWatching() const { return thread_.joinable(); }
+
+private:
+    void wait(const std::function<void()>& onTerminate, std::chrono::milliseconds limit) const;
+
+    FileDescriptor signals_;
+    FileDescriptor end_;
+    std::thread thread_;
+};
+
+}  // namespace lumacast
