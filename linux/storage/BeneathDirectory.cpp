@@ -1,0 +1,120 @@
+#include "linux/storage/BeneathDirectory.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <linux/openat2.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <memory>
+#include <vector>
+
+namespace lumacast {
+
+namespace {
+
+constexpr int kDirectoryFlags = O_PATH | O_DIRECTORY | O_CLOEXEC;
+constexpr int kMaximumDepth = 64;
+
+FileDescriptor openBeneath(int base, const std::string& path) {
+    open_how how{};
+    how.flags = static_cast<std::uint64_t>(kDirectoryFlags | O_NOFOLLOW);
+    how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS | RESOLVE_NO_MAGICLINKS;
+    return FileDescriptor(static_cast<int>(::syscall(SYS_openat2, base, path.c_str(), &how, sizeof how)));
+}
+
+FileDescriptor walkBeneath(FileDescriptor base, const std::vector<std::string>& components) {
+    for (const std::string& component : components) {
+        base.reset(::openat(base.get(), component.c_str(), kDirectoryFlags | O_NOFOLLOW));
+        if (!base) break;
+    }
+    return base;
+}
+
+std::vector<std::string> componentsOf(std::string_view path) {
+    std::vector<std::string> result;
+    while (!path.empty()) {
+        const std::size_t slash = path.find('/');
+        const std::string_view component = path.substr(0, slash);
+        if (!component.empty() && component != ".") result.emplace_back(component);
+        path.remove_prefix(slash == std::string_view::npos ? path.size() : slash + 1);
+    }
+    return result;
+}
+
+int removeTree(int directory, const std::string& name, int depth) {
+    if (depth > kMaximumDepth) return ELOOP;
+    if (::unlinkat(directory, name.c_str(), 0) == 0) return 0;
+    if (errno != EISDIR && errno != EPERM) return errno;
+    const int refusal = errno;
+    FileDescriptor opened(::openat(directory, name.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    if (!opened) return errno == ENOTDIR || errno == ELOOP ? refusal : errno;
+
+    const std::unique_ptr<DIR, int (*)(DIR*)> entries(::fdopendir(opened.get()), &::closedir);
+    if (!entries) return errno;
+    const int inside = opened.release();  // the stream closes it
+    int firstError = 0;
+    while (const dirent* entry = ::readdir(entries.get())) {
+        const std::string child = entry->d_name;
+        if (child == "." || child == "..") continue;
+        const int error = removeTree(inside, child, depth + 1);
+        if (error != 0 && firstError == 0) firstError = error;
+    }
+    if (firstError != 0) return firstError;
+    return ::unlinkat(directory, name.c_str(), AT_REMOVEDIR) == 0 ? 0 : errno;
+}
+
+}  // namespace
+
+Resolution availableResolution() {
+    const FileDescriptor root(::open("/", kDirectoryFlags));
+    return openBeneath(root.get(), ".") ? Resolution::Kernel : Resolution::Walk;
+}
+
+std::string withSingleSlashes(std::string_view path) {
+    std::string result;
+    for (const char c : path)
+        if (c != '/' || !result.ends_with('/')) result += c;
+    while (result.size() > 1 && result.ends_with('/')) result.pop_back();
+    return result;
+}
+
+std::variant<ResolvedName, int> resolveBeneath(const std::string& base, const std::string& path,
+                                               Resolution resolution) {
+    if (path.find('\0') != std::string::npos) return EINVAL;
+    const std::string top = withSingleSlashes(base);
+    const std::string whole = withSingleSlashes(path);
+    if (whole == top) {
+        const std::size_t slash = top.rfind('/');
+        FileDescriptor parent(::open(top.substr(0, slash + 1).c_str(), kDirectoryFlags));
+        if (!parent) return errno;
+        return ResolvedName{std::move(parent), top.substr(slash + 1)};
+    }
+    if (!whole.starts_with(top + "/")) return EACCES;
+    std::vector<std::string> components = componentsOf(std::string_view(whole).substr(top.size() + 1));
+    for (const std::string& component : components)
+        if (component == "..") return EACCES;
+    if (components.empty()) return EACCES;  // "." alone
+
+    ResolvedName result;
+    result.name = std::move(components.back());
+    components.pop_back();
+    result.directory.reset(::open(top.c_str(), kDirectoryFlags));
+    if (!result.directory) return errno;
+    if (components.empty()) return result;
+    if (resolution == Resolution::Walk) {
+        result.directory = walkBeneath(std::move(result.directory), components);
+    } else {
+        std::string relative;
+        for (const std::string& component : components) relative += (relative.empty() ? "" : "/") + component;
+        result.directory = openBeneath(result.directory.get(), relative);
+    }
+    if (!result.directory) return errno;
+    return result;
+}
+
+int removeTree(int directory, const std::string& name) { return removeTree(directory, name, 0); }
+
+}  // namespace lumacast

@@ -1,0 +1,42 @@
+#pragma once
+// Names resolved beneath one directory.
+
+#include <optional>
+#include <string>
+#include <string_view>
+#include <variant>
+
+#include "linux/system/FileDescriptor.h"
+
+namespace lumacast {
+
+/// How paths are resolved: by the kernel (openat2, Linux 5.6), or component by component where it does not have that or a
+/// sandbox forbids it. Both answer alike.
+enum class Resolution { Kernel, Walk };
+
+/// What the running kernel offers. Tried by a call, not read from a version.
+Resolution availableResolution();
+
+/// A name in an open directory. The name is a single component, never "." or "..".
+struct ResolvedName {
+    FileDescriptor directory;  ///< O_PATH
+    std::string name;
+};
+
+/// Finds the place of `path` beneath `base` without ever leaving it: ".." is refused, and so is every link on the way. The
+/// last component is not looked at; what is done with it must not follow links either. Both paths are absolute, doubled
+/// slashes count as one. `base` itself is reached the ordinary way (an administrator may have linked it elsewhere), and
+/// answers as its name in the folder that holds it.
+///
+/// Answers the error number instead: EACCES for a path outside `base` or with "..", ELOOP or ENOTDIR for a link on the
+/// way, else what the system says. Blocks as long as the disk does.
+std::variant<ResolvedName, int> resolveBeneath(const std::string& base, const std::string& path, Resolution resolution);
+
+/// `path` with every run of slashes as one and none at its end.
+std::string withSingleSlashes(std::string_view path);
+
+/// Removes `name` in `directory`; a directory with all that it holds. Links are removed, not followed. Answers 0 or the
+/// error number; directories nested deeper than 64 levels answer ELOOP. Blocks as long as the disk does.
+int removeTree(int directory, const std::string& name);
+
+}  // namespace lumacast

@@ -1,0 +1,194 @@
+#include "linux/storage/LinuxFileSystem.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <sys/statvfs.h>
+#include <time.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+
+#include "linux/system/LinuxEnvironment.h"
+#include "linux/system/SystemError.h"
+
+namespace lumacast {
+
+namespace {
+
+constexpr std::size_t kMaximumNames = 100'000;
+
+template <class T>
+Result<T> resultOf(std::variant<T, int> answer) {
+    if (const int* error = std::get_if<int>(&answer)) return systemError(*error);
+    return std::get<0>(std::move(answer));
+}
+
+/// For questions without an answer of their own.
+struct Done {};
+
+std::optional<Error> errorOf(const std::variant<Done, int>& answer) {
+    const int* error = std::get_if<int>(&answer);
+    return error ? std::optional(systemError(*error)) : std::nullopt;
+}
+
+Date dateOf(const statx_timestamp& time) {
+    return Date{static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) * 1e-9};
+}
+
+Date wallTime() {
+    timespec time{};
+    ::clock_gettime(CLOCK_REALTIME, &time);
+    return Date{static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) * 1e-9};
+}
+
+}  // namespace
+
+/// What a question needs of the object; owned by the question too, which may outlive the object.
+struct LinuxFileSystem::Place {
+    std::string root;
+    std::string directory;
+    Resolution resolution = Resolution::Walk;
+    std::function<void()> beforeEachQuestion;
+
+    std::variant<ResolvedName, int> resolve(const std::string& path) const {
+        if (beforeEachQuestion) beforeEachQuestion();
+        return resolveBeneath(directory, path, resolution);
+    }
+
+    /// Calls `action` with the folder's descriptor and the name; it answers 0 or -1 with errno.
+    template <class Action>
+    std::variant<Done, int> perform(const std::string& path, Action action) const {
+        const auto place = resolve(path);
+        if (const int* error = std::get_if<int>(&place)) return *error;
+        const auto& [folder, name] = std::get<ResolvedName>(place);
+        if (action(folder.get(), name) != 0) return errno;
+        return Done{};
+    }
+
+    /// Opens a directory, following a link only for the temporary directory itself.
+    std::variant<FileDescriptor, int> open(const std::string& path, int flags) const {
+        const auto place = resolve(path);
+        if (const int* error = std::get_if<int>(&place)) return *error;
+        const auto& [folder, name] = std::get<ResolvedName>(place);
+        const int noFollow = withSingleSlashes(path) == directory ? 0 : O_NOFOLLOW;
+        FileDescriptor file(::openat(folder.get(), name.c_str(), flags | noFollow | O_CLOEXEC));
+        if (!file) return errno;
+        return file;
+    }
+};
+
+LinuxFileSystem::LinuxFileSystem(Options options)
+    : place_(std::make_shared<const Place>(
+          Place{options.root, withSingleSlashes(options.root + std::string(kDeviceTemporaryDirectory)),
+                options.resolution ? *options.resolution : availableResolution(), options.beforeEachQuestion})),
+      bytesBeingWritten_(options.bytesBeingWritten),
+      patience_(options.patience) {}
+
+std::optional<Error> LinuxFileSystem::prepare() {
+    return makeDirectories(place_->directory.substr(0, place_->directory.rfind('/')));
+}
+
+template <class T>
+std::variant<T, int> LinuxFileSystem::ask(std::function<std::variant<T, int>(const Place&)> question) {
+    const auto asked = [place = place_, question = std::move(question)] { return question(*place); };
+    auto answer = disk_.ask<std::variant<T, int>>(patience_, asked);
+    if (!answer) return ETIMEDOUT;
+    return std::move(*answer);
+}
+
+std::string LinuxFileSystem::root() const { return place_->root; }
+
+bool LinuxFileSystem::exists(const std::string& path) {
+    const auto answer = ask<Done>([path](const Place& place) {
+        return place.perform(path, [](int folder, const std::string& name) {
+            struct stat status = {};
+            return ::fstatat(folder, name.c_str(), &status, AT_SYMLINK_NOFOLLOW);
+        });
+    });
+    return std::holds_alternative<Done>(answer);
+}
+
+std::optional<Error> LinuxFileSystem::createDirectory(const std::string& path) {
+    return errorOf(ask<Done>([path](const Place& place) {
+        return place.perform(path, [](int folder, const std::string& name) {
+            return ::mkdirat(folder, name.c_str(), 0700);
+        });
+    }));
+}
+
+Result<FileAttributes> LinuxFileSystem::attributes(const std::string& path) {
+    // A writer that has buffered bytes knows better than the disk, and also when the disk does not answer at all.
+    const std::optional<std::uint64_t> written =
+        bytesBeingWritten_ ? bytesBeingWritten_(withSingleSlashes(path)) : std::nullopt;
+    auto answer = ask<FileAttributes>([path](const Place& place) -> std::variant<FileAttributes, int> {
+        struct statx status = {};
+        const auto outcome = place.perform(path, [&](int folder, const std::string& name) {
+            const bool top = withSingleSlashes(path) == place.directory;
+            return ::statx(folder, name.c_str(), top ? 0 : AT_SYMLINK_NOFOLLOW, STATX_BASIC_STATS | STATX_BTIME, &status);
+        });
+        if (const int* error = std::get_if<int>(&outcome)) return *error;
+        FileAttributes result;
+        result.size = status.stx_size;
+        result.modified = dateOf(status.stx_mtime);
+        if ((status.stx_mask & STATX_BTIME) != 0) result.created = dateOf(status.stx_btime);
+        result.isDirectory = S_ISDIR(status.stx_mode);
+        return result;
+    });
+    if (written) {
+        const int* error = std::get_if<int>(&answer);
+        if (error && *error == ETIMEDOUT) return FileAttributes{*written, wallTime(), std::nullopt, false};
+        if (!error) std::get<FileAttributes>(answer).size = *written;
+    }
+    return resultOf(std::move(answer));
+}
+
+Result<std::uint64_t> LinuxFileSystem::freeSize(const std::string& path) {
+    return resultOf(ask<std::uint64_t>([path](const Place& place) -> std::variant<std::uint64_t, int> {
+        const auto opened = place.open(path, O_PATH);
+        if (const int* error = std::get_if<int>(&opened)) return *error;
+        struct statvfs status = {};
+        if (::fstatvfs(std::get<FileDescriptor>(opened).get(), &status) != 0) return errno;
+        return static_cast<std::uint64_t>(status.f_bavail) * status.f_frsize;
+    }));
+}
+
+Result<std::vector<std::string>> LinuxFileSystem::list(const std::string& path) {
+    auto opened = place_->open(path, O_RDONLY | O_DIRECTORY);
+    if (const int* error = std::get_if<int>(&opened)) return systemError(*error);
+    auto& directory = std::get<FileDescriptor>(opened);
+    const std::unique_ptr<DIR, int (*)(DIR*)> entries(::fdopendir(directory.get()), &::closedir);
+    if (!entries) return systemError(errno);
+    (void)directory.release();  // the stream closes it
+    std::vector<std::string> names;
+    errno = 0;
+    while (const dirent* entry = ::readdir(entries.get())) {
+        const std::string_view name = entry->d_name;
+        if (name != "." && name != ".." && names.size() < kMaximumNames) names.emplace_back(name);
+        errno = 0;
+    }
+    if (errno != 0) return systemError(errno);
+    return names;
+}
+
+std::optional<Error> LinuxFileSystem::remove(const std::string& path) {
+    const auto place = place_->resolve(path);
+    if (const int* error = std::get_if<int>(&place)) return systemError(*error);
+    const auto& [folder, name] = std::get<ResolvedName>(place);
+    const int error = removeTree(folder.get(), name);
+    return error == 0 ? std::nullopt : std::optional(systemError(error));
+}
+
+std::optional<Error> LinuxFileSystem::move(const std::string& from, const std::string& to) {
+    const auto source = place_->resolve(from);
+    if (const int* error = std::get_if<int>(&source)) return systemError(*error);
+    const auto destination = place_->resolve(to);
+    if (const int* error = std::get_if<int>(&destination)) return systemError(*error);
+    const auto& a = std::get<ResolvedName>(source);
+    const auto& b = std::get<ResolvedName>(destination);
+    if (::renameat(a.directory.get(), a.name.c_str(), b.directory.get(), b.name.c_str()) != 0) return systemError(errno);
+    return std::nullopt;
+}
+
+}  // namespace lumacast
