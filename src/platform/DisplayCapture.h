@@ -32,8 +32,9 @@ public:
 
 enum class GateWait : bool { No, UntilDelivered };
 
-/// Delivers what the display clone shows, as frames. Frames come when something changed, never faster than the minimum
-/// interval; the first at once after a start, and at least one each second.
+/// Delivers what the display clone shows, as frames. Frames come when something changed, in the long run never faster than
+/// the minimum interval (one that came late may be followed by the next after half of it, so that no picture of a steady
+/// stream is lost); the first at once after a start, and at least one each second.
 ///
 /// Lifetime: shared; the delegate is held weakly. All operations are callable from any lane, also from within a delivery,
 /// and never wait for the delivery thread, but for a bounded closeGate. Destroying the last reference from within a
@@ -45,11 +46,12 @@ public:
     /// Whom to deliver to; an empty pointer for nobody. A delivery in progress ends as it began.
     virtual void setDelegate(std::weak_ptr<DisplayCaptureDelegate> delegate) = 0;
 
-    /// Opens the capture gate and takes the clock of the current recording. A source starts closed.
+    /// Opens the capture gate and takes the clock of the current recording. A source starts closed, and stays so before the
+    /// first recording.
     virtual void openGate() = 0;
     /// Closes the gate: from its return on (with `UntilDelivered`, which waits at most 100 ms for a delivery in progress,
     /// and not at all on the delivery thread itself) nothing is delivered, the capture clock stands, and start does
-    /// nothing.
+    /// nothing. Delivery ends as by stop(): once the gate is open again it takes a start.
     virtual void closeGate(GateWait wait) = 0;
 
     /// Starts delivery, if the gate is open. Idempotent. A source that was started before in the same recording (the same
