@@ -34,7 +34,9 @@ struct Layout {
     [[nodiscard]] double rowEdge(int row) const { return top + (row + 0.5) * cellHeight; }
 };
 
-int rounded(double value) { return static_cast<int>(std::lround(value)); }
+int rounded(double value) {
+    return static_cast<int>(std::lround(value));
+}
 
 Cells cellsOf(std::uint32_t number) {
     const std::uint32_t word = (number & kFrameNumberMask) << 8 | frameNumberChecksum(number);

@@ -5,8 +5,8 @@
 
 namespace lumacast::scene {
 
-/// A borrowed 32-bit picture: bytes B, G, R, X in memory order, rows `stride` bytes apart (stride >= 4 * width, divisible
-/// by 4, pixels aligned to 4 bytes). The owner keeps the memory alive.
+/// A borrowed 32-bit picture: bytes B, G, R, X in memory order, rows `stride` bytes apart (stride >= 4 * width,
+/// divisible by 4, pixels aligned to 4 bytes). The owner keeps the memory alive.
 struct Picture {
     std::uint8_t* pixels = nullptr;
     int width = 0;

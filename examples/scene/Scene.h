@@ -27,9 +27,9 @@ public:
     /// At least kMinimumWidth x kMinimumHeight; smaller values are raised to it.
     Scene(int width, int height, Motion motion);
 
-    /// Draws frame `number` (its lowest 24 bits are readable by machine) and answers the rectangles that changed since this
-    /// object's last drawing, which is everything for the first one. With Motion::SmallPart later drawings write only
-    /// those, so the caller passes the same buffer each time; another buffer is drawn whole. The picture has this
+    /// Draws frame `number` (its lowest 24 bits are readable by machine) and answers the rectangles that changed since
+    /// this object's last drawing, which is everything for the first one. With Motion::SmallPart later drawings write
+    /// only those, so the caller passes the same buffer each time; another buffer is drawn whole. The picture has this
     /// object's size.
     std::vector<Rect> draw(const Picture& picture, std::uint32_t number, const WallTime& time);
 
@@ -46,9 +46,9 @@ private:
     int width_;
     int height_;
     Motion motion_;
-    int unit_;      // pixels of one glyph unit
-    int stripTop_;  // the frame pattern begins here
-    Rect footer_;   // the line of digits with the small ball
+    int unit_;                                          // pixels of one glyph unit
+    int stripTop_;                                      // the frame pattern begins here
+    Rect footer_;                                       // the line of digits with the small ball
     std::vector<std::vector<std::uint32_t>> rainbows_;  // each holds the period `width_` twice, in its own brightness
     std::vector<std::uint32_t> plate_;                  // the fine rings, plateSize_ squared
     int plateSize_;

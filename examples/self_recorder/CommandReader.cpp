@@ -21,7 +21,9 @@ CommandReader::CommandReader(Loop& loop, const CommandTable& commands, int descr
     loop_.watch(descriptor_, [this] { readable(); });
 }
 
-CommandReader::~CommandReader() { loop_.unwatch(descriptor_); }
+CommandReader::~CommandReader() {
+    loop_.unwatch(descriptor_);
+}
 
 void CommandReader::readable() {
     std::array<char, 1024> bytes{};

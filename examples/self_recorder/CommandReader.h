@@ -7,9 +7,9 @@
 
 namespace lumacast::example {
 
-/// Reads commands from a descriptor, one per line, runs them and prints the replies on standard output, each flushed. The
-/// end of the input ends the loop with status 0, so that an application never outlives the script that drives it. A line
-/// longer than 4096 bytes ends it with status 2.
+/// Reads commands from a descriptor, one per line, runs them and prints the replies on standard output, each flushed.
+/// The end of the input ends the loop with status 0, so that an application never outlives the script that drives it. A
+/// line longer than 4096 bytes ends it with status 2.
 class CommandReader final {
 public:
     /// Borrows all three.

@@ -20,12 +20,12 @@ class CommandTable final {
 public:
     using Handler = std::function<void(const Arguments&, const Reply&)>;
 
-    /// `usage` is the command as typed, its name first ("size W H"); the number of arguments must be the number of words
-    /// after the name.
+    /// `usage` is the command as typed, its name first ("size W H"); the number of arguments must be the number of
+    /// words after the name.
     void add(const std::string& usage, const std::string& help, Handler handler);
 
-    /// Runs one line. An unknown name or a wrong number of arguments is answered with "error ..." and calls no handler. An
-    /// empty line is ignored.
+    /// Runs one line. An unknown name or a wrong number of arguments is answered with "error ..." and calls no handler.
+    /// An empty line is ignored.
     void run(const std::string& line, const Reply& reply) const;
 
     /// One line per command.

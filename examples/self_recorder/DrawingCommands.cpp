@@ -8,7 +8,9 @@ namespace {
 constexpr int kLargest = 8192;
 constexpr int kFarthest = 32000;
 
-bool reachable(int place) { return place >= -kFarthest && place <= kFarthest; }
+bool reachable(int place) {
+    return place >= -kFarthest && place <= kFarthest;
+}
 
 }  // namespace
 

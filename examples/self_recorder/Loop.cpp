@@ -11,7 +11,9 @@ void Loop::watch(int descriptor, Handler handler) {
     handlers_[descriptor] = std::make_shared<Handler>(std::move(handler));
 }
 
-void Loop::unwatch(int descriptor) { handlers_.erase(descriptor); }
+void Loop::unwatch(int descriptor) {
+    handlers_.erase(descriptor);
+}
 
 void Loop::quit(int status) {
     running_ = false;

@@ -90,7 +90,8 @@ void SceneWindow::createWindow(int width, int height, const std::string& name) {
     std::array<char, HOST_NAME_MAX + 1> host{};
     if (::gethostname(host.data(), host.size() - 1) == 0) setTextProperty("WM_CLIENT_MACHINE", "STRING", host.data());
     const auto pid = static_cast<std::uint32_t>(::getpid());
-    xcb_change_property(connection, XCB_PROP_MODE_REPLACE, window_, atom("_NET_WM_PID"), XCB_ATOM_CARDINAL, 32, 1, &pid);
+    xcb_change_property(connection, XCB_PROP_MODE_REPLACE, window_, atom("_NET_WM_PID"), XCB_ATOM_CARDINAL, 32, 1,
+                        &pid);
     deleteWindow_ = atom("WM_DELETE_WINDOW");
     xcb_change_property(connection, XCB_PROP_MODE_REPLACE, window_, atom("WM_PROTOCOLS"), XCB_ATOM_ATOM, 32, 1,
                         &deleteWindow_);
@@ -100,8 +101,7 @@ void SceneWindow::createWindow(int width, int height, const std::string& name) {
 
 xcb_atom_t SceneWindow::atom(const char* name) {
     const std::string text(name);
-    const auto cookie =
-        xcb_intern_atom(connection_.get(), 0, static_cast<std::uint16_t>(text.size()), text.c_str());
+    const auto cookie = xcb_intern_atom(connection_.get(), 0, static_cast<std::uint16_t>(text.size()), text.c_str());
     const Owned<xcb_intern_atom_reply_t> reply(xcb_intern_atom_reply(connection_.get(), cookie, nullptr));
     return reply ? reply->atom : static_cast<xcb_atom_t>(XCB_ATOM_NONE);
 }

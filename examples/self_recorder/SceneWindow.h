@@ -19,11 +19,11 @@ namespace lumacast::example {
 class SceneWindow final {
 public:
     struct Events {
-        std::function<void()> shown;     ///< the picture given to `put` is on the window
-        std::function<void()> exposed;   ///< part of the window lost its content, or the window appeared
-        std::function<void()> resized;   ///< `picture()` is new and blank
-        std::function<void()> closed;    ///< the user closed the window
-        std::function<void()> lost;      ///< the display is gone or refused a request; the reason is on standard error
+        std::function<void()> shown;    ///< the picture given to `put` is on the window
+        std::function<void()> exposed;  ///< part of the window lost its content, or the window appeared
+        std::function<void()> resized;  ///< `picture()` is new and blank
+        std::function<void()> closed;   ///< the user closed the window
+        std::function<void()> lost;     ///< the display is gone or refused a request; the reason is on standard error
     };
 
     /// Connects to $DISPLAY and maps the window. On failure `error()` says why and nothing else may be called.

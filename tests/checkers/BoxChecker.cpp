@@ -26,7 +26,9 @@ struct FileWalk {
     std::uint64_t indexOffset = 0;
 };
 
-std::string at(std::uint64_t offset) { return " at " + std::to_string(offset); }
+std::string at(std::uint64_t offset) {
+    return " at " + std::to_string(offset);
+}
 
 bool isType(const std::string& type) {
     return std::all_of(type.begin(), type.end(), [](unsigned char byte) { return std::isprint(byte) != 0; });
@@ -74,7 +76,8 @@ void checkOrder(BoxReport& report) {
     const auto count = [&report](const char* type) {
         return std::count(report.topLevel.begin(), report.topLevel.end(), type);
     };
-    if (report.topLevel.empty() || report.topLevel.front() != "ftyp") report.findings.push_back("file: ftyp isn't first");
+    if (report.topLevel.empty() || report.topLevel.front() != "ftyp")
+        report.findings.push_back("file: ftyp isn't first");
     if (count("ftyp") > 1) report.findings.push_back("file: there are several ftyp boxes");
     if (count("moov") != 1)
         report.findings.push_back("file: there are " + std::to_string(count("moov")) + " moov boxes instead of one");

@@ -29,10 +29,10 @@ struct BoxReport {
     Findings findings;
 };
 
-/// Walks the boxes of a finished MP4 file strictly (ISO/IEC 14496-12): sizes nest exactly and fill the file; `ftyp` is first;
-/// there is exactly one `moov`; nothing of a fragmented file (`moof`, `mvex`, `sidx`, `mfra`) can be reached; in each track
-/// the sample tables agree with each other and with the durations, every chunk lies within an `mdat`, and no two chunks
-/// overlap. Any lane; blocks on the file.
+/// Walks the boxes of a finished MP4 file strictly (ISO/IEC 14496-12): sizes nest exactly and fill the file; `ftyp` is
+/// first; there is exactly one `moov`; nothing of a fragmented file (`moof`, `mvex`, `sidx`, `mfra`) can be reached; in
+/// each track the sample tables agree with each other and with the durations, every chunk lies within an `mdat`, and no
+/// two chunks overlap. Any lane; blocks on the file.
 [[nodiscard]] BoxReport checkBoxes(const std::string& path);
 
 }  // namespace lumacast::checkers

@@ -43,7 +43,9 @@ public:
 
 private:
     void find(const std::string& text) { findings_.push_back(where_ + ": " + text); }
-    std::vector<Box> children(const Box& box) { return boxesIn(box.content, box.offset, where_ + " " + box.type, findings_); }
+    std::vector<Box> children(const Box& box) {
+        return boxesIn(box.content, box.offset, where_ + " " + box.type, findings_);
+    }
     const Box* only(const std::vector<Box>& boxes, const char* type) { return onlyBox(boxes, type, where_, findings_); }
 
     void require(bool condition, const std::string& text) {
@@ -122,7 +124,8 @@ private:
         const std::size_t fixed = track_.handler == "vide" ? kVisualEntryBytes : kAudioEntryBytes;
         if (track_.handler != "vide" && track_.handler != "soun") return;
         if (entry.content.size() < fixed) return find("the sample entry is too short");
-        const auto inside = boxesIn(entry.content.subspan(fixed), entry.offset + fixed, where_ + " " + entry.type, findings_);
+        const auto inside =
+            boxesIn(entry.content.subspan(fixed), entry.offset + fixed, where_ + " " + entry.type, findings_);
         if (entry.type == "avc1") (void)only(inside, "avcC");
         if (entry.type == "mp4a") (void)only(inside, "esds");
     }
@@ -157,10 +160,10 @@ private:
             still = still || delta == 0;
         }
         require(!still, "stts has samples of no duration");
-        require(samples == track_.samples, "stts has times for " + std::to_string(samples) + " samples, stsz sizes for " +
-                                               std::to_string(track_.samples));
-        require(timed_ == track_.mediaDuration, "stts adds up to " + std::to_string(timed_) + ", mdhd says " +
-                                                    std::to_string(track_.mediaDuration));
+        require(samples == track_.samples, "stts has times for " + std::to_string(samples) +
+                                               " samples, stsz sizes for " + std::to_string(track_.samples));
+        require(timed_ == track_.mediaDuration,
+                "stts adds up to " + std::to_string(timed_) + ", mdhd says " + std::to_string(track_.mediaDuration));
     }
 
     void readOffsets(const std::vector<Box>& boxes) {
@@ -187,7 +190,8 @@ private:
             require(runs.back().samplesPerChunk != 0, "stsc has an empty chunk");
             const bool rising = runs.size() == 1 ? runs.back().firstChunk == 1
                                                  : runs.back().firstChunk > runs[runs.size() - 2].firstChunk;
-            if (!rising || runs.back().firstChunk > offsets_.size()) return find("stsc names chunks out of order or not there");
+            if (!rising || runs.back().firstChunk > offsets_.size())
+                return find("stsc names chunks out of order or not there");
         }
         std::uint64_t sample = 0;
         auto run = runs.begin();
@@ -199,8 +203,8 @@ private:
             counted_ += run->samplesPerChunk;
             placeChunk(chunk, {offsets_[chunk - 1], offsets_[chunk - 1] + size});
         }
-        require(counted_ == track_.samples, "stsc has " + std::to_string(counted_) + " samples in its chunks, stsz has " +
-                                                std::to_string(track_.samples));
+        require(counted_ == track_.samples, "stsc has " + std::to_string(counted_) +
+                                                " samples in its chunks, stsz has " + std::to_string(track_.samples));
     }
 
     void placeChunk(std::size_t chunk, const Extent& extent) {
@@ -264,8 +268,10 @@ private:
     }
 
     void requireNear(std::uint64_t expected, std::uint64_t slack, const std::string& what) {
-        const std::uint64_t apart = expected > track_.duration ? expected - track_.duration : track_.duration - expected;
-        require(apart <= slack, what + " lasts " + std::to_string(expected) + ", tkhd says " + std::to_string(track_.duration));
+        const std::uint64_t apart =
+            expected > track_.duration ? expected - track_.duration : track_.duration - expected;
+        require(apart <= slack,
+                what + " lasts " + std::to_string(expected) + ", tkhd says " + std::to_string(track_.duration));
     }
 
     std::uint32_t movieTimescale_;

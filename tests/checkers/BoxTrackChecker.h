@@ -22,7 +22,8 @@ struct Extent {
     std::uint64_t end = 0;
 };
 
-/// The boxes that fill `bytes`, the first at file offset `offset`. What doesn't nest exactly becomes a finding about `inside`.
+/// The boxes that fill `bytes`, the first at file offset `offset`. What doesn't nest exactly becomes a finding about
+/// `inside`.
 [[nodiscard]] std::vector<Box> boxesIn(std::span<const std::uint8_t> bytes, std::uint64_t offset,
                                        const std::string& inside, Findings& findings);
 

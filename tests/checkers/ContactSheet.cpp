@@ -42,9 +42,10 @@ std::string writeContactSheet(MovieReader& reader, const std::string& path, int 
         const int left = kGap + index % kColumns * (kCellWidth + kGap);
         const int top = kGap + index / kColumns * (cellHeight + kGap);
         for (int y = 0; y < cellHeight; ++y)
-            std::memcpy(sheet.samples.data() + static_cast<std::size_t>(((top + y) * sheet.width + left) * 3),
-                        cells[static_cast<std::size_t>(index)].samples.data() + static_cast<std::size_t>(y * kCellWidth * 3),
-                        kCellWidth * 3);
+            std::memcpy(
+                sheet.samples.data() + static_cast<std::size_t>(((top + y) * sheet.width + left) * 3),
+                cells[static_cast<std::size_t>(index)].samples.data() + static_cast<std::size_t>(y * kCellWidth * 3),
+                kCellWidth * 3);
     }
     return writePng(sheet, path);
 }

@@ -46,8 +46,9 @@ private:
     }
 
     [[nodiscard]] bool isForbidden(std::uint32_t number) const {
-        return std::any_of(expectation_.forbidden.begin(), expectation_.forbidden.end(),
-                           [number](const NumberRange& range) { return number >= range.first && number <= range.last; });
+        return std::any_of(
+            expectation_.forbidden.begin(), expectation_.forbidden.end(),
+            [number](const NumberRange& range) { return number >= range.first && number <= range.last; });
     }
 
     void checkTimes() {
@@ -124,9 +125,8 @@ private:
                 add(Kind::Unlogged, "number " + std::to_string(*picture.number) + " was never drawn");
                 continue;
             }
-            stretches[stretchOf(*picture.number)].push_back({*picture.number, picture.time,
-                                                             picture.time - stamp->second.shown,
-                                                             picture.time - stamp->second.sent});
+            stretches[stretchOf(*picture.number)].push_back(
+                {*picture.number, picture.time, picture.time - stamp->second.shown, picture.time - stamp->second.sent});
         }
         report_.largestLateness = nanoseconds::zero();
         for (auto& [place, stretch] : stretches) judgeStretch(stretch);

@@ -28,8 +28,8 @@ struct NumberRange {
 struct FrameExpectation {
     /// Each of these is in the movie.
     std::set<std::uint32_t> expected;
-    /// No number between the movie's lowest and highest is missing, but for the forbidden ones. With a log only numbers in
-    /// the log count.
+    /// No number between the movie's lowest and highest is missing, but for the forbidden ones. With a log only numbers
+    /// in the log count.
     bool withoutGaps = false;
     /// Numbers drawn while the recording was paused: none of them is in the movie. Each range parts the movie into
     /// stretches with a time line of their own.
@@ -47,7 +47,18 @@ struct FrameExpectation {
 };
 
 struct FrameFinding {
-    enum class Kind { NoPictures, Unreadable, TimesNotRising, OutOfOrder, Doubled, Missing, Forbidden, Hole, Unlogged, Late };
+    enum class Kind {
+        NoPictures,
+        Unreadable,
+        TimesNotRising,
+        OutOfOrder,
+        Doubled,
+        Missing,
+        Forbidden,
+        Hole,
+        Unlogged,
+        Late
+    };
     Kind kind;
     std::string text;
 };
@@ -71,14 +82,14 @@ struct FrameReport {
 
 /// Judges pictures given in the order of showing.
 ///
-/// The time line: in each stretch between two forbidden ranges the movie's clock and the host's may differ by any constant.
-/// The constant is the median difference of the stretch; a picture is late (or early) by what remains. Only the first
-/// picture of a number is judged, since a repeat is shown later than it was drawn.
+/// The time line: in each stretch between two forbidden ranges the movie's clock and the host's may differ by any
+/// constant. The constant is the median difference of the stretch; a picture is late (or early) by what remains. Only
+/// the first picture of a number is judged, since a repeat is shown later than it was drawn.
 [[nodiscard]] FrameReport checkFrameNumbers(const std::vector<NumberedPicture>& pictures,
                                             const FrameExpectation& expectation);
 
-/// Reads the number of every picture; `quarterTurns` is how far the pictures were turned clockwise. False, with the reason
-/// in the reader, when the movie can't be decoded to its end.
+/// Reads the number of every picture; `quarterTurns` is how far the pictures were turned clockwise. False, with the
+/// reason in the reader, when the movie can't be decoded to its end.
 [[nodiscard]] bool readFrameNumbers(MovieReader& reader, std::vector<NumberedPicture>& pictures, int quarterTurns = 0);
 
 }  // namespace lumacast::checkers

@@ -17,9 +17,9 @@ struct DrawnStamp {
 /// Every frame an application drew, by number.
 using FramesLog = std::map<std::uint32_t, DrawnStamp>;
 
-/// Reads lines "number shown_ns sent_ns"; without a third word both stamps are the second. None, with the reason, when the
-/// file can't be read or a complete line has another form. A last line without its end was still being written and is
-/// left out.
+/// Reads lines "number shown_ns sent_ns"; without a third word both stamps are the second. None, with the reason, when
+/// the file can't be read or a complete line has another form. A last line without its end was still being written and
+/// is left out.
 [[nodiscard]] std::optional<FramesLog> readFramesLog(const std::string& path, std::string& error);
 
 }  // namespace lumacast::checkers

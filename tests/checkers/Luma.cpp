@@ -6,7 +6,9 @@
 
 namespace lumacast::checkers {
 
-LumaPlane copyOf(const LumaView& view) { return turned(view, 0); }
+LumaPlane copyOf(const LumaView& view) {
+    return turned(view, 0);
+}
 
 LumaPlane turned(const LumaView& view, int quarterTurns) {
     const int turns = (quarterTurns % 4 + 4) % 4;

@@ -21,9 +21,7 @@ struct LumaPlane {
     int height = 0;
     std::vector<std::uint8_t> samples;
 
-    [[nodiscard]] LumaView view() const {
-        return {samples.data(), width, height, static_cast<std::size_t>(width)};
-    }
+    [[nodiscard]] LumaView view() const { return {samples.data(), width, height, static_cast<std::size_t>(width)}; }
 };
 
 [[nodiscard]] LumaPlane copyOf(const LumaView& view);
@@ -31,7 +29,8 @@ struct LumaPlane {
 /// The plane turned clockwise by `quarterTurns` times 90 degrees (any sign).
 [[nodiscard]] LumaPlane turned(const LumaView& view, int quarterTurns);
 
-/// The frame number drawn by the scene, when the picture was turned clockwise by `quarterTurns` on its way into the movie.
+/// The frame number drawn by the scene, when the picture was turned clockwise by `quarterTurns` on its way into the
+/// movie.
 [[nodiscard]] std::optional<std::uint32_t> frameNumberIn(const LumaView& view, int quarterTurns = 0);
 
 }  // namespace lumacast::checkers

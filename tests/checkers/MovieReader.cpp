@@ -128,13 +128,20 @@ std::optional<float> monoSample(const AVFrame& frame, int place) {
     for (int channel = 0; channel < channels; ++channel) {
         const int mixed = place * channels + channel;
         switch (frame.format) {
-            case AV_SAMPLE_FMT_FLTP: sum += reinterpret_cast<const float*>(frame.extended_data[channel])[place]; break;
-            case AV_SAMPLE_FMT_FLT: sum += reinterpret_cast<const float*>(frame.data[0])[mixed]; break;
-            case AV_SAMPLE_FMT_S16: sum += reinterpret_cast<const std::int16_t*>(frame.data[0])[mixed] / 32768.0F; break;
+            case AV_SAMPLE_FMT_FLTP:
+                sum += reinterpret_cast<const float*>(frame.extended_data[channel])[place];
+                break;
+            case AV_SAMPLE_FMT_FLT:
+                sum += reinterpret_cast<const float*>(frame.data[0])[mixed];
+                break;
+            case AV_SAMPLE_FMT_S16:
+                sum += reinterpret_cast<const std::int16_t*>(frame.data[0])[mixed] / 32768.0F;
+                break;
             case AV_SAMPLE_FMT_S16P:
                 sum += reinterpret_cast<const std::int16_t*>(frame.extended_data[channel])[place] / 32768.0F;
                 break;
-            default: return std::nullopt;
+            default:
+                return std::nullopt;
         }
     }
     return channels == 0 ? std::nullopt : std::optional(sum / static_cast<float>(channels));
@@ -203,7 +210,8 @@ std::optional<Sound> MovieReader::readSound(std::size_t track) {
                 readable = readable && sample;
                 const std::int64_t at = start + place;
                 if (at < 0 || !sample) continue;
-                if (static_cast<std::size_t>(at) >= sound.samples.size()) sound.samples.resize(static_cast<std::size_t>(at) + 1);
+                if (static_cast<std::size_t>(at) >= sound.samples.size())
+                    sound.samples.resize(static_cast<std::size_t>(at) + 1);
                 sound.samples[static_cast<std::size_t>(at)] = *sample;
             }
         });

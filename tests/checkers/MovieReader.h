@@ -47,8 +47,8 @@ struct RgbPicture {
     std::vector<std::uint8_t> samples;
 };
 
-/// Decodes a movie file with libav. Edit lists are applied, so times are what a player shows. Each read goes through the
-/// file anew. Any lane, one at a time; blocks.
+/// Decodes a movie file with libav. Edit lists are applied, so times are what a player shows. Each read goes through
+/// the file anew. Any lane, one at a time; blocks.
 class MovieReader final {
 public:
     /// On failure `error()` says why and there are no tracks.
@@ -59,12 +59,12 @@ public:
     [[nodiscard]] const std::vector<VideoTrack>& videoTracks() const { return video_; }
     [[nodiscard]] const std::vector<AudioTrack>& audioTracks() const { return audio_; }
 
-    /// Calls `each` for every picture of the first video track in the order of showing. False when the track is missing or
-    /// any part of it can't be decoded, which `error()` then explains; what could be decoded was delivered.
+    /// Calls `each` for every picture of the first video track in the order of showing. False when the track is missing
+    /// or any part of it can't be decoded, which `error()` then explains; what could be decoded was delivered.
     [[nodiscard]] bool readPictures(const std::function<void(const DecodedPicture&)>& each);
 
-    /// The sound of an audio track (0 is the first), its channels averaged. It begins at movie time zero; where the track
-    /// has no sound there is silence. None when missing or undecodable.
+    /// The sound of an audio track (0 is the first), its channels averaged. It begins at movie time zero; where the
+    /// track has no sound there is silence. None when missing or undecodable.
     [[nodiscard]] std::optional<Sound> readSound(std::size_t track = 0);
 
 private:

@@ -37,7 +37,8 @@ std::optional<double> meanSsim(const LumaView& one, const LumaView& other) {
     double sum = 0;
     int windows = 0;
     for (int top = 0; top + kWindow <= one.height; top += kStep)
-        for (int left = 0; left + kWindow <= one.width; left += kStep, ++windows) sum += windowSsim(one, other, left, top);
+        for (int left = 0; left + kWindow <= one.width; left += kStep, ++windows)
+            sum += windowSsim(one, other, left, top);
     return sum / windows;
 }
 

@@ -16,10 +16,16 @@ constexpr double kWindowSeconds = 0.1;
 constexpr double kShortestBeep = 0.02;
 constexpr double kShortestPause = 0.02;
 
-double decibels(double amplitude) { return amplitude > 1e-10 ? 20 * std::log10(amplitude) : kSilence; }
+double decibels(double amplitude) {
+    return amplitude > 1e-10 ? 20 * std::log10(amplitude) : kSilence;
+}
 
-nanoseconds secondsToTime(double seconds) { return nanoseconds(std::llround(seconds * 1e9)); }
-double timeToSeconds(nanoseconds time) { return static_cast<double>(time.count()) / 1e9; }
+nanoseconds secondsToTime(double seconds) {
+    return nanoseconds(std::llround(seconds * 1e9));
+}
+double timeToSeconds(nanoseconds time) {
+    return static_cast<double>(time.count()) / 1e9;
+}
 
 std::string inWords(double frequency, double level, double at) {
     char text[120];
@@ -40,8 +46,8 @@ Findings eachWindow(const Sound& sound, double frequency, const Stretch& stretch
     const auto end = std::min<long long>(to, static_cast<long long>(sound.samples.size()));
     Findings findings;
     for (auto start = from;; start = std::min(start + length, end - length)) {
-        const auto window = std::span(sound.samples).subspan(static_cast<std::size_t>(start),
-                                                             static_cast<std::size_t>(length));
+        const auto window =
+            std::span(sound.samples).subspan(static_cast<std::size_t>(start), static_cast<std::size_t>(length));
         const double level = toneLevel(window, sound.rate, frequency);
         if (!judge(level)) findings.push_back(inWords(frequency, level, static_cast<double>(start) / sound.rate));
         if (start >= end - length) break;
@@ -103,8 +109,9 @@ Findings checkToneAbsent(const Sound& sound, double frequency, double mostLevel,
 }
 
 Stretch wholeOf(const Sound& sound) {
-    return {nanoseconds::zero(),
-            sound.rate == 0 ? nanoseconds::zero() : secondsToTime(static_cast<double>(sound.samples.size()) / sound.rate)};
+    return {nanoseconds::zero(), sound.rate == 0
+                                     ? nanoseconds::zero()
+                                     : secondsToTime(static_cast<double>(sound.samples.size()) / sound.rate)};
 }
 
 std::vector<nanoseconds> beepOnsets(const Sound& sound, double frequency, double leastLevel) {

@@ -9,8 +9,9 @@
 
 namespace lumacast::checkers {
 
-/// Decibels below full scale of a sine of this frequency (0 is a sine of amplitude 1), by the Goertzel recurrence under a
-/// Hann window. -200 for silence or no samples. Neighbours further away than 4 / length are suppressed by 60 dB and more.
+/// Decibels below full scale of a sine of this frequency (0 is a sine of amplitude 1), by the Goertzel recurrence under
+/// a Hann window. -200 for silence or no samples. Neighbours further away than 4 / length are suppressed by 60 dB and
+/// more.
 [[nodiscard]] double toneLevel(std::span<const float> samples, int rate, double frequency);
 
 /// A stretch of movie time.
@@ -19,9 +20,10 @@ struct Stretch {
     std::chrono::nanoseconds to{};
 };
 
-/// Finds every window of 100 ms in the stretch (its whole length is looked at, the last window ends with it) in which the
-/// tone is weaker than `leastLevel` dB. A stretch that reaches beyond the sound is a finding.
-[[nodiscard]] Findings checkTonePresent(const Sound& sound, double frequency, double leastLevel, const Stretch& stretch);
+/// Finds every window of 100 ms in the stretch (its whole length is looked at, the last window ends with it) in which
+/// the tone is weaker than `leastLevel` dB. A stretch that reaches beyond the sound is a finding.
+[[nodiscard]] Findings checkTonePresent(const Sound& sound, double frequency, double leastLevel,
+                                        const Stretch& stretch);
 
 /// Finds every window of 100 ms in which the tone is stronger than `mostLevel` dB.
 [[nodiscard]] Findings checkToneAbsent(const Sound& sound, double frequency, double mostLevel, const Stretch& stretch);
@@ -29,8 +31,9 @@ struct Stretch {
 /// The whole sound.
 [[nodiscard]] Stretch wholeOf(const Sound& sound);
 
-/// When each beep of this frequency begins: where its envelope passes half of its own height. A beep lasts 20 ms or more,
-/// is louder than `leastLevel` dB and separated from the next by 20 ms of less than half its height. Good to about 1 ms.
+/// When each beep of this frequency begins: where its envelope passes half of its own height. A beep lasts 20 ms or
+/// more, is louder than `leastLevel` dB and separated from the next by 20 ms of less than half its height. Good to
+/// about 1 ms.
 [[nodiscard]] std::vector<std::chrono::nanoseconds> beepOnsets(const Sound& sound, double frequency,
                                                                double leastLevel = -40);
 

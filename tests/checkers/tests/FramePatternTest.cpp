@@ -15,7 +15,9 @@ namespace {
 using scene::Motion;
 using scene::Rect;
 
-std::optional<std::uint32_t> read(const LumaPlane& plane) { return frameNumberIn(plane.view()); }
+std::optional<std::uint32_t> read(const LumaPlane& plane) {
+    return frameNumberIn(plane.view());
+}
 
 // The mean of 2 x 2 samples each.
 LumaPlane halved(const LumaPlane& plane) {
@@ -32,7 +34,8 @@ LumaPlane halved(const LumaPlane& plane) {
 }
 
 TEST(FramePattern, IsReadBackAtEverySizeAndAtHalfOfIt) {
-    for (const auto& [width, height] : {std::pair{160, 90}, {161, 91}, {390, 844}, {640, 360}, {1366, 768}, {1920, 1080}}) {
+    for (const auto& [width, height] :
+         {std::pair{160, 90}, {161, 91}, {390, 844}, {640, 360}, {1366, 768}, {1920, 1080}}) {
         for (const std::uint32_t number : {0U, 1U, 255U, 256U, 65535U, 0xABCDEFU, 0xFFFFFFU}) {
             const LumaPlane plane = sceneLuma(width, height, number);
             EXPECT_EQ(read(plane), number) << width << "x" << height;
@@ -42,7 +45,8 @@ TEST(FramePattern, IsReadBackAtEverySizeAndAtHalfOfIt) {
 }
 
 TEST(FramePattern, EveryNumberOfAThousandIsReadBackAsItself) {
-    for (std::uint32_t number = 0; number < 1000; ++number) EXPECT_EQ(read(sceneLuma(160, 90, number * 16769)), (number * 16769) & 0xFFFFFF);
+    for (std::uint32_t number = 0; number < 1000; ++number)
+        EXPECT_EQ(read(sceneLuma(160, 90, number * 16769)), (number * 16769) & 0xFFFFFF);
 }
 
 TEST(FramePattern, TheChecksumIsTheOneThatIsDescribed) {
@@ -129,7 +133,8 @@ class SceneDrawing : public ::testing::Test {
 protected:
     static constexpr int kWidth = 320, kHeight = 180;
     std::vector<std::uint32_t> draw(scene::Scene& scene, std::vector<std::uint32_t>& buffer, std::uint32_t number) {
-        changed_ = scene.draw({reinterpret_cast<std::uint8_t*>(buffer.data()), kWidth, kHeight, kWidth * 4}, number, {1, 2, 3, 4});
+        changed_ = scene.draw({reinterpret_cast<std::uint8_t*>(buffer.data()), kWidth, kHeight, kWidth * 4}, number,
+                              {1, 2, 3, 4});
         return buffer;
     }
     [[nodiscard]] bool inChanged(int x, int y) const {
@@ -147,7 +152,8 @@ TEST_F(SceneDrawing, MovingEverywhereChangesMostPixelsFromFrameToFrame) {
     EXPECT_EQ(changed_, (std::vector<Rect>{{0, 0, kWidth, kHeight}}));
     const int upper = kWidth * kHeight / 2;
     int different = 0;
-    for (int place = 0; place < upper; ++place) different += before[static_cast<std::size_t>(place)] != after[static_cast<std::size_t>(place)];
+    for (int place = 0; place < upper; ++place)
+        different += before[static_cast<std::size_t>(place)] != after[static_cast<std::size_t>(place)];
     EXPECT_GT(different, upper / 2);
 }
 
@@ -186,9 +192,12 @@ TEST_F(SceneDrawing, StaysWithinThePictureAtOddSizes) {
         std::vector<std::uint32_t> buffer(stride * static_cast<std::size_t>(height + 1), 0xDEADBEEF);
         scene::Scene scene(width, height, Motion::Everywhere);
         for (std::uint32_t number = 0; number < 300; number += 7)
-            scene.draw({reinterpret_cast<std::uint8_t*>(buffer.data()), width, height, stride * 4}, number, {23, 59, 59, 999});
-        for (int y = 0; y <= height; ++y) EXPECT_EQ(buffer[static_cast<std::size_t>(y) * stride + static_cast<std::size_t>(width)], 0xDEADBEEF);
-        for (std::size_t x = 0; x < stride; ++x) EXPECT_EQ(buffer[static_cast<std::size_t>(height) * stride + x], 0xDEADBEEF);
+            scene.draw({reinterpret_cast<std::uint8_t*>(buffer.data()), width, height, stride * 4}, number,
+                       {23, 59, 59, 999});
+        for (int y = 0; y <= height; ++y)
+            EXPECT_EQ(buffer[static_cast<std::size_t>(y) * stride + static_cast<std::size_t>(width)], 0xDEADBEEF);
+        for (std::size_t x = 0; x < stride; ++x)
+            EXPECT_EQ(buffer[static_cast<std::size_t>(height) * stride + x], 0xDEADBEEF);
     }
 }
 

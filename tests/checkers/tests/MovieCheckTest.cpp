@@ -69,8 +69,10 @@ TEST_F(MovieCheck, AcceptsAGoodMovieAtHalfSizeAndALowBitRate) {
 }
 
 TEST_F(MovieCheck, AcceptsGoodMoviesOfOtherSizesAndWithReorderedPictures) {
-    for (const auto& [width, height, rate, half] :
-         {std::tuple{160, 90, 60'000, true}, {390, 844, 250'000, true}, {640, 360, 200'000, false}, {1280, 720, 400'000, true}}) {
+    for (const auto& [width, height, rate, half] : {std::tuple{160, 90, 60'000, true},
+                                                    {390, 844, 250'000, true},
+                                                    {640, 360, 200'000, false},
+                                                    {1280, 720, 400'000, true}}) {
         plan_.width = width;
         plan_.height = height;
         plan_.bitRate = rate;
@@ -204,7 +206,8 @@ TEST_F(MovieCheck, SaysThatDamagedMediaCantBeDecoded) {
     ASSERT_EQ(makeMovie(plan_, path), "");
     auto bytes = bytesOf(path);
     // Junk in the middle of the media; the index stays whole.
-    for (std::size_t place = bytes.size() / 2; place < bytes.size() / 2 + 400; ++place) bytes[place] = static_cast<char>(place * 37);
+    for (std::size_t place = bytes.size() / 2; place < bytes.size() / 2 + 400; ++place)
+        bytes[place] = static_cast<char>(place * 37);
     writeBytes(path, bytes);
     EXPECT_EQ(checkBoxes(path).findings, Findings{});
     MovieReader reader(path);

@@ -162,7 +162,9 @@ std::vector<PlannedPicture> steadyPictures(std::uint32_t first, int count, int f
     return pictures;
 }
 
-std::string makeMovie(const MoviePlan& plan, const std::string& path) { return Maker().run(plan, path); }
+std::string makeMovie(const MoviePlan& plan, const std::string& path) {
+    return Maker().run(plan, path);
+}
 
 LumaPlane sceneLuma(int width, int height, std::uint32_t number) {
     const auto bytes = sceneBytes(width, height, number);

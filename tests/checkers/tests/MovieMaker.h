@@ -24,7 +24,7 @@ struct MoviePlan {
     std::int64_t bitRate = 120'000;
     bool reordered = false;  ///< with B pictures
     std::vector<PlannedPicture> pictures;
-    double soundSeconds = 0;                      ///< no audio track when 0
+    double soundSeconds = 0;                     ///< no audio track when 0
     std::function<float(double seconds)> sound;  ///< amplitude up to 1
 };
 

@@ -1,0 +1,143 @@
+#include "tests/checkers/check_movie/MovieCheck.h"
+
+#include "tests/checkers/BoxChecker.h"
+#include "tests/checkers/ContactSheet.h"
+#include "tests/checkers/MovieReader.h"
+#include "tests/checkers/ToneChecker.h"
+
+namespace lumacast::checkers {
+namespace {
+
+using nlohmann::json;
+
+double milliseconds(nanoseconds time) {
+    return static_cast<double>(time.count()) / 1e6;
+}
+double seconds(nanoseconds time) {
+    return static_cast<double>(time.count()) / 1e9;
+}
+
+class Run final {
+public:
+    explicit Run(const MovieCheckOptions& options) : options_(options), reader_(options.movie) {}
+
+    MovieCheckResult go() {
+        result_.readable = reader_.error().empty();
+        if (!result_.readable) {
+            find("movie", reader_.error());
+        } else {
+            describe();
+            if (options_.readNumbers) judgeFrames();
+            judgeSound();
+            if (!options_.contactSheet.empty()) drawContactSheet();
+        }
+        if (!options_.unfinished) judgeBoxes();
+        result_.report["movie"] = options_.movie;
+        result_.report["findings"] = result_.findings;
+        result_.report["ok"] = result_.findings.empty();
+        return std::move(result_);
+    }
+
+private:
+    void find(const std::string& about, const std::string& text) { result_.findings.push_back(about + ": " + text); }
+
+    void describe() {
+        json& report = result_.report;
+        const double length = seconds(reader_.duration());
+        report["duration_s"] = length;
+        report["video"] = json::array();
+        for (const VideoTrack& track : reader_.videoTracks())
+            report["video"].push_back({{"codec", track.codec},
+                                       {"profile", track.profile},
+                                       {"pixel_format", track.pixelFormat},
+                                       {"width", track.width},
+                                       {"height", track.height},
+                                       {"rotation", track.rotation},
+                                       {"duration_s", seconds(track.duration)}});
+        report["audio"] = json::array();
+        for (const AudioTrack& track : reader_.audioTracks())
+            report["audio"].push_back({{"codec", track.codec},
+                                       {"sample_rate", track.sampleRate},
+                                       {"channels", track.channels},
+                                       {"duration_s", seconds(track.duration)}});
+        if (options_.leastSeconds && length < *options_.leastSeconds)
+            find("duration",
+                 std::to_string(length) + " s, at least " + std::to_string(*options_.leastSeconds) + " wanted");
+        if (options_.mostSeconds && length > *options_.mostSeconds)
+            find("duration",
+                 std::to_string(length) + " s, at most " + std::to_string(*options_.mostSeconds) + " wanted");
+    }
+
+    void judgeFrames() {
+        std::vector<NumberedPicture> pictures;
+        if (!readFrameNumbers(reader_, pictures, options_.turnedDegrees / 90)) find("pictures", reader_.error());
+        const FrameReport frames = checkFrameNumbers(pictures, options_.frames);
+        for (const FrameFinding& finding : frames.findings) find("frames", finding.text);
+        json& report = result_.report["frames"];
+        report = {{"count", frames.pictures},
+                  {"unreadable", frames.unreadable},
+                  {"repeats", frames.repeats},
+                  {"order_ok", frames.orderOk},
+                  {"missing", frames.missing},
+                  {"forbidden", frames.forbidden},
+                  {"largest_hole_ms", milliseconds(frames.largestHole)}};
+        report["first"] = frames.first ? json(*frames.first) : json();
+        report["last"] = frames.last ? json(*frames.last) : json();
+        report["largest_lateness_ms"] = frames.largestLateness ? json(milliseconds(*frames.largestLateness)) : json();
+    }
+
+    void judgeSound() {
+        if (options_.tones.empty() && options_.noTones.empty() && !options_.beeps) return;
+        const auto sound = reader_.readSound(options_.audioTrack);
+        if (!sound) return find("sound", reader_.error());
+        const nanoseconds margin(static_cast<std::int64_t>(options_.marginSeconds * 1e9));
+        const Stretch stretch{margin, wholeOf(*sound).to - margin};
+        const auto addAll = [this](const Findings& findings) {
+            for (const std::string& text : findings) find("sound", text);
+        };
+        for (const double tone : options_.tones) addAll(checkTonePresent(*sound, tone, options_.leastLevel, stretch));
+        for (const double tone : options_.noTones) addAll(checkToneAbsent(*sound, tone, options_.mostLevel, stretch));
+        json& report = result_.report["sound"];
+        report["duration_s"] = seconds(wholeOf(*sound).to);
+        if (!options_.beeps) return;
+        report["beeps_ms"] = json::array();
+        for (const nanoseconds onset : beepOnsets(*sound, *options_.beeps, options_.leastLevel))
+            report["beeps_ms"].push_back(milliseconds(onset));
+    }
+
+    void judgeBoxes() {
+        const BoxReport boxes = checkBoxes(options_.movie);
+        for (const std::string& text : boxes.findings) find("boxes", text);
+        json& report = result_.report["boxes"];
+        report = {{"top_level", boxes.topLevel}, {"timescale", boxes.timescale}, {"duration", boxes.duration}};
+        report["tracks"] = json::array();
+        for (const BoxTrack& track : boxes.tracks)
+            report["tracks"].push_back({{"id", track.identifier},
+                                        {"handler", track.handler},
+                                        {"codec", track.codec},
+                                        {"timescale", track.timescale},
+                                        {"media_duration", track.mediaDuration},
+                                        {"duration", track.duration},
+                                        {"samples", track.samples},
+                                        {"sync_samples", track.syncSamples},
+                                        {"chunks", track.chunks},
+                                        {"bytes", track.bytes}});
+    }
+
+    void drawContactSheet() {
+        const std::string problem = writeContactSheet(reader_, options_.contactSheet);
+        if (!problem.empty()) find("contact sheet", problem);
+    }
+
+    const MovieCheckOptions& options_;
+    MovieReader reader_;
+    MovieCheckResult result_;
+};
+
+}  // namespace
+
+MovieCheckResult checkMovie(const MovieCheckOptions& options) {
+    return Run(options).go();
+}
+
+}  // namespace lumacast::checkers

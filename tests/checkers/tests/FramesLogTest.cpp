@@ -1,0 +1,47 @@
+#include "tests/checkers/FramesLog.h"
+
+#include <gtest/gtest.h>
+
+#include "tests/checkers/tests/TestFolder.h"
+
+namespace lumacast::checkers {
+namespace {
+
+using namespace std::chrono_literals;
+
+class FramesLogTest : public ::testing::Test {
+protected:
+    std::optional<FramesLog> read(const std::string& text) {
+        const std::string path = folder_.file("frames.txt");
+        writeBytes(path, {text.begin(), text.end()});
+        error_.clear();
+        return readFramesLog(path, error_);
+    }
+    TestFolder folder_;
+    std::string error_;
+};
+
+TEST_F(FramesLogTest, ReadsLinesWithTwoAndThreeWords) {
+    const auto log = read("1 5000 4000\n2 9000\n");
+    ASSERT_TRUE(log) << error_;
+    EXPECT_EQ(log->size(), 2U);
+    EXPECT_EQ(log->at(1).shown, 5000ns);
+    EXPECT_EQ(log->at(1).sent, 4000ns);
+    EXPECT_EQ(log->at(2).sent, 9000ns);
+}
+
+TEST_F(FramesLogTest, LeavesOutALineThatIsStillBeingWritten) {
+    EXPECT_EQ(read("1 5000 4000\n2 90")->size(), 1U);
+    EXPECT_EQ(read("")->size(), 0U);
+}
+
+TEST_F(FramesLogTest, RefusesLinesOfAnotherForm) {
+    for (const char* text : {"x\n", "1\n", "1 2 x\n", "1 5 4 3\n", "1 4 5\n", "\n"}) {
+        EXPECT_FALSE(read(text)) << text;
+        EXPECT_NE(error_, "");
+    }
+    EXPECT_FALSE(readFramesLog(folder_.file("none"), error_));
+}
+
+}  // namespace
+}  // namespace lumacast::checkers
