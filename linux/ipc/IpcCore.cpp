@@ -1,0 +1,53 @@
+#include "linux/ipc/IpcCore.h"
+
+#include <fcntl.h>
+
+#include "base/Limits.h"
+#include "linux/ipc/LinuxIpcConnection.h"
+
+namespace lumacast {
+
+UserTable::Seat::~Seat() {
+    if (!table_) return;
+    const std::lock_guard lock(table_->mutex_);
+    const auto found = table_->open_.find(user_);
+    if (--found->second == 0) table_->open_.erase(found);
+}
+
+std::optional<UserTable::Seat> UserTable::take(uid_t user) {
+    const std::lock_guard lock(mutex_);
+    std::uint64_t& count = open_[user];
+    if (count >= limitOf(Limit::ConnectionsPerUser)) return std::nullopt;
+    ++count;
+    return Seat(shared_from_this(), user);
+}
+
+IpcCore::IpcCore(Reactor& theReactor, Log& theLog, EntitlementLookup lookup, std::chrono::nanoseconds deadline)
+    : reactor(theReactor),
+      log(theLog),
+      entitlements(std::move(lookup)),
+      helloDeadline(deadline),
+      spare(open("/dev/null", O_RDONLY | O_CLOEXEC)) {}
+
+void IpcCore::own(std::shared_ptr<LinuxIpcConnection> connection) {
+    const std::lock_guard lock(mutex_);
+    const LinuxIpcConnection* key = connection.get();
+    owned_.emplace(key, std::move(connection));
+}
+
+void IpcCore::release(const LinuxIpcConnection* connection) {
+    std::shared_ptr<LinuxIpcConnection> released;
+    const std::lock_guard lock(mutex_);
+    const auto found = owned_.find(connection);
+    if (found == owned_.end()) return;
+    released = std::move(found->second);
+    owned_.erase(found);
+}
+
+void IpcCore::releaseAll() {
+    decltype(owned_) released;
+    const std::lock_guard lock(mutex_);
+    released.swap(owned_);
+}
+
+}  // namespace lumacast

@@ -1,0 +1,81 @@
+#pragma once
+// What all connections and listeners of one LinuxIpc share.
+
+#include <sys/types.h>
+
+#include <array>
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string_view>
+#include <unordered_map>
+
+#include "base/Identifiers.h"
+#include "base/Log.h"
+#include "base/Value.h"
+#include "linux/ipc/Fd.h"
+#include "linux/ipc/Reactor.h"
+
+namespace lumacast {
+
+class LinuxIpcConnection;
+
+/// Answers what the administrator granted to a process under a name. Called on whatever lane asks.
+using EntitlementLookup = std::function<std::optional<Value>(ProcessID, std::string_view)>;
+
+/// Counts the open connections of each user. Thread-safe (a leaf lock).
+class UserTable : public std::enable_shared_from_this<UserTable> {
+public:
+    /// One connection's place in the count, given back when it goes.
+    class Seat {
+    public:
+        Seat(std::shared_ptr<UserTable> table, uid_t user) : table_(std::move(table)), user_(user) {}
+        Seat(Seat&&) = default;
+        Seat(const Seat&) = delete;
+        Seat& operator=(const Seat&) = delete;
+        Seat& operator=(Seat&&) = delete;
+        ~Seat();
+
+    private:
+        std::shared_ptr<UserTable> table_;
+        uid_t user_;
+    };
+
+    /// None when the user has as many connections as the limits table allows.
+    std::optional<Seat> take(uid_t user);
+
+private:
+    std::mutex mutex_;
+    std::map<uid_t, std::uint64_t> open_;
+};
+
+class IpcCore {
+public:
+    IpcCore(Reactor& theReactor, Log& theLog, EntitlementLookup lookup, std::chrono::nanoseconds deadline);
+
+    Reactor& reactor;
+    Log& log;
+    const EntitlementLookup entitlements;
+    const std::chrono::nanoseconds helloDeadline;
+    const std::shared_ptr<UserTable> users = std::make_shared<UserTable>();
+
+    /// What a connection's turn reads into. The reactor's own.
+    std::array<std::uint8_t, 65'536> scratch;
+    /// Closed for a moment when the process has no descriptor left, to take and refuse a connection. The reactor's own.
+    Fd spare;
+
+    /// Accepted connections, owned from their acceptance until their loss has been delivered.
+    void own(std::shared_ptr<LinuxIpcConnection> connection);
+    void release(const LinuxIpcConnection* connection);
+    void releaseAll();
+
+private:
+    std::mutex mutex_;
+    std::unordered_map<const LinuxIpcConnection*, std::shared_ptr<LinuxIpcConnection>> owned_;
+};
+
+}  // namespace lumacast

@@ -1,0 +1,100 @@
+#include "linux/ipc/OutgoingQueue.h"
+
+#include <sys/socket.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstring>
+#include <span>
+#include <utility>
+
+#include "base/Limits.h"
+
+namespace lumacast {
+
+namespace {
+
+constexpr std::size_t kMaximumDescriptors = limitOf(Limit::HandlesPerMessage);
+constexpr std::size_t kFramesPerWrite = 32;
+constexpr int kWritesPerFlush = 8;
+
+/// Writes once. Answers the bytes that went, or -1 with errno set.
+ssize_t write(int socket, std::span<iovec> parts, std::span<const int> descriptors) {
+    msghdr message{};
+    message.msg_iov = parts.data();
+    message.msg_iovlen = parts.size();
+    alignas(cmsghdr) std::array<char, CMSG_SPACE(kMaximumDescriptors * sizeof(int))> control;
+    if (!descriptors.empty()) {
+        const std::size_t bytes = descriptors.size() * sizeof(int);
+        control.fill(0);
+        message.msg_control = control.data();
+        message.msg_controllen = CMSG_SPACE(bytes);
+        cmsghdr* header = CMSG_FIRSTHDR(&message);
+        header->cmsg_level = SOL_SOCKET;
+        header->cmsg_type = SCM_RIGHTS;
+        header->cmsg_len = CMSG_LEN(bytes);
+        std::memcpy(CMSG_DATA(header), descriptors.data(), bytes);
+    }
+    for (;;) {
+        const ssize_t sent = sendmsg(socket, &message, MSG_DONTWAIT | MSG_NOSIGNAL);
+        if (sent >= 0 || errno != EINTR) return sent;
+    }
+}
+
+iovec rest(OutgoingFrame& frame) { return {frame.bytes.data() + frame.written, frame.bytes.size() - frame.written}; }
+
+}  // namespace
+
+OutgoingQueue::Result OutgoingQueue::send(int socket, OutgoingFrame& frame) {
+    if (waiting_.empty()) {
+        iovec part = rest(frame);
+        const ssize_t sent = write(socket, {&part, 1}, frame.descriptors);
+        if (sent < 0 && errno != EAGAIN) {
+            // Too many descriptors under way, or no memory: a receiver that is too slow. The rest is a lost peer.
+            return errno == ETOOMANYREFS || errno == ENOBUFS || errno == ENOMEM ? Result::Full : Result::Broken;
+        }
+        if (sent > 0) frame.written = static_cast<std::size_t>(sent);
+        if (frame.written == frame.bytes.size()) return Result::Sent;
+    }
+    // A frame that has begun must be finished; the queue is empty then, so there is room.
+    const std::uint64_t size = frame.bytes.size() - frame.written;
+    if (waitingBytes_ + size > limitOf(Limit::QueuedBytesPerReader)) return Result::Full;
+    waitingBytes_ += size;
+    waiting_.push_back(std::move(frame));
+    return Result::Queued;
+}
+
+OutgoingQueue::Flushed OutgoingQueue::flush(int socket, std::vector<OutgoingFrame>& done) {
+    for (int i = 0; i < kWritesPerFlush && !waiting_.empty(); ++i) {
+        std::array<iovec, kFramesPerWrite> parts;
+        std::size_t count = 0;
+        for (OutgoingFrame& frame : waiting_) {
+            // Descriptors go with the first byte of a write, so a frame that has some begins one.
+            if (count == parts.size() || (count > 0 && !frame.descriptors.empty())) break;
+            parts[count++] = rest(frame);
+        }
+        std::span<const int> descriptors;
+        if (waiting_.front().written == 0) descriptors = waiting_.front().descriptors;
+        ssize_t sent = write(socket, std::span(parts).first(count), descriptors);
+        if (sent < 0) return errno == EAGAIN ? Flushed::Some : Flushed::Broken;
+        waitingBytes_ -= static_cast<std::uint64_t>(sent);
+        while (sent > 0) {
+            OutgoingFrame& frame = waiting_.front();
+            const std::size_t part = std::min(static_cast<std::size_t>(sent), frame.bytes.size() - frame.written);
+            frame.written += part;
+            sent -= static_cast<ssize_t>(part);
+            if (frame.written < frame.bytes.size()) break;
+            done.push_back(std::move(frame));
+            waiting_.pop_front();
+        }
+    }
+    return waiting_.empty() ? Flushed::All : Flushed::Some;
+}
+
+std::deque<OutgoingFrame> OutgoingQueue::takeAll() {
+    waitingBytes_ = 0;
+    return std::exchange(waiting_, {});
+}
+
+}  // namespace lumacast
