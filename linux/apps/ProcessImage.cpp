@@ -1,0 +1,46 @@
+#include "linux/apps/ProcessImage.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <array>
+#include <string_view>
+
+#include "base/Utf8.h"
+#include "linux/system/FileDescriptor.h"
+
+namespace lumacast {
+
+namespace {
+
+constexpr std::size_t kMaximumPath = 4096;
+constexpr std::string_view kDeletedMark = " (deleted)";
+
+bool isSameFile(const struct stat& a, const struct stat& b) { return a.st_dev == b.st_dev && a.st_ino == b.st_ino; }
+
+}  // namespace
+
+std::optional<ProcessImage> processImage(ProcessID pid) {
+    if (number(pid) <= 0) return std::nullopt;
+    const FileDescriptor process(
+        ::open(("/proc/" + std::to_string(number(pid))).c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    if (!process) return std::nullopt;
+    std::array<char, kMaximumPath + kDeletedMark.size() + 1> buffer;
+    const ssize_t length = ::readlinkat(process.get(), "exe", buffer.data(), buffer.size());
+    ProcessImage image;
+    if (length <= 0 || ::fstatat(process.get(), "exe", &image.status, 0) != 0) return std::nullopt;
+    image.path.assign(buffer.data(), static_cast<std::size_t>(length));
+
+    if (!image.path.starts_with('/') || image.path.starts_with("/memfd:")) return std::nullopt;
+    // A file may well be called "x (deleted)": the kernel's mark stands where no such file is this image.
+    struct stat here = {};
+    bool isHere = ::stat(image.path.c_str(), &here) == 0 && isSameFile(here, image.status);
+    if (!isHere && image.path.ends_with(kDeletedMark)) {
+        image.path.resize(image.path.size() - kDeletedMark.size());
+        image.deleted = isHere = true;
+    }
+    if (!isHere || image.path.size() > kMaximumPath || !isValidUtf8(image.path)) return std::nullopt;
+    return image;
+}
+
+}  // namespace lumacast
