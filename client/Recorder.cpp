@@ -58,7 +58,7 @@ Answer waitFor(Operation operation) {
 class Recorder::Connection final : public IpcExportedObject, public std::enable_shared_from_this<Connection> {
 public:
     Connection(Events events, const std::string& runtimeDirectory)
-        : events_(std::move(events)), reactor_("lumacast client"), ipc_(reactor_, log_, runtimeDirectory, {}) {}
+        : events_(std::move(events)), reactor_("lumacast client"), ipc_(reactor_, log_, {.runtimeDirectory = runtimeDirectory}) {}
 
     void open() {
         connection_ = ipc_.connectToService(kServiceName);

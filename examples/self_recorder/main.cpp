@@ -11,6 +11,7 @@
 #include "examples/self_recorder/DrawingCommands.h"
 #include "examples/self_recorder/Loop.h"
 #include "examples/self_recorder/Painter.h"
+#include "examples/self_recorder/Recording.h"
 #include "examples/self_recorder/SceneWindow.h"
 
 namespace {
@@ -52,6 +53,7 @@ int main(int argc, char** argv) {
         window.events.closed = [&loop] { loop.quit(0); };
         window.events.lost = [&loop] { loop.quit(1); };
         example::addDrawingCommands(commands, loop, window, painter);
+        const example::Recording recording(loop, commands, window, painter);
         loop.watch(window.descriptor(), [&window] { window.pump(); });
         // Events that arrived while a reply was awaited don't wake the descriptor again.
         loop.beforeWaiting([&window] { window.pump(); });
