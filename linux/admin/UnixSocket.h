@@ -1,0 +1,21 @@
+#pragma once
+#include <sys/types.h>
+
+#include <optional>
+#include <string>
+
+#include "linux/system/FileDescriptor.h"
+
+namespace lumacast {
+
+/// A listening stream socket at `path`, for this user alone, non-blocking. A socket that nobody listens at any more is
+/// replaced; one that somebody does, and anything that is not a socket, is left alone: then, and on any failure, empty.
+FileDescriptor listenAt(const std::string& path);
+
+/// A connection to the socket at `path`, non-blocking; empty when nobody listens there.
+FileDescriptor connectTo(const std::string& path);
+
+/// The user at the other end, by the kernel's word; none when the system does not say.
+std::optional<uid_t> peerUser(int socket);
+
+}  // namespace lumacast
