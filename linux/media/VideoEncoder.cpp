@@ -1,6 +1,7 @@
 #include "linux/media/VideoEncoder.h"
 
 #include <algorithm>
+#include <bit>
 #include <cstring>
 #include <string>
 
@@ -20,9 +21,9 @@ void describe(AVCodecContext& context, const VideoTrackSettings& settings) {
     context.max_b_frames = 0;
     context.profile = FF_PROFILE_H264_HIGH;
     context.bit_rate = settings.bitRate;
-    // Half as much again in any one second: a scene change may cost something, but a page can be streamed.
-    context.rc_max_rate = settings.bitRate + settings.bitRate / 2;
-    context.rc_buffer_size = static_cast<int>(std::min<std::int64_t>(context.rc_max_rate, INT32_MAX));
+    // The average is a ceiling: what is simple takes less. A second's worth may be spent at once.
+    context.rc_max_rate = settings.bitRate;
+    context.rc_buffer_size = static_cast<int>(settings.bitRate);
     context.flags |= AV_CODEC_FLAG_GLOBAL_HEADER;
     context.color_primaries = AVCOL_PRI_SMPTE170M;
     context.color_trc = AVCOL_TRC_SMPTE170M;
@@ -41,9 +42,11 @@ void tune(AVCodecContext& context, const std::string& name) {
         set("tune", "zerolatency");
         set("profile", "high");
         set("forced-idr", "1");
-        // "ultrafast" alone is Constrained Baseline: the 8x8 transform makes it High. Pictures come when something
-        // changed, so rate control must look at the stamps.
-        set("x264-params", "8x8dct=1:cabac=1:force-cfr=0:scenecut=0:keyint-min=1");
+        // Constant quality beneath the ceiling. An average would be met by starving rare pictures: this encoder spends
+        // per picture, and can look at the stamps only if it may hold a picture back (see paceRate).
+        set("crf", "20");
+        // "ultrafast" alone is Constrained Baseline: the 8x8 transform makes it High.
+        set("x264-params", "8x8dct=1:cabac=1:force-cfr=1:scenecut=0:keyint-min=1");
     } else if (name == "h264_nvenc") {
         set("preset", "p4");
         set("tune", "ull");
@@ -136,6 +139,7 @@ bool VideoEncoder::works(VideoEncoder& encoder, const VideoTrackSettings& settin
 
 std::optional<Error> VideoEncoder::encode(const std::shared_ptr<I420Picture>& picture, std::int64_t stamp, KeyFrame key,
                                           const Output& output) {
+    if (!uploads_) paceRate(stamp);
     AVFrame& frame = *frame_;
     av_frame_unref(&frame);
     frame.buf[0] = shareMemory(picture);
@@ -154,6 +158,17 @@ std::optional<Error> VideoEncoder::encode(const std::shared_ptr<I420Picture>& pi
     av_frame_unref(&frame);
     if (error < 0) return avError(error);
     return receive(output);
+}
+
+/// The software encoder refills its rate buffer by one sixtieth (the frame rate) of a second with each picture. Where
+/// pictures are rarer its rate is raised accordingly, by powers of two, so that bits are counted per second of media.
+void VideoEncoder::paceRate(std::int64_t stamp) {
+    const std::int64_t interval = lastStamp_ ? stamp - *lastStamp_ : 0;
+    lastStamp_ = stamp;
+    const std::int64_t pictures = std::clamp<std::int64_t>(interval * context_->framerate.num / kTimescale, 1,
+                                                           context_->framerate.num);
+    const auto times = static_cast<std::int64_t>(std::bit_floor(static_cast<std::uint64_t>(pictures)));
+    context_->rc_max_rate = context_->bit_rate * times;
 }
 
 int VideoEncoder::send(AVFrame* frame) {

@@ -68,6 +68,7 @@ private:
     static std::variant<std::unique_ptr<VideoEncoder>, Error> openNamed(const char* name,
                                                                         const VideoTrackSettings& settings);
     static bool works(VideoEncoder& encoder, const VideoTrackSettings& settings);
+    void paceRate(std::int64_t stamp);
     int send(AVFrame* frame);
     std::optional<Error> receive(const Output& output);
 
@@ -75,6 +76,7 @@ private:
     AvOwned<AVBufferRef> uploads_;  ///< frames in the device's memory; null for encoders that read ours
     AvOwned<AVFrame> frame_, uploaded_;
     AvOwned<AVPacket> packet_;
+    std::optional<std::int64_t> lastStamp_;
 };
 
 /// Decides by stamps where key frames must stand. A value; one per track.

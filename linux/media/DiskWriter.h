@@ -1,0 +1,82 @@
+#pragma once
+#include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <cstdint>
+#include <deque>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "linux/media/MovieFile.h"
+#include "linux/media/mp4/BoxSink.h"
+
+namespace lumacast::media {
+
+/// Writes one movie file on a thread of its own, behind a bounded buffer. What is appended from the movie's encoder
+/// thread waits there for room; nothing else ever waits for the disk. After the first failure everything is dropped.
+class DiskWriter final : public mp4::BoxSink {
+public:
+    /// Bytes that may wait for the disk: more than ten seconds at the highest bit rate a window gets by itself.
+    static constexpr std::size_t kBufferBytes = 16u << 20u;
+
+    /// Begins creating the file. `failed` is called once, on the disk's thread, when anything goes wrong.
+    DiskWriter(std::shared_ptr<MovieFiles> files, std::string path, std::function<void(int error)> failed);
+    DiskWriter(const DiskWriter&) = delete;
+    DiskWriter& operator=(const DiskWriter&) = delete;
+    /// Waits for the thread: close() and wait before on lanes that must not.
+    ~DiskWriter() override;
+
+    /// Waits for the creation, at most `limit`: its error's number, 0 for success, none when the disk has not answered.
+    std::optional<int> waitForCreation(std::chrono::milliseconds limit);
+
+    [[nodiscard]] bool append(std::span<const std::uint8_t> bytes) override;
+    [[nodiscard]] bool overwrite(std::uint64_t offset, std::span<const std::uint8_t> bytes) override;
+    [[nodiscard]] bool sync() override;
+
+    /// Waits until all is done; the first error's number, 0 for none.
+    int drain();
+    /// Drops what waits (when `keep` is false), closes the file and ends the thread, without waiting for either.
+    enum class Pending { Write, Drop };
+    void close(Pending pending);
+
+    /// Whether the file is closed and the thread has nothing left to do but end.
+    bool hasEnded() const { return ended_.load(std::memory_order_acquire); }
+    /// Bytes in the file so far. Any thread.
+    std::uint64_t bytesWritten() const { return written_.load(std::memory_order_relaxed); }
+
+private:
+    struct Operation {
+        enum class Kind { Write, Sync } kind = Kind::Write;
+        std::uint64_t offset = 0;
+        std::vector<std::uint8_t> bytes;
+    };
+
+    bool submit(Operation operation);
+    void work(MovieFile* file);
+    void run(const std::shared_ptr<MovieFiles>& files, const std::string& path);
+    int perform(MovieFile& file, const Operation& operation);
+    void fail(int error);
+
+    const std::function<void(int)> failed_;
+    std::atomic<std::uint64_t> written_ = 0;
+    std::atomic<bool> ended_ = false;
+    std::uint64_t end_ = 0;  ///< where the next append goes; the encoder thread's
+
+    std::mutex mutex_;
+    std::condition_variable changed_;
+    std::deque<Operation> waiting_;
+    std::size_t waitingBytes_ = 0;
+    bool busy_ = true;  ///< at first with the creation
+    bool created_ = false;
+    bool closing_ = false;
+    int error_ = 0;
+
+    std::thread thread_;  ///< last: it uses the rest
+};
+
+}  // namespace lumacast::media

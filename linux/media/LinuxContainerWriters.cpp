@@ -1,0 +1,60 @@
+#include "linux/media/LinuxContainerWriters.h"
+
+#include <algorithm>
+#include <utility>
+
+#include "linux/media/LinuxContainerWriter.h"
+
+namespace lumacast {
+
+LinuxContainerWriters::LinuxContainerWriters(const Clock& clock)
+    : LinuxContainerWriters(clock, std::make_shared<media::PosixMovieFiles>()) {}
+
+LinuxContainerWriters::LinuxContainerWriters(const Clock& clock, std::shared_ptr<media::MovieFiles> files)
+    : clock_(clock), files_(std::move(files)), choice_(std::make_shared<media::EncoderChoice>()) {
+    // The library talks to the standard error output by itself, above all about hardware that is not there.
+    av_log_set_level(AV_LOG_QUIET);
+}
+
+LinuxContainerWriters::~LinuxContainerWriters() {
+    for (const auto& recording : recordings_) recording->abandon();
+}
+
+std::variant<std::unique_ptr<ContainerWriter>, Error> LinuxContainerWriters::make(const URL& outputURL,
+                                                                                  ContainerType) {
+    forgetEnded();
+    auto recording = std::make_shared<media::MovieRecording>(files_, outputURL.path(), clock_.captureClock(), choice_);
+    {
+        const std::lock_guard lock(mutex_);
+        recordings_.push_back(recording);
+    }
+    const std::optional<int> created = recording->waitForCreation(kCreationLimit);
+    if (created && *created != 0) {
+        recording->abandon();
+        return media::systemError(*created);
+    }
+    return std::make_unique<LinuxContainerWriter>(std::move(recording), outputURL);
+}
+
+void LinuxContainerWriters::closeOpenMovies() {
+    Recordings open;
+    {
+        const std::lock_guard lock(mutex_);
+        open = recordings_;
+    }
+    const auto deadline = std::chrono::steady_clock::now() + kClosingLimit;
+    for (const auto& recording : open) recording->requestFinish();  // all at once, then wait for each
+    for (const auto& recording : open) recording->waitUntilFinished(deadline);
+}
+
+/// Lets go of recordings whose threads only have to be joined, which takes no time.
+void LinuxContainerWriters::forgetEnded() {
+    Recordings ended;
+    const std::lock_guard lock(mutex_);
+    const auto isOpen = [](const auto& recording) { return !recording->hasEnded(); };
+    const auto first = std::stable_partition(recordings_.begin(), recordings_.end(), isOpen);
+    ended.assign(std::make_move_iterator(first), std::make_move_iterator(recordings_.end()));
+    recordings_.erase(first, recordings_.end());
+}
+
+}  // namespace lumacast

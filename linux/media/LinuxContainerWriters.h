@@ -1,0 +1,49 @@
+#pragma once
+#include <chrono>
+#include <memory>
+#include <mutex>
+#include <vector>
+
+#include "linux/media/MovieFile.h"
+#include "linux/media/MovieRecording.h"
+#include "platform/Clock.h"
+#include "platform/ContainerWriter.h"
+
+namespace lumacast {
+
+/// Makes writers of MP4 files: H.264 by libavcodec (hardware that works, else software), AAC, and a file that can be
+/// played while it grows. Callable from any lane. To be destroyed after its writers; that waits for their threads.
+class LinuxContainerWriters final : public ContainerWriters {
+public:
+    /// How long making a writer waits for the disk; a file that can't be made after that fails the writer later.
+    static constexpr std::chrono::milliseconds kCreationLimit{40};
+    /// How long closeOpenMovies waits for encoders and disks.
+    static constexpr std::chrono::seconds kClosingLimit{5};
+
+    /// `clock` must outlive it.
+    explicit LinuxContainerWriters(const Clock& clock);
+    /// With files from elsewhere.
+    LinuxContainerWriters(const Clock& clock, std::shared_ptr<media::MovieFiles> files);
+    LinuxContainerWriters(const LinuxContainerWriters&) = delete;
+    LinuxContainerWriters& operator=(const LinuxContainerWriters&) = delete;
+    ~LinuxContainerWriters() override;
+
+    std::variant<std::unique_ptr<ContainerWriter>, Error> make(const URL& outputURL, ContainerType type) override;
+
+    /// For the end of the process: finishes every movie that is being written, each up to its own clock's time, and
+    /// waits for that, at most kClosingLimit in all. Needs no lane of the daemon; to be called on a thread that may wait. The
+    /// writers take no samples any more.
+    void closeOpenMovies();
+
+private:
+    using Recordings = std::vector<std::shared_ptr<media::MovieRecording>>;
+    void forgetEnded();
+
+    const Clock& clock_;
+    const std::shared_ptr<media::MovieFiles> files_;
+    const std::shared_ptr<media::EncoderChoice> choice_;
+    std::mutex mutex_;
+    Recordings recordings_;  ///< whose threads have not all ended
+};
+
+}  // namespace lumacast

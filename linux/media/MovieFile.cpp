@@ -1,0 +1,57 @@
+#include "linux/media/MovieFile.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+namespace lumacast::media {
+
+namespace {
+
+class PosixMovieFile final : public MovieFile {
+public:
+    explicit PosixMovieFile(int descriptor) : descriptor_(descriptor) {}
+    PosixMovieFile(const PosixMovieFile&) = delete;
+    PosixMovieFile& operator=(const PosixMovieFile&) = delete;
+    ~PosixMovieFile() override { ::close(descriptor_); }
+
+    int write(std::uint64_t offset, std::span<const std::uint8_t> bytes) override {
+        while (!bytes.empty()) {
+            const ssize_t count = ::pwrite(descriptor_, bytes.data(), bytes.size(), static_cast<off_t>(offset));
+            if (count < 0 && errno == EINTR) continue;
+            if (count < 0) return errno;
+            if (count == 0) return EIO;
+            offset += static_cast<std::uint64_t>(count);
+            bytes = bytes.subspan(static_cast<std::size_t>(count));
+        }
+        return 0;
+    }
+
+    int sync() override {
+        while (::fdatasync(descriptor_) != 0) {
+            if (errno == EINTR) continue;
+            return errno == EINVAL || errno == EROFS ? 0 : errno;  // not a file that can be synced
+        }
+        return 0;
+    }
+
+private:
+    const int descriptor_;
+};
+
+bool climbs(const std::string& path) { return ("/" + path + "/").find("/../") != std::string::npos; }
+
+}  // namespace
+
+std::variant<std::unique_ptr<MovieFile>, int> PosixMovieFiles::create(const std::string& path) {
+    if (path.empty() || climbs(path)) return EINVAL;
+    for (;;) {
+        // The mode is what umask 077 would leave, whatever the process's umask is.
+        const int descriptor = ::open(path.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
+        if (descriptor >= 0) return std::make_unique<PosixMovieFile>(descriptor);
+        if (errno != EINTR) return errno;
+    }
+}
+
+}  // namespace lumacast::media

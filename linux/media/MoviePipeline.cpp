@@ -1,0 +1,75 @@
+#include "linux/media/MoviePipeline.h"
+
+#include <algorithm>
+#include <ctime>
+#include <utility>
+
+namespace lumacast::media {
+
+namespace {
+
+/// Players show these.
+constexpr const char* kSoundNames[] = {"Application audio", "Microphone"};
+
+mp4::MovieOptions options() {
+    constexpr std::uint64_t kFrom1904To1970 = 2'082'844'800;
+    mp4::MovieOptions options;
+    options.creationTime = kFrom1904To1970 + static_cast<std::uint64_t>(std::time(nullptr));
+    options.fragmentsPerSync = MoviePipeline::kFragmentsPerSync;
+    return options;
+}
+
+}  // namespace
+
+MoviePipeline::MoviePipeline(DiskWriter& disk) : movie_(disk, options()) {}
+
+std::variant<std::unique_ptr<MoviePipeline>, Error> MoviePipeline::open(const std::vector<TrackPlan>& tracks,
+                                                                        EncoderChoice& choice, DiskWriter& disk) {
+    std::unique_ptr<MoviePipeline> pipeline(new MoviePipeline(disk));
+    std::size_t sounds = 0;
+    for (const TrackPlan& plan : tracks) {
+        if (const auto* const video = std::get_if<VideoTrackSettings>(&plan.settings)) {
+            auto opened = PictureTrack::open(*video, plan.transform, choice, pipeline->movie_);
+            if (auto* const error = std::get_if<Error>(&opened)) return *error;
+            pipeline->tracks_.emplace_back(std::move(std::get<0>(opened)));
+        } else {
+            const char* const name = kSoundNames[std::min(sounds++, std::size(kSoundNames) - 1)];
+            auto opened = SoundTrack::open(std::get<AudioTrackSettings>(plan.settings), name, pipeline->movie_);
+            if (auto* const error = std::get_if<Error>(&opened)) return *error;
+            pipeline->tracks_.emplace_back(std::move(std::get<0>(opened)));
+        }
+    }
+    if (const auto error = movieError(pipeline->movie_.start())) return *error;
+    return pipeline;
+}
+
+std::optional<Error> MoviePipeline::add(std::size_t track, SampleRef sample, std::int64_t nanoseconds) {
+    std::optional<Error> error;
+    if (auto* const pictures = std::get_if<std::unique_ptr<PictureTrack>>(&tracks_[track])) {
+        error = (*pictures)->add(std::move(sample), nanoseconds);
+    } else {
+        error = std::get<std::unique_ptr<SoundTrack>>(tracks_[track])->add(*sample, nanoseconds);
+    }
+    if (!flushTime_) flushTime_ = lastFlush_ + kFlushInterval;
+    return error;
+}
+
+std::optional<Error> MoviePipeline::flush() {
+    lastFlush_ = std::chrono::steady_clock::now();
+    flushTime_.reset();
+    return movieError(movie_.flushFragment());
+}
+
+std::optional<Error> MoviePipeline::finish(std::optional<std::int64_t> end) {
+    std::int64_t lastPictureEnd = 0;
+    for (auto& track : tracks_) {
+        const auto error = std::visit([](auto& any) { return any->finish(); }, track);
+        if (error) return error;
+        if (auto* const pictures = std::get_if<std::unique_ptr<PictureTrack>>(&track)) {
+            lastPictureEnd = (end.value_or((*pictures)->naturalEnd()) + 500) / 1000;
+        }
+    }
+    return movieError(movie_.finish(lastPictureEnd));
+}
+
+}  // namespace lumacast::media

@@ -1,0 +1,58 @@
+#pragma once
+#include <chrono>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <variant>
+#include <vector>
+
+#include "linux/media/DiskWriter.h"
+#include "linux/media/PictureTrack.h"
+#include "linux/media/SoundTrack.h"
+
+namespace lumacast::media {
+
+/// What a track input was asked for.
+struct TrackPlan {
+    std::variant<VideoTrackSettings, AudioTrackSettings> settings;
+    AffineTransform transform;  ///< video only
+    bool isVideo() const { return std::holds_alternative<VideoTrackSettings>(settings); }
+};
+
+/// From samples to the movie file: conversion, encoders and box writer of one movie. Belongs to its encoder thread.
+class MoviePipeline final {
+public:
+    using SteadyTime = std::chrono::steady_clock::time_point;
+
+    /// What was encoded is handed to the disk at most this long after (wall time). Together with the encoder's time it
+    /// keeps a killed movie playable up to its last second, however rare the pictures are.
+    static constexpr std::chrono::milliseconds kFlushInterval{500};
+    /// Fragments between two times that the file is brought onto the disk for good: every two seconds while it grows.
+    static constexpr std::uint32_t kFragmentsPerSync = 4;
+
+    /// Opens the encoders and begins the file. `disk` must outlive it.
+    static std::variant<std::unique_ptr<MoviePipeline>, Error> open(const std::vector<TrackPlan>& tracks,
+                                                                    EncoderChoice& choice, DiskWriter& disk);
+
+    /// Adds a sample of the track with this number that begins at `nanoseconds` after the movie's zero.
+    std::optional<Error> add(std::size_t track, SampleRef sample, std::int64_t nanoseconds);
+
+    /// When flush must be called next; none while nothing waits.
+    std::optional<SteadyTime> flushTime() const { return flushTime_; }
+    std::optional<Error> flush();
+
+    /// Encodes the rest and writes the index. `end` is when the movie ends, nanoseconds after zero; none: when
+    /// its last picture does by itself. Not yet on the disk when it returns.
+    std::optional<Error> finish(std::optional<std::int64_t> end);
+
+private:
+    explicit MoviePipeline(DiskWriter& disk);
+
+    mp4::MovieBoxWriter movie_;
+    std::vector<std::variant<std::unique_ptr<PictureTrack>, std::unique_ptr<SoundTrack>>> tracks_;
+    std::optional<SteadyTime> flushTime_;
+    SteadyTime lastFlush_{};
+};
+
+}  // namespace lumacast::media

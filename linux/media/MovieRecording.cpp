@@ -1,0 +1,241 @@
+#include "linux/media/MovieRecording.h"
+
+#include <algorithm>
+#include <utility>
+
+namespace lumacast::media {
+
+MovieRecording::MovieRecording(std::shared_ptr<MovieFiles> files, std::string path,
+                               std::shared_ptr<CaptureClock> clock, std::shared_ptr<EncoderChoice> choice)
+    : clock_(std::move(clock)), choice_(std::move(choice)),
+      disk_(std::move(files), std::move(path), [this](int error) { fail(systemError(error)); }) {}
+
+MovieRecording::~MovieRecording() {
+    abandon();
+    if (thread_.joinable()) thread_.join();
+}
+
+// --- Called by the owner's lanes -------------------------------------------------------------------------------------
+
+std::optional<std::size_t> MovieRecording::addTrack(TrackPlan plan) {
+    const std::lock_guard lock(mutex_);
+    const auto isVideo = [](const Track& track) { return track.plan.isVideo(); };
+    const bool isSecondPicture = plan.isVideo() && std::any_of(tracks_.begin(), tracks_.end(), isVideo);
+    if (status_ != ContainerStatus::Unknown || isSecondPicture) return std::nullopt;
+    tracks_.push_back({std::move(plan), 0, std::nullopt});
+    return tracks_.size() - 1;
+}
+
+void MovieRecording::setTransform(std::size_t track, const AffineTransform& transform) {
+    const std::lock_guard lock(mutex_);
+    if (status_ == ContainerStatus::Unknown) tracks_[track].plan.transform = transform;
+}
+
+bool MovieRecording::startWriting() {
+    const std::lock_guard lock(mutex_);
+    if (status_ != ContainerStatus::Unknown || tracks_.empty()) return false;
+    status_ = ContainerStatus::Writing;
+    startThread();
+    return true;
+}
+
+void MovieRecording::startSession(MediaTime time) {
+    const std::lock_guard lock(mutex_);
+    if (status_ == ContainerStatus::Writing && !sessionStart_) sessionStart_ = nanosecondsOf(time);
+}
+
+void MovieRecording::endSession(MediaTime time) {
+    const std::lock_guard lock(mutex_);
+    if (status_ == ContainerStatus::Writing && sessionStart_ && !finishing_) sessionEnd_ = nanosecondsOf(time);
+}
+
+bool MovieRecording::hasRoom(std::size_t track) const {
+    const std::lock_guard lock(mutex_);
+    return tracks_[track].waiting < tracks_[track].depth();
+}
+
+bool MovieRecording::append(std::size_t number, const SampleRef& sample) {
+    if (!sample) return false;
+    const auto stamp = nanosecondsOf(sample->presentationTime());
+    const std::lock_guard lock(mutex_);
+    if (status_ != ContainerStatus::Writing || finishing_ || !sessionStart_ || !stamp) return false;
+    Track& track = tracks_[number];
+    const bool isVideo = sample->format().type == MediaType::Video;
+    if (isVideo != track.plan.isVideo() || track.waiting >= track.depth()) return false;
+
+    const bool isRepeat = track.lastNanoseconds && *stamp <= *track.lastNanoseconds;
+    const bool isEarly = isVideo && *stamp < *sessionStart_;  // sound is cut where the session begins
+    const bool isLate = sessionEnd_ && *stamp > *sessionEnd_;
+    if (isRepeat || isEarly || isLate) return true;
+    track.lastNanoseconds = stamp;
+    track.waiting += 1;
+    items_.push_back({number, sample, *stamp - *sessionStart_});
+    changed_.notify_all();
+    return true;
+}
+
+void MovieRecording::finish(std::function<void()> completion) {
+    const std::lock_guard lock(mutex_);
+    completions_.push_back(std::move(completion));
+    finishLocked();
+    startThread();  // where nothing was started a thread is needed for the completion alone
+    changed_.notify_all();
+}
+
+void MovieRecording::finishLocked() {
+    if (finishing_) return;
+    finishing_ = true;
+    if (clock_) clockAtFinish_ = nanosecondsOf(clock_->now());
+    if (status_ == ContainerStatus::Unknown) failLocked(systemError(ENODATA));
+}
+
+void MovieRecording::abandon() {
+    const std::lock_guard lock(mutex_);
+    abandoned_ = true;
+    if (!thread_.joinable()) {  // never started
+        disk_.close(DiskWriter::Pending::Drop);
+        ended_.store(true, std::memory_order_release);
+    }
+    changed_.notify_all();
+}
+
+ContainerStatus MovieRecording::status() const {
+    const std::lock_guard lock(mutex_);
+    return status_;
+}
+
+std::optional<Error> MovieRecording::error() const {
+    const std::lock_guard lock(mutex_);
+    return error_;
+}
+
+void MovieRecording::requestFinish() {
+    const std::lock_guard lock(mutex_);
+    if (status_ != ContainerStatus::Writing) return;
+    finishLocked();
+    changed_.notify_all();
+}
+
+void MovieRecording::waitUntilFinished(std::chrono::steady_clock::time_point deadline) {
+    std::unique_lock lock(mutex_);
+    changed_.wait_until(lock, deadline, [this] { return status_ != ContainerStatus::Writing; });
+}
+
+// --- Called with the lock held ---------------------------------------------------------------------------------------
+
+void MovieRecording::startThread() {
+    if (!thread_.joinable() && !abandoned_) thread_ = std::thread([this] { run(); });
+}
+
+void MovieRecording::failLocked(Error error) {
+    if (status_ != ContainerStatus::Unknown && status_ != ContainerStatus::Writing) return;
+    status_ = ContainerStatus::Failed;
+    error_ = std::move(error);
+    changed_.notify_all();
+}
+
+void MovieRecording::fail(Error error) {
+    const std::lock_guard lock(mutex_);
+    failLocked(std::move(error));
+}
+
+/// The end of the session where one was set, else the time of the recording's clock; after the movie's zero.
+std::optional<std::int64_t> MovieRecording::movieEnd() const {
+    const auto end = sessionEnd_ ? sessionEnd_ : clockAtFinish_;
+    if (!end || !sessionStart_) return std::nullopt;
+    return *end - *sessionStart_;
+}
+
+std::optional<MovieRecording::Item> MovieRecording::takeItem() {
+    if (items_.empty()) return std::nullopt;
+    Item item = std::move(items_.front());
+    items_.pop_front();
+    tracks_[item.track].waiting -= 1;
+    return item;
+}
+
+// --- The encoder thread ----------------------------------------------------------------------------------------------
+
+void MovieRecording::run() {
+    {
+        std::unique_lock lock(mutex_);
+        if (status_ == ContainerStatus::Writing) runPipeline(lock);
+        for (;;) {  // finished or failed: drop what still comes, answer who still asks
+            items_.clear();
+            for (Track& track : tracks_) track.waiting = 0;
+            runCompletions(lock);
+            if (abandoned_ && completions_.empty()) break;
+            changed_.wait(lock, [this] { return abandoned_ || !completions_.empty() || !items_.empty(); });
+        }
+    }
+    disk_.close(DiskWriter::Pending::Write);
+    ended_.store(true, std::memory_order_release);
+}
+
+/// From the start of writing until the movie is finished, has failed or nobody wants it any more.
+void MovieRecording::runPipeline(std::unique_lock<std::mutex>& lock) {
+    std::vector<TrackPlan> plans;
+    for (const Track& track : tracks_) plans.push_back(track.plan);
+    lock.unlock();
+    auto opened = MoviePipeline::open(plans, *choice_, disk_);
+    lock.lock();
+    if (auto* const error = std::get_if<Error>(&opened)) return failLocked(*error);
+    const auto pipeline = std::move(std::get<0>(opened));
+
+    while (status_ == ContainerStatus::Writing) {
+        const bool flushes = waitForWork(lock, pipeline->flushTime());
+        std::optional<Item> item = takeItem();
+        if (!item && finishing_) return finishPipeline(lock, pipeline.get());
+        const bool isLast = !item && abandoned_;
+        lock.unlock();
+        std::optional<Error> error;
+        if (item) error = pipeline->add(item->track, std::move(item->sample), item->nanoseconds);
+        if (!error && (flushes || isLast)) error = pipeline->flush();
+        lock.lock();
+        if (error) return failLocked(*error);
+        if (isLast) {
+            status_ = ContainerStatus::Cancelled;
+            changed_.notify_all();
+            return;
+        }
+    }
+}
+
+/// Waits for a sample, for the end, or for the time at which pending samples are due on the disk; whether they are.
+bool MovieRecording::waitForWork(std::unique_lock<std::mutex>& lock, std::optional<MoviePipeline::SteadyTime> until) {
+    const auto woken = [this] {
+        return !items_.empty() || finishing_ || abandoned_ || status_ != ContainerStatus::Writing;
+    };
+    if (until) {
+        changed_.wait_until(lock, *until, woken);
+    } else {
+        changed_.wait(lock, woken);
+    }
+    return until && std::chrono::steady_clock::now() >= *until;
+}
+
+void MovieRecording::finishPipeline(std::unique_lock<std::mutex>& lock, MoviePipeline* pipeline) {
+    const auto end = movieEnd();
+    lock.unlock();
+    auto error = pipeline->finish(end);
+    const int diskError = disk_.drain();
+    lock.lock();
+    if (diskError != 0) error = systemError(diskError);
+    if (error) return failLocked(*error);
+    if (status_ != ContainerStatus::Writing) return;
+    status_ = ContainerStatus::Completed;
+    changed_.notify_all();
+}
+
+void MovieRecording::runCompletions(std::unique_lock<std::mutex>& lock) {
+    while (!completions_.empty()) {
+        const auto completions = std::exchange(completions_, {});
+        lock.unlock();
+        for (const auto& completion : completions) {
+            if (completion) completion();
+        }
+        lock.lock();
+    }
+}
+
+}  // namespace lumacast::media
