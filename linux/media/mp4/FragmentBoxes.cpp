@@ -70,7 +70,9 @@ void writeFragmentHeader(BoxBuffer& out, std::uint32_t sequenceNumber, std::span
     std::vector<std::size_t> dataOffsets;
     dataOffsets.reserve(tracks.size());
     {
-        const Box box(out, "moof");  // ISO/IEC 14496-12 clause 8.8.4
+        // ISO/IEC 14496-12 clause 8.8.4: a moof. It bears another name until its samples are there, since readers give
+        // up on a whole file for one moof that is cut off.
+        const Box box(out, "free");
         {
             const Box header(out, "mfhd", 0, 0);  // ISO/IEC 14496-12 clause 8.8.5
             out.u32(sequenceNumber);

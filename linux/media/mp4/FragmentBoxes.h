@@ -22,8 +22,9 @@ struct TrackFragment {
     bool isVideo = false;
 };
 
-// The movie fragment box and the header of the media data box that must follow it; then come the samples, those of
-// one track after those of the other, in the order given.
+// The movie fragment box, hidden as a free box until the fragment is whole, and the header of the media data box that
+// must follow it; then come the samples, those of one track after those of the other, in the order given.
+inline constexpr std::uint64_t kBoxTypeOffset = 4;  // within any box: where "free" becomes "moof"
 void writeFragmentHeader(BoxBuffer& out, std::uint32_t sequenceNumber, std::span<const TrackFragment> tracks);
 
 }  // namespace lumacast::mp4

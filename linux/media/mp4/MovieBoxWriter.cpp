@@ -253,6 +253,7 @@ MovieError MovieBoxWriter::writeFragment() {
                              track.pending.size(), track.isVideo()});
         }
     }
+    const std::uint64_t headerOffset = position_ + boxes_.size();
     writeFragmentHeader(boxes_, fragments_ + 1, parts);
     if (!append(boxes_.view())) {
         return fail();
@@ -271,7 +272,12 @@ MovieError MovieBoxWriter::writeFragment() {
     pendingBytes_ = 0;
     fragments_ += 1;
     const bool syncs = options_.fragmentsPerSync != 0 && fragments_ % options_.fragmentsPerSync == 0;
-    return syncs && !sink_.sync() ? fail() : MovieError::none;
+    if (syncs && !sink_.sync()) {
+        return fail();
+    }
+    BoxBuffer type;
+    type.code("moof");  // all of the fragment is there now: readers may see it
+    return sink_.overwrite(headerOffset + kBoxTypeOffset, type.view()) ? MovieError::none : fail();
 }
 
 // The order is what makes it safe: README.md lists what a reader sees after each step.
