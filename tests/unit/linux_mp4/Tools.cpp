@@ -114,6 +114,10 @@ Played playStrictly(const std::filesystem::path& movie) {
     return playWith({"-xerror", "-err_detect", "explode"}, movie);
 }
 
+Played playStrictlyFrom(int seconds, const std::filesystem::path& movie) {
+    return playWith({"-xerror", "-err_detect", "explode", "-ss", std::to_string(seconds)}, movie);
+}
+
 Played play(const std::filesystem::path& movie) {
     return playWith({}, movie);
 }

@@ -41,6 +41,8 @@ struct Played {
 };
 // Stops at the first error.
 [[nodiscard]] Played playStrictly(const std::filesystem::path& movie);
+// The same from the key frame at `seconds` on.
+[[nodiscard]] Played playStrictlyFrom(int seconds, const std::filesystem::path& movie);
 // Goes on after errors, as players do.
 [[nodiscard]] Played play(const std::filesystem::path& movie);
 
