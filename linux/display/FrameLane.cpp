@@ -1,0 +1,278 @@
+#include "linux/display/FrameLane.h"
+
+#include <pthread.h>
+
+#include <algorithm>
+#include <array>
+#include <chrono>
+#include <ctime>
+
+#include "linux/display/X11DisplayCapture.h"
+#include "writer/media/SampleBuffer.h"
+
+namespace lumacast::x11 {
+namespace {
+
+// A picture that was overtaken while it was read is read again this often, so that it shows one moment.
+constexpr int kReadings = 3;
+// A source that stands longer gives the window and its planes back.
+constexpr std::int64_t kReleaseAfter = 10'000'000'000;
+
+std::int64_t steadyNow() {
+    return std::chrono::duration_cast<std::chrono::nanoseconds>(std::chrono::steady_clock::now().time_since_epoch())
+        .count();
+}
+
+std::int64_t intervalOf(const MediaTime& interval) {
+    const double seconds = interval.seconds();
+    return static_cast<std::int64_t>(std::clamp(seconds, 0.001, 3600.0) * 1e9);
+}
+
+}  // namespace
+
+FrameLane::FrameLane(FrameLaneSetup setup) : setup_(std::move(setup)), pacer_(intervalOf(setup_.minimumInterval)) {
+    setup_.selection->watch(wake_);
+}
+
+void FrameLane::quit() {
+    setup_.control->quit();
+    interrupt_.fire();
+    wake_->signal();
+}
+
+void FrameLane::run() {
+    pthread_setname_np(pthread_self(), "lc-frames");
+    while (true) {
+        // Only queued events: what the descriptor holds is announced by the poll.
+        if (connection_) drainEvents(true);
+        const Order order = setup_.control->order();
+        if (order.quit) break;
+        if (order.running) {
+            stoppedSince_ = 0;
+            work(order);
+        } else if (stoppedSince_ == 0) {
+            stoppedSince_ = steadyNow();
+        }
+        if (connection_) xcb_flush(connection_->get());
+        sleep(nextDeadline(order));
+    }
+    release();
+    finished_.store(true, std::memory_order_release);
+}
+
+// The last picture stays: a later start in the same recording begins with it.
+void FrameLane::release() {
+    target_.reset();
+    maker_.reset();
+    connection_.reset();
+}
+
+std::int64_t FrameLane::nextDeadline(const Order& order) const {
+    if (!order.running) return connection_ ? stoppedSince_ + kReleaseAfter : FramePacer::kNever;
+    if (!target_) return FramePacer::kNever;
+    if (target_->gone()) return 0;
+    std::int64_t deadline = last_.picture ? pacer_.nextRepeat() : FramePacer::kNever;
+    if (target_->repaintDeadline() != 0) deadline = std::min(deadline, target_->repaintDeadline());
+    return pictureIsDue() ? std::min(deadline, pacer_.nextChange()) : deadline;
+}
+
+bool FrameLane::pictureIsDue() const {
+    if (target_->needsRefresh()) return true;
+    if (!target_->readable()) return false;
+    if (target_->damaged()) return true;
+    const bool news = pictureWanted_ || (maker_->follows(*target_) && maker_->somethingNew());
+    return news && steadyNow() >= target_->repaintDeadline();
+}
+
+void FrameLane::sleep(std::int64_t deadline) {
+    const std::int64_t now = steadyNow();
+    if (stoppedSince_ != 0 && connection_ && now >= stoppedSince_ + kReleaseAfter) return release();
+    timespec limit{};
+    if (deadline > now && deadline != FramePacer::kNever) {
+        limit.tv_sec = (deadline - now) / 1'000'000'000;
+        limit.tv_nsec = (deadline - now) % 1'000'000'000;
+    }
+    std::array<pollfd, 2> polled{{{wake_->descriptor(), POLLIN, 0}, {-1, POLLIN, 0}}};
+    if (connection_) polled[1].fd = connection_->descriptor();
+    ::ppoll(polled.data(), polled.size(), deadline == FramePacer::kNever ? nullptr : &limit, nullptr);
+    if (polled[0].revents != 0) wake_->clear();
+    if (polled[1].revents != 0) drainEvents(false);
+    // Between recordings nobody is to be told; the next start connects anew.
+    if (connection_ && connection_->broken() && stoppedSince_ != 0) {
+        setup_.selection->forgetAll();
+        release();
+    }
+}
+
+bool FrameLane::drainEvents(bool onlyQueued) {
+    bool any = false;
+    while (true) {
+        xcb_connection_t* const x = connection_->get();
+        const Owned<xcb_generic_event_t> event(onlyQueued ? xcb_poll_for_queued_event(x) : xcb_poll_for_event(x));
+        if (!event) return any;
+        any = true;
+        if (target_) target_->handle(*event, steadyNow());
+    }
+}
+
+void FrameLane::work(const Order& order) {
+    if (order.run != run_ && !beginRun(order)) return;
+    if (connection_->broken()) {
+        setup_.selection->forgetAll();
+        return fail(order, X11CaptureStatus::kDisplayLost);
+    }
+    if (selectionVersion_ != setup_.selection->version() && !followSelection(order)) return;
+    if (target_ && target_->gone() && !followSelection(order)) return;
+    if (!target_) return;
+    if (pictureIsDue() && steadyNow() >= pacer_.nextChange()) takePicture(order);
+    if (last_.picture && steadyNow() >= pacer_.nextRepeat())
+        repeatPicture(order, order.clock->now(), CaptureControl::Stamp::Fresh);
+}
+
+bool FrameLane::beginRun(const Order& order) {
+    if (!connection_ || connection_->broken()) {
+        release();
+        if (!connect(order)) return false;
+    }
+    run_ = order.run;
+    if (last_.picture && last_.clock == order.clock)
+        repeatPicture(order, last_.stamp, CaptureControl::Stamp::Kept);
+    else
+        last_ = {};
+    if (!last_.picture) maker_->startOver();
+    pacer_.restart();
+    pictureWanted_ = true;
+    return followSelection(order);
+}
+
+bool FrameLane::connect(const Order& order) {
+    connection_ = X11Connection::open(setup_.display, interrupt_);
+    if (!connection_) return fail(order, X11CaptureStatus::kNoDisplay), false;
+    if (!connection_->canCapture()) return fail(order, X11CaptureStatus::kNotSupported), false;
+    maker_ = std::make_unique<PictureMaker>(*connection_, setup_.width, setup_.height);
+    return true;
+}
+
+bool FrameLane::captures(xcb_window_t window, CaptureTarget::Kind kind) const {
+    return target_ && target_->window() == window && target_->kind() == kind;
+}
+
+// One window at a time: of several wanted windows the first that exists is shown, they are not put together. False when
+// none does.
+bool FrameLane::chooseTarget(const CloneSelection::Wanted& wanted) {
+    using Kind = CaptureTarget::Kind;
+    if (wanted.mode == DisplayCloneControl::kMirrorDisplay) {
+        const xcb_window_t root = connection_->screen().root;
+        if (!captures(root, Kind::Screen)) target_ = CaptureTarget::open(*connection_, root, Kind::Screen);
+        return target_ != nullptr;
+    }
+    if (wanted.mode != DisplayCloneControl::kCloneContexts) {
+        target_.reset();  // nothing to show, for now
+        return true;
+    }
+    for (const ContextID context : wanted.contexts) {
+        const xcb_window_t window = number(context);
+        if (window == 0 || connection_->isRoot(window)) continue;
+        if (captures(window, Kind::Window)) return true;
+        if (auto target = CaptureTarget::open(*connection_, window, Kind::Window)) {
+            target_ = std::move(target);
+            return true;
+        }
+    }
+    return false;
+}
+
+bool FrameLane::followSelection(const Order& order) {
+    if (target_ && target_->gone()) {
+        setup_.selection->forget(ContextID{target_->window()});
+        target_.reset();
+    }
+    const auto wanted = setup_.selection->wanted();
+    selectionVersion_ = wanted.version;
+    const CaptureTarget* const before = target_.get();
+    if (!chooseTarget(wanted)) return fail(order, X11CaptureStatus::kWindowGone), false;
+    if (target_.get() != before) pictureWanted_ = true;
+    drainEvents(true);
+    return true;
+}
+
+// Whether the target's picture can be read now; what has changed in it is noted.
+bool FrameLane::lookAtTarget() {
+    if (target_->needsRefresh()) {
+        target_->refresh();
+        drainEvents(true);
+    }
+    if (!target_->readable()) return false;
+    if (!maker_->follows(*target_)) maker_->follow(*target_);
+    DamageRegion damage;
+    if (target_->damaged()) target_->takeDamage(damage);
+    maker_->add(damage);
+    if (target_->repaintDeadline() == 0) return true;
+    if (steadyNow() < target_->repaintDeadline()) return false;
+    target_->forgiveRepaint();
+    return true;
+}
+
+void FrameLane::takePicture(const Order& order) {
+    const MediaTime stamp = order.clock->now();
+    std::optional<std::size_t> plane;
+    for (int reading = 0; reading < kReadings; ++reading) {
+        const bool hadNews = target_->damaged() || target_->needsRefresh();
+        if (!lookAtTarget()) return;
+        if (!maker_->somethingNew() && !pictureWanted_) return;
+        if (!plane) plane = maker_->acquire();
+        if (!plane) return dropPicture(hadNews);
+        if (!maker_->update(*plane, *target_)) return pacer_.taken(steadyNow());
+        drainEvents(true);
+        if (!target_->overtaken() && !target_->needsRefresh()) break;
+    }
+    if (!deliver(order, maker_->picture(*plane, ++pictures_), stamp, CaptureControl::Stamp::Fresh)) return;
+    maker_->delivered();
+    pictureWanted_ = false;
+}
+
+// Every plane is in use. What changed is shown with the next picture: it stays wanted.
+void FrameLane::dropPicture(bool hadNews) {
+    if (hadNews) setup_.control->countDropped(1);
+    pacer_.taken(steadyNow());
+    pictureWanted_ = true;
+}
+
+void FrameLane::repeatPicture(const Order& order, MediaTime stamp, CaptureControl::Stamp kind) {
+    deliver(order, std::make_shared<Picture>(last_.picture->plane(), DamageRegion{}, ++pictures_), stamp, kind);
+}
+
+// False when the order has changed meanwhile.
+bool FrameLane::deliver(const Order& order, std::shared_ptr<Picture> picture, MediaTime stamp,
+                        CaptureControl::Stamp kind) {
+    const std::int64_t began = steadyNow();
+    pacer_.taken(began);
+    const auto source = setup_.source.lock();
+    const auto delegate = setup_.control->delegate();
+    if (!source || !delegate) return true;  // to nobody
+    const auto given = setup_.control->beginDelivery(order, stamp, kind);
+    if (!given) return false;
+    last_ = {picture, *given, order.clock};
+    delegate->screenCaptureControllerDidReceiveSampleBuffer(
+        *source, SampleBuffer::makeVideo(PixelBuffer(std::move(picture)), *given, setup_.minimumInterval), 0);
+    setup_.control->endDelivery();
+    setup_.control->countDelivered();
+
+    drainEvents(false);
+    const std::int64_t took = steadyNow() - began;
+    if (target_ && target_->damaged() && took > pacer_.interval())
+        setup_.control->countDropped(static_cast<std::uint64_t>(took / pacer_.interval()));
+    return true;
+}
+
+void FrameLane::fail(const Order& order, std::int32_t status) {
+    release();
+    if (!setup_.control->endRun(order)) return;
+    setup_.scheduler->mainQueue().async([source = setup_.source, control = setup_.control, status] {
+        const auto failed = source.lock();
+        const auto delegate = control->delegate();
+        if (failed && delegate) delegate->screenCaptureControllerDidFailWithStatus(*failed, status);
+    });
+}
+
+}  // namespace lumacast::x11

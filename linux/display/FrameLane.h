@@ -1,0 +1,93 @@
+#pragma once
+// The thread of one capture source.
+
+#include <poll.h>
+
+#include <atomic>
+#include <cstdint>
+#include <memory>
+#include <string>
+
+#include "linux/display/CaptureControl.h"
+#include "linux/display/CaptureTarget.h"
+#include "linux/display/CloneSelection.h"
+#include "linux/display/FramePacer.h"
+#include "linux/display/PictureMaker.h"
+#include "linux/display/Wake.h"
+#include "linux/display/X11Connection.h"
+#include "platform/Scheduler.h"
+
+namespace lumacast::x11 {
+
+/// What a frame lane captures, and for whom.
+struct FrameLaneSetup {
+    std::string display;
+    std::int32_t width = 0, height = 0;
+    MediaTime minimumInterval;
+    std::shared_ptr<CaptureControl> control;
+    std::shared_ptr<CloneSelection> selection;
+    std::weak_ptr<DisplayCaptureSource> source;
+    Scheduler* scheduler = nullptr;  ///< borrowed; for failures, which go to the main queue
+};
+
+/// Captures and delivers while the control says so; sleeps otherwise. It waits for the display server on its own
+/// connection, so nobody else ever waits for a server that hangs.
+class FrameLane final {
+public:
+    explicit FrameLane(FrameLaneSetup setup);
+
+    /// The thread's body: returns after quit().
+    void run();
+    bool finished() const { return finished_.load(std::memory_order_acquire); }
+    /// Callable from any thread, returns at once: there is a new order.
+    void wake() { wake_->signal(); }
+    /// Callable from any thread, returns at once; ends a wait for the server too.
+    void quit();
+
+private:
+    using Order = CaptureControl::Order;
+    struct Delivered {
+        std::shared_ptr<Picture> picture;
+        MediaTime stamp;
+        std::shared_ptr<CaptureClock> clock;
+    };
+
+    void work(const Order& order);
+    bool beginRun(const Order& order);
+    bool connect(const Order& order);
+    bool followSelection(const Order& order);
+    bool chooseTarget(const CloneSelection::Wanted& wanted);
+    bool captures(xcb_window_t window, CaptureTarget::Kind kind) const;
+    bool pictureIsDue() const;
+
+    void takePicture(const Order& order);
+    bool lookAtTarget();
+    void dropPicture(bool hadNews);
+    void repeatPicture(const Order& order, MediaTime stamp, CaptureControl::Stamp kind);
+    bool deliver(const Order& order, std::shared_ptr<Picture> picture, MediaTime stamp, CaptureControl::Stamp kind);
+    void fail(const Order& order, std::int32_t status);
+
+    bool drainEvents(bool onlyQueued);
+    std::int64_t nextDeadline(const Order& order) const;
+    void sleep(std::int64_t deadline);
+    void release();
+
+    const FrameLaneSetup setup_;
+    const std::shared_ptr<Wake> wake_ = std::make_shared<Wake>();
+    Interrupt interrupt_;
+    std::atomic<bool> finished_{false};
+
+    // Of the lane alone.
+    std::unique_ptr<X11Connection> connection_;
+    std::unique_ptr<PictureMaker> maker_;
+    std::unique_ptr<CaptureTarget> target_;
+    FramePacer pacer_;
+    std::uint64_t run_ = 0;
+    std::uint64_t selectionVersion_ = 0;
+    bool pictureWanted_ = false;  ///< the current picture is due though nothing may have changed
+    std::int64_t stoppedSince_ = 0;
+    std::uint64_t pictures_ = 0;  ///< numbered so far
+    Delivered last_;
+};
+
+}  // namespace lumacast::x11

@@ -1,0 +1,65 @@
+#pragma once
+// Turns a window's changing picture into planes of the frame's size.
+
+#include <array>
+#include <cstdint>
+#include <memory>
+#include <optional>
+
+#include "linux/display/CaptureTarget.h"
+#include "linux/display/DamageTracker.h"
+#include "linux/display/Fit.h"
+#include "linux/display/PlanePool.h"
+
+namespace lumacast::x11 {
+
+/// Reads from a target into planes, only what changed since each plane's own picture. Where window and frame have one
+/// size the display server writes straight into the plane; else into an image of the window, from which the plane is
+/// copied or scaled. Belongs to the frame lane. Waits for the server while reading.
+class PictureMaker final {
+public:
+    /// Pictures of this size; the connection must outlive the maker.
+    PictureMaker(X11Connection& connection, std::int32_t width, std::int32_t height);
+    ~PictureMaker();
+    PictureMaker(const PictureMaker&) = delete;
+    PictureMaker& operator=(const PictureMaker&) = delete;
+
+    /// The target to read from now on, or its new layout: everything has changed.
+    void follow(const CaptureTarget& target);
+    /// Whether follow() was last called for this target as it is laid out now.
+    bool follows(const CaptureTarget& target) const {
+        return window_ == target.window() && layout_ == target.layout();
+    }
+    /// This part of the target's picture has changed.
+    void add(const DamageRegion& damage);
+    /// The next picture goes to somebody who has seen none.
+    void startOver() { tracker_.nothingDelivered(); }
+    bool somethingNew() const { return !tracker_.sinceDelivery().empty(); }
+
+    /// A plane nobody holds; none when all are held.
+    std::optional<std::size_t> acquire();
+    /// Brings a plane up to date. False when the server would not, or there is no memory.
+    bool update(std::size_t plane, CaptureTarget& target);
+    /// The plane as a picture with this number.
+    std::shared_ptr<Picture> picture(std::size_t plane, std::uint64_t number);
+    /// A picture was delivered: the next one's damage counts from it.
+    void delivered() { tracker_.delivered(); }
+
+private:
+    bool updateDirectly(std::size_t plane, CaptureTarget& target);
+    bool updateFromImage(std::size_t plane, CaptureTarget& target);
+    bool readImage(CaptureTarget& target);
+    void show(const PixelRect& rect, Plane& plane);
+
+    X11Connection& connection_;
+    PlanePool pool_;
+    DamageTracker tracker_;
+    xcb_window_t window_ = XCB_NONE;
+    std::uint64_t layout_ = 0;
+    Fit fit_;
+    std::array<Fit, kPlanes> planeFits_{};  ///< what each plane's borders were cleared for
+    std::optional<SharedMemory> image_;     ///< the window's picture, where it is not copied as it is
+    DamageRegion imageStale_;
+};
+
+}  // namespace lumacast::x11

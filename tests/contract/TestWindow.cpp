@@ -1,0 +1,127 @@
+#include "tests/contract/TestWindow.h"
+
+#include <poll.h>
+
+namespace lumacast::test {
+
+using x11::Owned;
+
+TestWindow::TestWindow(const std::string& display, Look look)
+    : connection_(xcb_connect(display.c_str(), nullptr)),
+      screen_(xcb_setup_roots_iterator(xcb_get_setup(connection_.get())).data),
+      look_(look),
+      colour_(look.colour),
+      width_(look.place.width),
+      height_(look.place.height) {
+    xcb_connection_t* const x = connection_.get();
+    window_ = xcb_generate_id(x);
+    const xcb_window_t parent = look.parent != XCB_NONE ? look.parent : screen_->root;
+    std::uint32_t mask = XCB_CW_EVENT_MASK;
+    std::array<std::uint32_t, 2> values{XCB_EVENT_MASK_EXPOSURE | XCB_EVENT_MASK_STRUCTURE_NOTIFY, 0};
+    if (look.background) {
+        mask |= XCB_CW_BACK_PIXEL;
+        values = {0, values[0]};
+    }
+    xcb_create_window(x, XCB_COPY_FROM_PARENT, window_, parent, static_cast<std::int16_t>(look.place.x),
+                      static_cast<std::int16_t>(look.place.y), static_cast<std::uint16_t>(width_),
+                      static_cast<std::uint16_t>(height_), look.border, XCB_WINDOW_CLASS_INPUT_OUTPUT,
+                      XCB_COPY_FROM_PARENT, mask, values.data());
+    context_ = xcb_generate_id(x);
+    xcb_create_gc(x, context_, window_, 0, nullptr);
+    events_ = std::thread([this] { serveEvents(); });
+    if (look.mapped) map();
+    if (look.mapped) paint(look.colour);
+}
+
+TestWindow::~TestWindow() {
+    over_ = true;
+    wake_.signal();
+    events_.join();
+}
+
+void TestWindow::serveEvents() {
+    xcb_connection_t* const x = connection_.get();
+    while (!over_) {
+        bool exposed = false;
+        while (const Owned<xcb_generic_event_t> event{xcb_poll_for_event(x)})
+            exposed |= (event->response_type & 0x7F) == XCB_EXPOSE;
+        if (exposed && look_.repaints) {
+            const std::lock_guard lock(mutex_);
+            fill({0, 0, width_, height_}, colour_);
+            xcb_flush(x);
+            ++repaints_;
+            continue;
+        }
+        // Replies that another thread waits for may bring events without waking this one for long.
+        std::array<pollfd, 2> polled{{{wake_.descriptor(), POLLIN, 0}, {xcb_get_file_descriptor(x), POLLIN, 0}}};
+        ::poll(polled.data(), polled.size(), 5);
+        if ((polled[1].revents & (POLLHUP | POLLERR)) != 0) break;
+    }
+}
+
+void TestWindow::sync() const {
+    const Owned<xcb_get_input_focus_reply_t> done(
+        xcb_get_input_focus_reply(connection_.get(), xcb_get_input_focus(connection_.get()), nullptr));
+}
+
+void TestWindow::fill(const PixelRect& rect, std::uint32_t colour) {
+    xcb_change_gc(connection_.get(), context_, XCB_GC_FOREGROUND, &colour);
+    const xcb_rectangle_t area{static_cast<std::int16_t>(rect.x), static_cast<std::int16_t>(rect.y),
+                               static_cast<std::uint16_t>(rect.width), static_cast<std::uint16_t>(rect.height)};
+    xcb_poly_fill_rectangle(connection_.get(), window_, context_, 1, &area);
+}
+
+void TestWindow::paint(std::uint32_t colour) {
+    {
+        const std::lock_guard lock(mutex_);
+        colour_ = colour;
+        fill({0, 0, width_, height_}, colour);
+    }
+    sync();
+}
+
+void TestWindow::paintPart(const PixelRect& rect, std::uint32_t colour) {
+    {
+        const std::lock_guard lock(mutex_);
+        fill(rect, colour);
+    }
+    sync();
+}
+
+void TestWindow::configure(std::uint16_t mask, std::array<std::uint32_t, 4> values) {
+    xcb_configure_window(connection_.get(), window_, mask, values.data());
+    sync();
+}
+
+void TestWindow::move(int x, int y) {
+    configure(XCB_CONFIG_WINDOW_X | XCB_CONFIG_WINDOW_Y, {static_cast<std::uint32_t>(x), static_cast<std::uint32_t>(y)});
+}
+
+void TestWindow::resize(int width, int height) {
+    {
+        const std::lock_guard lock(mutex_);
+        width_ = width;
+        height_ = height;
+    }
+    configure(XCB_CONFIG_WINDOW_WIDTH | XCB_CONFIG_WINDOW_HEIGHT,
+              {static_cast<std::uint32_t>(width), static_cast<std::uint32_t>(height)});
+}
+
+void TestWindow::raise() { configure(XCB_CONFIG_WINDOW_STACK_MODE, {XCB_STACK_MODE_ABOVE}); }
+
+void TestWindow::map() {
+    xcb_map_window(connection_.get(), window_);
+    sync();
+}
+
+void TestWindow::unmap() {
+    xcb_unmap_window(connection_.get(), window_);
+    sync();
+}
+
+void TestWindow::destroy() {
+    xcb_destroy_window(connection_.get(), window_);
+    sync();
+}
+
+}  // namespace lumacast::test
