@@ -24,7 +24,7 @@ bool equalsIgnoringCase(std::string_view a, std::string_view b) {
 
 std::optional<double> decimal(std::string_view text) {
     if (text.find_first_not_of("0123456789+-.eE") != std::string_view::npos) return std::nullopt;  // no "inf", no hex
-    if (text.starts_with('+')) text.remove_prefix(1);
+    if (text.starts_with('+') && !text.starts_with("+-")) text.remove_prefix(1);
     double value = 0;
     const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), value);
     if (error != std::errc() || end != text.data() + text.size() || !std::isfinite(value)) return std::nullopt;
