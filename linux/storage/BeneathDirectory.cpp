@@ -38,7 +38,7 @@ std::vector<std::string> componentsOf(std::string_view path) {
     while (!path.empty()) {
         const std::size_t slash = path.find('/');
         const std::string_view component = path.substr(0, slash);
-        if (!component.empty() && component != ".") result.emplace_back(component);
+        if (!component.empty()) result.emplace_back(component);
         path.remove_prefix(slash == std::string_view::npos ? path.size() : slash + 1);
     }
     return result;
@@ -95,8 +95,7 @@ std::variant<ResolvedName, int> resolveBeneath(const std::string& base, const st
     if (!whole.starts_with(top + "/")) return EACCES;
     std::vector<std::string> components = componentsOf(std::string_view(whole).substr(top.size() + 1));
     for (const std::string& component : components)
-        if (component == "..") return EACCES;
-    if (components.empty()) return EACCES;  // "." alone
+        if (component == ".." || component == ".") return EACCES;
 
     ResolvedName result;
     result.name = std::move(components.back());
