@@ -46,23 +46,27 @@ public:
     virtual void setTransform(const AffineTransform& transform) = 0;
     /// Whether the track's own buffer has room. Always true before the first sample, encoder open or not.
     virtual bool isReadyForMoreMediaData() const = 0;
-    /// Takes a reference to the sample and returns at once: conversion, encoding and the disk are behind it. Drops a
-    /// picture whose stamp is not later than the one before. False when the writer can't take samples (any more); the
-    /// reason is then the writer's error.
+    /// Takes a reference to the sample and returns at once: conversion, encoding and the disk are behind it. Drops, and
+    /// answers true for, a sample that is not to be in the movie: its stamp is not later than the track's one before, or a
+    /// picture's is before the start of the session, or it is after the end of it. False, the sample not taken, when
+    /// there is no room, when the stamp is not valid or the sample of the other kind, and when the writer can't take
+    /// samples (any more): before the session is started, after finishing was asked for and after a failure.
     virtual bool append(const SampleRef& sample) = 0;
 };
 
 enum class ContainerStatus : std::int32_t { Unknown = 0, Writing = 1, Completed = 2, Failed = 3, Cancelled = 4 };
 
-/// Writes one MPEG-4 file. Its operations are called on one lane at a time (the movie writer's queue); completions come
-/// on a lane of the platform, never inline. The file appears at creation and can be played while it grows, up to a second
-/// ago. Destroying a writer that has not finished closes the file as it is and never re-creates it.
+/// Writes one MPEG-4 file. Unknown becomes Writing by startWriting; Writing becomes Completed or Failed by finishWriting,
+/// and Failed at any time when the disk or an encoder fails; Completed and Failed stay. Its operations are called on one
+/// lane at a time (the movie writer's queue); completions come on a lane of the platform, never inline. The file appears
+/// at creation and can be played while it grows, up to a second ago. Destroying a writer that has not finished closes the
+/// file as it is and never re-creates it.
 class ContainerWriter {
 public:
     virtual ~ContainerWriter() = default;
 
-    /// Adds a track; only before startWriting. Null for settings that no encoder can take. The first video track is the
-    /// picture, the first audio track the application's sound, the second the microphone.
+    /// Adds a track. Null once writing has started or failed, for a second video track, and for settings that no encoder
+    /// can take. The video track is the picture, the first audio track the application's sound, the second the microphone.
     virtual std::shared_ptr<TrackInput> addVideoInput(const Dictionary& settings) = 0;
     virtual std::shared_ptr<TrackInput> addAudioInput(const Dictionary& settings) = 0;
 
@@ -71,14 +75,15 @@ public:
     virtual std::optional<Error> error() const = 0;
     virtual URL outputURL() const = 0;
 
-    /// Begins writing. False in every state but Unknown (a second start fails and changes nothing).
+    /// Begins writing. False, changing nothing, in every state but Unknown, and without a track.
     virtual bool startWriting() = 0;
-    /// The movie begins at `time` of the samples' clock.
+    /// The movie begins at `time` of the samples' clock. Only the first one counts, and only while writing.
     virtual void startSession(MediaTime time) = 0;
     /// The movie ends at `time`: what was appended with a later stamp is not in it.
     virtual void endSession(MediaTime time) = 0;
     /// Writes what is still on its way and the index. The last picture is extended to the end of the session where one
-    /// was set, else to the time of the recording's capture clock. `completion` is called once, whatever came of it.
+    /// was set, else to the time of the recording's capture clock. A movie without a sample, started or not, fails.
+    /// `completion` is called once, whatever came of it; where nothing is being written any more only that happens.
     virtual void finishWriting(std::function<void()> completion) = 0;
 
     /// For status reports, callable from any lane: bytes written so far.
