@@ -1,6 +1,7 @@
 // The recorded application on a display of its own.
 
 #include <gtest/gtest.h>
+#include <signal.h>
 #include <xcb/xcb.h>
 
 #include <algorithm>
@@ -65,6 +66,31 @@ protected:
         return eventually([&] { return frame() >= number; });
     }
 
+    // Waits until the number has stood still for the time of twelve frames.
+    int standingFrame() {
+        int last = frame();
+        auto since = std::chrono::steady_clock::now();
+        EXPECT_TRUE(eventually([&] {
+            const int now = frame();
+            if (now != last) since = std::chrono::steady_clock::now();
+            last = now;
+            return std::chrono::steady_clock::now() - since > std::chrono::milliseconds(200);
+        })) << "the number doesn't stand still";
+        return last;
+    }
+
+    // Every frame is in the log, and none was sent before the one before it was shown.
+    void expectLogWithoutHole() {
+        std::string error;
+        const auto log = readFramesLog(log_, error);
+        ASSERT_TRUE(log) << error;
+        ASSERT_FALSE(log->empty());
+        EXPECT_EQ(log->begin()->first, 1U);
+        EXPECT_EQ(log->rbegin()->first, log->size());
+        for (auto entry = std::next(log->begin()); entry != log->end(); ++entry)
+            EXPECT_GT(entry->second.sent, std::prev(entry)->second.shown) << entry->first;
+    }
+
     Reply<xcb_get_geometry_reply_t> geometry() {
         return own(xcb_get_geometry_reply(connection_.get(), xcb_get_geometry(connection_.get(), window_), nullptr));
     }
@@ -122,14 +148,19 @@ TEST_F(SelfRecorder, ShowsRisingNumbersWithoutAHoleInItsLog) {
     EXPECT_GE(*number, 30U);
     EXPECT_EQ(application_->ask("quit"), "ok");
     EXPECT_EQ(application_->wait(), 0);
-    std::string error;
-    const auto log = readFramesLog(log_, error);
-    ASSERT_TRUE(log) << error;
-    EXPECT_EQ(log->begin()->first, 1U);
-    EXPECT_EQ(log->rbegin()->first, log->size());
-    EXPECT_GE(log->size(), *number);
-    for (auto frame = std::next(log->begin()); frame != log->end(); ++frame)
-        EXPECT_GT(frame->second.sent, std::prev(frame)->second.shown) << frame->first;
+    expectLogWithoutHole();
+}
+
+TEST_F(SelfRecorder, GivesNoNumberToAFrameThatASlowDisplayNeverShowed) {
+    start({"--size", "320x180", "--fps", "60"});
+    ASSERT_TRUE(reachesFrame(5));
+    ASSERT_EQ(::kill(server_->pid(), SIGSTOP), 0);
+    const int standing = standingFrame();
+    EXPECT_EQ(::kill(server_->pid(), SIGCONT), 0);
+    EXPECT_TRUE(reachesFrame(standing + 5));
+    EXPECT_EQ(application_->ask("quit"), "ok");
+    EXPECT_EQ(application_->wait(), 0);
+    expectLogWithoutHole();
 }
 
 TEST_F(SelfRecorder, NamesItsWindow) {
@@ -160,15 +191,7 @@ TEST_F(SelfRecorder, CountsNoFramesWhileHidden) {
     start({});
     ASSERT_TRUE(reachesFrame(3));
     EXPECT_EQ(application_->ask("hide"), "ok");
-    // Once the unmapping has come back to the application the number stands still: for the time of twelve frames here.
-    int last = frame();
-    auto since = std::chrono::steady_clock::now();
-    EXPECT_TRUE(eventually([&] {
-        const int now = frame();
-        if (now != last) since = std::chrono::steady_clock::now();
-        last = now;
-        return std::chrono::steady_clock::now() - since > std::chrono::milliseconds(200);
-    }));
+    const int last = standingFrame();
     EXPECT_EQ(application_->ask("show"), "ok");
     EXPECT_TRUE(reachesFrame(last + 3));
     EXPECT_TRUE(eventually([&] { return numberOnWindow().has_value(); }));
@@ -178,12 +201,12 @@ TEST_F(SelfRecorder, StillChangesNothingUntilItMovesAgain) {
     start({"--still", "--size", "320x180"});
     ASSERT_TRUE(reachesFrame(1));
     const auto before = content().samples;
-    for (int turn = 0; turn < 50; ++turn) EXPECT_EQ(content().samples, before);
-    EXPECT_EQ(frame(), 1);
+    EXPECT_EQ(standingFrame(), 1);
+    EXPECT_EQ(content().samples, before);
     // A new size shows the same number, newly drawn.
     EXPECT_EQ(application_->ask("size 480 270"), "ok");
     EXPECT_TRUE(eventually([&] { return content().width == 480 && numberOnWindow() == 1U; }));
-    EXPECT_EQ(frame(), 1);
+    EXPECT_EQ(standingFrame(), 1);
     EXPECT_EQ(application_->ask("moving"), "ok");
     EXPECT_TRUE(reachesFrame(4));
     EXPECT_EQ(application_->ask("still"), "ok");
