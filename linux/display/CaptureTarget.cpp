@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <array>
+#include <utility>
 
 namespace lumacast::x11 {
 namespace {
@@ -96,6 +97,46 @@ void CaptureTarget::exposed(const xcb_expose_event_t& event, std::int64_t now) {
     awaited_.add(PixelRect{event.x, event.y, event.width, event.height});
 }
 
+DamageRegion CaptureTarget::unpainted() const {
+    DamageRegion left;
+    for (const PixelRect& rect : awaited_.rects()) {
+        const PixelRect inside = intersection(rect, {0, 0, width_, height_});
+        if (!painted_.covers(inside)) left.add(inside);
+    }
+    return left;
+}
+
+void CaptureTarget::repaintIsLate(std::int64_t now) {
+    if (!foreign_ || !readable()) return awaited_.clear();
+    foreign_ = false;
+    awaited_ = unpainted();
+    paintOver(awaited_);
+    painted_.clear();
+    repaintDeadline_ = now + kRepaintPatience;
+}
+
+// Black in the picture itself, then the window's background where it has one, then the application's turn. Its damage from
+// before says nothing any more: everything is read anew.
+void CaptureTarget::paintOver(const DamageRegion& region) {
+    xcb_connection_t* const x = connection_.get();
+    const xcb_gcontext_t context = xcb_generate_id(x);
+    const std::uint32_t black = 0;
+    xcb_create_gc(x, context, drawable_, XCB_GC_FOREGROUND, &black);
+    for (const PixelRect& rect : region.rects()) {
+        const auto width = static_cast<std::uint16_t>(rect.width), height = static_cast<std::uint16_t>(rect.height);
+        const auto left = static_cast<std::int16_t>(rect.x), top = static_cast<std::int16_t>(rect.y);
+        const xcb_rectangle_t inPixmap{static_cast<std::int16_t>(rect.x + border_),
+                                       static_cast<std::int16_t>(rect.y + border_), width, height};
+        xcb_poly_fill_rectangle(x, drawable_, context, 1, &inPixmap);
+        xcb_clear_area(x, 1, window_, left, top, width, height);
+    }
+    xcb_free_gc(x, context);
+    forgetDamage();
+    xcb_flush(x);
+    damaged_ = true;
+    ++layout_;
+}
+
 // A move needs nothing: the picture is the window's own.
 void CaptureTarget::resized(const xcb_configure_notify_event_t& event) {
     if ((event.response_type & 0x80) != 0) return;  // sent by a window manager, about the place on the screen
@@ -116,16 +157,23 @@ void CaptureTarget::refresh() {
         measureScreen();
     // Everything is read anyway.
     damaged_ = readable();
+    foreign_ = kind_ == Kind::Window;
     ++layout_;
 }
 
+void CaptureTarget::forgetDamage() {
+    subtracted_ = xcb_damage_subtract(connection_.get(), damage_, XCB_NONE, XCB_NONE).sequence;
+}
+
+// At first, in one go with the redirection, what the server itself painted is forgotten, so that the application's own
+// painting is waited for. Later, at a change of size, the application may have been faster than this, and its painting must count.
 void CaptureTarget::nameWindow() {
     xcb_connection_t* const x = connection_.get();
     const xcb_pixmap_t pixmap = xcb_generate_id(x);
     const auto nameCookie = xcb_composite_name_window_pixmap_checked(x, window_, pixmap);
     // The pixmap's own size: the window's may be another one by the time it is asked for.
     const auto pixmapCookie = xcb_get_geometry(x, pixmap);
-    subtracted_ = xcb_damage_subtract(x, damage_, XCB_NONE, XCB_NONE).sequence;
+    if (layout_ == 0) forgetDamage();
     const auto windowCookie = xcb_get_geometry(x, window_);
     const bool named = connection_.succeeded(nameCookie);
     const Owned<xcb_get_geometry_reply_t> size(xcb_get_geometry_reply(x, pixmapCookie, nullptr));
@@ -148,7 +196,6 @@ void CaptureTarget::nameWindow() {
 
 void CaptureTarget::measureScreen() {
     xcb_connection_t* const x = connection_.get();
-    subtracted_ = xcb_damage_subtract(x, damage_, XCB_NONE, XCB_NONE).sequence;
     const Owned<xcb_get_geometry_reply_t> size(xcb_get_geometry_reply(x, xcb_get_geometry(x, window_), nullptr));
     if (!size) return;
     drawable_ = window_;
@@ -170,9 +217,7 @@ void CaptureTarget::takeDamage(DamageRegion& into) {
     into.add(changed);
     if (awaited_.empty()) return;
     painted_.add(changed);
-    const auto awaited = awaited_.rects();
-    if (std::all_of(awaited.begin(), awaited.end(), [&](const PixelRect& rect) { return painted_.covers(rect); }))
-        awaited_.clear();
+    if (unpainted().empty()) awaited_.clear();
 }
 
 bool CaptureTarget::read(const SharedMemory& memory, std::span<const Strip> strips) {

@@ -57,8 +57,9 @@ public:
     void takeDamage(DamageRegion& into);
     /// Until when to wait for the application to paint what the server uncovered; 0 when there is nothing to wait for.
     std::int64_t repaintDeadline() const { return awaited_.empty() ? 0 : repaintDeadline_; }
-    /// Stops waiting for it.
-    void forgiveRepaint() { awaited_.clear(); }
+    /// The deadline has passed. What the server uncovered may still show other windows' pixels; once, that is painted over and
+    /// the application asked again, with another deadline. The second time the picture is taken as it is.
+    void repaintIsLate(std::int64_t now);
 
     /// Copies rows of the picture into `memory`, each where it is in a picture with rows of width() pixels and nothing between
     /// them. False when the server would not; then the picture needs a refresh.
@@ -72,7 +73,10 @@ private:
     void nameWindow();
     void measureScreen();
     void freePixmap();
+    void forgetDamage();
     void exposed(const xcb_expose_event_t& event, std::int64_t now);
+    DamageRegion unpainted() const;
+    void paintOver(const DamageRegion& region);
     void resized(const xcb_configure_notify_event_t& event);
 
     X11Connection& connection_;
@@ -89,6 +93,7 @@ private:
 
     DamageRegion awaited_;  ///< uncovered by the server, not painted yet
     DamageRegion painted_;
+    bool foreign_ = false;  ///< the server made new memory for the picture, out of what was on the screen
     std::int64_t repaintDeadline_ = 0;
 
     // The server's numbers of our requests: they tell whether an event came before or after one.

@@ -208,9 +208,9 @@ bool FrameLane::lookAtTarget() {
     if (target_->damaged()) target_->takeDamage(damage);
     maker_->add(damage);
     if (target_->repaintDeadline() == 0) return true;
-    if (steadyNow() < target_->repaintDeadline()) return false;
-    target_->forgiveRepaint();
-    return true;
+    const std::int64_t now = steadyNow();
+    if (now >= target_->repaintDeadline()) target_->repaintIsLate(now);
+    return target_->repaintDeadline() == 0;
 }
 
 void FrameLane::takePicture(const Order& order) {

@@ -14,8 +14,8 @@ namespace lumacast::x11 {
 class FramePacer {
 public:
     static constexpr std::int64_t kNever = std::numeric_limits<std::int64_t>::max();
-    /// A still picture is repeated a little before the second is over.
-    static constexpr std::int64_t kRepeatAfter = 950'000'000;
+    /// A still picture is repeated before the second is over, however late the machine wakes us.
+    static constexpr std::int64_t kRepeatAfter = 900'000'000;
 
     explicit FramePacer(std::int64_t interval) : interval_(std::max<std::int64_t>(interval, 1)) {}
 

@@ -5,6 +5,7 @@
 #include <chrono>
 #include <condition_variable>
 #include <cstdint>
+#include <cstdlib>
 #include <cstring>
 #include <functional>
 #include <memory>
@@ -38,6 +39,13 @@ inline std::uint32_t colourAt(const SharedPlane& plane, int x, int y) {
     return pixel & 0xFFFFFF;
 }
 
+/// Equal but for what a scaler's rounding changes.
+inline bool sameColour(std::uint32_t a, std::uint32_t b) {
+    for (const int shift : {0, 8, 16})
+        if (std::abs(static_cast<int>(a >> shift & 0xFF) - static_cast<int>(b >> shift & 0xFF)) > 3) return false;
+    return true;
+}
+
 /// Notes every frame and failure; the test waits for what it expects.
 class CapturedFrames final : public DisplayCaptureDelegate {
 public:
@@ -49,7 +57,7 @@ public:
                             colourAt(*plane, plane->width() / 2, plane->height() / 2), true,
                             std::chrono::steady_clock::now(), nullptr};
         for (int y = 0; y < plane->height() && frame.oneColour; y += checkEvery)
-            for (int x = 0; x < plane->width(); x += checkEvery) frame.oneColour &= colourAt(*plane, x, y) == frame.colour;
+            for (int x = 0; x < plane->width(); x += checkEvery) frame.oneColour &= sameColour(colourAt(*plane, x, y), frame.colour);
         {
             const std::lock_guard lock(mutex_);
             if (keepPlanes) frame.plane = plane;
@@ -82,7 +90,7 @@ public:
     /// Until the newest frame shows this colour and nothing else.
     bool waitForColour(std::uint32_t colour) {
         return waitFor([colour](const Frames& frames) {
-            return !frames.empty() && frames.back().colour == colour && frames.back().oneColour;
+            return !frames.empty() && sameColour(frames.back().colour, colour) && frames.back().oneColour;
         });
     }
     std::optional<std::int32_t> waitForFailure() {
@@ -103,6 +111,8 @@ public:
         const std::lock_guard lock(mutex_);
         return failures_;
     }
+    /// Within a condition of waitFor.
+    std::size_t failuresUnlocked() const { return failures_.size(); }
     std::thread::id failureThread() const {
         const std::lock_guard lock(mutex_);
         return failureThread_;

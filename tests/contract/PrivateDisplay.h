@@ -37,7 +37,10 @@ public:
         if (::posix_spawnp(&pid_, arguments[0], &actions, nullptr, arguments.data(), variables.data()) != 0) pid_ = -1;
         posix_spawn_file_actions_destroy(&actions);
     }
-    ~ChildProcess() { end(); }
+    ~ChildProcess() {
+        send(SIGCONT);
+        end(SIGTERM);
+    }
     ChildProcess(const ChildProcess&) = delete;
     ChildProcess& operator=(const ChildProcess&) = delete;
 
@@ -60,15 +63,19 @@ private:
 /// A headless display server without a window manager. It has gone when this has.
 class PrivateDisplay final {
 public:
-    explicit PrivateDisplay(const std::string& size = "2200x1300x24") {
+    /// `name` (":7") when it must be that one.
+    explicit PrivateDisplay(const std::string& size = "2200x1300x24", const std::string& name = {}) {
         int ends[2] = {-1, -1};
         if (::pipe2(ends, O_CLOEXEC) != 0) return;
         const Fd read(ends[0]);
         Fd write(ends[1]);
-        server_ = std::make_unique<ChildProcess>(
-            std::vector<std::string>{"Xvfb", "-displayfd", std::to_string(write.get()), "-screen", "0", size, "-noreset",
-                                     "-nolisten", "tcp"},
-            write.get());
+        std::vector<std::string> command{"Xvfb"};
+        if (!name.empty()) command.push_back(name);
+        for (const std::string& word : {std::string("-displayfd"), std::to_string(write.get()), std::string("-screen"),
+                                        std::string("0"), size, std::string("-noreset"), std::string("-nolisten"),
+                                        std::string("tcp")})
+            command.push_back(word);
+        server_ = std::make_unique<ChildProcess>(command, write.get());
         write.reset();
         char digit = 0;
         std::string number;
@@ -80,7 +87,7 @@ public:
     const std::string& name() const { return name_; }
     void hang() const { server_->send(SIGSTOP); }
     void goOn() const { server_->send(SIGCONT); }
-    void kill() const { server_->end(); }
+    void kill() const { server_->end(SIGTERM); }
     pid_t pid() const { return server_->pid(); }
 
 private:

@@ -18,9 +18,9 @@ TestWindow::TestWindow(const std::string& display, Look look)
     const xcb_window_t parent = look.parent != XCB_NONE ? look.parent : screen_->root;
     std::uint32_t mask = XCB_CW_EVENT_MASK;
     std::array<std::uint32_t, 2> values{XCB_EVENT_MASK_EXPOSURE | XCB_EVENT_MASK_STRUCTURE_NOTIFY, 0};
-    if (look.background) {
+    if (look.background != Look::kNone) {
         mask |= XCB_CW_BACK_PIXEL;
-        values = {0, values[0]};
+        values = {static_cast<std::uint32_t>(look.background), values[0]};
     }
     xcb_create_window(x, XCB_COPY_FROM_PARENT, window_, parent, static_cast<std::int16_t>(look.place.x),
                       static_cast<std::int16_t>(look.place.y), static_cast<std::uint16_t>(width_),
@@ -47,9 +47,9 @@ void TestWindow::serveEvents() {
             exposed |= (event->response_type & 0x7F) == XCB_EXPOSE;
         if (exposed && look_.repaints) {
             const std::lock_guard lock(mutex_);
+            ++repaints_;
             fill({0, 0, width_, height_}, colour_);
             xcb_flush(x);
-            ++repaints_;
             continue;
         }
         // Replies that another thread waits for may bring events without waking this one for long.

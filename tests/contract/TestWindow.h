@@ -25,11 +25,12 @@ class TestWindow final {
 public:
     struct Look {
         PixelRect place{0, 0, 320, 240};
+        static constexpr std::int64_t kNone = -1;
         std::uint32_t colour = 0;
         std::uint16_t border = 0;
+        std::int64_t background = kNone;  ///< a colour that the server paints
         bool mapped = true;
         bool repaints = true;             ///< on Expose
-        bool background = false;          ///< painted by the server, black
         xcb_window_t parent = XCB_NONE;   ///< the screen's root when none
         std::uint8_t depth = 0;           ///< the parent's when 0
     };

@@ -86,24 +86,397 @@ TEST_F(X11Capture, RecordsACoveredWindowThatMoves) {
     }
 }
 
-TEST_F(X11Capture, SeesNothingOfWhatCoversAWindowThatIsNeverRepainted) {
-    TestWindow window(display.name(), {.colour = kRed, .repaints = false});
-    TestWindow cover(display.name(), {.place = {-10, -10, 600, 500}, .colour = kBlue});
-    const auto made = startOn(window, 320, 240);
-    ASSERT_TRUE(frames->waitForCount(1));
-    EXPECT_NE(frames->frames()[0].colour, kBlue);
+TEST_F(X11Capture, ShowsACoveredStillWindowAndNothingBlankBefore) {
+    for (const std::int64_t background : {Look::kNone, std::int64_t{kGreen}}) {
+        TestWindow window(display.name(), {.colour = kRed, .background = background});
+        TestWindow cover(display.name(), {.place = {-10, -10, 600, 500}, .colour = kBlue});
+        frames->clear();
+        const std::uint64_t before = window.repaints();
+        const auto made = startOn(window, 320, 240);
+        ASSERT_TRUE(frames->waitForCount(1));
+        EXPECT_EQ(frames->frames()[0].colour, kRed) << "background " << background;
+        EXPECT_TRUE(frames->frames()[0].oneColour);
+        EXPECT_GT(window.repaints(), before) << "the server asked the application to paint";
+    }
 }
 
-TEST_F(X11Capture, ShowsACoveredStillWindowAndNothingBlankBefore) {
-    for (const bool background : {false, true}) {
-        TestWindow window(display.name(), {.colour = kRed, .background = background});
+// The memory that the server gives a redirected window begins with what is on the screen at its place.
+TEST_F(X11Capture, NeverShowsWhatCoversAWindowThatIsNotRepainted) {
+    for (const std::int64_t background : {Look::kNone, std::int64_t{kGreen}}) {
+        TestWindow window(display.name(), {.colour = kRed, .background = background, .repaints = false});
         TestWindow cover(display.name(), {.place = {-10, -10, 600, 500}, .colour = kBlue});
         frames->clear();
         const auto made = startOn(window, 320, 240);
         ASSERT_TRUE(frames->waitForCount(1));
-        EXPECT_EQ(frames->frames()[0].colour, kRed) << (background ? "with" : "without") << " a background";
+        EXPECT_EQ(frames->frames()[0].colour, background == Look::kNone ? 0 : kGreen);
         EXPECT_TRUE(frames->frames()[0].oneColour);
-        EXPECT_GT(window.repaints(), 0u) << "the server asked the application to paint";
+        window.paint(kRed);
+        EXPECT_TRUE(frames->waitForColour(kRed));
+        for (const CapturedFrame& frame : frames->frames()) EXPECT_NE(frame.colour, kBlue);
+    }
+}
+
+TEST_F(X11Capture, FollowsAResizeWithoutBlankOrTornPictures) {
+    TestWindow window(display.name(), {.place = {0, 0, 320, 240}, .colour = kRed, .background = kRed});
+    const auto made = startOn(window, 320, 240);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    window.resize(640, 480);
+    window.paint(kGreen);
+    ASSERT_TRUE(frames->waitForColour(kGreen));
+    window.resize(160, 120);
+    window.paint(kBlue);
+    ASSERT_TRUE(frames->waitForColour(kBlue));
+    for (const CapturedFrame& frame : frames->frames()) {
+        EXPECT_EQ(frame.width, 320);
+        EXPECT_EQ(frame.height, 240);
+        EXPECT_TRUE(frame.oneColour) << "window and frame have one shape: there is no border to show";
+    }
+}
+
+TEST_F(X11Capture, KeepsTheShapeAndLeavesTheRestBlack) {
+    TestWindow window(display.name(), {.place = {0, 0, 320, 240}, .colour = kRed, .background = kRed});
+    frames->keepPlanes = true;
+    const auto made = startOn(window, 320, 240);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    window.resize(100, 240);
+    window.paint(kGreen);
+    const auto narrow = [](const Frames& got) {
+        const SharedPlane& plane = *got.back().plane;
+        return colourAt(plane, 160, 120) == kGreen && colourAt(plane, 5, 5) == 0;
+    };
+    ASSERT_TRUE(frames->waitFor(narrow));
+    const auto plane = frames->frames().back().plane;
+    EXPECT_EQ(colourAt(*plane, 109, 0), 0u);
+    EXPECT_EQ(colourAt(*plane, 110, 0), kGreen);
+    EXPECT_EQ(colourAt(*plane, 209, 239), kGreen);
+    EXPECT_EQ(colourAt(*plane, 210, 239), 0u);
+    // Back to the frame's own size: the borders go.
+    window.resize(320, 240);
+    window.paint(kBlue);
+    ASSERT_TRUE(frames->waitForColour(kBlue));
+}
+
+TEST_F(X11Capture, TakesOddSizes) {
+    TestWindow window(display.name(), {.place = {0, 0, 317, 231}, .colour = kRed, .repaints = false});
+    frames->keepPlanes = true;
+    const auto made = startOn(window, 317, 231);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    window.paintPart({313, 228, 3, 2}, kGreen);
+    ASSERT_TRUE(frames->waitFor([](const Frames& got) { return colourAt(*got.back().plane, 313, 228) == kGreen; }));
+    const auto plane = frames->frames().back().plane;
+    EXPECT_EQ(plane->width(), 317);
+    EXPECT_EQ(plane->height(), 231);
+    EXPECT_EQ(plane->stride() % 64, 0u);
+    EXPECT_EQ(colourAt(*plane, 315, 229), kGreen);
+    EXPECT_EQ(colourAt(*plane, 316, 229), kRed);
+    EXPECT_EQ(colourAt(*plane, 315, 230), kRed);
+    EXPECT_EQ(colourAt(*plane, 312, 229), kRed);
+}
+
+TEST_F(X11Capture, CutsOffFractionsOfTheSize) {
+    TestWindow window(display.name(), {.colour = kRed});
+    capture.setContexts({window.context()});
+    capture.setMirroringMode(DisplayCloneControl::kCloneContexts);
+    const auto made = capture.makeSource({320.9, 240.2}, MediaTime::make(1, 60));
+    made->setDelegate(frames);
+    made->openGate();
+    made->start();
+    ASSERT_TRUE(frames->waitForCount(1));
+    EXPECT_EQ(frames->frames()[0].width, 320);
+    EXPECT_EQ(frames->frames()[0].height, 240);
+}
+
+TEST_F(X11Capture, IsNotDisturbedByMoves) {
+    TestWindow window(display.name(), {.colour = kRed});
+    const auto made = startOn(window, 320, 240);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    window.move(1000, 900);
+    window.move(-200, -100);
+    window.paint(kGreen);
+    ASSERT_TRUE(frames->waitForColour(kGreen));
+    for (const CapturedFrame& frame : frames->frames()) EXPECT_TRUE(frame.oneColour);
+}
+
+TEST_F(X11Capture, KeepsTheLastPictureOfAHiddenWindowAndGoesOnWhenItIsBack) {
+    TestWindow window(display.name(), {.colour = kRed});
+    const auto made = startOn(window, 320, 240);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    window.unmap();
+    const std::size_t before = frames->count();
+    ASSERT_TRUE(frames->waitForCount(before + 2)) << "the picture is repeated";
+    EXPECT_EQ(frames->frames().back().colour, kRed);
+    EXPECT_TRUE(frames->frames().back().damage.empty());
+    window.map();
+    window.paint(kGreen);
+    ASSERT_TRUE(frames->waitForColour(kGreen));
+    window.paint(kBlue);
+    ASSERT_TRUE(frames->waitForColour(kBlue));
+    EXPECT_TRUE(frames->failures().empty());
+}
+
+TEST_F(X11Capture, GoesOnWhenTheParentOfTheWindowWasHidden) {
+    TestWindow frame(display.name(), {.place = {10, 10, 400, 300}, .colour = kBlue, .repaints = false});
+    TestWindow window(display.name(), {.colour = kRed, .parent = frame.id()});
+    const auto made = startOn(window, 320, 240);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    frame.unmap();
+    frame.map();
+    window.paint(kGreen);
+    ASSERT_TRUE(frames->waitForColour(kGreen));
+    EXPECT_TRUE(frames->failures().empty());
+}
+
+TEST_F(X11Capture, WaitsForAWindowThatIsNotShownYet) {
+    TestWindow window(display.name(), {.colour = kRed, .mapped = false});
+    const auto made = startOn(window, 320, 240);
+    window.map();
+    window.paint(kRed);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    EXPECT_TRUE(frames->failures().empty());
+}
+
+TEST_F(X11Capture, FailsOnceWhenTheWindowIsDestroyed) {
+    TestWindow window(display.name(), {.colour = kRed});
+    const auto made = startOn(window, 320, 240);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    window.destroy();
+    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kWindowGone);
+    EXPECT_EQ(frames->failures().size(), 1u);
+}
+
+TEST_F(X11Capture, NeverCapturesTheSameNumberAgainAfterTheWindowWasDestroyed) {
+    TestWindow window(display.name(), {.colour = kRed});
+    const auto made = startOn(window, 320, 240);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    window.destroy();
+    ASSERT_TRUE(frames->waitForFailure());
+    // The application makes a new window, which happens to get the old one's number.
+    xcb_create_window(window.connection(), XCB_COPY_FROM_PARENT, window.id(), window.screen().root, 0, 0, 320, 240, 0,
+                      XCB_WINDOW_CLASS_INPUT_OUTPUT, XCB_COPY_FROM_PARENT, 0, nullptr);
+    window.map();
+    const std::size_t before = frames->count();
+    made->start();
+    ASSERT_TRUE(frames->waitFor([&](const Frames&) { return frames->failuresUnlocked() >= 2; }));
+    EXPECT_LE(frames->count(), before + 1) << "at most the last picture once more";
+}
+
+TEST_F(X11Capture, FailsForAWindowThatDoesNotExist) {
+    capture.setContexts({ContextID{0x7fffff}});
+    capture.setMirroringMode(DisplayCloneControl::kCloneContexts);
+    const auto made = source(320, 240);
+    made->openGate();
+    made->start();
+    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kWindowGone);
+}
+
+TEST_F(X11Capture, NeverTakesTheScreenForAWindow) {
+    TestWindow window(display.name(), {.colour = kRed});
+    capture.setContexts({ContextID{0}, ContextID{window.screen().root}});
+    capture.setMirroringMode(DisplayCloneControl::kCloneContexts);
+    const auto made = source(320, 240);
+    made->openGate();
+    made->start();
+    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kWindowGone);
+    EXPECT_EQ(frames->count(), 0u);
+}
+
+TEST_F(X11Capture, ShowsTheFirstOfSeveralWindowsThatExists) {
+    TestWindow first(display.name(), {.colour = kRed});
+    TestWindow second(display.name(), {.colour = kGreen});
+    capture.setContexts({ContextID{7}, first.context(), second.context()});
+    capture.setMirroringMode(DisplayCloneControl::kCloneContexts);
+    const auto made = source(320, 240);
+    made->openGate();
+    made->start();
+    const bool firstIsLower = first.id() < second.id();
+    ASSERT_TRUE(frames->waitForColour(firstIsLower ? kRed : kGreen));
+    (firstIsLower ? first : second).destroy();
+    ASSERT_TRUE(frames->waitForColour(firstIsLower ? kGreen : kRed)) << "the other one takes over";
+    EXPECT_TRUE(frames->failures().empty());
+}
+
+TEST_F(X11Capture, FollowsTheSelectionWhileItRuns) {
+    TestWindow first(display.name(), {.colour = kRed});
+    TestWindow second(display.name(), {.place = {500, 500, 320, 240}, .colour = kGreen});
+    const auto made = startOn(first, 320, 240);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    capture.setContexts({second.context()});
+    ASSERT_TRUE(frames->waitForColour(kGreen));
+}
+
+TEST_F(X11Capture, MirrorsTheScreenAsItIsShown) {
+    TestWindow back(display.name(), {.place = {0, 0, 2200, 1300}, .colour = kRed});
+    capture.setMirroringMode(DisplayCloneControl::kMirrorDisplay);
+    frames->keepPlanes = true;
+    frames->checkEvery = 50;
+    const auto made = source(2200, 1300);
+    made->openGate();
+    made->start();
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    TestWindow front(display.name(), {.place = {100, 100, 300, 200}, .colour = kGreen});
+    const auto shown = [](const Frames& got) { return colourAt(*got.back().plane, 399, 299) == kGreen; };
+    ASSERT_TRUE(frames->waitFor(shown));
+    const auto plane = frames->frames().back().plane;
+    EXPECT_EQ(colourAt(*plane, 100, 100), kGreen);
+    EXPECT_EQ(colourAt(*plane, 99, 99), kRed);
+    EXPECT_EQ(colourAt(*plane, 400, 300), kRed);
+}
+
+TEST_F(X11Capture, SealsItsPlanesSoThatNobodyElseCanWriteOrResizeThem) {
+    TestWindow window(display.name(), {.colour = kRed});
+    frames->keepPlanes = true;
+    const auto made = startOn(window, 320, 240);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    const auto plane = frames->frames().back().plane;
+    const int descriptor = plane->descriptor();
+    EXPECT_EQ(::fcntl(descriptor, F_GET_SEALS) & (F_SEAL_SHRINK | F_SEAL_GROW | F_SEAL_SEAL),
+              F_SEAL_SHRINK | F_SEAL_GROW | F_SEAL_SEAL);
+    const std::size_t size = plane->pixels().size();
+    EXPECT_EQ(size, plane->stride() * 240);
+    EXPECT_EQ(::mmap(nullptr, size, PROT_READ | PROT_WRITE, MAP_SHARED, descriptor, 0), MAP_FAILED);
+    EXPECT_NE(::ftruncate(descriptor, 1), 0);
+    void* const readable = ::mmap(nullptr, size, PROT_READ, MAP_SHARED, descriptor, 0);
+    ASSERT_NE(readable, MAP_FAILED);
+    EXPECT_EQ(std::memcmp(readable, plane->pixels().data(), size), 0) << "the very same picture";
+    ::munmap(readable, size);
+}
+
+TEST_F(X11Capture, DropsFramesWhenAllPlanesAreHeldAndGoesOnWhenTheyAreGivenBack) {
+    TestWindow window(display.name(), {.colour = 1});
+    frames->keepPlanes = true;
+    const auto made = startOn(window, 320, 240, 1000);
+    ASSERT_TRUE(frames->waitForCount(1));
+    std::uint32_t colour = 1;
+    const auto limit = std::chrono::steady_clock::now() + kGenerous;
+    while (made->counters().dropped == 0 && std::chrono::steady_clock::now() < limit) {
+        const std::size_t before = frames->count();
+        window.paint(++colour);
+        frames->waitFor([&](const Frames& got) { return got.size() > before; }, std::chrono::milliseconds(50));
+    }
+    EXPECT_GT(made->counters().dropped, 0u);
+    for (const CapturedFrame& frame : frames->frames())
+        EXPECT_EQ(colourAt(*frame.plane, 1, 1), frame.colour) << "a held picture never changes";
+    frames->keepPlanes = false;
+    frames->clear();
+    ASSERT_TRUE(frames->waitForColour(colour)) << "the newest picture comes, without anything new being drawn";
+}
+
+TEST_F(X11Capture, BringsEveryPlaneUpToDate) {
+    TestWindow window(display.name(), {.colour = kRed, .repaints = false});
+    const auto made = startOn(window, 320, 240, 1000);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    // Small squares, each seen before the next is drawn, so that planes take turns with different histories.
+    std::vector<std::shared_ptr<SharedPlane>> some;
+    frames->keepPlanes = true;
+    for (int i = 0; i < 60; ++i) {
+        const int x = 16 * (i % 20), y = 16 * (i / 20);
+        window.paintPart({x, y, 16, 16}, kGreen);
+        ASSERT_TRUE(frames->waitFor([&](const Frames& got) {
+            return !got.empty() && got.back().plane && colourAt(*got.back().plane, x + 8, y + 8) == kGreen;
+        })) << i;
+        const auto plane = frames->frames().back().plane;
+        for (int j = 0; j < 60; ++j)
+            ASSERT_EQ(colourAt(*plane, 16 * (j % 20) + 8, 16 * (j / 20) + 8), j <= i ? kGreen : kRed) << i << " " << j;
+        if (i % 7 == 0) some.push_back(plane);
+        if (some.size() > 3) some.erase(some.begin());
+        frames->clear();
+    }
+}
+
+TEST_F(X11Capture, DamageTellsWhatDiffersFromTheLastPicture) {
+    TestWindow window(display.name(), {.place = {0, 0, 640, 480}, .colour = kRed, .repaints = false});
+    const auto made = startOn(window, 640, 480);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    EXPECT_EQ(frames->frames()[0].damage, (std::vector<PixelRect>{{0, 0, 640, 480}}));
+    const std::size_t before = frames->count();
+    window.paintPart({100, 200, 30, 20}, kGreen);
+    ASSERT_TRUE(frames->waitFor([&](const Frames& got) {
+        return std::any_of(got.begin() + static_cast<std::ptrdiff_t>(before), got.end(), [](const CapturedFrame& frame) {
+            return frame.damage == std::vector<PixelRect>{{100, 200, 30, 20}};
+        });
+    }));
+    const Frames got = frames->frames();
+    for (std::size_t i = 1; i < got.size(); ++i) EXPECT_EQ(got[i].number, got[i - 1].number + 1);
+}
+
+TEST_F(X11Capture, FailsOnceWhenTheServerDiesAndWorksWithTheNextOne) {
+    auto window = std::make_unique<TestWindow>(display.name(), Look{.colour = kRed});
+    const auto made = startOn(*window, 320, 240);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    display.kill();
+    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kDisplayLost);
+    made->start();
+    ASSERT_TRUE(frames->waitFor([&](const Frames&) { return frames->failuresUnlocked() >= 2; }));
+    EXPECT_EQ(frames->failures()[1], X11CaptureStatus::kNoDisplay);
+    window.reset();
+
+    const PrivateDisplay next("800x600x24", display.name());
+    ASSERT_EQ(next.name(), display.name());
+    TestWindow another(next.name(), {.colour = kGreen});
+    capture.setContexts({another.context()});
+    frames->clear();
+    made->start();
+    ASSERT_TRUE(frames->waitForColour(kGreen));
+    EXPECT_EQ(frames->failures().size(), 2u);
+}
+
+TEST_F(X11Capture, NobodyWaitsForAServerThatHangs) {
+    TestWindow window(display.name(), {.colour = kRed});
+    auto made = startOn(window, 320, 240);
+    ASSERT_TRUE(frames->waitForColour(kRed));
+    window.paint(kGreen);
+    display.hang();
+    const auto began = std::chrono::steady_clock::now();
+    made->closeGate(GateWait::UntilDelivered);
+    made->stop();
+    made->openGate();
+    made->start();
+    made.reset();
+    EXPECT_LT(std::chrono::steady_clock::now() - began, std::chrono::seconds(2));
+    display.goOn();
+}
+
+TEST_F(X11Capture, EndsWhileTheServerHangs) {
+    auto second = std::make_unique<X11DisplayCapture>(display.name(), clock, scheduler);
+    second->setMirroringMode(DisplayCloneControl::kMirrorDisplay);
+    display.hang();
+    const auto made = second->makeSource({320, 240}, MediaTime::make(1, 60));
+    made->setDelegate(frames);
+    made->openGate();
+    made->start();
+    const auto began = std::chrono::steady_clock::now();
+    second.reset();
+    EXPECT_LT(std::chrono::steady_clock::now() - began, std::chrono::seconds(5)) << "its lane waits for the connection";
+    display.goOn();
+}
+
+TEST(X11CaptureWithoutDisplay, FailsAfterTheStart) {
+    LinuxClock clock;
+    clock.startCaptureClock();
+    const auto loop = std::make_shared<ThreadLoop>();
+    ThreadScheduler scheduler(loop);
+    RunningThreadLoop running(*loop);
+    for (const char* name : {"", ":4711", "elsewhere:0", "nonsense"}) {
+        X11DisplayCapture capture(name, clock, scheduler);
+        const auto frames = std::make_shared<CapturedFrames>();
+        const auto made = capture.makeSource({320, 240}, MediaTime::make(1, 60));
+        ASSERT_NE(made, nullptr);
+        made->setDelegate(frames);
+        made->openGate();
+        made->start();
+        EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kNoDisplay) << name;
+    }
+}
+
+TEST_F(X11Capture, RefusesSizesThatNoFrameHas) {
+    capture.setMirroringMode(DisplayCloneControl::kMirrorDisplay);
+    for (const Size size : {Size{0, 240}, Size{320, -1}, Size{1e9, 10}}) {
+        const auto failed = std::make_shared<CapturedFrames>();
+        const auto made = capture.makeSource(size, MediaTime::make(1, 60));
+        made->setDelegate(failed);
+        made->openGate();
+        made->start();
+        EXPECT_EQ(failed->waitForFailure(), X11CaptureStatus::kNotSupported);
     }
 }
 
