@@ -31,7 +31,16 @@ Child::Child(const std::vector<std::string>& command, const std::vector<std::str
     for (const std::string& word : environment) variables.push_back(const_cast<char*>(word.c_str()));
     for (char** word = environ; *word != nullptr; ++word) variables.push_back(*word);
     variables.push_back(nullptr);
-    if (::posix_spawnp(&pid_, arguments[0], &actions, nullptr, arguments.data(), variables.data()) != 0) pid_ = -1;
+    // A test that ignores broken pipes doesn't hand that on.
+    posix_spawnattr_t attributes;
+    posix_spawnattr_init(&attributes);
+    sigset_t defaults;
+    sigemptyset(&defaults);
+    sigaddset(&defaults, SIGPIPE);
+    posix_spawnattr_setsigdefault(&attributes, &defaults);
+    posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF);
+    if (::posix_spawnp(&pid_, arguments[0], &actions, &attributes, arguments.data(), variables.data()) != 0) pid_ = -1;
+    posix_spawnattr_destroy(&attributes);
     posix_spawn_file_actions_destroy(&actions);
     ::close(in[0]);
     ::close(out[1]);

@@ -76,6 +76,12 @@ TEST(FramePattern, AnySingleCellTurnedOverIsRefused) {
     }
 }
 
+TEST(FramePattern, APatternWithoutItsQuietFrameIsRefused) {
+    LumaPlane plane = sceneLuma(320, 180, 4711);
+    std::fill(plane.samples.begin() + 175 * 320, plane.samples.end(), static_cast<std::uint8_t>(200));
+    EXPECT_FALSE(read(plane));
+}
+
 TEST(FramePattern, TwoPicturesMixedAreRefused) {
     for (std::uint32_t number = 0; number < 200; ++number) {
         LumaPlane mixed = sceneLuma(160, 90, number);
