@@ -149,7 +149,7 @@ MovieError MovieBoxWriter::flushFragment() {
     return pendingBytes_ == 0 || waitsForPicture() ? MovieError::none : writeFragment();
 }
 
-MovieError MovieBoxWriter::finish(std::int64_t lastPictureEnd) {
+MovieError MovieBoxWriter::finish(std::int64_t lastPictureEnd, std::optional<std::int64_t> presentationEnd) {
     if (state_ != State::writing) {
         return state_ == State::failed ? MovieError::sinkFailed : MovieError::badState;
     }
@@ -169,7 +169,25 @@ MovieError MovieBoxWriter::finish(std::int64_t lastPictureEnd) {
             return error;
         }
     }
+    if (presentationEnd) {
+        for (MovieTrack& track : tracks_) {
+            cut(track, rescale(*presentationEnd, kNanosecondTimescale, track.timescale));
+        }
+    }
     return replaceFragmentsByIndex();
+}
+
+// A picture at the very end stays, for one tick: it was not later. Sound there has nothing to present.
+void MovieBoxWriter::cut(MovieTrack& track, std::int64_t end) {
+    const std::size_t kept = track.isVideo() ? 1 : 0;
+    while (track.index.count() > kept && track.lastStart() >= end + (track.isVideo() ? 1 : 0)) {
+        track.index.removeLast();
+    }
+    if (track.hasSamples()) {
+        const std::int64_t duration = track.index.samples().back().duration;
+        track.index.setLastDuration(
+            static_cast<std::uint32_t>(std::clamp<std::int64_t>(end - track.lastStart(), 1, std::max<std::int64_t>(duration, 1))));
+    }
 }
 
 MovieTrack* MovieBoxWriter::find(TrackId id) {
@@ -242,7 +260,7 @@ std::uint32_t MovieBoxWriter::lastFragmentDuration(const MovieTrack& track) cons
 MovieError MovieBoxWriter::writeFragment() {
     boxes_.clear();
     if (fragments_ == 0) {
-        placeFragments(tracks_);
+        placeFragments(tracks_, options_.presentationStart);
         writeInitialMovie(boxes_, {options_.timescale, options_.creationTime}, tracks_);
     }
     std::vector<TrackFragment> parts;
@@ -288,7 +306,8 @@ MovieError MovieBoxWriter::replaceFragmentsByIndex() {
     bool presents = false;
     {
         const Box hidden(boxes_, "free");  // ISO/IEC 14496-12 clause 8.1.2
-        presents = writeFinalMovie(boxes_, {options_.timescale, options_.creationTime}, tracks_);
+        const MovieHead head{options_.timescale, options_.creationTime};
+        presents = writeFinalMovie(boxes_, head, tracks_, options_.presentationStart);
     }
     if (!presents) {
         state_ = State::finished;

@@ -34,6 +34,9 @@ struct MovieOptions {
     std::uint32_t fragmentNanoseconds = 1'000'000'000;  // media time after which a fragment is closed
     std::uint32_t fragmentBytes = 8U << 20U;            // pending bytes after which it is closed early; 1 GiB at most
     std::uint32_t fragmentsPerSync = 1;  // the sink is synced after every so many fragments; 0: only at the end
+    // Nanoseconds on the tracks' time line at which the movie begins. What lies before is there to decode from and is not
+    // presented. None: the movie begins with its first picture.
+    std::optional<std::int64_t> presentationStart;
 };
 
 struct SampleInfo {
@@ -76,8 +79,10 @@ public:
 
     // Completes the movie: the last picture lasts until `lastPictureEnd` (ticks of the video track; one tick at least,
     // and 2^32-1 at most), tracks without a sample are left out. To be called once. After sinkFailed the file plays as
-    // far as it was flushed.
-    [[nodiscard]] MovieError finish(std::int64_t lastPictureEnd);
+    // far as it was flushed. `presentationEnd` (nanoseconds on the tracks' time line): later samples are left out of the
+    // movie, though their bytes stay in the file, and what lasts longer is cut; the first picture always stays.
+    [[nodiscard]] MovieError finish(std::int64_t lastPictureEnd,
+                                    std::optional<std::int64_t> presentationEnd = std::nullopt);
 
     // Bytes handed to the sink so far.
     [[nodiscard]] std::uint64_t bytesWritten() const { return position_; }
@@ -93,6 +98,7 @@ private:
                                    std::span<const std::uint8_t> bytes) const;
     [[nodiscard]] bool closesFragment(const MovieTrack& track, const SampleInfo& info, std::size_t bytes) const;
     [[nodiscard]] bool waitsForPicture() const;
+    void cut(MovieTrack& track, std::int64_t end);
     void take(MovieTrack& track, const SampleInfo& info, std::span<const std::uint8_t> bytes);
     [[nodiscard]] std::uint32_t lastFragmentDuration(const MovieTrack& track) const;
     [[nodiscard]] MovieError writeFragment();

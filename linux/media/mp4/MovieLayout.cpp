@@ -74,11 +74,11 @@ std::int64_t movieStartNanoseconds(std::span<const MovieTrack> tracks) {
     return start;
 }
 
-void placeFragments(std::span<MovieTrack> tracks) {
-    const std::int64_t movieStart = movieStartNanoseconds(tracks);
+void placeFragments(std::span<MovieTrack> tracks, std::optional<std::int64_t> givenStart) {
+    const std::int64_t movieStart = givenStart ? *givenStart : movieStartNanoseconds(tracks);
     for (MovieTrack& track : tracks) {
         const std::int64_t start = rescale(movieStart, kNanosecondTimescale, track.timescale);
-        const std::int64_t early = track.hasSamples() && !track.isVideo() ? start - track.firstPts : 0;
+        const std::int64_t early = track.hasSamples() ? start - track.firstPts : 0;
         track.fragmentSkip = std::max(track.priming, early);
         track.fragmentOffset = track.fragmentSkip - start;
     }
@@ -98,8 +98,9 @@ void writeInitialMovie(BoxBuffer& out, const MovieHead& head, std::span<const Mo
     writeMovieExtends(out, ids);
 }
 
-bool writeFinalMovie(BoxBuffer& out, const MovieHead& head, std::span<const MovieTrack> tracks) {
-    const std::int64_t movieStart = movieStartNanoseconds(tracks);
+bool writeFinalMovie(BoxBuffer& out, const MovieHead& head, std::span<const MovieTrack> tracks,
+                     std::optional<std::int64_t> givenStart) {
+    const std::int64_t movieStart = givenStart ? *givenStart : movieStartNanoseconds(tracks);
     std::vector<TrackEdits> edits;
     std::uint64_t duration = 0;
     for (const MovieTrack& track : tracks) {

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <span>
 
 #include "linux/media/mp4/MovieTrack.h"
@@ -27,9 +28,11 @@ void writeFileStart(BoxBuffer& out);
 // sound. At least one track must have a sample.
 [[nodiscard]] std::int64_t movieStartNanoseconds(std::span<const MovieTrack> tracks);
 
+// `start` below: the same where it is not left to the tracks.
+
 // Decides how stamps become decoding times in fragments (fragmentOffset, fragmentSkip), so that none is negative. Sound
 // that has not come yet is expected not to begin before the movie does.
-void placeFragments(std::span<MovieTrack> tracks);
+void placeFragments(std::span<MovieTrack> tracks, std::optional<std::int64_t> start);
 
 // The movie box of a file in fragments: every track declared, none with samples, and an edit list where ticks are
 // skipped.
@@ -37,7 +40,8 @@ void writeInitialMovie(BoxBuffer& out, const MovieHead& head, std::span<const Mo
 
 // The movie box of the finished file: every track that has something to present, with its complete tables. False, and
 // nothing is written, when no track has.
-[[nodiscard]] bool writeFinalMovie(BoxBuffer& out, const MovieHead& head, std::span<const MovieTrack> tracks);
+[[nodiscard]] bool writeFinalMovie(BoxBuffer& out, const MovieHead& head, std::span<const MovieTrack> tracks,
+                                   std::optional<std::int64_t> start);
 
 // An upper bound of the bytes of the final movie box's tables.
 [[nodiscard]] std::size_t finalTableBytes(std::span<const MovieTrack> tracks);

@@ -31,6 +31,10 @@ struct MovieTrack {
 
     [[nodiscard]] bool isVideo() const { return std::holds_alternative<VideoTrackDescription>(description); }
     [[nodiscard]] bool hasSamples() const { return index.count() > 0; }
+    // When the last sample of the index begins; there must be one.
+    [[nodiscard]] std::int64_t lastStart() const {
+        return firstPts + static_cast<std::int64_t>(index.totalDuration() - index.samples().back().duration);
+    }
     [[nodiscard]] std::int64_t presentedStart() const { return firstPts + priming; }
 };
 

@@ -32,6 +32,18 @@ public:
         samples_.back().duration = duration;
     }
 
+    // Takes the last sample back. There must be one, and every sample must lie in a chunk.
+    void removeLast() {
+        totalDuration_ -= samples_.back().duration;
+        syncCount_ -= samples_.back().isSync;
+        samples_.pop_back();
+        chunkCounts_.back() -= 1;
+        if (chunkCounts_.back() == 0) {
+            chunkCounts_.pop_back();
+            chunkOffsets_.pop_back();
+        }
+    }
+
     // The `count` samples after those of the chunk before lie one after the other from `offset` on.
     void addChunk(std::uint64_t offset, std::uint32_t count) {
         chunkOffsets_.push_back(offset);

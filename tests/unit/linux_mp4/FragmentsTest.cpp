@@ -95,6 +95,35 @@ TEST_F(Fragments, CloseWithEachSecondOfPicturesAndBeginWithKeyFrames) {
     }
 }
 
+TEST_F(Fragments, CloseAtAKeyFrameFromHalfASecondOn) {
+    MovieBoxWriter writer(sink);
+    const auto video = writer.addVideoTrack(test::videoDescription());
+    ASSERT_EQ(writer.start(), MovieError::none);
+    for (int i = 0; i < 100; ++i) {
+        ASSERT_EQ(picture(writer, *video, i * kSecond / 100, i == 0 || i == 49 || i == 70), MovieError::none);
+    }
+    const auto boxes = parseBoxes(sink.file());
+    const auto fragments = fragmentsOf(boxes);
+    ASSERT_EQ(fragments.size(), 1U);
+    EXPECT_EQ(parseFragment(*fragments[0])[0].samples.size(), 70U);
+}
+
+TEST_F(Fragments, CloseAfterASecondWithoutAKeyFrame) {
+    MovieBoxWriter writer(sink);
+    const auto video = writer.addVideoTrack(test::videoDescription());
+    ASSERT_EQ(writer.start(), MovieError::none);
+    for (int i = 0; i < 151; ++i) {
+        ASSERT_EQ(picture(writer, *video, i * kSecond / 50, i == 0), MovieError::none);
+    }
+    const auto boxes = parseBoxes(sink.file());
+    ASSERT_EQ(fragmentsOf(boxes).size(), 3U);
+    for (const ParsedBox* moof : fragmentsOf(boxes)) {
+        const auto run = parseFragment(*moof)[0];
+        EXPECT_EQ(run.samples.size(), 50U);
+        EXPECT_EQ(run.samples.back().duration, 20'000U);
+    }
+}
+
 TEST_F(Fragments, HoldTheBytesOfEachSampleWhereTheyAreSaidToBe) {
     MovieBoxWriter writer(sink);
     const auto video = writer.addVideoTrack(test::videoDescription());
