@@ -22,7 +22,8 @@ public:
     // Replaces bytes that were appended before; never reaches past the end.
     [[nodiscard]] virtual bool overwrite(std::uint64_t offset, std::span<const std::uint8_t> bytes) = 0;
 
-    // A barrier: everything before it is on the disk before anything after it.
+    // A barrier: everything before it is on the disk before anything after it. Asked for once a fragment, and twice at
+    // the end. A sink that answers without doing it gives up what the movie survives of a power cut, nothing else.
     [[nodiscard]] virtual bool sync() = 0;
 };
 

@@ -185,8 +185,8 @@ void MovieBoxWriter::cut(MovieTrack& track, std::int64_t end) {
     }
     if (track.hasSamples()) {
         const std::int64_t duration = track.index.samples().back().duration;
-        track.index.setLastDuration(
-            static_cast<std::uint32_t>(std::clamp<std::int64_t>(end - track.lastStart(), 1, std::max<std::int64_t>(duration, 1))));
+        track.index.setLastDuration(static_cast<std::uint32_t>(
+            std::clamp<std::int64_t>(end - track.lastStart(), 1, std::max<std::int64_t>(duration, 1))));
     }
 }
 
@@ -289,8 +289,7 @@ MovieError MovieBoxWriter::writeFragment() {
     }
     pendingBytes_ = 0;
     fragments_ += 1;
-    const bool syncs = options_.fragmentsPerSync != 0 && fragments_ % options_.fragmentsPerSync == 0;
-    if (syncs && !sink_.sync()) {
+    if (!sink_.sync()) {
         return fail();
     }
     BoxBuffer type;

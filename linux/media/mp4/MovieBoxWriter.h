@@ -33,8 +33,6 @@ struct MovieOptions {
     std::uint64_t creationTime = 0;                     // seconds since 1904 began, UTC; 0: not stated
     std::uint32_t fragmentNanoseconds = 1'000'000'000;  // media time after which a fragment is closed
     std::uint32_t fragmentBytes = 8U << 20U;            // pending bytes after which it is closed early; 1 GiB at most
-    std::uint32_t fragmentsPerSync = 1;  // the sink is synced after every so many fragments; 0: only at the end
-    // Nanoseconds on the tracks' time line at which the movie begins. What lies before is there to decode from and is not
     // presented. None: the movie begins with its first picture.
     std::optional<std::int64_t> presentationStart;
 };
@@ -79,8 +77,8 @@ public:
 
     // Completes the movie: the last picture lasts until `lastPictureEnd` (ticks of the video track; one tick at least,
     // and 2^32-1 at most), tracks without a sample are left out. To be called once. After sinkFailed the file plays as
-    // far as it was flushed. `presentationEnd` (nanoseconds on the tracks' time line): later samples are left out of the
-    // movie, though their bytes stay in the file, and what lasts longer is cut; the first picture always stays.
+    // far as it was flushed. `presentationEnd` (nanoseconds on the tracks' time line): later samples are left out of
+    // the movie, though their bytes stay in the file, and what lasts longer is cut; the first picture always stays.
     [[nodiscard]] MovieError finish(std::int64_t lastPictureEnd,
                                     std::optional<std::int64_t> presentationEnd = std::nullopt);
 
