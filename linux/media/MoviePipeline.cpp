@@ -60,16 +60,16 @@ std::optional<Error> MoviePipeline::flush() {
     return movieError(movie_.flushFragment());
 }
 
-std::optional<Error> MoviePipeline::finish(std::optional<std::int64_t> end) {
+std::optional<Error> MoviePipeline::finish(const End& end) {
     std::int64_t lastPictureEnd = 0;
     for (auto& track : tracks_) {
         const auto error = std::visit([](auto& any) { return any->finish(); }, track);
         if (error) return error;
         if (auto* const pictures = std::get_if<std::unique_ptr<PictureTrack>>(&track)) {
-            lastPictureEnd = (end.value_or((*pictures)->naturalEnd()) + 500) / 1000;
+            lastPictureEnd = (end.lastPicture.value_or((*pictures)->naturalEnd()) + 500) / 1000;
         }
     }
-    return movieError(movie_.finish(lastPictureEnd));
+    return movieError(movie_.finish(lastPictureEnd, end.cut));
 }
 
 }  // namespace lumacast::media

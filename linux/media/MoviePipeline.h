@@ -42,9 +42,13 @@ public:
     std::optional<SteadyTime> flushTime() const { return flushTime_; }
     std::optional<Error> flush();
 
-    /// Encodes the rest and writes the index. `end` is when the movie ends, nanoseconds after zero; none: when
-    /// its last picture does by itself. Not yet on the disk when it returns.
-    std::optional<Error> finish(std::optional<std::int64_t> end);
+    /// When a movie ends, nanoseconds after its zero.
+    struct End {
+        std::optional<std::int64_t> lastPicture;  ///< until when the last picture lasts; none: as long as it says itself
+        std::optional<std::int64_t> cut;          ///< what is later is not in the movie
+    };
+    /// Encodes the rest and writes the index. Not yet on the disk when it returns.
+    std::optional<Error> finish(const End& end);
 
 private:
     explicit MoviePipeline(DiskWriter& disk);

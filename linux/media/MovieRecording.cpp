@@ -139,11 +139,12 @@ void MovieRecording::fail(Error error) {
     failLocked(std::move(error));
 }
 
-/// The end of the session where one was set, else the time of the recording's clock; after the movie's zero.
-std::optional<std::int64_t> MovieRecording::movieEnd() const {
-    const auto end = sessionEnd_ ? sessionEnd_ : clockAtFinish_;
-    if (!end || !sessionStart_) return std::nullopt;
-    return *end - *sessionStart_;
+/// The end of the session where one was set, else the time of the recording's clock.
+MoviePipeline::End MovieRecording::movieEnd() const {
+    if (!sessionStart_) return {};
+    if (sessionEnd_) return {*sessionEnd_ - *sessionStart_, *sessionEnd_ - *sessionStart_};
+    if (clockAtFinish_) return {*clockAtFinish_ - *sessionStart_, std::nullopt};
+    return {};
 }
 
 std::optional<MovieRecording::Item> MovieRecording::takeItem() {

@@ -87,7 +87,7 @@ private:
     void runCompletions(std::unique_lock<std::mutex>& lock);
     void fail(Error error);
     void failLocked(Error error);
-    std::optional<std::int64_t> movieEnd() const;
+    MoviePipeline::End movieEnd() const;
     void finishLocked();
 
     const std::shared_ptr<CaptureClock> clock_;
