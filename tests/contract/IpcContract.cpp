@@ -9,6 +9,7 @@
 
 #include "base/Limits.h"
 #include "base/MessageTables.h"
+#include "tests/contract/IpcFakeWorld.h"
 #include "tests/contract/IpcPortWorld.h"
 #include "tests/contract/IpcWorld.h"
 
@@ -919,6 +920,12 @@ TEST_P(IpcContract, OnlySoManyPlanesAreLentToOnePeer) {
     EXPECT_EQ(clientLoss.invalidations.get(), 0);
 }
 
+INSTANTIATE_TEST_SUITE_P(Fake, IpcContract, ::testing::Values([]() -> std::unique_ptr<IpcWorld> {
+                             return std::make_unique<IpcFakeWorld<SimScheduler>>(std::uint64_t{1});
+                         }));
+INSTANTIATE_TEST_SUITE_P(FakeOnThreads, IpcContract, ::testing::Values([]() -> std::unique_ptr<IpcWorld> {
+                             return std::make_unique<IpcFakeWorld<ThreadScheduler>>(std::make_shared<ThreadLoop>());
+                         }));
 INSTANTIATE_TEST_SUITE_P(Port, IpcContract, ::testing::Values([]() -> std::unique_ptr<IpcWorld> {
                              return std::make_unique<IpcPortWorld>();
                          }));
