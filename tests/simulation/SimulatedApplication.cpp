@@ -1,0 +1,72 @@
+#include "tests/simulation/SimulatedApplication.h"
+
+namespace lumacast {
+
+class SimulatedApplication::Inbox final : public IpcExportedObject {
+public:
+    explicit Inbox(std::shared_ptr<std::vector<Told>> told) : told_(std::move(told)) {}
+    void receiveMessage(const std::shared_ptr<IpcConnection>&, std::uint16_t message, Array arguments, IpcReply) override {
+        told_->push_back({static_cast<ClientMessage>(message), std::move(arguments)});
+    }
+
+private:
+    const std::shared_ptr<std::vector<Told>> told_;
+};
+
+SimulatedApplication::SimulatedApplication(FakePlatform& machine, BundleIdentifier theIdentifier, const std::string& theName,
+                                           ProcessID pid, ContextID theWindow)
+    : identifier(std::move(theIdentifier)), name(theName), window(theWindow), machine_(machine), pid_(pid) {
+    machine_.bundles.installApplication(identifier, name);
+    machine_.appStateMonitor.setState(identifier, AppStateMonitor::kRunningForeground);
+    startAgain(pid);
+}
+
+SimulatedApplication::~SimulatedApplication() { die(); }
+
+void SimulatedApplication::startAgain(ProcessID pid) {
+    pid_ = pid;
+    process_ = machine_.makeProcess(pid);
+    machine_.bundles.run(pid, identifier);
+    machine_.renderServer.addLayer(window, pid);
+}
+
+void SimulatedApplication::connect() {
+    inbox_ = std::make_shared<Inbox>(told_);
+    connection_ = process_->connectToService("com.orvane.lumacastd");
+    connection_->setExportedInterface(clientProtocol());
+    connection_->setExportedObject(inbox_);
+    connection_->setRemoteInterface(daemonProtocol());
+    connection_->setInvalidationHandler([losses = losses_] { ++*losses; });
+    connection_->resume();
+}
+
+void SimulatedApplication::die() {
+    if (!process_) return;
+    machine_.endProcess(*process_);
+    connection_.reset();
+    process_.reset();
+}
+
+std::shared_ptr<SimulatedApplication::Asked> SimulatedApplication::ask(DaemonMessage message, Array arguments) {
+    auto asked = std::make_shared<Asked>(Asked{message, 0, 0, {}});
+    asked_.push_back(asked);
+    connection_->remoteProxy([asked](const Error&) { ++asked->failures; })
+        ->send(static_cast<std::uint16_t>(message), std::move(arguments), [asked](Array values) {
+            ++asked->answers;
+            asked->values = std::move(values);
+        });
+    return asked;
+}
+
+void SimulatedApplication::tell(DaemonMessage message, Array arguments) {
+    connection_->remoteProxy([](const Error&) {})->send(static_cast<std::uint16_t>(message), std::move(arguments));
+}
+
+std::shared_ptr<SimulatedApplication::Asked> SimulatedApplication::start(const std::vector<ContextID>& windows) {
+    Array ids;
+    for (const ContextID id : windows) ids.emplace_back(number(id));
+    return ask(DaemonMessage::StartRecording,
+               {std::move(ids), Array{640.0, 360.0}, false, false, false, false, false, Value()});
+}
+
+}  // namespace lumacast

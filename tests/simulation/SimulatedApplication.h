@@ -1,0 +1,72 @@
+#pragma once
+// One application in the simulation: a process that talks to the daemon and remembers what it was told.
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "base/Identifiers.h"
+#include "base/MessageTables.h"
+#include "tests/fakes/FakePlatform.h"
+
+namespace lumacast {
+
+/// A client process with one window. Everything it is told arrives on its own main queue; the counters are read between steps.
+class SimulatedApplication {
+public:
+    /// One request that has a reply: how often it was answered and with what.
+    struct Asked {
+        DaemonMessage message;
+        int answers = 0;
+        int failures = 0;  ///< the connection said that there will be no answer
+        Array values;
+    };
+    /// A message from the daemon.
+    struct Told {
+        ClientMessage message;
+        Array arguments;
+    };
+
+    /// Installs the application under `identifier`, starts its process and shows its window.
+    SimulatedApplication(FakePlatform& machine, BundleIdentifier identifier, const std::string& name, ProcessID pid,
+                         ContextID window);
+    ~SimulatedApplication();
+
+    void connect();
+    bool isConnected() const { return connection_ != nullptr; }
+    /// The process dies: connection, window and process are gone.
+    void die();
+    bool isAlive() const { return process_ != nullptr; }
+    /// A new process of the same application, with another number and the same window.
+    void startAgain(ProcessID pid);
+
+    std::shared_ptr<Asked> ask(DaemonMessage message, Array arguments = {});
+    void tell(DaemonMessage message, Array arguments = {});
+
+    std::shared_ptr<Asked> start(const std::vector<ContextID>& windows);
+    std::shared_ptr<Asked> start() { return start({window}); }
+
+    const BundleIdentifier identifier;
+    const std::string name;
+    const ContextID window;
+
+    const std::vector<std::shared_ptr<Asked>>& asked() const { return asked_; }
+    const std::vector<Told>& told() const { return *told_; }
+    int losses() const { return *losses_; }
+
+private:
+    class Inbox;
+
+    FakePlatform& machine_;
+    ProcessID pid_;
+    std::unique_ptr<FakeIpc> process_;
+    std::shared_ptr<IpcConnection> connection_;
+    std::shared_ptr<Inbox> inbox_;
+    std::vector<std::shared_ptr<Asked>> asked_;
+    std::shared_ptr<std::vector<Told>> told_ = std::make_shared<std::vector<Told>>();
+    std::shared_ptr<int> losses_ = std::make_shared<int>(0);
+};
+
+}  // namespace lumacast
