@@ -108,7 +108,8 @@ TEST_P(ClockContract, ANewCaptureClockStandsAtZero) {
     ASSERT_TRUE(capture);
     world_->passTime();
     EXPECT_FALSE(capture->isRunning());
-    EXPECT_EQ(capture->now(), MediaTime::make(0, CaptureClock::kTimescale));
+    EXPECT_EQ(capture->now().seconds(), 0);
+    EXPECT_EQ(capture->now().timescale, CaptureClock::kTimescale);
 }
 
 TEST_P(ClockContract, ACaptureClockCountsOnlyWhileItRuns) {
@@ -117,13 +118,13 @@ TEST_P(ClockContract, ACaptureClockCountsOnlyWhileItRuns) {
     capture->run();
     world_->passTime();
     capture->stand();
-    const MediaTime ran = capture->now();
-    EXPECT_GE(ran, MediaTime::make(1'000'000, CaptureClock::kTimescale));
+    const double ran = capture->now().seconds();
+    EXPECT_GE(ran, 0.001);
     world_->passTime();
-    EXPECT_EQ(capture->now(), ran);
+    EXPECT_EQ(capture->now().seconds(), ran);
     capture->run();
     world_->passTime();
-    EXPECT_GT(capture->now(), ran);
+    EXPECT_GT(capture->now().seconds(), ran);
 }
 
 TEST_P(ClockContract, ALaterRecordingLeavesTheEarlierClockAlone) {

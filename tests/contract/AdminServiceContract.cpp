@@ -1,0 +1,120 @@
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <functional>
+#include <future>
+#include <thread>
+
+#include "linux/admin/LinuxAdminService.h"
+#include "linux/system/Json.h"
+#include "support/ThreadScheduler.h"
+#include "tests/contract/ScratchDirectory.h"
+#include "tests/fakes/FakeAdminService.h"
+#include "tests/fakes/ThreadLoop.h"
+
+namespace lumacast {
+namespace {
+
+constexpr std::chrono::seconds kPatience{30};
+
+/// A daemon's main queue, and its administrator.
+class AdminWorld {
+public:
+    virtual ~AdminWorld() = default;
+    virtual AdminService& admin() = 0;
+    /// The administrator asks how the daemon is, from a lane of its own. None when nobody answers.
+    virtual std::optional<Dictionary> ask() = 0;
+
+    SerialQueue& mainQueue() { return scheduler_.mainQueue(); }
+
+protected:
+    const std::shared_ptr<ThreadLoop> loop_ = std::make_shared<ThreadLoop>();
+    ThreadScheduler scheduler_{loop_};
+    RunningThreadLoop running_{*loop_};
+};
+
+class FakeAdminWorld final : public AdminWorld {
+public:
+    AdminService& admin() override { return admin_; }
+    std::optional<Dictionary> ask() override {
+        const auto answer = std::make_shared<std::promise<Dictionary>>();
+        auto future = answer->get_future();
+        if (!admin_.ask([answer](Dictionary status) { answer->set_value(std::move(status)); })) return std::nullopt;
+        if (future.wait_for(kPatience) != std::future_status::ready) return std::nullopt;
+        return future.get();
+    }
+
+private:
+    FakeAdminService admin_{scheduler_};
+};
+
+class PortAdminWorld final : public AdminWorld {
+public:
+    AdminService& admin() override { return admin_; }
+    std::optional<Dictionary> ask() override {
+        const auto line = askAdminService(scratch_.path("admin.sock"), "status", kPatience);
+        const auto value = line ? valueFromJson(*line) : std::nullopt;
+        return value && value->as<Dictionary>() ? std::optional(*value->as<Dictionary>()) : std::nullopt;
+    }
+
+private:
+    ScratchDirectory scratch_;
+    LinuxAdminService admin_{scheduler_, scratch_.path("admin.sock"), {kPatience, kPatience, kPatience}};
+};
+
+using Maker = std::function<std::unique_ptr<AdminWorld>()>;
+
+class AdminServiceContract : public ::testing::TestWithParam<Maker> {
+protected:
+    std::unique_ptr<AdminWorld> world_ = GetParam()();
+};
+
+TEST_P(AdminServiceContract, BeforeItResumesNobodyAnswers) { EXPECT_EQ(world_->ask(), std::nullopt); }
+
+TEST_P(AdminServiceContract, AQuestionIsAnsweredWithTheSnapshot) {
+    const Dictionary status{{"sessions", Array{Dictionary{{"bundleIdentifier", "org.example.Player"}, {"recording", true}}}},
+                            {"frames", std::int64_t{1234}},
+                            {"rate", 59.5},
+                            {"nothing", Value()}};
+    world_->admin().resume([status] { return status; });
+    const auto answer = world_->ask();
+    ASSERT_TRUE(answer);
+    EXPECT_EQ(Value(*answer), Value(status));
+}
+
+TEST_P(AdminServiceContract, EachQuestionTakesASnapshotOfItsOwnOnTheMainQueue) {
+    std::atomic<std::int64_t> count{0};
+    std::atomic<bool> elsewhere{false};
+    world_->admin().resume([&] {
+        if (!world_->mainQueue().isCurrent()) elsewhere = true;
+        return Dictionary{{"count", std::int64_t{++count}}};
+    });
+    for (std::int64_t expected = 1; expected <= 3; ++expected) {
+        const auto answer = world_->ask();
+        ASSERT_TRUE(answer);
+        EXPECT_EQ(*answer->find("count"), Value(expected));
+    }
+    EXPECT_FALSE(elsewhere);
+    world_.reset();
+}
+
+TEST_P(AdminServiceContract, SeveralMayAskAtOnce) {
+    world_->admin().resume([] { return Dictionary{{"well", true}}; });
+    std::vector<std::thread> administrators;
+    std::atomic<int> answered{0};
+    for (int i = 0; i < 4; ++i)
+        administrators.emplace_back([&] {
+            for (int question = 0; question < 5; ++question)
+                if (world_->ask()) ++answered;
+        });
+    for (std::thread& administrator : administrators) administrator.join();
+    EXPECT_EQ(answered, 20);
+}
+
+INSTANTIATE_TEST_SUITE_P(Fake, AdminServiceContract,
+                         ::testing::Values(Maker([] { return std::make_unique<FakeAdminWorld>(); })));
+INSTANTIATE_TEST_SUITE_P(Port, AdminServiceContract,
+                         ::testing::Values(Maker([] { return std::make_unique<PortAdminWorld>(); })));
+
+}  // namespace
+}  // namespace lumacast
