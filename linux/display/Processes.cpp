@@ -1,0 +1,55 @@
+#include "linux/display/Processes.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <array>
+#include <charconv>
+#include <string>
+#include <string_view>
+
+namespace lumacast::x11 {
+namespace {
+
+constexpr std::size_t kMostAncestors = 64;
+
+// The fourth field of /proc/<pid>/stat; the second one is a name in parentheses that may contain anything.
+ProcessID parentOf(ProcessID pid) {
+    const Fd file(::open(("/proc/" + std::to_string(number(pid)) + "/stat").c_str(), O_RDONLY | O_CLOEXEC));
+    std::array<char, 512> buffer;
+    const ssize_t length = file ? ::read(file.get(), buffer.data(), buffer.size()) : -1;
+    if (length <= 0) return ProcessID{0};
+    const std::string_view text(buffer.data(), static_cast<std::size_t>(length));
+    const std::size_t name = text.rfind(')');
+    if (name == std::string_view::npos || name + 4 >= text.size()) return ProcessID{0};
+    std::int32_t parent = 0;
+    std::from_chars(text.data() + name + 4, text.data() + text.size(), parent);
+    return ProcessID{parent};
+}
+
+}  // namespace
+
+std::optional<HeldProcess> HeldProcess::hold(ProcessID pid) {
+    if (number(pid) <= 0) return std::nullopt;
+    Fd descriptor(static_cast<int>(::syscall(SYS_pidfd_open, number(pid), 0)));
+    if (!descriptor) return std::nullopt;
+    HeldProcess process(pid, std::move(descriptor));
+    if (process.ended()) return std::nullopt;
+    return process;
+}
+
+bool HeldProcess::ended() const {
+    pollfd polled{descriptor_.get(), POLLIN, 0};
+    return ::poll(&polled, 1, 0) != 0;
+}
+
+std::vector<ProcessID> ancestorsOf(ProcessID pid) {
+    std::vector<ProcessID> ancestors;
+    for (ProcessID parent = parentOf(pid); number(parent) > 0 && ancestors.size() < kMostAncestors; parent = parentOf(parent))
+        ancestors.push_back(parent);
+    return ancestors;
+}
+
+}  // namespace lumacast::x11

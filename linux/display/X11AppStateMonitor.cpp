@@ -1,0 +1,152 @@
+#include "linux/display/X11AppStateMonitor.h"
+
+#include <algorithm>
+#include <utility>
+
+#include "linux/display/WindowOwner.h"
+
+namespace lumacast {
+namespace {
+
+using x11::X11Connection;
+
+// Applications whose end is waited for, at most.
+constexpr std::size_t kMostSeen = 64;
+
+bool contains(const std::vector<ProcessID>& processes, ProcessID pid) {
+    return std::find(processes.begin(), processes.end(), pid) != processes.end();
+}
+
+}  // namespace
+
+X11AppStateMonitor::X11AppStateMonitor(std::string display, ApplicationNaming naming, Scheduler& scheduler)
+    : naming_(std::move(naming)),
+      scheduler_(scheduler),
+      lane_(std::make_unique<x11::QuestionLane>(std::move(display), "lc-appstate",
+                                                static_cast<x11::QuestionLaneObserver*>(this))) {}
+
+X11AppStateMonitor::~X11AppStateMonitor() {
+    lane_.reset();
+    const std::lock_guard lock(listener_->mutex);
+    listener_->handler = nullptr;
+}
+
+std::uint32_t X11AppStateMonitor::applicationState(const BundleIdentifier& identifier) {
+    const std::function<std::uint32_t(X11Connection&)> question = [this, identifier](X11Connection& connection) {
+        return stateOf(connection, identifier);
+    };
+    return lane_->ask<std::uint32_t>(question, 0);
+}
+
+std::uint32_t X11AppStateMonitor::stateOf(X11Connection& connection, const BundleIdentifier& identifier) {
+    const auto processes = naming_.processesOf(identifier);
+    if (processes.empty()) return 0;
+    const auto active = frontProcess(connection);
+    if (active && (contains(processes, *active) || naming_.identifierOf(*active) == identifier))
+        return kRunningForeground;
+    return isToolInFront(connection, processes, active) ? kRunningForeground : kRunningBackground;
+}
+
+bool X11AppStateMonitor::isToolInFront(X11Connection& connection, const std::vector<ProcessID>& processes,
+                                       std::optional<ProcessID> active) {
+    for (const ProcessID owner : x11::ownersOf(connection, activeWindow_->applicationWindows()))
+        if (contains(processes, owner)) return false;
+    if (!active) return true;
+    return std::any_of(processes.begin(), processes.end(),
+                       [&](ProcessID process) { return contains(x11::ancestorsOf(process), *active); });
+}
+
+void X11AppStateMonitor::setHandler(Handler handler) {
+    const bool wanted = handler != nullptr;
+    {
+        const std::lock_guard lock(listener_->mutex);
+        listener_->handler.swap(handler);
+    }
+    lane_->later([this, wanted](X11Connection* connection) { watch(connection, wanted); });
+}
+
+// On the lane from here on
+
+void X11AppStateMonitor::connected(X11Connection& connection) {
+    activeWindow_ = std::make_unique<x11::ActiveWindow>(connection);
+    if (!watching_) return;
+    activeWindow_->watch(true);
+    lookForChange(connection);
+}
+
+// Without a server the next connection takes note. Only changes are told: not who is in front at first.
+void X11AppStateMonitor::watch(X11Connection* connection, bool wanted) {
+    if (wanted == watching_) return;
+    watching_ = wanted;
+    seen_.clear();
+    front_.reset();
+    if (connection == nullptr) return;
+    activeWindow_->watch(wanted);
+    if (!wanted) return;
+    front_ = frontProcess(*connection);
+    if (front_) remember(*front_);
+}
+
+std::optional<ProcessID> X11AppStateMonitor::frontProcess(X11Connection& connection) {
+    const xcb_window_t window = activeWindow_->current();
+    return window == XCB_NONE ? std::nullopt : x11::ownerOf(connection, window);
+}
+
+x11::HeldProcess* X11AppStateMonitor::remembered(ProcessID pid) {
+    const auto found = std::find_if(seen_.begin(), seen_.end(), [&](const auto& process) { return process.pid() == pid; });
+    return found == seen_.end() ? nullptr : &*found;
+}
+
+void X11AppStateMonitor::remember(ProcessID pid) {
+    if (remembered(pid) != nullptr) return;
+    if (seen_.size() >= kMostSeen) seen_.erase(seen_.begin());
+    if (auto process = x11::HeldProcess::hold(pid)) seen_.push_back(std::move(*process));
+}
+
+void X11AppStateMonitor::eventsMayHaveCome(X11Connection& connection) {
+    bool any = false;
+    while (const x11::Owned<xcb_generic_event_t> event{xcb_poll_for_event(connection.get())})
+        any |= activeWindow_->concerns(*event);
+    if (any && watching_) lookForChange(connection);
+}
+
+void X11AppStateMonitor::lookForChange(X11Connection& connection) {
+    const auto now = frontProcess(connection);
+    if (now == front_) return;
+    const auto before = std::exchange(front_, now);
+    // One that has ended is told of when its end is seen.
+    const x11::HeldProcess* const left = before ? remembered(*before) : nullptr;
+    if (left != nullptr && !left->ended()) tell(kRunningBackground, false, *before);
+    if (!now) return;
+    tell(kRunningForeground, true, *now);
+    remember(*now);
+}
+
+std::vector<int> X11AppStateMonitor::descriptors() {
+    std::vector<int> all;
+    for (const x11::HeldProcess& process : seen_) all.push_back(process.descriptor());
+    return all;
+}
+
+void X11AppStateMonitor::readable(int descriptor) {
+    const auto ended =
+        std::find_if(seen_.begin(), seen_.end(), [&](const auto& process) { return process.descriptor() == descriptor; });
+    if (ended == seen_.end()) return;
+    const ProcessID pid = ended->pid();
+    seen_.erase(ended);
+    if (front_ == pid) front_.reset();
+    tell(kEnded, false, pid);
+}
+
+void X11AppStateMonitor::tell(std::int64_t state, bool frontmost, ProcessID pid) {
+    scheduler_.mainQueue().async([listener = listener_, state, frontmost, pid] {
+        Handler handler;
+        {
+            const std::lock_guard lock(listener->mutex);
+            handler = listener->handler;
+        }
+        if (handler) handler(state, frontmost, pid);
+    });
+}
+
+}  // namespace lumacast

@@ -1,0 +1,78 @@
+#pragma once
+// What applications are doing, as an X11 desktop sees it.
+
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "linux/display/ActiveWindow.h"
+#include "linux/display/Processes.h"
+#include "linux/display/QuestionLane.h"
+#include "platform/AppStateMonitor.h"
+#include "platform/Scheduler.h"
+
+namespace lumacast {
+
+/// How an application's processes and identifier belong together. Called on the monitor's own lane, concurrently with others.
+struct ApplicationNaming {
+    /// The application that the process runs; none for one that is no application's.
+    std::function<std::optional<BundleIdentifier>(ProcessID)> identifierOf;
+    /// The application's running processes.
+    std::function<std::vector<ProcessID>(const BundleIdentifier&)> processesOf;
+};
+
+/// An application is in the foreground when one of its processes owns the active window. A tool that has no windows is in the
+/// foreground when the active window belongs to one of its ancestors (the terminal it was started from), or when nothing is active.
+class X11AppStateMonitor final : public AppStateMonitor, private x11::QuestionLaneObserver {
+public:
+    /// The other bit that this monitor gives: the application runs, but not in the foreground.
+    static constexpr std::uint32_t kRunningBackground = 4;
+    /// The update of an application that has ended.
+    static constexpr std::int64_t kEnded = 1;
+
+    /// `display` as in $DISPLAY; without such a server every state is 0. The scheduler is borrowed; tasks that it still has
+    /// when the monitor ends do nothing.
+    X11AppStateMonitor(std::string display, ApplicationNaming naming, Scheduler& scheduler);
+    ~X11AppStateMonitor() override;
+
+    std::uint32_t applicationState(const BundleIdentifier& identifier) override;
+    void setHandler(Handler handler) override;
+
+private:
+    struct Listener {
+        std::mutex mutex;
+        Handler handler;
+    };
+
+    void connected(x11::X11Connection& connection) override;
+    void eventsMayHaveCome(x11::X11Connection& connection) override;
+    std::vector<int> descriptors() override;
+    void readable(int descriptor) override;
+
+    void watch(x11::X11Connection* connection, bool wanted);
+    std::optional<ProcessID> frontProcess(x11::X11Connection& connection);
+    x11::HeldProcess* remembered(ProcessID pid);
+    void remember(ProcessID pid);
+    void lookForChange(x11::X11Connection& connection);
+    std::uint32_t stateOf(x11::X11Connection& connection, const BundleIdentifier& identifier);
+    bool isToolInFront(x11::X11Connection& connection, const std::vector<ProcessID>& processes,
+                       std::optional<ProcessID> active);
+    void tell(std::int64_t state, bool frontmost, ProcessID pid);
+
+    const ApplicationNaming naming_;
+    Scheduler& scheduler_;
+    const std::shared_ptr<Listener> listener_ = std::make_shared<Listener>();
+
+    // Of the lane alone.
+    std::unique_ptr<x11::ActiveWindow> activeWindow_;
+    bool watching_ = false;
+    std::optional<ProcessID> front_;
+    std::vector<x11::HeldProcess> seen_;  ///< those that were in front and have not ended
+
+    std::unique_ptr<x11::QuestionLane> lane_;  // last: its thread uses what stands above
+};
+
+}  // namespace lumacast
