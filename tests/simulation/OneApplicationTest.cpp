@@ -104,6 +104,8 @@ private:
     /// The last stop with nothing in its way, then death; afterwards nothing is left but what the rules leave.
     void end() {
         fakes().faults.clear();
+        daemon_.world.scheduler.advance(seconds(5));
+        checkNothingIsHeldWhenIdle();
         if (application_.isAlive() && !faulty_) recordOnceMore();
         application_.die();
         daemon_.world.scheduler.advance(seconds(5));
@@ -120,6 +122,17 @@ private:
         const std::string folder = fakes().fileSystem.temporaryDirectory() + "/";
         for (const std::string& path : fakes().fileSystem.files())
             EXPECT_TRUE(path == folder + "Player.mp4" || path == folder + "Player_trimmed.mp4") << path;
+    }
+
+    /// A session that has come to rest holds no transaction; only a clip that could not be made leaves its stop unanswered.
+    void checkNothingIsHeldWhenIdle() {
+        for (const auto& stop : stops_)
+            if (stop->message == DaemonMessage::StopRecordingWithClipDurations && stop->answers == 0) return;
+        const Dictionary snapshot = daemon_.snapshot();
+        for (const Value& entry : *snapshot.find("sessions")->as<Array>()) {
+            const Dictionary& session = *entry.as<Dictionary>();
+            EXPECT_EQ(*session.find("transactionOpen"), *session.find("recording")) << describe(entry);
+        }
     }
 
     /// Whatever happened before, the application can record again, and that movie is whole.
