@@ -29,5 +29,7 @@ private:
 
 /// The process's parent, its parent and so on, at most 64 of them.
 std::vector<ProcessID> ancestorsOf(ProcessID pid);
+/// Every running process of the user that this process runs as.
+std::vector<ProcessID> processesOfThisUser();
 
 }  // namespace lumacast::x11

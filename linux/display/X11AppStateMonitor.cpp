@@ -17,10 +17,20 @@ bool contains(const std::vector<ProcessID>& processes, ProcessID pid) {
     return std::find(processes.begin(), processes.end(), pid) != processes.end();
 }
 
+X11AppStateMonitor::ProcessesOf askingAll(const X11AppStateMonitor::IdentifierOf& identifierOf) {
+    return [identifierOf](const BundleIdentifier& identifier) {
+        std::vector<ProcessID> found = x11::processesOfThisUser();
+        std::erase_if(found, [&](ProcessID process) { return identifierOf(process) != identifier; });
+        return found;
+    };
+}
+
 }  // namespace
 
-X11AppStateMonitor::X11AppStateMonitor(std::string display, ApplicationNaming naming, Scheduler& scheduler)
-    : naming_(std::move(naming)),
+X11AppStateMonitor::X11AppStateMonitor(std::string display, Scheduler& scheduler, IdentifierOf identifierOf,
+                                       ProcessesOf processesOf)
+    : identifierOf_(std::move(identifierOf)),
+      processesOf_(processesOf ? std::move(processesOf) : askingAll(identifierOf_)),
       scheduler_(scheduler),
       lane_(std::make_unique<x11::QuestionLane>(std::move(display), "lc-appstate",
                                                 static_cast<x11::QuestionLaneObserver*>(this))) {}
@@ -39,10 +49,10 @@ std::uint32_t X11AppStateMonitor::applicationState(const BundleIdentifier& ident
 }
 
 std::uint32_t X11AppStateMonitor::stateOf(X11Connection& connection, const BundleIdentifier& identifier) {
-    const auto processes = naming_.processesOf(identifier);
+    const auto processes = processesOf_(identifier);
     if (processes.empty()) return 0;
     const auto active = frontProcess(connection);
-    if (active && (contains(processes, *active) || naming_.identifierOf(*active) == identifier))
+    if (active && (contains(processes, *active) || identifierOf_(*active) == identifier))
         return kRunningForeground;
     return isToolInFront(connection, processes, active) ? kRunningForeground : kRunningBackground;
 }

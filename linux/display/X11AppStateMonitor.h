@@ -16,14 +16,6 @@
 
 namespace lumacast {
 
-/// How an application's processes and identifier belong together. Called on the monitor's own lane, concurrently with others.
-struct ApplicationNaming {
-    /// The application that the process runs; none for one that is no application's.
-    std::function<std::optional<BundleIdentifier>(ProcessID)> identifierOf;
-    /// The application's running processes.
-    std::function<std::vector<ProcessID>(const BundleIdentifier&)> processesOf;
-};
-
 /// An application is in the foreground when one of its processes owns the active window. A tool that has no windows is in the
 /// foreground when the active window belongs to one of its ancestors (the terminal it was started from), or when nothing is active.
 class X11AppStateMonitor final : public AppStateMonitor, private x11::QuestionLaneObserver {
@@ -33,9 +25,14 @@ public:
     /// The update of an application that has ended.
     static constexpr std::int64_t kEnded = 1;
 
+    /// The application that a process runs; none for one that is no application's. Called on the monitor's own lane.
+    using IdentifierOf = std::function<std::optional<BundleIdentifier>(ProcessID)>;
+    /// The running processes of an application. Called on the monitor's own lane.
+    using ProcessesOf = std::function<std::vector<ProcessID>(const BundleIdentifier&)>;
+
     /// `display` as in $DISPLAY; without such a server every state is 0. The scheduler is borrowed; tasks that it still has
-    /// when the monitor ends do nothing.
-    X11AppStateMonitor(std::string display, ApplicationNaming naming, Scheduler& scheduler);
+    /// when the monitor ends do nothing. Without `processesOf` all the user's processes are asked who they are.
+    X11AppStateMonitor(std::string display, Scheduler& scheduler, IdentifierOf identifierOf, ProcessesOf processesOf = {});
     ~X11AppStateMonitor() override;
 
     std::uint32_t applicationState(const BundleIdentifier& identifier) override;
@@ -62,7 +59,8 @@ private:
                        std::optional<ProcessID> active);
     void tell(std::int64_t state, bool frontmost, ProcessID pid);
 
-    const ApplicationNaming naming_;
+    const IdentifierOf identifierOf_;
+    const ProcessesOf processesOf_;
     Scheduler& scheduler_;
     const std::shared_ptr<Listener> listener_ = std::make_shared<Listener>();
 
