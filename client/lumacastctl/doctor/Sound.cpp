@@ -1,0 +1,49 @@
+#include "client/lumacastctl/doctor/Sound.h"
+
+#include <unistd.h>
+
+#include "linux/admin/UnixSocket.h"
+
+namespace lumacast::ctl {
+
+namespace {
+
+constexpr std::string_view kUnixPrefix = "unix:";
+
+std::string pulseSocket(const LinuxEnvironment::Variables& variables, const std::string& runtime) {
+    const std::string server = variables("PULSE_SERVER").value_or("");
+    if (server.starts_with(kUnixPrefix)) return server.substr(kUnixPrefix.size());
+    if (server.starts_with('/')) return server;
+    if (const auto path = variables("PULSE_RUNTIME_PATH"); path && !path->empty()) return *path + "/native";
+    return runtime + "/pulse/native";
+}
+
+std::string pipeWireSocket(const LinuxEnvironment::Variables& variables, const std::string& runtime) {
+    const std::string remote = variables("PIPEWIRE_REMOTE").value_or("pipewire-0");
+    if (remote.starts_with('/')) return remote;
+    const std::string directory = variables("PIPEWIRE_RUNTIME_DIR").value_or("");
+    return (directory.empty() ? runtime : directory) + "/" + remote;
+}
+
+}  // namespace
+
+SoundFacts probeSound(const LinuxEnvironment::Variables& variables) {
+    std::string runtime = variables("XDG_RUNTIME_DIR").value_or("");
+    if (runtime.empty()) runtime = "/run/user/" + std::to_string(::getuid());
+    SoundFacts facts;
+    facts.sockets = {{"PulseAudio", pulseSocket(variables, runtime)}, {"PipeWire", pipeWireSocket(variables, runtime)}};
+    for (SoundFacts::Socket& socket : facts.sockets) socket.answers = static_cast<bool>(connectTo(socket.path));
+    return facts;
+}
+
+Findings checkSound(const SoundFacts& facts) {
+    std::vector<std::string> answering, silent;
+    for (const SoundFacts::Socket& socket : facts.sockets)
+        (socket.answers ? answering : silent).push_back(socket.server + " at " + socket.path);
+    const std::string servers = answering.empty() ? "no sound server answers (looked for " + listText(silent) + ")"
+                                                  : listText(answering) + " can be reached";
+    return {warning("sound", "this daemon does not record sound yet, so movies are silent whatever is played; " + servers +
+                                 ", which makes no difference for now. There is nothing to do.")};
+}
+
+}  // namespace lumacast::ctl

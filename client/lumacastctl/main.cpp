@@ -1,0 +1,75 @@
+// lumacastctl: the tool of the daemon's administrator and of those who develop applications for it.
+
+#include <unistd.h>
+
+#include <CLI/CLI.hpp>
+#include <cstdio>
+#include <cstdlib>
+#include <optional>
+#include <string>
+
+#include "client/lumacastctl/ExitStatus.h"
+#include "client/lumacastctl/doctor/Doctor.h"
+#include "client/lumacastctl/status/StatusCommand.h"
+
+namespace {
+
+using namespace lumacast;
+using namespace lumacast::ctl;
+
+constexpr char kExitStatuses[] =
+    "Exit status:\n"
+    "  0  all is well\n"
+    "  1  the daemon isn't running or does not answer (status), or the output could not be written\n"
+    "  2  wrong usage\n"
+    "  3  the doctor found problems (warnings alone are none)";
+
+std::optional<std::string> variable(std::string_view name) {
+    const char* value = std::getenv(std::string(name).c_str());
+    return value ? std::optional<std::string>(value) : std::nullopt;
+}
+
+int runDoctor(const IdentityQuestion& question) {
+    const Findings findings = examine(LinuxEnvironment::ofThisProcess(), variable, question);
+    std::fputs(findingsText(findings).c_str(), stdout);
+    return hasProblem(findings) ? kProblemsFound : kGood;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    CLI::App app("Asks the screen recording daemon how it is, and looks for what keeps it from recording.", "lumacastctl");
+    app.footer(kExitStatuses);
+    app.require_subcommand(1);
+    CLI::App* status = app.add_subcommand("status", "Show the applications that the daemon knows and the running recording");
+    status->footer(kExitStatuses);
+    CLI::App* doctor =
+        app.add_subcommand("doctor", "Look at all that recording takes; a line each: ok, warning or problem, and what to do");
+    doctor->footer(kExitStatuses);
+    std::int32_t pid = 0;
+    std::string executable;
+    CLI::Option* byPid = doctor->add_option("--pid", pid, "Tell which application this process counts as")->check(CLI::Range(1, 1 << 30));
+    doctor->add_option("--exe", executable, "Tell which application this program counts as")->excludes(byPid);
+
+    try {
+        app.parse(argc, argv);
+    } catch (const CLI::ParseError& error) {
+        return app.exit(error) == 0 ? kGood : kWrongUsage;  // --help comes this way too
+    }
+
+    int result = kGood;
+    if (status->parsed()) {
+        result = showStatus(LinuxEnvironment::ofThisProcess().runtimeDirectory, stdout, stderr);
+    } else {
+        IdentityQuestion question;
+        if (!executable.empty()) question.executable = executable;
+        else question.pid = ProcessID{pid > 0 ? pid : ::getppid()};
+        question.isExample = pid == 0 && executable.empty();
+        result = runDoctor(question);
+    }
+    if (std::fflush(stdout) != 0 || std::ferror(stdout) != 0) {
+        std::fprintf(stderr, "lumacastctl: the output could not be written.\n");
+        return kNoAnswer;
+    }
+    return result;
+}

@@ -1,0 +1,89 @@
+#include "client/lumacastctl/status/Status.h"
+#include "linux/system/Json.h"
+
+namespace lumacast::ctl {
+
+namespace {
+
+constexpr char kNotUnderstood[] = "its answer can't be understood; is this tool of another version than the daemon?";
+
+std::optional<double> numberIn(const Dictionary& dictionary, std::string_view key) {
+    const Value* value = dictionary.find(key);
+    if (!value) return std::nullopt;
+    if (const auto* whole = value->as<std::int64_t>()) return static_cast<double>(*whole);
+    if (const auto* whole = value->as<std::uint64_t>()) return static_cast<double>(*whole);
+    if (const auto* number = value->as<double>()) return *number;
+    return std::nullopt;
+}
+
+std::optional<std::uint64_t> countIn(const Dictionary& dictionary, std::string_view key) {
+    const Value* value = dictionary.find(key);
+    if (!value) return std::nullopt;
+    if (const auto* whole = value->as<std::uint64_t>()) return *whole;
+    if (const auto* whole = value->as<std::int64_t>(); whole && *whole >= 0) return static_cast<std::uint64_t>(*whole);
+    return std::nullopt;
+}
+
+std::optional<std::string> textIn(const Dictionary& dictionary, std::string_view key) {
+    const Value* value = dictionary.find(key);
+    const auto* text = value ? value->as<std::string>() : nullptr;
+    return text ? std::optional(*text) : std::nullopt;
+}
+
+bool flagIn(const Dictionary& dictionary, std::string_view key) {
+    const Value* value = dictionary.find(key);
+    const bool* flag = value ? value->as<bool>() : nullptr;
+    return flag && *flag;
+}
+
+RunningRecording readRecording(const Dictionary& entry) {
+    RunningRecording result;
+    result.paused = flagIn(entry, "paused");
+    result.elapsedSeconds = numberIn(entry, "elapsedSeconds").value_or(0);
+    result.path = textIn(entry, "path");
+    result.width = numberIn(entry, "width");
+    result.height = numberIn(entry, "height");
+    result.bytes = countIn(entry, "bytes");
+    result.frames = countIn(entry, "frames");
+    result.delivered = countIn(entry, "framesDelivered");
+    result.dropped = countIn(entry, "framesDropped");
+    return result;
+}
+
+std::optional<ApplicationSession> readSession(const Value& value) {
+    const auto* entry = value.as<Dictionary>();
+    const auto application = entry ? textIn(*entry, "bundleID") : std::nullopt;
+    if (!application) return std::nullopt;
+    ApplicationSession result;
+    result.application = *application;
+    if (const auto pid = countIn(*entry, "pid")) result.pid = static_cast<std::int64_t>(*pid);
+    result.connected = flagIn(*entry, "connected");
+    const Value* current = entry->find("current");
+    const auto* recording = current ? current->as<Dictionary>() : nullptr;
+    if (recording) result.recording = readRecording(*recording);
+    else if (flagIn(*entry, "recording")) result.recording = RunningRecording();
+    return result;
+}
+
+}  // namespace
+
+std::variant<DaemonStatus, std::string> readStatus(std::string_view answer) {
+    const auto value = valueFromJson(answer);
+    const auto* top = value ? value->as<Dictionary>() : nullptr;
+    if (!top) return kNotUnderstood;
+    if (const auto error = textIn(*top, "error")) return *error;
+    const Value* sessions = top->find("sessions");
+    const auto* list = sessions ? sessions->as<Array>() : nullptr;
+    if (!list) return kNotUnderstood;
+    DaemonStatus result;
+    result.temporaryDirectory = textIn(*top, "temporaryDirectory").value_or("");
+    result.freeBytes = countIn(*top, "freeBytes").value_or(0);
+    for (const Value& entry : *list) {
+        auto session = readSession(entry);
+        if (!session) return kNotUnderstood;
+        result.sessions.push_back(std::move(*session));
+    }
+    return result;
+}
+
+}  // namespace lumacast::ctl
