@@ -1,11 +1,22 @@
 #include "linux/media/LinuxContainerWriters.h"
 
 #include <algorithm>
+#include <iterator>
 #include <utility>
 
 #include "linux/media/LinuxContainerWriter.h"
 
 namespace lumacast {
+
+namespace {
+
+std::string withSingleSlashes(const std::string& path) {
+    std::string result;
+    std::unique_copy(path.begin(), path.end(), std::back_inserter(result), [](char a, char b) { return a == '/' && b == '/'; });
+    return result;
+}
+
+}  // namespace
 
 LinuxContainerWriters::LinuxContainerWriters(const Clock& clock)
     : LinuxContainerWriters(clock, std::make_shared<media::PosixMovieFiles>()) {}
@@ -17,7 +28,7 @@ LinuxContainerWriters::LinuxContainerWriters(const Clock& clock, std::shared_ptr
 }
 
 LinuxContainerWriters::~LinuxContainerWriters() {
-    for (const auto& recording : recordings_) recording->abandon();
+    for (const auto& open : recordings_) open.recording->abandon();
 }
 
 std::variant<std::unique_ptr<ContainerWriter>, Error> LinuxContainerWriters::make(const URL& outputURL,
@@ -26,7 +37,7 @@ std::variant<std::unique_ptr<ContainerWriter>, Error> LinuxContainerWriters::mak
     auto recording = std::make_shared<media::MovieRecording>(files_, outputURL.path(), clock_.captureClock(), choice_);
     {
         const std::lock_guard lock(mutex_);
-        recordings_.push_back(recording);
+        recordings_.push_back({withSingleSlashes(outputURL.path()), recording});
     }
     const std::optional<int> created = recording->waitForCreation(kCreationLimit);
     if (created && *created != 0) {
@@ -36,6 +47,14 @@ std::variant<std::unique_ptr<ContainerWriter>, Error> LinuxContainerWriters::mak
     return std::make_unique<LinuxContainerWriter>(std::move(recording), outputURL);
 }
 
+std::optional<std::uint64_t> LinuxContainerWriters::bytesBeingWritten(const std::string& path) {
+    const std::lock_guard lock(mutex_);
+    // The newest writer of a path is the one whose file is there.
+    for (auto each = recordings_.rbegin(); each != recordings_.rend(); ++each)
+        if (each->path == path && !each->recording->hasEnded()) return each->recording->bytesWritten();
+    return std::nullopt;
+}
+
 void LinuxContainerWriters::closeOpenMovies() {
     Recordings open;
     {
@@ -43,15 +62,15 @@ void LinuxContainerWriters::closeOpenMovies() {
         open = recordings_;
     }
     const auto deadline = std::chrono::steady_clock::now() + kClosingLimit;
-    for (const auto& recording : open) recording->requestFinish();  // all at once, then wait for each
-    for (const auto& recording : open) recording->waitUntilFinished(deadline);
+    for (const auto& each : open) each.recording->requestFinish();  // all at once, then wait for each
+    for (const auto& each : open) each.recording->waitUntilFinished(deadline);
 }
 
 /// Lets go of recordings whose threads only have to be joined, which takes no time.
 void LinuxContainerWriters::forgetEnded() {
     Recordings ended;
     const std::lock_guard lock(mutex_);
-    const auto isOpen = [](const auto& recording) { return !recording->hasEnded(); };
+    const auto isOpen = [](const Open& each) { return !each.recording->hasEnded(); };
     const auto first = std::stable_partition(recordings_.begin(), recordings_.end(), isOpen);
     ended.assign(std::make_move_iterator(first), std::make_move_iterator(recordings_.end()));
     recordings_.erase(first, recordings_.end());

@@ -15,7 +15,6 @@ mp4::MovieOptions options() {
     constexpr std::uint64_t kFrom1904To1970 = 2'082'844'800;
     mp4::MovieOptions options;
     options.creationTime = kFrom1904To1970 + static_cast<std::uint64_t>(std::time(nullptr));
-    options.fragmentsPerSync = MoviePipeline::kFragmentsPerSync;
     return options;
 }
 

@@ -28,8 +28,6 @@ public:
     /// What was encoded is handed to the disk at most this long after (wall time). Together with the encoder's time it
     /// keeps a killed movie playable up to its last second, however rare the pictures are.
     static constexpr std::chrono::milliseconds kFlushInterval{500};
-    /// Fragments between two times that the file is brought onto the disk for good: every two seconds while it grows.
-    static constexpr std::uint32_t kFragmentsPerSync = 4;
 
     /// Opens the encoders and begins the file. `disk` must outlive it.
     static std::variant<std::unique_ptr<MoviePipeline>, Error> open(const std::vector<TrackPlan>& tracks,

@@ -1,0 +1,127 @@
+// The Linux port's platform: every role made of real services, in the order in which they need each other.
+
+#include <cstdio>
+#include <cstdlib>
+#include <memory>
+#include <string>
+
+#include "linux/admin/LinuxAdminService.h"
+#include "linux/apps/Entitlements.h"
+#include "linux/apps/LinuxBundles.h"
+#include "linux/display/X11AppStateMonitor.h"
+#include "linux/display/X11DisplayCapture.h"
+#include "linux/display/X11RenderServer.h"
+#include "linux/ipc/LinuxIpc.h"
+#include "linux/media/LinuxContainerWriters.h"
+#include "linux/media/LinuxMovieExporters.h"
+#include "linux/storage/LinuxFileSystem.h"
+#include "linux/system/LinuxClock.h"
+#include "linux/system/LinuxDeviceInfo.h"
+#include "linux/system/LinuxEnvironment.h"
+#include "linux/system/LinuxKeepAlive.h"
+#include "linux/system/LinuxLogSink.h"
+#include "linux/system/LinuxPreferences.h"
+#include "linux/system/LinuxTelemetry.h"
+#include "linux/system/Termination.h"
+#include "platform/Platform.h"
+#include "support/ThreadScheduler.h"
+
+namespace lumacast {
+
+namespace {
+
+std::string environmentVariable(const char* name) {
+    const char* value = std::getenv(name);
+    return value ? value : "";
+}
+
+/// Members are made in this order and unmade in the opposite one.
+class LinuxPlatform final : public PlatformOwner {
+public:
+    explicit LinuxPlatform(const LinuxEnvironment& environment)
+        : environment_(environment),
+          termination_([this] { writers_.closeOpenMovies(); }),
+          sink_({.journalStream = environment.journalStream}),
+          log_([this](LogLevel level, std::string_view text) { sink_.write(level, text); }),
+          reactor_(std::make_shared<Reactor>("com.orvane.lumacastd")),
+          scheduler_(reactor_),
+          bundles_(LinuxBundles::optionsFrom(environment)),
+          entitlements_(bundles_, {.directories = Entitlements::directoriesFrom(environment)}),
+          ipc_(*reactor_, log_,
+               {.runtimeDirectory = environment.runtimeDirectory,
+                .entitlements = [this](ProcessID pid, std::string_view name) { return entitlements_.value(pid, name); },
+                .activated = ActivatedSockets::fromEnvironment()}),
+          writers_(clock_),
+          fileSystem_(fileSystemOptions(environment)),
+          preferences_(environment.configDirectories),
+          deviceInfo_(environment.systemDirectories),
+          telemetry_(environment.stateDirectory + "/telemetry.jsonl"),
+          keepAlive_(environment.notifySocket),
+          capture_(environmentVariable("DISPLAY"), clock_, scheduler_),
+          renderServer_(environmentVariable("DISPLAY")),
+          appState_(environmentVariable("DISPLAY"), scheduler_, [this](ProcessID pid) { return applicationOf(pid); }),
+          admin_(scheduler_, environment.runtimeDirectory + "/admin.sock"),
+          platform_{log_,     scheduler_,   clock_,      ipc_,         bundles_,   renderServer_, appState_, capture_, capture_,
+                    writers_, exporters_,   fileSystem_, preferences_, deviceInfo_, telemetry_,   keepAlive_, admin_} {}
+
+    /// What must be there before the daemon can work; the error when it can't be had.
+    std::optional<Error> prepare() { return fileSystem_.prepare(); }
+
+    Platform& platform() override { return platform_; }
+
+private:
+    std::optional<BundleIdentifier> applicationOf(ProcessID pid) {
+        const auto executable = bundles_.executablePath(pid);
+        const auto path = executable ? bundles_.bundlePathForExecutable(*executable) : std::nullopt;
+        const auto bundle = path ? bundles_.open(*path) : nullptr;
+        return bundle ? bundle->identifier() : std::nullopt;
+    }
+
+    LinuxFileSystem::Options fileSystemOptions(const LinuxEnvironment& environment) {
+        LinuxFileSystem::Options options;
+        options.root = environment.root;
+        options.bytesBeingWritten = [this](const std::string& path) { return writers_.bytesBeingWritten(path); };
+        return options;
+    }
+
+    const LinuxEnvironment environment_;
+    Termination termination_;  // first: it blocks the signals for every thread that follows
+    LinuxLogSink sink_;
+    Log log_;
+    LinuxClock clock_;
+    const std::shared_ptr<Reactor> reactor_;
+    ThreadScheduler scheduler_;
+    LinuxBundles bundles_;
+    Entitlements entitlements_;
+    LinuxIpc ipc_;
+    LinuxContainerWriters writers_;
+    LinuxMovieExporters exporters_;
+    LinuxFileSystem fileSystem_;
+    LinuxPreferences preferences_;
+    LinuxDeviceInfo deviceInfo_;
+    LinuxTelemetry telemetry_;
+    LinuxKeepAlive keepAlive_;
+    X11DisplayCapture capture_;
+    X11RenderServer renderServer_;
+    X11AppStateMonitor appState_;
+    LinuxAdminService admin_;
+    Platform platform_;
+};
+
+}  // namespace
+
+std::unique_ptr<PlatformOwner> makePlatform() {
+    const LinuxEnvironment environment = LinuxEnvironment::ofThisProcess();
+    if (const auto error = environment.prepareDirectories()) {
+        std::fprintf(stderr, "lumacastd: the runtime and state directories can't be made: %s\n", describe(*error).c_str());
+        return nullptr;
+    }
+    auto platform = std::make_unique<LinuxPlatform>(environment);
+    if (const auto error = platform->prepare()) {
+        std::fprintf(stderr, "lumacastd: the parents of the temporary directory can't be made: %s\n", describe(*error).c_str());
+        return nullptr;
+    }
+    return platform;
+}
+
+}  // namespace lumacast
