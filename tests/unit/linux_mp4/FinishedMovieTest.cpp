@@ -227,6 +227,7 @@ TEST_F(FinishedMovie, NamesTracksAndSaysWhatTheyAre) {
     addSound(0);
     ASSERT_EQ(writer.finish(kSecond), MovieError::none);
     const auto tracks = tracksOf(parseBoxes(sink.file())[2]);
+    EXPECT_FALSE(parseBoxes(sink.file())[2].all("trak")[1]->has("mdia/minf/stbl/stss")) << "all sound is sync";
     EXPECT_EQ(tracks[0].handler, "vide");
     EXPECT_EQ(tracks[0].name, "Screen");
     EXPECT_EQ(tracks[0].width, 1920U << 16U);

@@ -266,24 +266,25 @@ TEST_F(Fragments, CloseEarlyWhenTheyGrowTooLarge) {
     }
 }
 
-TEST_F(Fragments, AreSyncedAsOftenAsAsked) {
-    for (const std::uint32_t every : {0U, 1U, 3U}) {
-        MemorySink target;
-        MovieOptions options;
-        options.fragmentsPerSync = every;
-        MovieBoxWriter writer(target, options);
-        const auto video = writer.addVideoTrack(test::videoDescription());
-        ASSERT_EQ(writer.start(), MovieError::none);
-        for (int i = 0; i < 7; ++i) {
-            ASSERT_EQ(picture(writer, *video, i * kSecond, true), MovieError::none);
-        }
-        ASSERT_EQ(writer.fragmentCount(), 6U);
-        std::size_t syncs = 0;
-        for (const auto& operation : target.operations()) {
-            syncs += operation.kind == MemorySink::Kind::sync ? 1 : 0;
-        }
-        EXPECT_EQ(syncs, every == 0 ? 0U : 6U / every);
+TEST_F(Fragments, AreSyncedBeforeTheyAreShown) {
+    MovieBoxWriter writer(sink);
+    const auto video = writer.addVideoTrack(test::videoDescription());
+    ASSERT_EQ(writer.start(), MovieError::none);
+    for (int i = 0; i < 7; ++i) {
+        ASSERT_EQ(picture(writer, *video, i * kSecond, true), MovieError::none);
     }
+    using Kind = MemorySink::Kind;
+    std::vector<Kind> expected{Kind::append};
+    for (int i = 0; i < 6; ++i) {
+        for (const Kind kind : {Kind::append, Kind::append, Kind::sync, Kind::overwrite}) {
+            expected.push_back(kind);
+        }
+    }
+    std::vector<Kind> kinds;
+    for (const auto& operation : sink.operations()) {
+        kinds.push_back(operation.kind);
+    }
+    EXPECT_EQ(kinds, expected);
 }
 
 TEST_F(Fragments, WaitForTheFirstPictureAndHideSoundFromBeforeIt) {
@@ -304,6 +305,7 @@ TEST_F(Fragments, WaitForTheFirstPictureAndHideSoundFromBeforeIt) {
     ASSERT_EQ(runs.size(), 2U);
     EXPECT_EQ(runs[0].decodeTime, 0U);
     EXPECT_EQ(runs[1].decodeTime, 0U);
+    EXPECT_EQ(runs[1].samples.back().duration, 1024U) << "what was stated, in a fragment longer than a second too";
     const auto track = test::parseTrack(*boxes[2].all("trak")[1]);
     ASSERT_EQ(track.edits.size(), 1U);
     EXPECT_EQ(track.edits[0].mediaTime, 1024 + 96000);  // priming and the two seconds before the picture
