@@ -74,12 +74,12 @@ private:
 
 using Maker = std::function<std::unique_ptr<TelemetryWorld>()>;
 
-class TelemetryReporterContract : public ::testing::TestWithParam<Maker> {
+class TelemetryContract : public ::testing::TestWithParam<Maker> {
 protected:
     std::unique_ptr<TelemetryWorld> world_ = GetParam()();
 };
 
-TEST_P(TelemetryReporterContract, AnEventArrivesWhole) {
+TEST_P(TelemetryContract, AnEventArrivesWhole) {
     const Dictionary payload{{"ActiveDuration", std::int64_t{13}},
                              {"FrontCameraUsed", false},
                              {"RecordedFileSize", std::int64_t{123'456'789'012}},
@@ -100,7 +100,7 @@ TEST_P(TelemetryReporterContract, AnEventArrivesWhole) {
     EXPECT_EQ(Value(event.payload), Value(payload));
 }
 
-TEST_P(TelemetryReporterContract, EventsArriveInTheirOrder) {
+TEST_P(TelemetryContract, EventsArriveInTheirOrder) {
     for (std::int64_t type = 0; type < 20; ++type)
         EXPECT_FALSE(world_->telemetry().send({}, {"a", "b"}, 2, type, {}));
     const auto received = world_->received();
@@ -108,7 +108,7 @@ TEST_P(TelemetryReporterContract, EventsArriveInTheirOrder) {
     for (std::int64_t type = 0; type < 20; ++type) EXPECT_EQ(received[static_cast<std::size_t>(type)].type, type);
 }
 
-TEST_P(TelemetryReporterContract, ManyLanesMaySend) {
+TEST_P(TelemetryContract, ManyLanesMaySend) {
     std::vector<std::thread> lanes;
     for (int lane = 0; lane < 4; ++lane)
         lanes.emplace_back([this] {
@@ -118,9 +118,9 @@ TEST_P(TelemetryReporterContract, ManyLanesMaySend) {
     EXPECT_EQ(world_->received().size(), 40u);
 }
 
-INSTANTIATE_TEST_SUITE_P(Fake, TelemetryReporterContract,
+INSTANTIATE_TEST_SUITE_P(Fake, TelemetryContract,
                          ::testing::Values(Maker([] { return std::make_unique<FakeTelemetryWorld>(); })));
-INSTANTIATE_TEST_SUITE_P(Port, TelemetryReporterContract,
+INSTANTIATE_TEST_SUITE_P(Port, TelemetryContract,
                          ::testing::Values(Maker([] { return std::make_unique<PortTelemetryWorld>(); })));
 
 }  // namespace
