@@ -4,7 +4,10 @@
 #include <memory>
 
 #include "linux/media/LinuxContainerWriters.h"
+#include "support/ThreadScheduler.h"
 #include "tests/contract/MediaWorld.h"
+#include "tests/fakes/FakeContainerWriter.h"
+#include "tests/fakes/ThreadLoop.h"
 
 namespace lumacast {
 namespace {
@@ -20,7 +23,21 @@ public:
 
     HandClock clock;
     OwnDirectory directory;
-    URL url(const std::string& name = "movie.mp4") const { return URL::file(directory.file(name)); }
+    virtual URL url(const std::string& name = "movie.mp4") const { return URL::file(directory.file(name)); }
+};
+
+class FakeWriterWorld final : public WriterWorld {
+public:
+    FakeWriterWorld() { EXPECT_FALSE(files_.createDirectory(files_.temporaryDirectory())); }
+    ContainerWriters& writers() override { return writers_; }
+    bool fileExists(const URL& url) override { return files_.exists(url.path()); }
+    URL url(const std::string& name) const override { return URL::file(files_.temporaryDirectory() + "/" + name); }
+
+private:
+    FaultPlan faults_;
+    FakeFileSystem files_{clock, faults_};
+    ThreadScheduler scheduler_{std::make_shared<ThreadLoop>()};
+    FakeContainerWriters writers_{scheduler_, clock, files_, faults_};
 };
 
 class PortWriterWorld final : public WriterWorld {
@@ -286,6 +303,8 @@ TEST_P(ContainerWriterContract, EveryOperationInEveryStateDoesWhatTheTableSays) 
     }
 }
 
+INSTANTIATE_TEST_SUITE_P(Fake, ContainerWriterContract,
+                         ::testing::Values(Maker([] { return std::make_unique<FakeWriterWorld>(); })));
 INSTANTIATE_TEST_SUITE_P(Port, ContainerWriterContract,
                          ::testing::Values(Maker([] { return std::make_unique<PortWriterWorld>(); })));
 
