@@ -33,7 +33,9 @@ struct MovieOptions {
     std::uint64_t creationTime = 0;                     // seconds since 1904 began, UTC; 0: not stated
     std::uint32_t fragmentNanoseconds = 1'000'000'000;  // media time after which a fragment is closed
     std::uint32_t fragmentBytes = 8U << 20U;            // pending bytes after which it is closed early; 1 GiB at most
-    // presented. None: the movie begins with its first picture.
+    // Nanoseconds on the tracks' time line at which the movie begins. What lies before is there to decode from and is
+    // not Nanoseconds on the tracks' time line at which the movie begins. What lies before is there to decode from and
+    // is not presented. None: the movie begins with its first picture.
     std::optional<std::int64_t> presentationStart;
 };
 

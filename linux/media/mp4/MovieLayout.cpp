@@ -76,10 +76,17 @@ std::int64_t movieStartNanoseconds(std::span<const MovieTrack> tracks) {
 
 void placeFragments(std::span<MovieTrack> tracks, std::optional<std::int64_t> givenStart) {
     const std::int64_t movieStart = givenStart ? *givenStart : movieStartNanoseconds(tracks);
+    std::int64_t earliest = movieStart;
+    for (const MovieTrack& track : tracks) {
+        if (track.hasSamples()) {
+            earliest = std::min(earliest, rescale(track.presentedStart(), track.timescale, kNanosecondTimescale));
+        }
+    }
     for (MovieTrack& track : tracks) {
         const std::int64_t start = rescale(movieStart, kNanosecondTimescale, track.timescale);
-        const std::int64_t early = track.hasSamples() ? start - track.firstPts : 0;
-        track.fragmentSkip = std::max(track.priming, early);
+        const std::int64_t expected = rescale(earliest, kNanosecondTimescale, track.timescale) - track.priming;
+        const std::int64_t first = track.hasSamples() ? track.firstPts : expected;
+        track.fragmentSkip = std::max(track.priming, start - first);
         track.fragmentOffset = track.fragmentSkip - start;
     }
 }

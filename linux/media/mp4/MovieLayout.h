@@ -30,8 +30,8 @@ void writeFileStart(BoxBuffer& out);
 
 // `start` below: the same where it is not left to the tracks.
 
-// Decides how stamps become decoding times in fragments (fragmentOffset, fragmentSkip), so that none is negative. Sound
-// that has not come yet is expected not to begin before the movie does.
+// Decides how stamps become decoding times in fragments (fragmentOffset, fragmentSkip), so that none is negative. A
+// track that has no sample yet is expected not to begin before the others, or before the movie if they begin later.
 void placeFragments(std::span<MovieTrack> tracks, std::optional<std::int64_t> start);
 
 // The movie box of a file in fragments: every track declared, none with samples, and an edit list where ticks are
