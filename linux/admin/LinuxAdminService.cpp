@@ -240,7 +240,11 @@ void LinuxAdminService::resume(std::function<Dictionary()> snapshot) {
 std::optional<std::string> askAdminService(const std::string& socketPath, std::string_view request,
                                            std::chrono::milliseconds limit) {
     const auto deadline = std::chrono::steady_clock::now() + limit;
-    const FileDescriptor socket = connectTo(socketPath);
+    FileDescriptor socket = connectTo(socketPath);
+    while (!socket && errno == EAGAIN && std::chrono::steady_clock::now() < deadline) {  // others wait to be heard
+        ::poll(nullptr, 0, 5);
+        socket = connectTo(socketPath);
+    }
     const std::string line = std::string(request) + "\n";
     if (!socket || ::send(socket.get(), line.data(), line.size(), MSG_NOSIGNAL) != static_cast<ssize_t>(line.size()))
         return std::nullopt;

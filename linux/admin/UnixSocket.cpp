@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 
 namespace lumacast {
 
@@ -44,8 +45,11 @@ FileDescriptor connectTo(const std::string& path) {
     const auto address = addressOf(path);
     FileDescriptor socket = streamSocket();
     if (!address || !socket) return {};
-    if (::connect(socket.get(), reinterpret_cast<const sockaddr*>(&*address), sizeof *address) != 0) return {};
-    return socket;
+    if (::connect(socket.get(), reinterpret_cast<const sockaddr*>(&*address), sizeof *address) == 0) return socket;
+    const int error = errno;
+    socket.reset();
+    errno = error;
+    return {};
 }
 
 std::optional<uid_t> peerUser(int socket) {

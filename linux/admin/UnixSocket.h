@@ -12,7 +12,8 @@ namespace lumacast {
 /// replaced; one that somebody does, and anything that is not a socket, is left alone: then, and on any failure, empty.
 FileDescriptor listenAt(const std::string& path);
 
-/// A connection to the socket at `path`, non-blocking; empty when nobody listens there.
+/// A connection to the socket at `path`, non-blocking; empty, with errno, when nobody listens there
+/// (EAGAIN: somebody does, but too many wait already).
 FileDescriptor connectTo(const std::string& path);
 
 /// The user at the other end, by the kernel's word; none when the system does not say.

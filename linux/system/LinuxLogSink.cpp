@@ -18,7 +18,7 @@ namespace lumacast {
 
 namespace {
 
-/// Below PIPE_BUF with the level in front: such a write to a pipe is whole or not at all.
+/// With its level and a note before it below PIPE_BUF: such a write to a pipe is whole or not at all.
 constexpr std::size_t kMaximumText = 4000;
 
 std::string_view levelName(LogLevel level) {
@@ -52,6 +52,8 @@ std::string presentable(std::string_view text) {
         result.begin(), result.end(), [](char c) { return (c >= 0 && c < ' ' && c != '\t') || c == 0x7F; }, ' ');
     return result;
 }
+
+std::string droppedNote(std::uint64_t lines) { return std::to_string(lines) + " log lines dropped"; }
 
 /// Writes to a pipe whose reader may have gone: the signal that brings is taken back.
 ssize_t writeWithoutSignal(int number, std::string_view bytes) {
@@ -128,25 +130,29 @@ LinuxLogSink::LinuxLogSink(const LogSinkTargets& targets)
 }
 
 void LinuxLogSink::write(LogLevel level, std::string_view text) {
-    if (level != LogLevel::Print) {
+    const std::string line = presentable(text);
+    bool delivered = false;
+    if (level == LogLevel::Print) {
+        delivered = output_.write(line + "\n");
+    } else {
         const std::uint64_t missed = unreported_.exchange(0);
-        if (missed > 0 && !deliver(LogLevel::Error, std::to_string(missed) + " log lines dropped")) unreported_ += missed;
+        delivered = journal_ ? sendToJournal(level, line, missed) : writeToError(level, line, missed);
+        if (!delivered) unreported_ += missed + 1;
     }
-    if (deliver(level, presentable(text))) return;
-    ++dropped_;
-    ++unreported_;
+    if (!delivered) ++dropped_;
 }
 
-bool LinuxLogSink::deliver(LogLevel level, const std::string& text) {
-    if (level == LogLevel::Print) return output_.write(text + "\n");
-    if (journal_) return sendToJournal(level, text);
-    return error_.write(std::string(levelName(level)) + " " + text + "\n");
+bool LinuxLogSink::writeToError(LogLevel level, const std::string& text, std::uint64_t missed) const {
+    // One write for both: else the short notes about what was dropped would fill the room the lines did not fit into.
+    const std::string note = missed > 0 ? "error " + droppedNote(missed) + "\n" : "";
+    return error_.write(note + std::string(levelName(level)) + " " + text + "\n");
 }
 
-bool LinuxLogSink::sendToJournal(LogLevel level, std::string_view text) const {
+bool LinuxLogSink::sendToJournal(LogLevel level, const std::string& text, std::uint64_t missed) const {
+    if (missed > 0 && !sendToJournal(LogLevel::Error, droppedNote(missed), 0)) return false;
     // The journal's native protocol: one field a line; no text holds a newline here.
     const std::string datagram = std::string("PRIORITY=") + journalPriority(level) +
-                                 "\nSYSLOG_IDENTIFIER=lumacastd\nMESSAGE=" + std::string(text) + "\n";
+                                 "\nSYSLOG_IDENTIFIER=lumacastd\nMESSAGE=" + text + "\n";
     return ::send(journal_.get(), datagram.data(), datagram.size(), MSG_DONTWAIT | MSG_NOSIGNAL) ==
            static_cast<ssize_t>(datagram.size());
 }

@@ -44,14 +44,15 @@ private:
         FileDescriptor reopened_;
     };
 
-    bool deliver(LogLevel level, const std::string& text);
-    bool sendToJournal(LogLevel level, std::string_view text) const;
+    /// `missed` lines were dropped before this one. False when it was dropped too.
+    bool writeToError(LogLevel level, const std::string& text, std::uint64_t missed) const;
+    bool sendToJournal(LogLevel level, const std::string& text, std::uint64_t missed) const;
 
     const Stream error_;
     const Stream output_;
     FileDescriptor journal_;
     std::atomic<std::uint64_t> dropped_{0};
-    std::atomic<std::uint64_t> unreported_{0};
+    std::atomic<std::uint64_t> unreported_{0};  ///< those of the log that no note has told of
 };
 
 }  // namespace lumacast

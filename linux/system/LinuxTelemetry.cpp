@@ -54,6 +54,7 @@ bool append(const std::string& path, std::uint64_t maximumBytes, const std::stri
 struct LinuxTelemetry::State {
     std::string path;
     std::uint64_t maximumBytes = 0;
+    std::function<void()> beforeEachWrite;
     std::mutex mutex;
     std::condition_variable workCame;
     std::condition_variable workDone;
@@ -64,9 +65,11 @@ struct LinuxTelemetry::State {
     bool running = false;  ///< the thread is made with the first event
 };
 
-LinuxTelemetry::LinuxTelemetry(std::string path, std::uint64_t maximumBytes) : state_(std::make_shared<State>()) {
+LinuxTelemetry::LinuxTelemetry(std::string path, std::uint64_t maximumBytes, std::function<void()> beforeEachWrite)
+    : state_(std::make_shared<State>()) {
     state_->path = std::move(path);
     state_->maximumBytes = maximumBytes;
+    state_->beforeEachWrite = std::move(beforeEachWrite);
 }
 
 LinuxTelemetry::~LinuxTelemetry() {
@@ -122,6 +125,7 @@ void LinuxTelemetry::write(const std::shared_ptr<State>& state) {
         const std::string line = std::move(state->waiting.front());
         state->waiting.pop_front();
         lock.unlock();
+        if (state->beforeEachWrite) state->beforeEachWrite();
         const bool written = append(state->path, state->maximumBytes, line);
         lock.lock();
         if (!written) ++state->lost;

@@ -1,6 +1,7 @@
 #pragma once
 #include <chrono>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <string>
 
@@ -16,7 +17,9 @@ public:
     static constexpr std::uint64_t kDefaultLimit = 1024 * 1024;
 
     /// `path` is the file, usually telemetry.jsonl in the state directory, whose folder is made when it is missing.
-    explicit LinuxTelemetry(std::string path, std::uint64_t maximumBytes = kDefaultLimit);
+    /// `beforeEachWrite` is where tests put a slow disk; it runs on the writing thread.
+    explicit LinuxTelemetry(std::string path, std::uint64_t maximumBytes = kDefaultLimit,
+                            std::function<void()> beforeEachWrite = {});
     /// Waits at most 2 s until what was handed over is written.
     ~LinuxTelemetry() override;
 

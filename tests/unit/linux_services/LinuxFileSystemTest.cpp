@@ -1,0 +1,164 @@
+// What the contract suite can't ask for: a hung disk, permissions, and both ways of resolving names against attacks.
+#include "linux/storage/LinuxFileSystem.h"
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <map>
+
+#include "tests/contract/ScratchDirectory.h"
+#include "tests/unit/linux_services/Until.h"
+
+namespace lumacast {
+namespace {
+
+using namespace std::chrono_literals;
+
+struct Disk {
+    explicit Disk(std::chrono::milliseconds patience = 30s) {
+        LinuxFileSystem::Options options;
+        options.root = scratch.path("root");
+        options.patience = patience;
+        options.beforeEachQuestion = [gate = gate] { gate->pass(); };
+        options.bytesBeingWritten = [this](const std::string& path) -> std::optional<std::uint64_t> {
+            const auto found = writers.find(path);
+            return found == writers.end() ? std::nullopt : std::optional(found->second);
+        };
+        fileSystem.emplace(options);
+        EXPECT_FALSE(fileSystem->prepare());
+        directory = scratch.path("root") + std::string(kDeviceTemporaryDirectory);
+    }
+    ~Disk() { gate->open(); }
+
+    ScratchDirectory scratch;
+    std::shared_ptr<Gate> gate = std::make_shared<Gate>();
+    std::map<std::string, std::uint64_t> writers;
+    std::optional<LinuxFileSystem> fileSystem;
+    std::string directory;
+};
+
+template <class T>
+std::int64_t code(const Result<T>& result) {
+    const Error* error = std::get_if<Error>(&result);
+    return error ? error->code() : 0;
+}
+
+mode_t modeOf(const std::string& path) {
+    struct stat status = {};
+    return ::stat(path.c_str(), &status) == 0 ? status.st_mode & 07777 : 0;
+}
+
+TEST(LinuxFileSystem, PreparingMakesTheParentsAndNotTheDirectory) {
+    Disk disk;
+    EXPECT_FALSE(disk.fileSystem->exists(disk.directory));
+    EXPECT_EQ(modeOf(disk.scratch.path("root/private/var/mobile/Library")), 0700u);
+    EXPECT_FALSE(disk.fileSystem->prepare()) << "a second start";
+    EXPECT_FALSE(disk.fileSystem->createDirectory(disk.directory));
+}
+
+TEST(LinuxFileSystem, WhatIsMadeIsThisUsersAlone) {
+    Disk disk;
+    const mode_t before = ::umask(0);
+    EXPECT_FALSE(disk.fileSystem->createDirectory(disk.directory));
+    EXPECT_FALSE(disk.fileSystem->createDirectory(disk.directory + "/sub"));
+    ::umask(before);
+    EXPECT_EQ(modeOf(disk.directory), 0700u);
+    EXPECT_EQ(modeOf(disk.directory + "/sub"), 0700u);
+}
+
+TEST(LinuxFileSystem, AHungDiskIsUnreadableAfter40Milliseconds) {
+    Disk disk(40ms);
+    ASSERT_TRUE(until([&] { return !disk.fileSystem->createDirectory(disk.directory) || disk.fileSystem->exists(disk.directory); }));
+    disk.gate->shut();
+    const auto begin = std::chrono::steady_clock::now();
+    EXPECT_EQ(code(disk.fileSystem->attributes(disk.directory)), ETIMEDOUT);
+    EXPECT_EQ(code(disk.fileSystem->freeSize(disk.directory)), ETIMEDOUT);
+    EXPECT_FALSE(disk.fileSystem->exists(disk.directory));
+    EXPECT_EQ(disk.fileSystem->createDirectory(disk.directory + "/x")->code(), ETIMEDOUT);
+    EXPECT_GE(std::chrono::steady_clock::now() - begin, 160ms);
+    EXPECT_EQ(disk.fileSystem->diskThreadCount(), 4u);
+    for (int i = 0; i < 5; ++i) EXPECT_EQ(code(disk.fileSystem->freeSize(disk.directory)), ETIMEDOUT);
+    EXPECT_EQ(disk.fileSystem->diskThreadCount(), 4u);
+    disk.gate->open();
+    EXPECT_TRUE(until([&] { return disk.fileSystem->exists(disk.directory); })) << "the disk came back";
+}
+
+TEST(LinuxFileSystem, AFileBeingWrittenAnswersEvenOnAHungDisk) {
+    Disk disk(40ms);
+    ASSERT_TRUE(until([&] { return !disk.fileSystem->createDirectory(disk.directory) || disk.fileSystem->exists(disk.directory); }));
+    disk.writers[disk.directory + "/movie.mp4"] = 4711;
+    disk.gate->shut();
+    const auto answer = disk.fileSystem->attributes(disk.directory + "//movie.mp4");
+    ASSERT_EQ(code(answer), 0);
+    EXPECT_EQ(std::get<FileAttributes>(answer).size, 4711u);
+    EXPECT_GT(std::get<FileAttributes>(answer).modified.secondsSince1970, 1.7e9);
+    EXPECT_EQ(code(disk.fileSystem->attributes(disk.directory + "//other.mp4")), ETIMEDOUT);
+}
+
+TEST(LinuxFileSystem, AFileThatIsGoneIsGoneEvenWhileItIsBeingWritten) {
+    Disk disk;
+    ASSERT_FALSE(disk.fileSystem->createDirectory(disk.directory));
+    disk.writers[disk.directory + "/movie.mp4"] = 4711;
+    EXPECT_EQ(code(disk.fileSystem->attributes(disk.directory + "//movie.mp4")), ENOENT);
+}
+
+TEST(LinuxFileSystem, TheDirectoryItselfMayBeALinkOfTheAdministrators) {
+    Disk disk;
+    std::filesystem::create_symlink(disk.scratch.makeDirectory("big-disk"), disk.directory);
+    disk.scratch.write("big-disk/movie.mp4", "12345");
+    const auto top = disk.fileSystem->attributes(disk.directory + "/");
+    ASSERT_EQ(code(top), 0);
+    EXPECT_TRUE(std::get<FileAttributes>(top).isDirectory);
+    EXPECT_EQ(std::get<0>(disk.fileSystem->list(disk.directory + "/")), std::vector<std::string>{"movie.mp4"});
+    const auto file = disk.fileSystem->attributes(disk.directory + "//movie.mp4");
+    ASSERT_EQ(code(file), 0);
+    EXPECT_EQ(std::get<FileAttributes>(file).size, 5u);
+}
+
+TEST(LinuxFileSystem, ATreeTooDeepIsNotFollowedToItsEnd) {
+    Disk disk;
+    ASSERT_FALSE(disk.fileSystem->createDirectory(disk.directory));
+    std::string deep = disk.directory;
+    for (int i = 0; i < 80; ++i) deep += "/d";
+    std::filesystem::create_directories(deep);
+    const auto error = disk.fileSystem->remove(disk.directory + "/d");
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->code(), ELOOP);
+}
+
+class Resolving : public testing::TestWithParam<Resolution> {};
+
+TEST_P(Resolving, StaysBeneathWhateverIsPutInTheWay) {
+    ScratchDirectory scratch;
+    const std::string base = scratch.makeDirectory("base");
+    scratch.write("secret", "x");
+    scratch.write("base/sub/file", "x");
+    std::filesystem::create_symlink("..", base + "/up");
+    std::filesystem::create_symlink(scratch.path(), base + "/out");
+    std::filesystem::create_symlink("sub", base + "/inner");
+    const auto error = [&](const std::string& path) {
+        const auto answer = resolveBeneath(base, path, GetParam());
+        const int* number = std::get_if<int>(&answer);
+        return number ? *number : 0;
+    };
+    EXPECT_EQ(error(base + "/sub/file"), 0);
+    EXPECT_EQ(error(base + "//sub///file/"), 0);
+    EXPECT_EQ(error(base), 0);
+    EXPECT_EQ(error(base + "/up"), 0) << "the link itself, not what it leads to";
+    for (const char* through : {"/up/secret", "/out/secret", "/inner/file", "/up/base/sub/file"}) {
+        const int number = error(base + through);
+        EXPECT_TRUE(number == ELOOP || number == ENOTDIR) << through << " " << number;
+    }
+    for (const char* outside : {"/..", "/../secret", "/sub/../file", "/sub/..", "/./sub", "x", "/sub/.."})
+        EXPECT_EQ(error(base + outside), EACCES) << outside;
+    EXPECT_EQ(error("/"), EACCES);
+    EXPECT_EQ(error(""), EACCES);
+    EXPECT_EQ(error(base + "/none/file"), ENOENT);
+}
+
+INSTANTIATE_TEST_SUITE_P(Ways, Resolving, testing::Values(availableResolution(), Resolution::Walk));
+
+}  // namespace
+}  // namespace lumacast
