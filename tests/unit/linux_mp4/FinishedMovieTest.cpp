@@ -342,6 +342,108 @@ TEST_F(FinishedMovie, TakesWideFieldsForLongTimes) {
     EXPECT_EQ(tracks[1].edits[0].duration, 7'200'000'000U + 21333);
 }
 
+TEST_F(FinishedMovie, LeavesOutWhatIsLaterThanItsGivenEndAndCutsWhatLastsLonger) {
+    startWithPicture();
+    sound = writer.addAudioTrack(test::audioDescription());
+    ASSERT_EQ(writer.start(), MovieError::none);
+    for (std::uint32_t i = 0; i < 90; ++i) {
+        add(i * kSecond / 30, i % 30 == 0, i);
+    }
+    for (std::int64_t frame = -1024; frame < 3 * 48000; frame += 1024) {
+        addSound(frame);
+    }
+    ASSERT_EQ(writer.finish(3 * kSecond, 1'510'000'000), MovieError::none);  // 1.51 s, in nanoseconds
+    const auto boxes = parseBoxes(sink.file());
+    const auto tracks = tracksOf(boxes.at(2));
+    ASSERT_EQ(tracks.size(), 2U);
+    ASSERT_EQ(tracks[0].samples.size(), 46U) << "the pictures up to 1.5 s";
+    EXPECT_EQ(tracks[0].samples.back().duration, 10'000U);
+    EXPECT_EQ(tracks[0].mediaDuration, 1'510'000U);
+    for (std::uint32_t i = 0; i < 46; ++i) {
+        const auto begin = sink.file().begin() + static_cast<std::ptrdiff_t>(tracks[0].samples[i].offset);
+        EXPECT_EQ(test::Bytes(begin, begin + 40), payload(i, 40));
+    }
+    EXPECT_EQ(tracks[1].mediaDuration, 1024U + 72'480);
+    EXPECT_EQ(tracks[1].movieDuration, 1'510'000U);
+    EXPECT_EQ(movieDuration(boxes[2]), 1'510'000U);
+}
+
+TEST_F(FinishedMovie, KeepsItsFirstPictureWhateverItsGivenEnd) {
+    startWithPicture();
+    sound = writer.addAudioTrack(test::audioDescription());
+    ASSERT_EQ(writer.start(), MovieError::none);
+    add(kSecond);
+    add(2 * kSecond, false);
+    addSound(48000 - 1024);
+    addSound(48000);
+    ASSERT_EQ(writer.finish(3 * kSecond, 0), MovieError::none);
+    const auto tracks = tracksOf(parseBoxes(sink.file()).at(2));
+    ASSERT_EQ(tracks.size(), 1U) << "sound has nothing to present";
+    ASSERT_EQ(tracks[0].samples.size(), 1U);
+    EXPECT_EQ(tracks[0].samples[0].duration, 1U);
+}
+
+TEST_F(FinishedMovie, KeepsAPictureAtItsGivenEndForOneTick) {
+    startWithPicture();
+    ASSERT_EQ(writer.start(), MovieError::none);
+    add(0);
+    add(kSecond);
+    add(2 * kSecond);
+    ASSERT_EQ(writer.finish(3 * kSecond, 1'000'000'000), MovieError::none);
+    const auto tracks = tracksOf(parseBoxes(sink.file()).at(2));
+    ASSERT_EQ(tracks[0].samples.size(), 2U);
+    EXPECT_EQ(tracks[0].samples[1].duration, 1U);
+}
+
+TEST(MovieStart, GivenWithinTheMediaSkipsWhatLiesBeforeInEveryTrack) {
+    MemorySink sink;
+    MovieOptions options;
+    options.presentationStart = 700'000'000;
+    MovieBoxWriter writer(sink, options);
+    const auto video = writer.addVideoTrack(test::videoDescription());
+    const auto sound = writer.addAudioTrack(test::audioDescription());
+    ASSERT_EQ(writer.start(), MovieError::none);
+    for (std::int64_t i = 0; i < 20; ++i) {
+        ASSERT_EQ(writer.addSample(*video, {i * kSecond / 10, 0, i == 0}, payload(1, 30)), MovieError::none);
+    }
+    for (std::int64_t frame = -1024; frame < 96000; frame += 1024) {
+        ASSERT_EQ(writer.addSample(*sound, {frame, 1024}, payload(2, 10)), MovieError::none);
+    }
+    ASSERT_EQ(writer.flushFragment(), MovieError::none);
+    const auto recording = sink.file();
+    const auto initial = tracksOf(parseBoxes(recording).at(2));
+    ASSERT_EQ(writer.finish(2 * kSecond), MovieError::none);
+    const auto boxes = parseBoxes(sink.file());
+    const auto tracks = tracksOf(boxes.at(2));
+    ASSERT_EQ(tracks[0].edits.size(), 1U);
+    EXPECT_EQ(tracks[0].edits[0].mediaTime, 700'000);
+    EXPECT_EQ(tracks[0].edits[0].duration, 1'300'000U);
+    ASSERT_EQ(tracks[1].edits.size(), 1U);
+    EXPECT_EQ(tracks[1].edits[0].mediaTime, 1024 + 33'600);
+    EXPECT_EQ(tracks[0].samples.size(), 20U) << "all pictures are there to decode from";
+    ASSERT_EQ(initial[0].edits.size(), 1U);
+    EXPECT_EQ(initial[0].edits[0].mediaTime, 700'000);
+    ASSERT_EQ(initial[1].edits.size(), 1U);
+    EXPECT_EQ(initial[1].edits[0].mediaTime, 1024 + 33'600) << "though no sound had come with the first fragment";
+}
+
+TEST(MovieStart, GivenBeforeTheFirstPictureDelaysIt) {
+    MemorySink sink;
+    MovieOptions options;
+    options.presentationStart = 0;
+    MovieBoxWriter writer(sink, options);
+    const auto video = writer.addVideoTrack(test::videoDescription());
+    ASSERT_EQ(writer.start(), MovieError::none);
+    ASSERT_EQ(writer.addSample(*video, {kSecond / 4, 0, true}, payload(1, 30)), MovieError::none);
+    ASSERT_EQ(writer.finish(kSecond), MovieError::none);
+    const auto boxes = parseBoxes(sink.file());
+    const auto tracks = tracksOf(boxes.at(2));
+    ASSERT_EQ(tracks[0].edits.size(), 2U);
+    EXPECT_EQ(tracks[0].edits[0].mediaTime, -1);
+    EXPECT_EQ(tracks[0].edits[0].duration, 250'000U);
+    EXPECT_EQ(movieDuration(boxes[2]), 1'000'000U);
+}
+
 TEST(MovieCreationTime, IsStatedInEveryHeaderAndTakesWideFieldsAfter2040) {
     for (const std::uint64_t when : {std::uint64_t{3'800'000'000}, std::uint64_t{5'000'000'000}}) {
         MemorySink sink;
