@@ -1,0 +1,179 @@
+#include "tests/system/World.h"
+
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <signal.h>
+#include <stdlib.h>
+
+#include <algorithm>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+
+#include "linux/admin/LinuxAdminService.h"
+
+namespace lumacast::test {
+
+namespace fs = std::filesystem;
+
+bool waitUntil(const std::function<bool()>& condition, std::chrono::seconds limit) {
+    const auto until = std::chrono::steady_clock::now() + limit;
+    while (!condition()) {
+        if (std::chrono::steady_clock::now() > until) return false;
+        ::poll(nullptr, 0, 5);
+    }
+    return true;
+}
+
+bool longTests() {
+    const char* wanted = ::getenv("LC_LONG_TESTS");
+    return wanted && std::strcmp(wanted, "1") == 0;
+}
+
+Application::Application(World& world, const std::vector<std::string>& options) : log_(world.path("frames.txt")) {
+    std::vector<std::string> command{LC_SELF_RECORDER, "--name", "Self Recorder", "--frames-log", log_};
+    command.insert(command.end(), options.begin(), options.end());
+    child_ = std::make_unique<checkers::Child>(command, world.environment(), world.path("application.log"));
+    const std::string line = child_->readLine();
+    if (line.starts_with("window 0x")) window_ = static_cast<std::uint32_t>(std::stoul(line.substr(9), nullptr, 16));
+    EXPECT_NE(window_, 0u) << line;
+}
+
+std::string Application::ask(const std::string& command) {
+    child_->send(command);
+    for (;;) {
+        std::string line = child_->readLine();
+        if (!line.starts_with("event ")) return line;
+        events_.push_back(std::move(line));
+    }
+}
+
+std::uint32_t Application::askForFrame(const std::string& command) {
+    const std::string answer = ask(command);
+    const auto at = answer.find("frame ");
+    EXPECT_NE(at, std::string::npos) << command << ": " << answer;
+    return at == std::string::npos ? 0 : static_cast<std::uint32_t>(std::stoul(answer.substr(at + 6)));
+}
+
+bool Application::waitForFrame(std::uint32_t number) {
+    return waitUntil([&] { return askForFrame("frame") >= number; }, std::chrono::seconds(60));
+}
+
+std::string Application::nextEvent() {
+    if (events_.empty()) return child_->readLine();
+    std::string event = std::move(events_.front());
+    events_.erase(events_.begin());
+    return event;
+}
+
+std::string Application::stop(const std::string& command) {
+    const std::string answer = ask(command);
+    EXPECT_TRUE(answer.starts_with("stopped frame ")) << answer;
+    const auto at = answer.find(" /");
+    return at == std::string::npos ? "" : answer.substr(at + 1);
+}
+
+void Application::kill() {
+    ::kill(child_->pid(), SIGKILL);
+    child_->wait();
+}
+
+checkers::FramesLog Application::framesLog() const {
+    std::string error;
+    const auto log = checkers::readFramesLog(log_, error);
+    EXPECT_TRUE(log) << error;
+    return log.value_or(checkers::FramesLog{});
+}
+
+World::World(Consent consent) : display_("1280x800x24") {
+    std::string pattern = (fs::temp_directory_path() / "lumacast-XXXXXX").string();
+    EXPECT_TRUE(::mkdtemp(pattern.data()));
+    folder_ = pattern;
+    EXPECT_FALSE(display_.name().empty()) << "no display";
+    environment_ = {"DISPLAY=" + display_.name(), "WAYLAND_DISPLAY=", "LANG=C", "LANGUAGE=en"};
+    for (const auto& [variable, name] : {std::pair{"XDG_RUNTIME_DIR", "run"}, {"XDG_CONFIG_HOME", "config"},
+                                         {"XDG_DATA_HOME", "data"}, {"XDG_STATE_HOME", "state"}, {"XDG_CACHE_HOME", "cache"}}) {
+        fs::create_directory(path(name));
+        fs::permissions(path(name), fs::perms::owner_all);
+        environment_.push_back(std::string(variable) + "=" + path(name));
+    }
+    fs::create_directories(path("config/lumacast"));
+    fs::create_directories(path("data/applications"));
+    fs::create_directories(path("data/lumacast"));
+    fs::copy(fs::path(LC_SOURCE_DIR) / "resources/Lumacast.bundle", path("data/lumacast/Lumacast.bundle"),
+             fs::copy_options::recursive);
+    if (consent == Consent::Suppressed)
+        std::ofstream(path("config/lumacast/com.orvane.lumacastd.conf")) << "LCSuppressAlert=true\n";
+    install("org.lumacast.SelfRecorder", "Self Recorder", LC_SELF_RECORDER);
+}
+
+World::~World() {
+    if (::testing::Test::HasFailure()) std::fprintf(stderr, "%s\n", daemonLog().c_str());
+    daemon_.reset();
+    std::error_code ignored;
+    fs::remove_all(folder_, ignored);
+}
+
+void World::install(const std::string& identifier, const std::string& name, const std::string& executable) {
+    std::ofstream(path("data/applications/" + identifier + ".desktop"))
+        << "[Desktop Entry]\nType=Application\nName=" << name << "\nExec=" << executable << "\n";
+}
+
+void World::startDaemon() {
+    daemon_ = std::make_unique<checkers::Child>(std::vector<std::string>{LC_DAEMON}, environment_, path("daemon.log"));
+    EXPECT_TRUE(waitUntil([this] { return !status().is_null(); })) << daemonLog();
+}
+
+int World::endDaemon(int signal) {
+    ::kill(daemon_->pid(), signal);
+    return daemon_->wait();
+}
+
+std::unique_ptr<Application> World::application(std::vector<std::string> options) {
+    return std::make_unique<Application>(*this, options);
+}
+
+nlohmann::json World::status() {
+    const auto answer = askAdminService(path("run/lumacast/admin.sock"), "status", std::chrono::milliseconds(5000));
+    return answer ? nlohmann::json::parse(*answer, nullptr, false) : nlohmann::json();
+}
+
+nlohmann::json World::recording() {
+    const auto sessions = status()["sessions"];
+    for (const auto& session : sessions)
+        if (session.contains("current")) return session["current"];
+    return {};
+}
+
+bool World::waitForElapsed(double seconds) {
+    return waitUntil([&] {
+        const auto current = recording();
+        return !current.is_null() && current["elapsedSeconds"].get<double>() >= seconds;
+    }, std::chrono::seconds(60));
+}
+
+std::size_t World::daemonDescriptors() {
+    const fs::directory_iterator open("/proc/" + std::to_string(daemon_->pid()) + "/fd");
+    return static_cast<std::size_t>(std::distance(fs::begin(open), fs::end(open)));
+}
+
+std::string World::moviePath() const {
+    return path("state/lumacast/root/private/var/mobile/Library/Lumacast/Self Recorder.mp4");
+}
+
+std::string World::daemonLog() const {
+    std::ifstream file(path("daemon.log"));
+    return {std::istreambuf_iterator<char>(file), {}};
+}
+
+std::vector<checkers::NumberedPicture> picturesOf(const std::string& movie, bool mayEndEarly) {
+    checkers::MovieReader reader(movie);
+    EXPECT_EQ(reader.error(), "");
+    std::vector<checkers::NumberedPicture> pictures;
+    const bool whole = checkers::readFrameNumbers(reader, pictures);
+    EXPECT_TRUE(mayEndEarly || whole) << reader.error();
+    return pictures;
+}
+
+}  // namespace lumacast::test

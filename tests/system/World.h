@@ -1,0 +1,102 @@
+#pragma once
+// A machine of the test's own: directories, a display, the daemon and applications, all real processes.
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <nlohmann/json.hpp>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "tests/checkers/FrameNumberChecker.h"
+#include "tests/checkers/FramesLog.h"
+#include "tests/checkers/MovieReader.h"
+#include "tests/checkers/tests/Child.h"
+#include "tests/contract/PrivateDisplay.h"
+
+namespace lumacast::test {
+
+/// Asks again and again until `condition` holds; false when it did not within `limit`.
+bool waitUntil(const std::function<bool()>& condition, std::chrono::seconds limit = std::chrono::seconds(30));
+
+/// Whether the long runs were asked for (LC_LONG_TESTS=1).
+bool longTests();
+
+class World;
+
+/// One example application, driven by its standard input.
+class Application {
+public:
+    Application(World& world, const std::vector<std::string>& options);
+
+    /// Answers the line that answers `command`; "event ..." lines are put aside.
+    std::string ask(const std::string& command);
+    /// The number that stands behind "frame" in an answer; fails the test when there is none.
+    std::uint32_t askForFrame(const std::string& command);
+    /// Waits until a frame with at least this number is shown.
+    bool waitForFrame(std::uint32_t number);
+    /// The next event line, waiting for it; empty when none comes.
+    std::string nextEvent();
+    /// Stops the recording; the movie's path, empty after a failure.
+    std::string stop(const std::string& command = "stop");
+
+    std::uint32_t window() const { return window_; }
+    pid_t pid() const { return child_->pid(); }
+    void kill();
+    checkers::FramesLog framesLog() const;
+
+private:
+    std::string log_;
+    std::unique_ptr<checkers::Child> child_;
+    std::vector<std::string> events_;
+    std::uint32_t window_ = 0;
+};
+
+class World {
+public:
+    enum class Consent { Suppressed, Asked };
+
+    explicit World(Consent consent = Consent::Suppressed);
+    ~World();
+    World(const World&) = delete;
+    World& operator=(const World&) = delete;
+
+    /// Starts the daemon and waits for its sockets.
+    void startDaemon();
+    checkers::Child& daemon() { return *daemon_; }
+    /// Ends it with a signal and waits; its exit status, -1 when the signal ended it.
+    int endDaemon(int signal);
+
+    std::unique_ptr<Application> application(std::vector<std::string> options);
+
+    /// What `status` of the administrator's socket answers.
+    nlohmann::json status();
+    /// The one session's running recording; null when there is none.
+    nlohmann::json recording();
+    /// Waits until the running recording is at least so old.
+    bool waitForElapsed(double seconds);
+    std::size_t daemonDescriptors();
+    /// The movie that the example's recordings are written to.
+    std::string moviePath() const;
+    std::string daemonLog() const;
+
+    std::string path(const std::string& name) const { return folder_ + "/" + name; }
+    const std::vector<std::string>& environment() const { return environment_; }
+    const PrivateDisplay& display() const { return display_; }
+    /// Installs a program as an application.
+    void install(const std::string& identifier, const std::string& name, const std::string& executable);
+
+private:
+    std::string folder_;
+    PrivateDisplay display_;
+    std::vector<std::string> environment_;
+    std::unique_ptr<checkers::Child> daemon_;
+    int applications_ = 0;
+};
+
+/// The pictures of a movie with their numbers; fails the test when the movie can't be decoded, unless `mayEndEarly`.
+std::vector<checkers::NumberedPicture> picturesOf(const std::string& movie, bool mayEndEarly = false);
+
+}  // namespace lumacast::test
