@@ -255,8 +255,8 @@ bool FrameLane::deliver(const Order& order, std::shared_ptr<Picture> picture, Me
     last_ = {picture, *given, order.clock};
     delegate->screenCaptureControllerDidReceiveSampleBuffer(
         *source, SampleBuffer::makeVideo(PixelBuffer(std::move(picture)), *given, setup_.minimumInterval), 0);
-    setup_.control->endDelivery();
     setup_.control->countDelivered();
+    setup_.control->endDelivery();
 
     drainEvents(false);
     const std::int64_t took = steadyNow() - began;

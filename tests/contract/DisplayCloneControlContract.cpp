@@ -1,9 +1,8 @@
-// What the display clone shows is what capture sources capture.
-
 #include <gtest/gtest.h>
 
 #include <functional>
 #include <memory>
+#include <thread>
 
 #include "linux/display/X11DisplayCapture.h"
 #include "linux/system/LinuxClock.h"
@@ -17,119 +16,139 @@
 namespace lumacast {
 namespace {
 
-/// What a capture source shows: one of two window layers, or the screen, on which the second layer covers half of the
-/// first.
-enum class Shown { First, Second, Screen };
+constexpr std::uint32_t kRed = 0xC01020, kGreen = 0x10B030;
 
-class CloneControlWorld {
+class CloneWorld {
 public:
-    virtual ~CloneControlWorld() = default;
+    virtual ~CloneWorld() = default;
     virtual DisplayCloneControl& control() = 0;
-    virtual ContextID layer(Shown which) = 0;
-    /// Starts a capture source, or lets the one that runs go on.
-    virtual void capture() = 0;
-    /// Whether capture shows this within a generous bound.
-    virtual bool shows(Shown what) = 0;
+    virtual ContextID first() = 0;
+    virtual ContextID second() = 0;
+    /// Whether the clone comes to show this and nothing else.
+    virtual bool shows(ContextID window) = 0;
+    virtual bool showsTheScreen() = 0;
+    virtual bool showsNothing() = 0;
 };
 
-/// The fake's capture shows no window, so what was recorded is what would be shown.
-class FakeCloneControlWorld final : public CloneControlWorld {
+class FakeCloneWorld final : public CloneWorld {
 public:
     DisplayCloneControl& control() override { return control_; }
-    ContextID layer(Shown which) override { return ContextID{which == Shown::First ? 11u : 12u}; }
-    void capture() override {}
-    bool shows(Shown what) override {
-        if (control_.mode() == DisplayCloneControl::kMirrorDisplay) return what == Shown::Screen;
-        if (control_.mode() != DisplayCloneControl::kCloneContexts) return false;
-        return what != Shown::Screen && control_.contexts() == std::set{layer(what)};
+    ContextID first() override { return ContextID{11}; }
+    ContextID second() override { return ContextID{12}; }
+    bool shows(ContextID window) override {
+        return control_.mode() == DisplayCloneControl::kCloneContexts && control_.contexts() == std::set{window};
     }
+    bool showsTheScreen() override { return control_.mode() == DisplayCloneControl::kMirrorDisplay; }
+    bool showsNothing() override { return control_.mode() == DisplayCloneControl::kOff; }
 
 private:
     FakeDisplayCloneControl control_;
 };
 
-class PortCloneControlWorld final : public CloneControlWorld {
+/// Two windows of one colour each; what is shown is what a running source delivers.
+class PortCloneWorld final : public CloneWorld {
 public:
-    PortCloneControlWorld() { clock_.startCaptureClock(); }
-    DisplayCloneControl& control() override { return capture_; }
-    ContextID layer(Shown which) override { return which == Shown::First ? first_.context() : second_.context(); }
-    void capture() override {
-        if (source_) return;
-        source_ = capture_.makeSource({640, 480}, MediaTime::make(1, 60));
+    PortCloneWorld() {
+        clock_.startCaptureClock();
         source_->setDelegate(frames_);
         source_->openGate();
         source_->start();
     }
-    bool shows(Shown what) override {
-        return frames_->waitFor([what](const test::CapturedFrames::Frames& frames) {
-            if (frames.empty()) return false;
-            const test::CapturedFrame& last = frames.back();
-            if (what == Shown::Screen) return last.colour == kScreenMiddle && !last.oneColour;
-            return last.oneColour && last.colour == (what == Shown::First ? kRed : kGreen);
+    DisplayCloneControl& control() override { return capture_; }
+    ContextID first() override { return first_.context(); }
+    ContextID second() override { return second_.context(); }
+    bool shows(ContextID window) override {
+        return frames_->waitForColour(window == first_.context() ? kRed : kGreen);
+    }
+    // Both windows at their places, and the empty screen between them.
+    bool showsTheScreen() override {
+        frames_->keepPlanes = true;
+        return frames_->waitFor([](const test::CapturedFrames::Frames& got) {
+            if (got.empty() || !got.back().plane) return false;
+            const SharedPlane& plane = *got.back().plane;
+            return test::colourAt(plane, 50, 50) == kRed && test::colourAt(plane, 250, 50) == kGreen &&
+                   test::colourAt(plane, 190, 50) == 0;
         });
+    }
+    // Whatever is drawn, nothing is delivered until something is to be shown again.
+    bool showsNothing() override {
+        const test::TestWindow probe(display_.name(), {.place = {0, 0, 400, 300}, .colour = 0x123456});
+        first_.paint(kRed);
+        const std::size_t before = frames_->count();
+        // A source of another maker sees the screen meanwhile.
+        X11DisplayCapture other(display_.name(), clock_, scheduler_);
+        other.setMirroringMode(DisplayCloneControl::kMirrorDisplay);
+        const auto seen = std::make_shared<test::CapturedFrames>();
+        const auto source = other.makeSource({400, 300}, MediaTime::make(1, 60));
+        source->setDelegate(seen);
+        source->openGate();
+        source->start();
+        if (!seen->waitForCount(3)) return false;  // more than a second: it is still
+        return frames_->count() <= before + 1;
     }
 
 private:
-    static constexpr std::uint32_t kRed = 0xC01020, kGreen = 0x10B030, kScreenMiddle = kGreen;
-
-    test::PrivateDisplay display_{"640x480x24"};
-    // Both are as large as a frame, so that each layer alone is one colour.
-    test::TestWindow first_{display_.name(), {.place = {0, 0, 640, 480}, .colour = kRed}};
-    test::TestWindow second_{display_.name(), {.place = {320, 0, 640, 480}, .colour = kGreen}};
+    test::PrivateDisplay display_{"400x300x24"};
+    test::TestWindow first_{display_.name(), {.place = {0, 0, 160, 120}, .colour = kRed}};
+    test::TestWindow second_{display_.name(), {.place = {220, 0, 160, 120}, .colour = kGreen}};
     LinuxClock clock_;
-    std::shared_ptr<ThreadLoop> loop_ = std::make_shared<ThreadLoop>();
+    const std::shared_ptr<ThreadLoop> loop_ = std::make_shared<ThreadLoop>();
     ThreadScheduler scheduler_{loop_};
     RunningThreadLoop running_{*loop_};
     X11DisplayCapture capture_{display_.name(), clock_, scheduler_};
-    std::shared_ptr<test::CapturedFrames> frames_ = std::make_shared<test::CapturedFrames>();
-    std::shared_ptr<DisplayCaptureSource> source_;
+    const std::shared_ptr<test::CapturedFrames> frames_ = std::make_shared<test::CapturedFrames>();
+    const std::shared_ptr<DisplayCaptureSource> source_ = capture_.makeSource({400, 300}, MediaTime::make(1, 60));
 };
 
-using Maker = std::function<std::unique_ptr<CloneControlWorld>()>;
+using Maker = std::function<std::unique_ptr<CloneWorld>()>;
 
 class DisplayCloneControlContract : public ::testing::TestWithParam<Maker> {
 protected:
-    std::unique_ptr<CloneControlWorld> world_ = GetParam()();
+    const std::unique_ptr<CloneWorld> world_ = GetParam()();
     DisplayCloneControl& control_ = world_->control();
 };
 
-TEST_P(DisplayCloneControlContract, ALayerThatWasChosenIsShown) {
-    control_.setContexts({world_->layer(Shown::Second)});
-    control_.setMirroringMode(DisplayCloneControl::kCloneContexts);
-    world_->capture();
-    EXPECT_TRUE(world_->shows(Shown::Second));
-}
+TEST_P(DisplayCloneControlContract, ShowsNothingAtFirst) { EXPECT_TRUE(world_->showsNothing()); }
 
-TEST_P(DisplayCloneControlContract, ALayerIsShownAloneThoughOthersLieOnIt) {
-    control_.setMirroringMode(DisplayCloneControl::kCloneContexts);
-    control_.setContexts({world_->layer(Shown::First)});
-    world_->capture();
-    EXPECT_TRUE(world_->shows(Shown::First));
-}
-
-TEST_P(DisplayCloneControlContract, TheWholeScreenIsShownWhenItIsMirrored) {
+TEST_P(DisplayCloneControlContract, ShowsTheScreen) {
     control_.setMirroringMode(DisplayCloneControl::kMirrorDisplay);
-    world_->capture();
-    EXPECT_TRUE(world_->shows(Shown::Screen));
+    EXPECT_TRUE(world_->showsTheScreen());
 }
 
-TEST_P(DisplayCloneControlContract, AnotherChoiceCountsForASourceThatRuns) {
-    control_.setContexts({world_->layer(Shown::First)});
+TEST_P(DisplayCloneControlContract, ShowsTheContextsAndFollowsTheirChange) {
+    control_.setContexts({world_->first()});
     control_.setMirroringMode(DisplayCloneControl::kCloneContexts);
-    world_->capture();
-    ASSERT_TRUE(world_->shows(Shown::First));
-    control_.setContexts({world_->layer(Shown::Second)});
-    EXPECT_TRUE(world_->shows(Shown::Second));
-    control_.setMirroringMode(DisplayCloneControl::kMirrorDisplay);
-    EXPECT_TRUE(world_->shows(Shown::Screen));
+    EXPECT_TRUE(world_->shows(world_->first()));
+    control_.setContexts({world_->second()});
+    EXPECT_TRUE(world_->shows(world_->second()));
+}
+
+TEST_P(DisplayCloneControlContract, ShowsNothingOnceItIsOff) {
+    control_.setContexts({world_->first()});
     control_.setMirroringMode(DisplayCloneControl::kCloneContexts);
-    EXPECT_TRUE(world_->shows(Shown::Second));
+    EXPECT_TRUE(world_->shows(world_->first()));
+    control_.setMirroringMode(DisplayCloneControl::kOff);
+    EXPECT_TRUE(world_->showsNothing());
+}
+
+TEST_P(DisplayCloneControlContract, TakesChangesFromAnyLane) {
+    std::vector<std::thread> lanes;
+    for (int lane = 0; lane < 4; ++lane)
+        lanes.emplace_back([this, lane] {
+            for (int i = 0; i < 200; ++i) {
+                control_.setContexts({lane % 2 == 0 ? world_->first() : world_->second()});
+                control_.setMirroringMode(i % 2 == 0 ? DisplayCloneControl::kOff : DisplayCloneControl::kCloneContexts);
+            }
+        });
+    for (std::thread& lane : lanes) lane.join();
+    control_.setContexts({world_->second()});
+    EXPECT_TRUE(world_->shows(world_->second()));
 }
 
 INSTANTIATE_TEST_SUITE_P(Fake, DisplayCloneControlContract,
-                         ::testing::Values(Maker([] { return std::make_unique<FakeCloneControlWorld>(); })));
+                         ::testing::Values([] { return std::make_unique<FakeCloneWorld>(); }));
 INSTANTIATE_TEST_SUITE_P(Port, DisplayCloneControlContract,
-                         ::testing::Values(Maker([] { return std::make_unique<PortCloneControlWorld>(); })));
+                         ::testing::Values([] { return std::make_unique<PortCloneWorld>(); }));
 
 }  // namespace
 }  // namespace lumacast
