@@ -1,6 +1,7 @@
 #include "linux/media/MovieFile.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -34,6 +35,12 @@ public:
             return errno == EINVAL || errno == EROFS ? 0 : errno;  // not a file that can be synced
         }
         return 0;
+    }
+
+    void removeName(const std::string& path) override {
+        struct stat own {}, named {};
+        if (::fstat(descriptor_, &own) != 0 || ::lstat(path.c_str(), &named) != 0) return;
+        if (own.st_dev == named.st_dev && own.st_ino == named.st_ino) ::unlink(path.c_str());
     }
 
 private:

@@ -15,6 +15,8 @@ public:
     [[nodiscard]] virtual int write(std::uint64_t offset, std::span<const std::uint8_t> bytes) = 0;
     /// What was written is on the disk when this returns.
     [[nodiscard]] virtual int sync() = 0;
+    /// Takes the name `path` away if it still is this file's.
+    virtual void removeName(const std::string& path) = 0;
 };
 
 /// Creates movie files; the seam at which tests put disks that are full, slow or broken.

@@ -79,6 +79,7 @@ public:
         disk_.syncs_ += 1;
         return disk_.syncError_;
     }
+    void removeName(const std::string& path) override { real_->removeName(path); }
 
 private:
     FaultyFiles& disk_;

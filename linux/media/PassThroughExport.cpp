@@ -1,0 +1,151 @@
+#include "linux/media/PassThroughExport.h"
+
+#include <algorithm>
+#include <limits>
+#include <utility>
+#include <vector>
+
+#include "linux/media/MovieSource.h"
+#include "linux/media/PictureTrack.h"
+#include "linux/media/SoundTrack.h"
+#include "linux/media/mp4/MovieBoxWriter.h"
+
+namespace lumacast::media {
+
+namespace {
+
+/// Sound that a decoder wants before the first sound that is heard: two packets of AAC, and a third for rounding.
+constexpr std::int64_t kSoundLeadNanoseconds = 70'000'000;
+/// How far tracks may lie apart in a file; past the range by so much nothing of it follows.
+constexpr std::int64_t kInterleavingNanoseconds = 10'000'000'000;
+
+/// Writes at once, and brings the file onto the disk only at the end: a copy that is lost can be made again.
+class ExportSink final : public mp4::BoxSink {
+public:
+    explicit ExportSink(MovieFile& file) : file_(file) {}
+    bool append(std::span<const std::uint8_t> bytes) override {
+        const std::uint64_t offset = std::exchange(end_, end_ + bytes.size());
+        return overwrite(offset, bytes);
+    }
+    bool overwrite(std::uint64_t offset, std::span<const std::uint8_t> bytes) override {
+        if (error_ == 0) error_ = file_.write(offset, bytes);
+        return error_ == 0;
+    }
+    bool sync() override { return error_ == 0; }
+    int error() const { return error_; }
+
+private:
+    MovieFile& file_;
+    std::uint64_t end_ = 0;
+    int error_ = 0;
+};
+
+/// A range in nanoseconds.
+struct Span {
+    std::int64_t start = 0;
+    std::int64_t end = 0;
+};
+
+std::variant<Span, Error> spanOf(const ExportPlan& plan, std::int64_t movieDuration) {
+    if (!plan.range) return Span{0, movieDuration};
+    const auto start = nanosecondsOf(plan.range->start);
+    const auto end = nanosecondsOf(add(plan.range->start, plan.range->duration));
+    const bool isInside = start && end && *start >= 0 && *end > *start && *end <= movieDuration;
+    if (!isInside) return systemError(EINVAL);
+    return Span{*start, *end};
+}
+
+std::int64_t nanosecondsOfTicks(std::int64_t ticks, int timescale) {
+    return av_rescale(ticks, 1'000'000'000, timescale);
+}
+
+/// One export while it runs.
+class Copy final {
+public:
+    Copy(MovieSource& source, ExportSink& sink, Span span, const std::atomic<bool>& cancelled)
+        : source_(source), sink_(sink), span_(span), cancelled_(cancelled), movie_(sink, options(span)) {}
+
+    ExportResult run() {
+        if (!source_.declareTracks(movie_, ids_)) return failed(systemError(ENOTSUP));
+        if (const auto error = movieError(movie_.start())) return failed(*error);
+        keyFrame_ = source_.keyFrameBefore(span_.start);
+        if (const auto error = source_.seek(span_.start - kSoundLeadNanoseconds)) return failed(*error);
+        std::vector<bool> passed(source_.tracks().size());
+        for (;;) {
+            if (cancelled_.load(std::memory_order_relaxed)) return {ExportStatus::Cancelled, std::nullopt};
+            auto next = source_.read();
+            if (auto* const error = std::get_if<Error>(&next)) return failed(*error);
+            const auto& sample = std::get<0>(next);
+            if (!sample) break;
+            const int timescale = source_.tracks()[sample->track].timescale;
+            const std::int64_t begin = nanosecondsOfTicks(sample->stamp, timescale);
+            if (begin >= span_.end + kInterleavingNanoseconds) break;
+            if (begin >= span_.end) {
+                passed[sample->track] = true;
+                if (std::all_of(passed.begin(), passed.end(), [](bool is) { return is; })) break;
+                continue;
+            }
+            if (const auto error = copy(*sample, timescale)) return failed(*error);
+        }
+        const auto error = movieError(movie_.finish(lastPictureEnd_, span_.end));
+        return error ? failed(*error) : ExportResult{ExportStatus::Completed, std::nullopt};
+    }
+
+private:
+    static mp4::MovieOptions options(const Span& span) {
+        mp4::MovieOptions options;
+        options.presentationStart = span.start;
+        return options;
+    }
+
+    std::optional<Error> copy(const MovieSource::Sample& sample, int timescale) {
+        const bool isVideo = source_.tracks()[sample.track].isVideo;
+        const std::int64_t end = sample.stamp + sample.duration;
+        const bool isNeeded = isVideo ? !keyFrame_ || sample.stamp >= *keyFrame_
+                                      : nanosecondsOfTicks(end, timescale) > span_.start - kSoundLeadNanoseconds;
+        if (!isNeeded) return std::nullopt;
+        if (sample.duration < 0 || sample.duration > std::numeric_limits<std::uint32_t>::max()) return systemError(EPROTO);
+        if (isVideo) lastPictureEnd_ = end;
+        const auto result = movie_.addSample(
+            ids_[sample.track], {sample.stamp, static_cast<std::uint32_t>(sample.duration), sample.isKeyFrame}, sample.bytes);
+        // What a recording may leave out, a copy must not.
+        const bool isRefused = result != mp4::MovieError::none && result != mp4::MovieError::sinkFailed;
+        return isRefused ? systemError(EPROTO) : movieError(result);
+    }
+
+    ExportResult failed(Error error) const {
+        return {ExportStatus::Failed, sink_.error() != 0 ? systemError(sink_.error()) : std::move(error)};
+    }
+
+    MovieSource& source_;
+    ExportSink& sink_;
+    const Span span_;
+    const std::atomic<bool>& cancelled_;
+    mp4::MovieBoxWriter movie_;
+    std::vector<mp4::TrackId> ids_;
+    std::optional<std::int64_t> keyFrame_;
+    std::int64_t lastPictureEnd_ = 0;
+};
+
+}  // namespace
+
+ExportResult exportMovie(const ExportPlan& plan, MovieFiles& files, const std::atomic<bool>& cancelled) {
+    auto opened = MovieSource::open(plan.source);
+    if (auto* const error = std::get_if<Error>(&opened)) return {ExportStatus::Failed, *error};
+    MovieSource& source = *std::get<0>(opened);
+    const auto span = spanOf(plan, source.duration());
+    if (auto* const error = std::get_if<Error>(&span)) return {ExportStatus::Failed, *error};
+
+    auto made = files.create(plan.destination);
+    if (auto* const error = std::get_if<int>(&made)) return {ExportStatus::Failed, systemError(*error)};
+    MovieFile& file = *std::get<0>(made);
+    ExportSink sink(file);
+    ExportResult result = Copy(source, sink, std::get<Span>(span), cancelled).run();
+    if (result.status == ExportStatus::Completed) {
+        if (const int error = file.sync(); error != 0) result = {ExportStatus::Failed, systemError(error)};
+    }
+    if (result.status != ExportStatus::Completed) file.removeName(plan.destination);
+    return result;
+}
+
+}  // namespace lumacast::media
