@@ -20,10 +20,9 @@ public:
     virtual ~WriterWorld() = default;
     virtual ContainerWriters& writers() = 0;
     virtual bool fileExists(const URL& url) = 0;
+    virtual URL url(const std::string& name = "movie.mp4") const = 0;
 
     HandClock clock;
-    OwnDirectory directory;
-    virtual URL url(const std::string& name = "movie.mp4") const { return URL::file(directory.file(name)); }
 };
 
 class FakeWriterWorld final : public WriterWorld {
@@ -42,12 +41,13 @@ private:
 
 class PortWriterWorld final : public WriterWorld {
 public:
-    PortWriterWorld() : writers_(clock) {}
     ContainerWriters& writers() override { return writers_; }
     bool fileExists(const URL& url) override { return std::filesystem::exists(url.path()); }
+    URL url(const std::string& name) const override { return URL::file(directory_.file(name)); }
 
 private:
-    LinuxContainerWriters writers_;
+    OwnDirectory directory_;
+    LinuxContainerWriters writers_{clock};
 };
 
 using Maker = std::function<std::unique_ptr<WriterWorld>()>;
