@@ -102,7 +102,7 @@ void writeSampleTables(BoxBuffer& out, const SampleIndex& index) {
 }
 
 std::size_t sampleTableBytes(const SampleIndex& index) {
-    constexpr std::size_t kHeaders = 100;  // five tables, 20 bytes at most
+    constexpr std::size_t kHeaders = 100;           // five tables, 20 bytes at most
     constexpr std::size_t kBytesPerSample = 8 + 4;  // stts without runs, stsz
     constexpr std::size_t kBytesPerChunk = 12 + 8;  // stsc without runs, co64
     return kHeaders + index.count() * kBytesPerSample + index.syncCount() * 4 +
