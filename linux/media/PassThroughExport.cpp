@@ -9,6 +9,7 @@
 #include "linux/media/PictureTrack.h"
 #include "linux/media/SoundTrack.h"
 #include "linux/media/mp4/MovieBoxWriter.h"
+#include "linux/media/mp4/Ticks.h"
 
 namespace lumacast::media {
 
@@ -105,9 +106,15 @@ private:
                                       : nanosecondsOfTicks(end, timescale) > span_.start - kSoundLeadNanoseconds;
         if (!isNeeded) return std::nullopt;
         if (sample.duration < 0 || sample.duration > std::numeric_limits<std::uint32_t>::max()) return systemError(EPROTO);
-        if (isVideo) lastPictureEnd_ = end;
+        std::int64_t stamp = sample.stamp;
+        if (isVideo) {
+            // The picture that is on show when the range begins begins with it: players drop what begins before an edit.
+            const std::int64_t start = mp4::rescale(span_.start, mp4::kNanosecondTimescale, static_cast<std::uint32_t>(timescale));
+            if (stamp < start && end > start) stamp = start;
+            lastPictureEnd_ = end;
+        }
         const auto result = movie_.addSample(
-            ids_[sample.track], {sample.stamp, static_cast<std::uint32_t>(sample.duration), sample.isKeyFrame}, sample.bytes);
+            ids_[sample.track], {stamp, static_cast<std::uint32_t>(end - stamp), sample.isKeyFrame}, sample.bytes);
         // What a recording may leave out, a copy must not.
         const bool isRefused = result != mp4::MovieError::none && result != mp4::MovieError::sinkFailed;
         return isRefused ? systemError(EPROTO) : movieError(result);
