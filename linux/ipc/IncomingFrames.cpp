@@ -75,7 +75,8 @@ IncomingFrames::Next IncomingFrames::next(Frame& frame, const char*& reason) {
         descriptors_.pop_front();
     }
     unread_ = unread_.subspan(frame.header.frameBytes());
-    return Next::Frame;
+    // Descriptors of a later message come with its first byte: without one these are this message's, and undeclared.
+    return unread_.empty() && !descriptors_.empty() ? Next::Malformed : Next::Frame;
 }
 
 void IncomingFrames::endTurn() {

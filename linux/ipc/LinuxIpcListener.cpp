@@ -134,6 +134,7 @@ Reactor::Again LinuxIpcListener::acceptFromService() {
             admit(std::move(socket));
         } else if (errno == EMFILE || errno == ENFILE) {
             refuseForLackOfDescriptors();
+            break;
         } else if (errno != EINTR && errno != ECONNABORTED) {
             break;
         }
@@ -143,9 +144,9 @@ Reactor::Again LinuxIpcListener::acceptFromService() {
 
 /// Without this the connection would stay at the door and keep the loop awake for nothing.
 void LinuxIpcListener::refuseForLackOfDescriptors() {
-    core_->log.error("IPC: a connection was refused: no descriptor is left");
     core_->spare.reset();
-    Fd refused(accept4(service_.descriptor(), nullptr, nullptr, SOCK_CLOEXEC));
+    Fd refused(accept4(service_.descriptor(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+    if (refused) core_->log.error("IPC: a connection was refused: no descriptor is left");
     refused.reset();
     core_->spare.reset(open("/dev/null", O_RDONLY | O_CLOEXEC));
 }

@@ -49,7 +49,11 @@ public:
     }
     IpcPort(const IpcPort&) = delete;
     IpcPort& operator=(const IpcPort&) = delete;
-    ~IpcPort() {
+    ~IpcPort() { stop(); }
+
+    /// Ends the reactor; nothing is delivered any more.
+    void stop() {
+        if (!thread_.joinable()) return;
         reactor.requestStop();
         thread_.join();
     }

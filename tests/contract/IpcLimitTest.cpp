@@ -1,0 +1,152 @@
+// Every limit is kept: one overflow for each row of the table.
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <array>
+
+#include "tests/contract/IpcHostileWorld.h"
+
+namespace lumacast {
+namespace {
+
+using ::testing::HasSubstr;
+
+/// One overflow for each row of the table. A new row without its case here does not compile.
+class IpcLimitTest : public IpcHostileTest, public ::testing::WithParamInterface<LimitRow> {
+protected:
+    void overflow(Limit limit) {
+        RawPeer peer(path());
+        switch (limit) {
+            case Limit::MessageBytes: {
+                FrameHeader header = setMicrophone(1);
+                header.valueBytes = static_cast<std::uint32_t>(limitOf(limit) + 1 - kFrameHeaderBytes);
+                peer.hello();
+                peer.send(rawFrame(header, {}, {}, true));
+                return expectDropped(peer, "over the size limit");
+            }
+            case Limit::MessageDepth:
+                peer.hello();
+                peer.send(rawFrame(setMicrophone(1), nestedArrays(limitOf(limit))));
+                expectDropped(peer, "other types");  // as deep as the limit is read
+                peer = RawPeer(path());
+                peer.hello();
+                peer.send(rawFrame(setMicrophone(1), nestedArrays(limitOf(limit) + 1)));
+                return expectDropped(peer, "malformed message", 1);
+            case Limit::HandlesPerMessage:
+                peer.hello();
+                peer.send(rawFrame(setMicrophone(1), kTrue), std::vector<int>(limitOf(limit) + 1, 0));
+                return expectDropped(peer, "too many descriptors");
+            case Limit::ConnectionsPerUser: return overflowConnections();
+            case Limit::MessagesInFlight: return overflowRequests(peer);
+            case Limit::QueuedBytesPerReader: return overflowReplies(peer);
+            case Limit::ContextIdentifiersPerRequest: return overflowContextIdentifiers(peer);
+            case Limit::HelloBytes:
+                peer.send(helloWith(12, static_cast<std::uint8_t>(limitOf(limit) + 1)));
+                return expectDropped(peer, "its hello is too long");
+            case Limit::PlanesLeased: return overflowLeases(peer);
+        }
+        FAIL() << "no overflow for this limit";
+    }
+
+    void overflowConnections() {
+        std::vector<RawPeer> peers;
+        // The friendly client and the one that the caller made have a place each.
+        for (std::uint64_t i = 2; i < limitOf(Limit::ConnectionsPerUser); ++i) {
+            ASSERT_TRUE(peers.emplace_back(path()).hello());
+            if (i % 100 == 0) { ASSERT_TRUE(isServed()); }
+        }
+        expectHello(peers.back());
+        RawPeer excess(path());
+        expectDropped(excess, "has too many");
+        peers.pop_back();
+        ASSERT_TRUE(until([&] {
+            RawPeer next(path());
+            return next.hello() && next.read(kHelloBytes) == makeHello();
+        })) << "a closed connection makes room";
+    }
+
+    void overflowRequests(RawPeer& peer) {
+        object->onMessage.set({});
+        peer.hello();
+        for (std::uint64_t i = 1; i <= limitOf(Limit::MessagesInFlight); ++i)
+            peer.send(message(DaemonMessage::SynchronousGetCurrentState, {}, i));
+        ASSERT_TRUE(until([&] { return object->count() == 1 + limitOf(Limit::MessagesInFlight); }));
+        EXPECT_TRUE(lines().empty()) << "the limit itself is fine";
+        answerState();
+        peer.send(message(DaemonMessage::SynchronousGetCurrentState, {}, 1 + limitOf(Limit::MessagesInFlight)));
+        expectDropped(peer, "too many requests in flight");
+    }
+
+    void overflowReplies(RawPeer& peer) {
+        object->onMessage.set([](const auto&, const IpcReply& reply) {
+            reply({Dictionary{{"k", Data(limitOf(Limit::MessageBytes) / 2)}}});
+        });
+        peer.hello();
+        const std::uint64_t enough = 4 * limitOf(Limit::QueuedBytesPerReader) / limitOf(Limit::MessageBytes);
+        for (std::uint64_t i = 1; i <= enough; ++i) peer.send(message(DaemonMessage::SynchronousGetCurrentState, {}, i));
+        ASSERT_TRUE(until([&] { return !lines().empty(); }));
+        expectLine("it does not read its replies");
+    }
+
+    void overflowContextIdentifiers(RawPeer& peer) {
+        const auto start = [](std::uint64_t count) {
+            const Array ids(count, Value(std::uint32_t{1}));
+            return Array{ids, Array{1.0, 1.0}, false, false, false, false, false, Value()};
+        };
+        object->onMessage.set({});
+        peer.hello();
+        peer.send(message(DaemonMessage::StartRecording, start(limitOf(Limit::ContextIdentifiersPerRequest)), 1));
+        ASSERT_TRUE(until([&] { return object->count() == 2; }));
+        answerState();
+        peer.send(message(DaemonMessage::StartRecording, start(limitOf(Limit::ContextIdentifiersPerRequest) + 1), 2));
+        expectDropped(peer, "other types");
+    }
+
+    void overflowLeases(RawPeer& peer) {
+        // The peer never gives one back.
+        peer.hello();
+        peer.send(message(DaemonMessage::PauseRecording, {}, 1));
+        ASSERT_TRUE(until([&] { return object->count() == 2; }));
+        const auto connection = object->received.get().back().connection.lock();
+        ASSERT_TRUE(connection);
+        std::vector<std::weak_ptr<SharedPlane>> planes;
+        Outcome outcome;
+        for (std::uint64_t i = 0; i < limitOf(Limit::PlanesLeased) + 3; ++i) {
+            const auto plane = std::make_shared<PlainPlane>(4, 4);
+            planes.push_back(plane);
+            connection->remoteProxy(outcome.onError())
+                ->send(static_cast<std::uint16_t>(ClientMessage::CaptureHandlerWithSample),
+                       {Value(Value::PlaneRef(plane)), Data{}});
+        }
+        ASSERT_TRUE(until([&] { return outcome.errorCount() == 3; }));
+        for (std::uint64_t i = 0; i < planes.size(); ++i)
+            EXPECT_EQ(planes[i].expired(), i >= limitOf(Limit::PlanesLeased)) << i;
+        peer.close();
+        EXPECT_TRUE(until([&] { return planes.front().expired(); }));
+    }
+
+    void expectLine(std::string_view reason) {
+        EXPECT_EQ(lines().size(), 1u);
+        EXPECT_THAT(lines().front(), HasSubstr(std::string(reason)));
+        answerState();
+        EXPECT_TRUE(isServed());
+    }
+};
+
+TEST_P(IpcLimitTest, IsKept) {
+    ASSERT_TRUE(isServed());
+    overflow(GetParam().limit);
+}
+
+std::string limitName(const ::testing::TestParamInfo<LimitRow>& info) {
+    constexpr std::array kNames{"MessageBytes",     "MessageDepth",         "HandlesPerMessage",
+                                "ConnectionsPerUser", "MessagesInFlight",   "QueuedBytesPerReader",
+                                "ContextIdentifiersPerRequest", "HelloBytes", "PlanesLeased"};
+    static_assert(kNames.size() == kLimits.size());
+    return kNames.at(static_cast<std::size_t>(info.param.limit));
+}
+INSTANTIATE_TEST_SUITE_P(Row, IpcLimitTest, ::testing::ValuesIn(kLimits), limitName);
+
+}  // namespace
+}  // namespace lumacast
