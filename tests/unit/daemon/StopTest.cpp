@@ -1,0 +1,210 @@
+// Stopping, discarding, pausing and resuming, and the reports of sessions that stopped by themselves.
+
+#include "tests/unit/daemon/DaemonWorld.h"
+
+namespace lumacast {
+namespace {
+
+using std::chrono::milliseconds;
+using std::chrono::seconds;
+
+class Stop : public DaemonWorld {
+protected:
+    TestClient::AskedRef stopped(TestClient& client) {
+        auto asked = client.ask(DaemonMessage::StopRecording);
+        settle();
+        return asked;
+    }
+    void tell(TestClient& client, DaemonMessage message, Array arguments = {}) {
+        fakes_.logSink.clear();
+        client.tell(message, std::move(arguments));
+        settle();
+    }
+};
+
+TEST_F(Stop, AStopIsAnsweredWithTheMovieAndThenTheStateIsReset) {
+    const auto client = makeRecording();
+    advance(seconds(2));
+    const auto asked = stopped(*client);
+    ASSERT_EQ(asked->answers, 1);
+    ASSERT_TRUE(asked->url(0));
+    EXPECT_EQ(asked->url(0)->path(), pathOf("Player"));
+    EXPECT_TRUE(asked->values[1].isNull());
+    EXPECT_NEAR(fakes_.fileSystem.movie(pathOf("Player"))->duration().seconds(), 2, 0.1);
+    EXPECT_FALSE(session(*client)->isRecording());
+    EXPECT_EQ(fakes_.keepAlive.open(), 0);
+    EXPECT_TRUE(client->told.empty());
+    EXPECT_EQ(logged("LCRecordingManager:resetStatesForSession:"), 1u);
+}
+
+TEST_F(Stop, AStopOfAnIdleSessionIsNeverAnswered) {
+    const auto client = makeConnected();
+    fakes_.logSink.clear();
+    const auto asked = stopped(*client);
+    advance(seconds(10));
+    EXPECT_EQ(asked->answers, 0);
+    EXPECT_EQ(fakes_.logSink.logged(),
+              (Lines{"LCRecordingManager: stopRecordingWithHandler:",
+                     "LCRecordingManager: stopRecordingWithStartTimeOffset:endTimeOffset:handler:",
+                     "LCRecordingManager: stopRecordingSession:handler:"}));
+}
+
+TEST_F(Stop, ASecondStopIsNeverAnswered) {
+    const auto client = makeRecording();
+    const auto first = client->ask(DaemonMessage::StopRecording), second = client->ask(DaemonMessage::StopRecording);
+    advance(seconds(1));
+    EXPECT_EQ(first->answers, 1);
+    EXPECT_EQ(second->answers, 0);
+}
+
+TEST_F(Stop, AStopWithClipDurationsGivesAClip) {
+    const auto client = makeRecording();
+    advance(seconds(10));
+    const auto asked = client->ask(DaemonMessage::StopRecordingWithClipDurations, {2.4, 3.6});
+    settle();
+    ASSERT_TRUE(asked->url(0));
+    EXPECT_EQ(asked->url(0)->path(), pathOf("Player_trimmed"));
+    EXPECT_NEAR(fakes_.fileSystem.movie(pathOf("Player_trimmed"))->duration().seconds(), 4, 0.1);
+    EXPECT_EQ(logged("LCRecordingManager: stopRecordingWithHandler:"), 0u);
+    EXPECT_EQ(logged("LCRecordingManager: stopRecordingWithStartTimeOffset:endTimeOffset:handler:"), 1u);
+}
+
+TEST_F(Stop, AStopWhoseClipCannotBeMadeHoldsItsTransactionUntilTheNextStart) {
+    const auto client = makeRecording();
+    advance(seconds(10));
+    fakes_.faults.failNext("MovieExporter.export");
+    const auto asked = client->ask(DaemonMessage::StopRecordingWithClipDurations, {1.0, 1.0});
+    advance(seconds(10));
+    EXPECT_EQ(asked->answers, 0);
+    EXPECT_EQ(fakes_.keepAlive.open(), 1);
+    const auto start = client->start();
+    settle();
+    EXPECT_EQ(start->code(), 0);
+    EXPECT_EQ(fakes_.keepAlive.open(), 1);
+    stopped(*client);
+    EXPECT_EQ(fakes_.keepAlive.open(), 0);
+    EXPECT_FALSE(fakes_.keepAlive.endedWithoutBegin());
+}
+
+TEST_F(Stop, AClientThatLeavesAfterAnUnansweredStopClosesItsTransaction) {
+    const auto client = makeRecording();
+    advance(seconds(10));
+    fakes_.faults.failNext("MovieExporter.export");
+    client->ask(DaemonMessage::StopRecordingWithClipDurations, {1.0, 1.0});
+    advance(seconds(1));
+    client->die();
+    settle();
+    EXPECT_EQ(fakes_.keepAlive.open(), 0);
+}
+
+TEST_F(Stop, ADiscardWhileRecordingIsNeverAnswered) {
+    const auto client = makeRecording();
+    const auto asked = client->ask(DaemonMessage::DiscardRecording);
+    advance(seconds(10));
+    EXPECT_EQ(asked->answers, 0);
+    EXPECT_TRUE(session(*client)->isRecording());
+    EXPECT_EQ(fakes_.logSink.logged(), (Lines{"LCRecordingManager: discardRecording",
+                                              "can't discard recording while recording is in progress"}));
+}
+
+TEST_F(Stop, ADiscardAfterwardsDeletesTheMovieAndAnswersWithNothing) {
+    const auto client = makeRecording();
+    stopped(*client);
+    ASSERT_TRUE(fakes_.fileSystem.exists(pathOf("Player")));
+    const auto asked = client->ask(DaemonMessage::DiscardRecording);
+    settle();
+    EXPECT_EQ(asked->answers, 1);
+    EXPECT_TRUE(asked->values.empty());
+    EXPECT_FALSE(fakes_.fileSystem.exists(pathOf("Player")));
+}
+
+TEST_F(Stop, AFailedSourceTellsTheClientOnceAndResets) {
+    const auto client = makeRecording();
+    fakes_.displayCapture.lastSource()->fail(-1);
+    settle();
+    EXPECT_EQ(client->toldOfStop(-5817), 1);
+    EXPECT_EQ(client->told.size(), 1u);
+    EXPECT_TRUE(client->told[0].arguments[1].isNull());
+    EXPECT_FALSE(session(*client)->isRecording());
+    EXPECT_EQ(fakes_.keepAlive.open(), 0);
+    EXPECT_EQ(logged("LCRecordingManager:recordingSessionStoppedWithError:movieURL:"), 1u);
+}
+
+TEST_F(Stop, APauseHoldsTheRecordingAndAResumeGoesOn) {
+    const auto client = makeRecording();
+    advance(seconds(1));
+    tell(*client, DaemonMessage::PauseRecording);
+    EXPECT_TRUE(session(*client)->isPaused());
+    EXPECT_EQ(fakes_.logSink.logged(), (Lines{"LCRecordingManager:pauseRecording", "LCRecordingSession: pauseSession",
+                                              "LCRecordingSession: stopAllCapture", "Stop mirroring"}));
+    advance(seconds(30));
+    tell(*client, DaemonMessage::ResumeRecording, {number(client->window)});
+    EXPECT_FALSE(session(*client)->isPaused());
+    EXPECT_EQ(logged("LCRecordingManager: resumeRecording"), 1u);
+    advance(seconds(2));
+    const auto asked = stopped(*client);
+    ASSERT_TRUE(asked->url(0));
+    EXPECT_NEAR(fakes_.fileSystem.movie(pathOf("Player"))->duration().seconds(), 3, 0.1);
+}
+
+TEST_F(Stop, APauseIsIgnoredWhenIdleWhenPausedAndForASystemRecording) {
+    const auto client = makeConnected();
+    tell(*client, DaemonMessage::PauseRecording);
+    EXPECT_EQ(fakes_.logSink.logged(), Lines{"LCRecordingManager:pauseRecording"});
+    client->start();
+    settle();
+    session(*client)->setSystemRecording(true);
+    tell(*client, DaemonMessage::PauseRecording);
+    EXPECT_EQ(fakes_.logSink.logged(), Lines{"LCRecordingManager:pauseRecording"});
+    EXPECT_FALSE(session(*client)->isPaused());
+    session(*client)->setSystemRecording(false);
+    tell(*client, DaemonMessage::PauseRecording);
+    tell(*client, DaemonMessage::PauseRecording);
+    EXPECT_EQ(fakes_.logSink.logged(), Lines{"LCRecordingManager:pauseRecording"});
+}
+
+TEST_F(Stop, AResumeOfWhatIsNotPausedOnlyLogs) {
+    const auto client = makeRecording();
+    tell(*client, DaemonMessage::ResumeRecording, {number(client->window)});
+    EXPECT_EQ(fakes_.logSink.logged(), Lines{"LCRecordingManager: resumeRecording"});
+    EXPECT_TRUE(session(*client)->isRecording());
+}
+
+TEST_F(Stop, AResumeWithAForeignWindowStopsAPausedRecordingAndReportsIt) {
+    const auto other = makeConnected("Editor", 501, 8);
+    const auto client = makeRecording();
+    advance(seconds(1));
+    tell(*client, DaemonMessage::PauseRecording);
+    tell(*client, DaemonMessage::ResumeRecording, {number(other->window)});
+    EXPECT_EQ(client->toldOfStop(-5816), 1);
+    ASSERT_EQ(client->told.size(), 1u);
+    EXPECT_EQ(client->told[0].arguments[1], Value(URL::file(pathOf("Player"))));
+    EXPECT_FALSE(session(*client)->isRecording());
+    EXPECT_FALSE(session(*client)->isPaused());
+    EXPECT_EQ(fakes_.keepAlive.open(), 0);
+    EXPECT_EQ(logged("LCRecordingManager: resumeRecording"), 0u);
+}
+
+TEST_F(Stop, AResumeWithAForeignWindowOfWhatIsNotPausedDoesNothing) {
+    const auto other = makeConnected("Editor", 501, 8);
+    const auto client = makeRecording();
+    tell(*client, DaemonMessage::ResumeRecording, {number(other->window)});
+    EXPECT_TRUE(fakes_.logSink.logged().empty());
+    EXPECT_TRUE(session(*client)->isRecording());
+    EXPECT_TRUE(client->told.empty());
+}
+
+TEST_F(Stop, AResumeOfABroadcastDoesNothingAtAll) {
+    const auto other = makeConnected("Editor", 501, 8);
+    const auto client = makeRecording();
+    tell(*client, DaemonMessage::PauseRecording);
+    session(*client)->setIsBroadcasting(true);
+    for (const ContextID window : {client->window, other->window}) {
+        tell(*client, DaemonMessage::ResumeRecording, {number(window)});
+        EXPECT_TRUE(fakes_.logSink.logged().empty());
+        EXPECT_TRUE(session(*client)->isPaused());
+    }
+}
+
+}  // namespace
+}  // namespace lumacast
