@@ -1,6 +1,5 @@
 #include "linux/display/X11Connection.h"
 
-#include <X11/Xauth.h>
 #include <fcntl.h>
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -11,12 +10,12 @@
 #include <xcb/shm.h>
 #include <xcb/xfixes.h>
 
-#include <array>
-#include <climits>
 #include <cstddef>
 #include <cstring>
 #include <optional>
 #include <string_view>
+
+#include "linux/display/AuthorityFile.h"
 
 namespace lumacast::x11 {
 namespace {
@@ -52,20 +51,6 @@ Fd connectTo(const std::string& path) {
         if (::connect(socket.get(), reinterpret_cast<const sockaddr*>(&address), length) == 0) return socket;
     }
     return {};
-}
-
-struct ForgetAuth {
-    void operator()(Xauth* auth) const { XauDisposeAuth(auth); }
-};
-std::unique_ptr<Xauth, ForgetAuth> authorization(const std::string& number) {
-    std::array<char, HOST_NAME_MAX + 1> host{};
-    if (::gethostname(host.data(), host.size() - 1) != 0) return nullptr;
-    std::string_view method = "MIT-MAGIC-COOKIE-1";
-    std::array<char*, 1> methods{const_cast<char*>(method.data())};
-    std::array<int, 1> lengths{static_cast<int>(method.size())};
-    return std::unique_ptr<Xauth, ForgetAuth>(XauGetBestAuthByAddr(
-        FamilyLocal, static_cast<unsigned short>(std::strlen(host.data())), host.data(),
-        static_cast<unsigned short>(number.size()), number.c_str(), 1, methods.data(), lengths.data()));
 }
 
 const xcb_screen_t* screenNumber(xcb_connection_t* connection, int number) {
@@ -114,10 +99,12 @@ std::unique_ptr<X11Connection> X11Connection::open(const std::string& display, I
     Fd socket = connectTo(name->socketPath);
     if (!socket) return nullptr;
     interrupt.arm(socket.get());
-    const auto auth = authorization(name->number);
+    auto key = userKey(name->number);
     xcb_auth_info_t info{};
-    if (auth) info = {auth->name_length, auth->name, auth->data_length, auth->data};
-    xcb_connection_t* const connection = xcb_connect_to_fd(socket.release(), auth ? &info : nullptr);
+    if (key)
+        info = {static_cast<int>(key->method.size()), key->method.data(), static_cast<int>(key->secret.size()),
+                reinterpret_cast<char*>(key->secret.data())};
+    xcb_connection_t* const connection = xcb_connect_to_fd(socket.release(), key ? &info : nullptr);
     if (xcb_connection_has_error(connection) != 0) {
         xcb_disconnect(connection);
         interrupt.disarm();

@@ -392,7 +392,9 @@ TEST_P(DisplayCaptureContract, MayLoseItsLastReferenceWithinADelivery) {
     Watched watched = make();
     std::atomic<bool> released{false};
     watched.frames->onFrame = [&](DisplayCaptureSource&) {
-        if (!released.exchange(true)) watched.source.reset();
+        if (released) return;
+        watched.source.reset();
+        released = true;
     };
     watched.source->openGate();
     const std::weak_ptr<DisplayCaptureSource> weak = watched.source;
@@ -400,7 +402,7 @@ TEST_P(DisplayCaptureContract, MayLoseItsLastReferenceWithinADelivery) {
     keep->start();
     keep.reset();
     const auto limit = std::chrono::steady_clock::now() + test::kGenerous;
-    while (!weak.expired() && std::chrono::steady_clock::now() < limit) std::this_thread::yield();
+    while (!(released && weak.expired()) && std::chrono::steady_clock::now() < limit) std::this_thread::yield();
     EXPECT_TRUE(weak.expired());
     EXPECT_EQ(watched.frames->count(), 1u);
 }

@@ -64,7 +64,8 @@ private:
 class PrivateDisplay final {
 public:
     /// `name` (":7") when it must be that one.
-    explicit PrivateDisplay(const std::string& size = "2200x1300x24", const std::string& name = {}) {
+    explicit PrivateDisplay(const std::string& size = "2200x1300x24", const std::string& name = {},
+                            const std::vector<std::string>& options = {}) {
         int ends[2] = {-1, -1};
         if (::pipe2(ends, O_CLOEXEC) != 0) return;
         const Fd read(ends[0]);
@@ -75,6 +76,7 @@ public:
                                         std::string("0"), size, std::string("-noreset"), std::string("-nolisten"),
                                         std::string("tcp")})
             command.push_back(word);
+        command.insert(command.end(), options.begin(), options.end());
         server_ = std::make_unique<ChildProcess>(command, write.get());
         write.reset();
         char digit = 0;
