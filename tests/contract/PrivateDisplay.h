@@ -48,6 +48,10 @@ public:
     void send(int signal) const {
         if (pid_ > 0) ::kill(pid_, signal);
     }
+    bool ended() const {
+        siginfo_t info{};
+        return ::waitid(P_PID, static_cast<id_t>(pid_), &info, WEXITED | WNOHANG | WNOWAIT) != 0 || info.si_pid != 0;
+    }
     /// Ends it, if it hasn't ended, and waits for that.
     void end(int signal = SIGKILL) {
         if (pid_ <= 0) return;
