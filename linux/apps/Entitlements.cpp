@@ -68,9 +68,14 @@ std::vector<std::string> Entitlements::directoriesFrom(const LinuxEnvironment& e
 }
 
 std::optional<Value> Entitlements::value(ProcessID pid, std::string_view name) {
-    const Explanation answer = explain(pid);
-    const Value* value = answer.counts ? answer.entitlements.find(name) : nullptr;
-    return value ? std::optional(*value) : std::nullopt;
+    // The question touches this object and the bundles. That is safe: each of its looks at the disk ends with the
+    // patience, and the lane waits for it when it is destroyed.
+    const auto question = [this, pid, wanted = std::string(name)]() -> std::optional<Value> {
+        const Explanation answer = explain(pid);
+        const Value* value = answer.counts ? answer.entitlements.find(wanted) : nullptr;
+        return value ? std::optional(*value) : std::nullopt;
+    };
+    return questions_.ask<std::optional<Value>>(options_.patience, question).value_or(std::nullopt);
 }
 
 Entitlements::Explanation Entitlements::explain(ProcessID pid) {

@@ -33,7 +33,19 @@ TEST(LinuxPreferences, APipeInTheFilesPlaceIsNotWaitedFor) {
     ScratchDirectory scratch;
     scratch.makeDirectory("lumacast");
     ASSERT_EQ(::mkfifo(scratch.path("lumacast/d.conf").c_str(), 0600), 0);
+    const auto begin = std::chrono::steady_clock::now();
     EXPECT_EQ(LinuxPreferences({scratch.path()}, kPatience).value("d", "A"), std::nullopt);
+    EXPECT_LT(std::chrono::steady_clock::now() - begin, kPatience);
+}
+
+TEST(LinuxPreferences, ADomainIsNoPath) {
+    ScratchDirectory scratch;
+    scratch.makeDirectory("lumacast");
+    scratch.write("secret.conf", "A=1\n");
+    const LinuxPreferences preferences({scratch.path()}, kPatience);
+    EXPECT_EQ(preferences.value("../secret", "A"), std::nullopt);
+    scratch.write("lumacast/sub/d.conf", "A=1\n");
+    EXPECT_EQ(preferences.value("sub/d", "A"), std::nullopt);
 }
 
 TEST(LinuxDeviceInfo, ANumberThatIsNoneIsNoAnswer) {
