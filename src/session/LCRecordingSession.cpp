@@ -62,6 +62,7 @@ void LCRecordingSession::startSessionWithHandler(Handler handler) {
     writer->setBroadcastConfig(broadcastConfiguration_);
     writer->setSystemRecording(systemRecording_);
     pathClaim_ = services_.tempStore.claimPath(writer->outputPath());
+    writer->setPathClaim(pathClaim_);
     movieWriter_.set(writer);
 
     startIsPending_ = true;

@@ -32,10 +32,14 @@ void LCMovieWriter::startWritingHandler(Handler handler) {
 
 void LCMovieWriter::dispatchedStartWritingHandler(Handler handler) {
     log_.line("LCMovieWriter: startWritingHandler");
-    tempStore_._srRemoveFile(outputURL(), [self = shared_from_this(), handler = std::move(handler)](std::optional<Error>) {
+    auto setUp = [self = shared_from_this(), handler = std::move(handler)](std::optional<Error>) {
         self->dispatchedSetupAssetWriter();
         handler();
-    });
+    };
+    if (pathClaim_)
+        tempStore_.removeFileOfClaim(outputURL(), *pathClaim_, std::move(setUp));
+    else
+        tempStore_._srRemoveFile(outputURL(), std::move(setUp));
 }
 
 void LCMovieWriter::setupAssetWriter() {

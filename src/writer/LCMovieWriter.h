@@ -2,6 +2,7 @@
 // One recording's movie file.
 
 #include <atomic>
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -34,6 +35,10 @@ public:
     /// Stored for the owner; the writer itself does not read it.
     void setSystemRecording(bool systemRecording) { systemRecording_ = systemRecording; }
     bool systemRecording() const { return systemRecording_; }
+
+    /// The store's claim on the output path, see TempStore::claimPath: a start that comes late then leaves the file of a later
+    /// writer alone. Set before the start.
+    void setPathClaim(std::uint64_t claim) { pathClaim_ = claim; }
 
     Size windowSize() const { return windowSize_; }
     const std::string& outputPath() const { return outputPath_; }
@@ -101,6 +106,7 @@ private:
     const std::string outputPath_;
     std::optional<LCBroadcastConfiguration> broadcastConfig_;
     bool systemRecording_ = false;
+    std::optional<std::uint64_t> pathClaim_;
 
     Guarded<Tracks> tracks_;
     std::atomic<bool> didProcessFirstSample_{false};
