@@ -38,6 +38,37 @@ TEST_F(MovieWriterSetup, AStartRemovesAStaleFileSetsUpAndThenAnswers) {
                                                                  "bit rate set to 3000000"}));
 }
 
+TEST_F(MovieWriterSetup, AStartThatComesLateLeavesTheFileOfALaterWriterAlone) {
+    const auto older = makeWriter(), later = makeWriter();
+    older->setPathClaim(tempStore_.claimPath(path_));
+    later->setPathClaim(tempStore_.claimPath(path_));
+    later->startWritingHandler([] {});
+    settle();
+    const auto recording = fakes_.containerWriters.lastRecording();
+    int answers = 0;
+    older->startWritingHandler([&] { ++answers; });
+    settle();
+    EXPECT_EQ(answers, 1);
+    EXPECT_FALSE(older->assetWriter());
+    later->appendVideoSampleBuffer(picture(100), {});
+    later->finishWritingWithHandler([](std::optional<URL>) {});
+    settle();
+    EXPECT_EQ(fakes_.containerWriters.lastRecording(), recording);
+    EXPECT_TRUE(fakes_.fileSystem.movie(path_)) << "the later writer's movie is at its path";
+}
+
+TEST_F(MovieWriterSetup, AnEarlierStartsFileIsReplacedByTheLaterWriters) {
+    const auto older = makeWriter(), later = makeWriter();
+    older->setPathClaim(tempStore_.claimPath(path_));
+    later->setPathClaim(tempStore_.claimPath(path_));
+    older->startWritingHandler([] {});
+    settle();
+    ASSERT_TRUE(older->assetWriter());
+    later->startWritingHandler([] {});
+    settle();
+    EXPECT_TRUE(later->assetWriter());
+}
+
 TEST_F(MovieWriterSetup, TheSynchronousFormKeepsAStaleFile) {
     fakes_.fileSystem.addFile(path_, 777);
     const auto writer = makeWriter();
