@@ -38,6 +38,11 @@ std::string durationText(double seconds) {
     return text.data();
 }
 
+std::string settingText(const Value& value) {
+    if (const bool* flag = value.as<bool>()) return *flag ? "true" : "false";
+    return describe(value);
+}
+
 std::string printable(std::string_view text) {
     std::string result(text);
     for (std::size_t at = 0; at < result.size(); ++at) {

@@ -5,6 +5,8 @@
 #include <string>
 #include <string_view>
 
+#include "base/Value.h"
+
 namespace lumacast::ctl {
 
 /// "512 bytes", "1.2 MB", "34.0 GB": decimal units (1 MB is 1,000,000 bytes), one digit behind the point, rounded.
@@ -17,5 +19,8 @@ std::string durationText(double seconds);
 /// The text with every control character replaced by '?': names and paths come from other programs, and a terminal obeys
 /// what it is sent.
 std::string printable(std::string_view text);
+
+/// A value as it would be written in a configuration file: flags are true and false, texts in quotes.
+std::string settingText(const Value& value);
 
 }  // namespace lumacast::ctl

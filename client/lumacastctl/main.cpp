@@ -3,6 +3,7 @@
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
+#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <optional>
@@ -11,6 +12,7 @@
 #include "client/lumacastctl/ExitStatus.h"
 #include "client/lumacastctl/doctor/Doctor.h"
 #include "client/lumacastctl/status/StatusCommand.h"
+#include "linux/system/IniFile.h"
 
 namespace {
 
@@ -27,6 +29,12 @@ constexpr char kExitStatuses[] =
 std::optional<std::string> variable(std::string_view name) {
     const char* value = std::getenv(std::string(name).c_str());
     return value ? std::optional<std::string>(value) : std::nullopt;
+}
+
+/// Empty for the number of a process.
+std::string whyNoPid(const std::string& text) {
+    const auto number = wholeNumber(text);
+    return number && *number > 0 && *number <= INT32_MAX ? "" : text + " is no process's number";
 }
 
 int runDoctor(const IdentityQuestion& question) {
@@ -48,8 +56,12 @@ int main(int argc, char** argv) {
     doctor->footer(kExitStatuses);
     std::int32_t pid = 0;
     std::string executable;
-    CLI::Option* byPid = doctor->add_option("--pid", pid, "Tell which application this process counts as")->check(CLI::Range(1, 1 << 30));
-    doctor->add_option("--exe", executable, "Tell which application this program counts as")->excludes(byPid);
+    CLI::Option* byPid = doctor->add_option("--pid", pid, "Tell which application this process counts as")
+                            ->type_name("N")
+                            ->check(CLI::Validator(whyNoPid, ""));
+    CLI::Option* byProgram = doctor->add_option("--exe", executable, "Tell which application this program counts as")
+                                 ->type_name("PATH")
+                                 ->excludes(byPid);
 
     try {
         app.parse(argc, argv);
@@ -62,9 +74,9 @@ int main(int argc, char** argv) {
         result = showStatus(LinuxEnvironment::ofThisProcess().runtimeDirectory, stdout, stderr);
     } else {
         IdentityQuestion question;
-        if (!executable.empty()) question.executable = executable;
-        else question.pid = ProcessID{pid > 0 ? pid : ::getppid()};
-        question.isExample = pid == 0 && executable.empty();
+        if (byProgram->count() > 0) question.executable = executable;
+        else question.pid = ProcessID{byPid->count() > 0 ? pid : ::getppid()};
+        question.isExample = byProgram->count() == 0 && byPid->count() == 0;
         result = runDoctor(question);
     }
     if (std::fflush(stdout) != 0 || std::ferror(stdout) != 0) {

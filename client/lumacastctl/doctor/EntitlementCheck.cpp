@@ -1,3 +1,4 @@
+#include "client/lumacastctl/Text.h"
 #include "client/lumacastctl/doctor/Identity.h"
 
 namespace lumacast::ctl {
@@ -8,7 +9,7 @@ constexpr char kSubject[] = "entitlements";
 
 std::string entitlementsText(const Dictionary& entitlements) {
     std::vector<std::string> parts;
-    for (const auto& [name, value] : entitlements.entries()) parts.push_back(name + " = " + describe(value));
+    for (const auto& [name, value] : entitlements.entries()) parts.push_back(name + " = " + settingText(value));
     return listText(parts);
 }
 

@@ -29,7 +29,7 @@ Finding unknownProgram(const IdentityFacts& facts) {
         return problem(kSubject, processText(*facts.question.pid) +
                                      " is not there, is another user's, or runs a program whose path means another file here "
                                      "(a container); give the pid of a running process of this user.");
-    return problem(kSubject, facts.question.executable.value_or("the program") + " is no program that can be found; give its path.");
+    return problem(kSubject, "\"" + facts.question.executable.value_or("") + "\" is no program that can be found; give its path.");
 }
 
 }  // namespace
@@ -51,8 +51,9 @@ IdentityFacts probeIdentity(LinuxBundles& bundles, const LinuxBundles::Options& 
     if (!bundle) return facts;
     if (const auto identifier = bundle->identifier(); identifier && !identifier->text().empty())
         facts.identifier = identifier->text();
+    facts.name = bundle->localizedInfo(kInfoDisplayName).value_or("");
     for (const auto key : {kInfoDisplayName, kInfoName})
-        if (facts.name.empty()) facts.name = bundle->localizedInfo(key).value_or("");
+        if (facts.name.empty()) facts.name = bundle->info(key).value_or("");
     return facts;
 }
 

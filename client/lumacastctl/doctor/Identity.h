@@ -13,9 +13,9 @@ namespace lumacast::ctl {
 
 /// Whose identity is asked for.
 struct IdentityQuestion {
-    std::optional<ProcessID> pid;           ///< --pid
-    std::optional<std::string> executable;  ///< --exe; used when there is no pid
-    bool isExample = false;                 ///< nobody asked: the pid is that of whoever called this tool
+    std::optional<ProcessID> pid = {};           ///< --pid
+    std::optional<std::string> executable = {};  ///< --exe; used when there is no pid
+    bool isExample = false;                      ///< nobody asked: the pid is that of whoever called this tool
 };
 
 struct IdentityFacts {

@@ -2,6 +2,7 @@
 
 #include <unistd.h>
 
+#include "client/lumacastctl/Text.h"
 #include "linux/system/IniFile.h"
 #include "linux/system/LinuxPreferences.h"
 #include "linux/system/SmallFile.h"
@@ -33,13 +34,13 @@ const bool* flagOf(const Preference& preference) { return preference.value ? pre
 std::string placeText(const Preference& preference) { return preference.path.empty() ? "" : " (" + preference.path + ")"; }
 
 /// "LCFullResCapture=1 (file)"
-std::string settingText(const std::string& key, const Preference& preference) {
-    return key + "=" + (preference.value ? describe(*preference.value) : "") + placeText(preference);
+std::string preferenceText(const std::string& key, const Preference& preference) {
+    return key + "=" + (preference.value ? settingText(*preference.value) : "") + placeText(preference);
 }
 
 Finding notAFlag(const std::string& key, const Preference& preference, Severity severity, const std::string& consequence) {
     return {severity, kSubject,
-            settingText(key, preference) + " is neither true nor false, " + consequence + "; write " + key + "=true or =false."};
+            preferenceText(key, preference) + " is neither true nor false, " + consequence + "; write " + key + "=true or =false."};
 }
 
 Findings checkFiles(const std::vector<File>& files) {
@@ -64,10 +65,10 @@ Finding checkSuppressAlert(const PreferenceFacts& facts) {
     const std::string file = facts.files.empty() ? "the preference file" : facts.files.front().path;
     const bool* flag = flagOf(preference);
     if (flag && *flag)
-        return ok(kSubject, settingText("LCSuppressAlert", preference) +
+        return ok(kSubject, preferenceText("LCSuppressAlert", preference) +
                                 ": applications may record themselves without the user being asked.");
     if (preference.value && !flag) return notAFlag("LCSuppressAlert", preference, Severity::Problem, refused);
-    return problem(kSubject, (flag ? settingText("LCSuppressAlert", preference) : std::string("LCSuppressAlert is not set")) +
+    return problem(kSubject, (flag ? preferenceText("LCSuppressAlert", preference) : std::string("LCSuppressAlert is not set")) +
                                  ", " + refused + "; write LCSuppressAlert=true into " + file +
                                  " (a line before any [section]). It counts from the next start on.");
 }
@@ -75,7 +76,7 @@ Finding checkSuppressAlert(const PreferenceFacts& facts) {
 Finding checkBitRate(const Preference& preference) {
     if (!preference.value) return ok(kSubject, "LCBitRateOverride is not set: the bit rate follows from the movie's size.");
     const auto* rate = preference.value->as<std::int64_t>();
-    const std::string setting = settingText("LCBitRateOverride", preference);
+    const std::string setting = preferenceText("LCBitRateOverride", preference);
     if (rate && *rate > 0) return ok(kSubject, setting + ": movies get this many bits per second, whatever their size.");
     return warning(kSubject, setting + " is no bit rate; write a whole number of bits per second, or remove it.");
 }
@@ -84,8 +85,8 @@ Finding checkFullResolution(const Preference& preference) {
     const bool* flag = flagOf(preference);
     if (preference.value && !flag)
         return notAFlag("LCFullResCapture", preference, Severity::Warning, "so it counts as not set");
-    if (flag && *flag) return ok(kSubject, settingText("LCFullResCapture", preference) + ": movies keep the window's full size.");
-    return ok(kSubject, (flag ? settingText("LCFullResCapture", preference) : std::string("LCFullResCapture is not set")) +
+    if (flag && *flag) return ok(kSubject, preferenceText("LCFullResCapture", preference) + ": movies keep the window's full size.");
+    return ok(kSubject, (flag ? preferenceText("LCFullResCapture", preference) : std::string("LCFullResCapture is not set")) +
                             ": a movie's longer side has at most 1920 pixels (on devices of reduced capture 1600).");
 }
 
