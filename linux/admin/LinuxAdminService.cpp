@@ -83,7 +83,9 @@ public:
             const bool room = peers_.size() < kMaximumPeers;
             waited.push_back({room ? listener_.get() : -1, POLLIN, 0});
             for (const Peer& peer : peers_) {
-                const short events = peer.state == Peer::State::Asking ? POLLIN : peer.state == Peer::State::Reading ? POLLOUT : 0;
+                const short events = peer.state == Peer::State::Asking    ? POLLIN
+                                     : peer.state == Peer::State::Reading ? POLLOUT
+                                                                          : 0;
                 waited.push_back({peer.socket.get(), events, 0});
             }
             if (::poll(waited.data(), waited.size(), timeout()) < 0 && errno != EINTR) break;
@@ -153,7 +155,8 @@ private:
         peer.deadline = in(limits_.snapshot);
         peer.question = ++questions_;
         {
-            // A main queue that does not answer must not be heaped with questions; this peer will be told that it is busy.
+            // A main queue that does not answer must not be heaped with questions; this peer will be told that it is
+            // busy.
             const std::lock_guard lock(mailbox_->mutex);
             if (mailbox_->asked == kMaximumPeers) return;
             ++mailbox_->asked;
@@ -184,7 +187,8 @@ private:
         }
         if (!snapshot) return;
         for (Peer& peer : peers_)
-            if (peer.state == Peer::State::Waiting && peer.question <= question) reply(peer, replyTo(peer.request, *snapshot));
+            if (peer.state == Peer::State::Waiting && peer.question <= question)
+                reply(peer, replyTo(peer.request, *snapshot));
     }
 
     void reply(Peer& peer, std::string text) const {

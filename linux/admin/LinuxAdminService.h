@@ -12,10 +12,11 @@
 
 namespace lumacast {
 
-/// The administrator's questions on a Unix socket: a peer sends one line and gets one line of JSON, then the connection is
-/// closed. `status` answers the whole snapshot, any other word the snapshot's entry of that name; what can't be answered is
-/// {"error": "..."}. Only the daemon's own user and root are heard (by the kernel's word). At most 8 peers at a time, a line
-/// of at most 128 bytes, and a limit for every wait; one thread serves them all and never holds the daemon up.
+/// The administrator's questions on a Unix socket: a peer sends one line and gets one line of JSON, then the connection
+/// is closed. `status` answers the whole snapshot, any other word the snapshot's entry of that name; what can't be
+/// answered is
+/// {"error": "..."}. Only the daemon's own user and root are heard (by the kernel's word). At most 8 peers at a time, a
+/// line of at most 128 bytes, and a limit for every wait; one thread serves them all and never holds the daemon up.
 class LinuxAdminService final : public AdminService {
 public:
     struct Limits {
@@ -24,7 +25,8 @@ public:
         std::chrono::milliseconds reply{5000};     ///< for the peer to read
     };
     /// `socketPath` is where the socket will be, in a directory of this user's own.
-    LinuxAdminService(Scheduler& scheduler, std::string socketPath) : LinuxAdminService(scheduler, std::move(socketPath), Limits()) {}
+    LinuxAdminService(Scheduler& scheduler, std::string socketPath)
+        : LinuxAdminService(scheduler, std::move(socketPath), Limits()) {}
     LinuxAdminService(Scheduler& scheduler, std::string socketPath, Limits limits);
     /// Closes every connection and removes the socket. A snapshot that was asked for is not waited for.
     ~LinuxAdminService() override;
@@ -44,8 +46,8 @@ private:
     std::thread thread_;
 };
 
-/// Asks an admin service: sends `request` and answers the line that comes back. None when nobody answers within `limit`.
-/// For tools and tests; blocks.
+/// Asks an admin service: sends `request` and answers the line that comes back. None when nobody answers within
+/// `limit`. For tools and tests; blocks.
 std::optional<std::string> askAdminService(const std::string& socketPath, std::string_view request,
                                            std::chrono::milliseconds limit);
 

@@ -22,7 +22,9 @@ std::optional<sockaddr_un> addressOf(const std::string& path) {
     return address;
 }
 
-FileDescriptor streamSocket() { return FileDescriptor(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0)); }
+FileDescriptor streamSocket() {
+    return FileDescriptor(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+}
 
 }  // namespace
 

@@ -29,7 +29,8 @@ public:
         ::clock_gettime(CLOCK_REALTIME, &now_);
     }
 
-    /// `prefix` is what the names of the folders above add to an id. Ids already taken belong to a more important place.
+    /// `prefix` is what the names of the folders above add to an id. Ids already taken belong to a more important
+    /// place.
     void collect(const std::string& directory, const std::string& prefix, int depth) {
         if (depth > kMaximumDepth || result_.directories_.size() == kMaximumDirectories) return;
         struct stat status = {};

@@ -22,15 +22,15 @@ struct InstalledApplication {
 /// An unchanging picture of what is installed.
 class InstalledApplications {
 public:
-    /// Reads all `directories`, most important first: "*.desktop" files, at most four folders deep (the id of an entry in
-    /// a folder joins their names by '-'), and application folders "*.app" with a manifest. At most 4096 applications.
-    /// Blocks as long as the disk does.
+    /// Reads all `directories`, most important first: "*.desktop" files, at most four folders deep (the id of an entry
+    /// in a folder joins their names by '-'), and application folders "*.app" with a manifest. At most 4096
+    /// applications. Blocks as long as the disk does.
     static InstalledApplications read(const std::vector<std::string>& directories,
                                       const std::vector<std::string>& searchPath);
 
     const InstalledApplication* withIdentifier(const std::string& identifier) const;
-    /// The application whose program this is. An entry that names it as X-Lumacast-Executable goes before one that starts
-    /// it, earlier directories before later ones, then the order of the ids decides.
+    /// The application whose program this is. An entry that names it as X-Lumacast-Executable goes before one that
+    /// starts it, earlier directories before later ones, then the order of the ids decides.
     const InstalledApplication* withProgram(const std::string& program) const;
 
     /// Whether a directory that was read has changed, or may have, since.

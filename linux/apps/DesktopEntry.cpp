@@ -38,8 +38,8 @@ std::string unescaped(std::string_view text) {
     return result;
 }
 
-/// The arguments of an Exec value (section "The Exec key"): separated by blanks, quoted in whole by double quotes, where a
-/// backslash protects what follows. None when a quote is not closed.
+/// The arguments of an Exec value (section "The Exec key"): separated by blanks, quoted in whole by double quotes,
+/// where a backslash protects what follows. None when a quote is not closed.
 std::optional<std::vector<std::string>> arguments(std::string_view exec) {
     std::vector<std::string> result;
     bool inArgument = false;
@@ -66,11 +66,28 @@ std::optional<std::vector<std::string>> arguments(std::string_view exec) {
 }
 
 bool isInterpreter(std::string_view program) {
-    static constexpr std::array<std::string_view, 20> kNames{
-        "sh", "bash", "dash", "zsh", "ksh", "busybox", "node", "nodejs", "java", "mono", "flatpak", "snap", "gjs", "xterm",
-        "x-terminal-emulator", "gnome-terminal", "konsole", "pkexec", "sudo", "systemd-run"};
-    static constexpr std::array<std::string_view, 8> kFamilies{"python", "perl", "ruby", "php", "lua", "wine", "electron",
-                                                               "guile"};
+    static constexpr std::array<std::string_view, 20> kNames{"sh",
+                                                             "bash",
+                                                             "dash",
+                                                             "zsh",
+                                                             "ksh",
+                                                             "busybox",
+                                                             "node",
+                                                             "nodejs",
+                                                             "java",
+                                                             "mono",
+                                                             "flatpak",
+                                                             "snap",
+                                                             "gjs",
+                                                             "xterm",
+                                                             "x-terminal-emulator",
+                                                             "gnome-terminal",
+                                                             "konsole",
+                                                             "pkexec",
+                                                             "sudo",
+                                                             "systemd-run"};
+    static constexpr std::array<std::string_view, 8> kFamilies{"python", "perl", "ruby",     "php",
+                                                               "lua",    "wine", "electron", "guile"};
     const std::string_view name = program.substr(program.rfind('/') + 1);
     return std::find(kNames.begin(), kNames.end(), name) != kNames.end() ||
            std::any_of(kFamilies.begin(), kFamilies.end(), [&](std::string_view family) {
@@ -124,9 +141,9 @@ std::optional<std::string> DesktopEntry::localizedName(const std::vector<Locale>
         const std::string country = locale.country.empty() ? "" : "_" + locale.country;
         const std::string modifier = locale.modifier.empty() ? "" : "@" + locale.modifier;
         // The order of the section "Localized values for keys".
-        for (const std::string& name : {locale.language + country + modifier, locale.language + country,
-                                        locale.language + modifier, locale.language})
-            if (const std::string* found = find(name)) return *found;
+        for (const std::string& written : {locale.language + country + modifier, locale.language + country,
+                                           locale.language + modifier, locale.language})
+            if (const std::string* found = find(written)) return *found;
         if (locale.language == "en") return std::nullopt;
     }
     return std::nullopt;

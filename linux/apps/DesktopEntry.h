@@ -19,7 +19,8 @@ struct DesktopEntry {
     std::vector<std::pair<std::string, std::string>> localizedNames;  ///< locale as written ("pt_BR"), name
     std::string exec;
     std::string tryExec;
-    std::string lumacastExecutable;  ///< X-Lumacast-Executable: the application's own program, where Exec starts another
+    std::string
+        lumacastExecutable;  ///< X-Lumacast-Executable: the application's own program, where Exec starts another
 
     /// A pure parser of the whole file. None when there is no [Desktop Entry] group, or the text is not UTF-8.
     static std::optional<DesktopEntry> parse(std::string_view text);

@@ -21,7 +21,8 @@ std::string entryOf(const std::string& bundlePath) {
     return bundlePath.ends_with(".desktop") ? bundlePath : bundlePath + "/" + std::string(kManifestName);
 }
 
-void readDropIns(const Entitlements::Options& options, const std::string& identifier, Entitlements::Explanation& answer) {
+void readDropIns(const Entitlements::Options& options, const std::string& identifier,
+                 Entitlements::Explanation& answer) {
     for (const std::string& directory : options.directories) {
         for (const std::string& name : namesIn(directory, kMaximumDropIns).value_or(std::vector<std::string>())) {
             if (!name.ends_with(".conf")) continue;

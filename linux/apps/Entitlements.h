@@ -24,8 +24,8 @@ namespace lumacast {
 ///
 /// read in the order of their names, a later one deciding over an earlier one. They count only for a process whose
 /// executable *and* whose desktop entry or manifest are the administrator's and writable by nobody else, and so are all
-/// folders above them: otherwise anybody could give an own program the identifier of an entitled one. Drop-ins that others
-/// could have written don't count either. Callable from any lane; what the disk has not answered in time is no
+/// folders above them: otherwise anybody could give an own program the identifier of an entitled one. Drop-ins that
+/// others could have written don't count either. Callable from any lane; what the disk has not answered in time is no
 /// entitlement (`value` waits for the patience once).
 ///
 /// What it can't tell: a user may still load code into an entitled program that permits it (a debugger, a preload).
@@ -42,8 +42,8 @@ public:
     /// The value of entitlement `name` of a process, or none.
     std::optional<Value> value(ProcessID pid, std::string_view name);
 
-    /// How an answer came about, for people: one finding a line, and what the drop-ins say if all is well. Waits for the
-    /// patience a few times.
+    /// How an answer came about, for people: one finding a line, and what the drop-ins say if all is well. Waits for
+    /// the patience a few times.
     struct Explanation {
         std::optional<BundleIdentifier> application;
         std::vector<std::string> findings;
@@ -63,8 +63,8 @@ private:
 };
 
 /// Why a file or a folder can't be trusted to be the administrator's own: it, or a folder above it, belongs to somebody
-/// else or may be written to by others (a folder where only owners may rename, like /tmp, is fine above it). None when it
-/// can. Links are resolved first. Blocks as long as the disk does.
+/// else or may be written to by others (a folder where only owners may rename, like /tmp, is fine above it). None when
+/// it can. Links are resolved first. Blocks as long as the disk does.
 std::optional<std::string> whyNotAdministratorOwned(const std::string& path, uid_t administrator);
 
 }  // namespace lumacast

@@ -25,7 +25,8 @@ LinuxBundles::Options LinuxBundles::optionsFrom(const LinuxEnvironment& environm
 
 LinuxBundles::LinuxBundles(Options options)
     : options_(std::move(options)),
-      library_(std::make_shared<BundleLibrary>(options_.applicationDirectories, options_.searchPath, options_.locales)) {
+      library_(
+          std::make_shared<BundleLibrary>(options_.applicationDirectories, options_.searchPath, options_.locales)) {
     for (const Locale& locale : options_.locales) languages_.push_back(languageTag(locale));
     if (languages_.empty()) languages_.push_back("en");
     const auto framework = library_->open(options_.frameworkBundlePath);

@@ -37,7 +37,8 @@ std::optional<std::string> best(const Translations& translations, const std::vec
 bool isBundleIdentifier(std::string_view text) {
     if (text.empty() || text.size() > 255 || text.front() == '.') return false;
     return std::all_of(text.begin(), text.end(), [](char c) {
-        return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '.' || c == '-' || c == '_';
+        return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '.' || c == '-' ||
+               c == '_';
     });
 }
 
@@ -53,7 +54,8 @@ std::optional<Manifest> Manifest::parse(std::string_view text) {
         if (key == "name") manifest.name = *string;
         if (key == "displayName") manifest.displayName = *string;
         if (key == "developmentLanguage" && isBundleIdentifier(*string)) manifest.developmentLanguage = *string;
-        if (const auto language = languageOf("name", key); language && manifest.localizedNames.size() < kMaximumTranslations)
+        if (const auto language = languageOf("name", key);
+            language && manifest.localizedNames.size() < kMaximumTranslations)
             manifest.localizedNames.emplace_back(*language, *string);
         if (const auto language = languageOf("displayName", key);
             language && manifest.localizedDisplayNames.size() < kMaximumTranslations)

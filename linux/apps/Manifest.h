@@ -22,8 +22,8 @@ struct Manifest {
     std::vector<std::pair<std::string, std::string>> localizedDisplayNames;
     std::string developmentLanguage = "en";
 
-    /// A pure parser of the whole file. None when it is not a JSON object; entries of the wrong kind are passed over, an
-    /// identifier that is no name of a bundle (letters, digits, '.', '-', '_'; at most 255) counts as none.
+    /// A pure parser of the whole file. None when it is not a JSON object; entries of the wrong kind are passed over,
+    /// an identifier that is no name of a bundle (letters, digits, '.', '-', '_'; at most 255) counts as none.
     static std::optional<Manifest> parse(std::string_view text);
 
     std::optional<std::string> localizedName(const std::vector<Locale>& locales) const;

@@ -15,10 +15,10 @@ struct ProcessImage {
     struct stat status = {};  ///< of the image itself
 };
 
-/// The image of a running process, from /proc. None for a process that is gone (all is read through one handle, so it is
-/// never another one that took its number), that is a kernel thread or another user's, whose path is longer than 4096
-/// bytes or not UTF-8, whose image never had a path, or that lives in a mount namespace where the path names another
-/// file than it does here. Callable from any lane; waits for the disk that holds the program.
+/// The image of a running process, from /proc. None for a process that is gone (all is read through one handle, so it
+/// is never another one that took its number), that is a kernel thread or another user's, whose path is longer than
+/// 4096 bytes or not UTF-8, whose image never had a path, or that lives in a mount namespace where the path names
+/// another file than it does here. Callable from any lane; waits for the disk that holds the program.
 std::optional<ProcessImage> processImage(ProcessID pid);
 
 }  // namespace lumacast

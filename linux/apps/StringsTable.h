@@ -11,8 +11,8 @@ namespace lumacast {
 /// before anything else stands for that alone. A key may be written without quotes.
 class StringsTable {
 public:
-    /// A pure parser. Reads as far as the text makes sense: what stands before a mistake is kept, what follows is not. At
-    /// most 4096 entries. A key given twice keeps its first text. Text that is not UTF-8 gives an empty table.
+    /// A pure parser. Reads as far as the text makes sense: what stands before a mistake is kept, what follows is not.
+    /// At most 4096 entries. A key given twice keeps its first text. Text that is not UTF-8 gives an empty table.
     static StringsTable parse(std::string_view text);
 
     /// The text of `key`, or null.

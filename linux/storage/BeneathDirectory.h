@@ -10,8 +10,8 @@
 
 namespace lumacast {
 
-/// How paths are resolved: by the kernel (openat2, Linux 5.6), or component by component where it does not have that or a
-/// sandbox forbids it. Both answer alike.
+/// How paths are resolved: by the kernel (openat2, Linux 5.6), or component by component where it does not have that or
+/// a sandbox forbids it. Both answer alike.
 enum class Resolution { Kernel, Walk };
 
 /// What the running kernel offers. Tried by a call, not read from a version.
@@ -23,13 +23,13 @@ struct ResolvedName {
     std::string name;
 };
 
-/// Finds the place of `path` beneath `base` without ever leaving it: "." and ".." are refused, and so is every link on the
-/// way. The last component is not looked at; what is done with it must not follow links either. Both paths are absolute,
-/// doubled slashes count as one. `base` itself is reached the ordinary way (an administrator may have linked it
-/// elsewhere), and answers as its name in the folder that holds it.
+/// Finds the place of `path` beneath `base` without ever leaving it: "." and ".." are refused, and so is every link on
+/// the way. The last component is not looked at; what is done with it must not follow links either. Both paths are
+/// absolute, doubled slashes count as one. `base` itself is reached the ordinary way (an administrator may have linked
+/// it elsewhere), and answers as its name in the folder that holds it.
 ///
-/// Answers the error number instead: EACCES for a path outside `base` or with "." or "..", ELOOP or ENOTDIR for a link on
-/// the way, else what the system says. Blocks as long as the disk does.
+/// Answers the error number instead: EACCES for a path outside `base` or with "." or "..", ELOOP or ENOTDIR for a link
+/// on the way, else what the system says. Blocks as long as the disk does.
 std::variant<ResolvedName, int> resolveBeneath(const std::string& base, const std::string& path, Resolution resolution);
 
 /// `path` with every run of slashes as one and none at its end.

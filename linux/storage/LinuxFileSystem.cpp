@@ -126,7 +126,8 @@ Result<FileAttributes> LinuxFileSystem::attributes(const std::string& path) {
         struct statx status = {};
         const auto outcome = place.perform(path, [&](int folder, const std::string& name) {
             const bool top = withSingleSlashes(path) == place.directory;
-            return ::statx(folder, name.c_str(), top ? 0 : AT_SYMLINK_NOFOLLOW, STATX_BASIC_STATS | STATX_BTIME, &status);
+            return ::statx(folder, name.c_str(), top ? 0 : AT_SYMLINK_NOFOLLOW, STATX_BASIC_STATS | STATX_BTIME,
+                           &status);
         });
         if (const int* error = std::get_if<int>(&outcome)) return *error;
         FileAttributes result;
@@ -187,7 +188,8 @@ std::optional<Error> LinuxFileSystem::move(const std::string& from, const std::s
     if (const int* error = std::get_if<int>(&destination)) return systemError(*error);
     const auto& a = std::get<ResolvedName>(source);
     const auto& b = std::get<ResolvedName>(destination);
-    if (::renameat(a.directory.get(), a.name.c_str(), b.directory.get(), b.name.c_str()) != 0) return systemError(errno);
+    if (::renameat(a.directory.get(), a.name.c_str(), b.directory.get(), b.name.c_str()) != 0)
+        return systemError(errno);
     return std::nullopt;
 }
 

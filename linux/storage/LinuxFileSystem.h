@@ -13,13 +13,14 @@ namespace lumacast {
 /// The device's fixed temporary directory, below the root directory.
 inline constexpr std::string_view kDeviceTemporaryDirectory = "/private/var/mobile/Library/Lumacast";
 
-/// How many bytes a container writer has written to the file at a path, or none when no writer is writing it. Called with
-/// single slashes, from any lane; must not wait.
+/// How many bytes a container writer has written to the file at a path, or none when no writer is writing it. Called
+/// with single slashes, from any lane; must not wait.
 using BytesBeingWritten = std::function<std::optional<std::uint64_t>(const std::string& path)>;
 
-/// The file system role on the disk of this machine. Only the temporary directory and what is beneath it can be reached;
-/// links in it are never followed: they answer with their own attributes, and removing one removes the link. What the disk
-/// has not answered in time is ETIMEDOUT. Everything is made for this user alone, whatever the process's umask.
+/// The file system role on the disk of this machine. Only the temporary directory and what is beneath it can be
+/// reached; links in it are never followed: they answer with their own attributes, and removing one removes the link.
+/// What the disk has not answered in time is ETIMEDOUT. Everything is made for this user alone, whatever the process's
+/// umask.
 class LinuxFileSystem final : public FileSystem {
 public:
     struct Options {
@@ -31,8 +32,8 @@ public:
     };
     explicit LinuxFileSystem(Options options);
 
-    /// Makes the folders that hold the temporary directory (not the directory itself), each for this user alone. Once, at
-    /// the start; blocks as long as the disk does. The error when one could not be made.
+    /// Makes the folders that hold the temporary directory (not the directory itself), each for this user alone. Once,
+    /// at the start; blocks as long as the disk does. The error when one could not be made.
     [[nodiscard]] std::optional<Error> prepare();
 
     std::string root() const override;

@@ -10,15 +10,15 @@
 
 namespace lumacast {
 
-/// Runs questions on threads of its own and gives up on those that take too long, so that a stuck disk costs its callers
-/// their patience and nothing more. A stuck question keeps its thread; there are never more than `maximumThreads`, and
-/// when all are stuck every further question fails after its patience without having been begun. Threads are made when
-/// they are needed. Callable from any lane.
+/// Runs questions on threads of its own and gives up on those that take too long, so that a stuck disk costs its
+/// callers their patience and nothing more. A stuck question keeps its thread; there are never more than
+/// `maximumThreads`, and when all are stuck every further question fails after its patience without having been begun.
+/// Threads are made when they are needed. Callable from any lane.
 class DiskLane final {
 public:
     explicit DiskLane(std::size_t maximumThreads = 4);
-    /// Waits a moment (at most 2 s) for questions in progress, then leaves them to their threads. So a question must own
-    /// everything it touches.
+    /// Waits a moment (at most 2 s) for questions in progress, then leaves them to their threads. So a question must
+    /// own everything it touches.
     ~DiskLane();
     DiskLane(const DiskLane&) = delete;
     DiskLane& operator=(const DiskLane&) = delete;

@@ -20,8 +20,8 @@ struct IniSection {
 };
 
 /// The sections of a configuration file in their order; sections of the same name are one. A pure parser: every text is
-/// accepted, lines that are neither a section, an entry nor a comment ('#' or ';') are passed over, so that one bad line
-/// does not take the others with it. At most 4096 entries are kept.
+/// accepted, lines that are neither a section, an entry nor a comment ('#' or ';') are passed over, so that one bad
+/// line does not take the others with it. At most 4096 entries are kept.
 struct IniFile {
     std::vector<IniSection> sections;
 
@@ -33,8 +33,8 @@ struct IniFile {
     const std::string* find(std::string_view section, std::string_view key) const;
 };
 
-/// What a written value means: true, false, yes, no (any case) are bools, whole numbers int64, numbers with a point or an
-/// exponent double, all else text. A text in double quotes is always text, without the quotes.
+/// What a written value means: true, false, yes, no (any case) are bools, whole numbers int64, numbers with a point or
+/// an exponent double, all else text. A text in double quotes is always text, without the quotes.
 Value iniValue(std::string_view text);
 
 /// A whole decimal number as int64; none when `text` is anything else or out of range.

@@ -10,9 +10,9 @@
 
 namespace lumacast {
 
-/// One line of JSON. Dictionaries keep their order. Dates are seconds since 1970, bytes are written as their count, errors
-/// as an object of domain, code and userInfo; numbers that JSON has no form for, endpoints and planes become null; bytes
-/// that are not UTF-8 become U+FFFD.
+/// One line of JSON. Dictionaries keep their order. Dates are seconds since 1970, bytes are written as their count,
+/// errors as an object of domain, code and userInfo; numbers that JSON has no form for, endpoints and planes become
+/// null; bytes that are not UTF-8 become U+FFFD.
 std::string jsonText(const Value& value);
 
 /// Reads one JSON document of at most `maximumDepth` nested arrays and objects. None for anything malformed or deeper;

@@ -5,8 +5,8 @@
 
 namespace lumacast {
 
-/// The machine's clocks: wall time from CLOCK_REALTIME, host time from CLOCK_MONOTONIC, the calendar of the zone the user
-/// has set now (a change of zone counts from the next question on).
+/// The machine's clocks: wall time from CLOCK_REALTIME, host time from CLOCK_MONOTONIC, the calendar of the zone the
+/// user has set now (a change of zone counts from the next question on).
 class LinuxClock final : public Clock {
 public:
     Date now() const override;

@@ -9,8 +9,8 @@
 namespace lumacast {
 
 /// The device as the administrator or the user describes it in `device.conf`: `Idiom=`, `ChipID=` and
-/// `ReducedCaptureChipID=`, whole numbers, before any section. The first file that has a key decides. Read at each use; a
-/// disk that does not answer within 40 ms counts as a device that does not.
+/// `ReducedCaptureChipID=`, whole numbers, before any section. The first file that has a key decides. Read at each use;
+/// a disk that does not answer within 40 ms counts as a device that does not.
 class LinuxDeviceInfo final : public DeviceInfo {
 public:
     /// `directories` hold the files device.conf, most important first.

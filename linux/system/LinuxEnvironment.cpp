@@ -58,8 +58,8 @@ std::string rootDirectory(const LinuxEnvironment& environment) {
     return environment.stateDirectory + "/root";
 }
 
-/// The resource bundle is looked for where the user, the administrator or the distribution installs data, then beside the
-/// executable's own installation.
+/// The resource bundle is looked for where the user, the administrator or the distribution installs data, then beside
+/// the executable's own installation.
 std::string resourceBundle(const LinuxEnvironment& environment) {
     static constexpr std::string_view kBundle = "/lumacast/Lumacast.bundle";
     std::vector<std::string> places;
@@ -102,7 +102,8 @@ LinuxEnvironment LinuxEnvironment::from(const Variables& variables, uid_t user, 
     result.dataHome = absolute(variables("XDG_DATA_HOME")).value_or(result.home + "/.local/share");
     result.stateDirectory =
         absolute(variables("XDG_STATE_HOME")).value_or(result.home + "/.local/state") + std::string(kName);
-    result.cacheDirectory = absolute(variables("XDG_CACHE_HOME")).value_or(result.home + "/.cache") + std::string(kName);
+    result.cacheDirectory =
+        absolute(variables("XDG_CACHE_HOME")).value_or(result.home + "/.cache") + std::string(kName);
 
     const std::vector<std::string> systemConfiguration = list(variables("XDG_CONFIG_DIRS"), "/etc/xdg");
     result.configDirectories = systemConfiguration;

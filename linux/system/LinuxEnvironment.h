@@ -14,7 +14,8 @@
 namespace lumacast {
 
 /// An immutable picture of the process's environment. Only the XDG, language and service-manager variables count; a
-/// relative path in an XDG variable is ignored, as the XDG Base Directory Specification wants it. No path ends in a slash.
+/// relative path in an XDG variable is ignored, as the XDG Base Directory Specification wants it. No path ends in a
+/// slash.
 struct LinuxEnvironment {
     std::string home;
     std::string runtimeDirectory;  ///< $XDG_RUNTIME_DIR/lumacast (else /run/user/UID/lumacast): sockets; one user's
@@ -24,7 +25,8 @@ struct LinuxEnvironment {
     std::vector<std::string> dataDirectories;  ///< dataHome first, then $XDG_DATA_DIRS
     std::string stateDirectory;                ///< $XDG_STATE_HOME/lumacast: telemetry, and the root directory
     std::string cacheDirectory;                ///< $XDG_CACHE_HOME/lumacast
-    std::vector<std::string> systemDirectories;  ///< the administrator's: /etc/lumacast, then lumacast in $XDG_CONFIG_DIRS
+    std::vector<std::string>
+        systemDirectories;  ///< the administrator's: /etc/lumacast, then lumacast in $XDG_CONFIG_DIRS
 
     /// What stands in front of every fixed path of the device: `Root=` of the administrator's daemon.conf, else
     /// $XDG_STATE_HOME/lumacast/root. `Root=/` makes it empty: the fixed paths as they are prescribed.
@@ -48,8 +50,8 @@ struct LinuxEnvironment {
     static LinuxEnvironment from(const Variables& variables, uid_t user, std::string executable,
                                  const std::string& systemDirectory = "/etc/lumacast");
 
-    /// Makes the runtime, state and cache directories, for this user alone (mode 0700). The error of the first that could
-    /// not be made, or that belongs to somebody else.
+    /// Makes the runtime, state and cache directories, for this user alone (mode 0700). The error of the first that
+    /// could not be made, or that belongs to somebody else.
     [[nodiscard]] std::optional<Error> prepareDirectories() const;
 
     /// `name` below each of `directories`, in their order.

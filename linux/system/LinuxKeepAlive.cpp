@@ -26,7 +26,8 @@ void LinuxKeepAlive::announceReady() {
 
 void LinuxKeepAlive::announceStopping(int seconds) {
     const std::lock_guard lock(mutex_);
-    socket_.send("STOPPING=1\nEXTEND_TIMEOUT_USEC=" + std::to_string(static_cast<long long>(seconds) * 1'000'000) + "\n");
+    socket_.send("STOPPING=1\nEXTEND_TIMEOUT_USEC=" + std::to_string(static_cast<long long>(seconds) * 1'000'000) +
+                 "\n");
 }
 
 void LinuxKeepAlive::announceStatus(int open) { socket_.send(open > 0 ? "STATUS=Recording.\n" : "STATUS=Idle.\n"); }

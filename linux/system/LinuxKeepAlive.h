@@ -7,8 +7,8 @@
 
 namespace lumacast {
 
-/// Counts the transactions and tells the service manager what the daemon does: READY=1 once it runs, STATUS= whenever it
-/// begins or ends being busy, STOPPING=1 when it ends.
+/// Counts the transactions and tells the service manager what the daemon does: READY=1 once it runs, STATUS= whenever
+/// it begins or ends being busy, STOPPING=1 when it ends.
 class LinuxKeepAlive final : public KeepAlive {
 public:
     /// `notify` is $NOTIFY_SOCKET, empty for none.

@@ -17,10 +17,10 @@ struct LogSinkTargets {
     std::string journalSocket = "/run/systemd/journal/socket";
 };
 
-/// Log lines to standard error as `level text`, or, when standard error leads to the journal, as datagrams of its native
-/// protocol with PRIORITY and MESSAGE; `Print` lines to standard output. Never waits: a line the reader has no room for
-/// is dropped, and the next one that gets through is preceded by how many were. Lines are cut at 4000 bytes; control
-/// characters become blanks, so that no text can pretend to be a line of its own. Callable from any lane.
+/// Log lines to standard error as `level text`, or, when standard error leads to the journal, as datagrams of its
+/// native protocol with PRIORITY and MESSAGE; `Print` lines to standard output. Never waits: a line the reader has no
+/// room for is dropped, and the next one that gets through is preceded by how many were. Lines are cut at 4000 bytes;
+/// control characters become blanks, so that no text can pretend to be a line of its own. Callable from any lane.
 class LinuxLogSink final : public LogSink {
 public:
     explicit LinuxLogSink(const LogSinkTargets& targets);

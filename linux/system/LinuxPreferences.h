@@ -8,8 +8,8 @@
 namespace lumacast {
 
 /// Preferences in INI files: `<directory>/lumacast/<domain>.conf`, `key=value` lines before any section. The first
-/// directory whose file has the key decides, so the user's own file goes before the administrator's. Read at each use; a
-/// file larger than 64 KiB, or one the disk does not answer for within 40 ms, counts as missing.
+/// directory whose file has the key decides, so the user's own file goes before the administrator's. Read at each use;
+/// a file larger than 64 KiB, or one the disk does not answer for within 40 ms, counts as missing.
 class LinuxPreferences final : public Preferences {
 public:
     /// `configDirectories`, most important first (see LinuxEnvironment). `patience` is how long a question may take.

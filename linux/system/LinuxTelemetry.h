@@ -9,9 +9,9 @@
 
 namespace lumacast {
 
-/// Writes each event as one line of JSON to a file on this device; nothing leaves it. When the file would grow beyond its
-/// limit it becomes `<file>.1` (the one before is gone) and a new one begins. A thread of its own writes, so a caller
-/// never waits for the disk; at most 64 events wait for it, further ones are refused.
+/// Writes each event as one line of JSON to a file on this device; nothing leaves it. When the file would grow beyond
+/// its limit it becomes `<file>.1` (the one before is gone) and a new one begins. A thread of its own writes, so a
+/// caller never waits for the disk; at most 64 events wait for it, further ones are refused.
 class LinuxTelemetry final : public TelemetryReporter {
 public:
     static constexpr std::uint64_t kDefaultLimit = 1024 * 1024;

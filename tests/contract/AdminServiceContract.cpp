@@ -72,10 +72,11 @@ protected:
 TEST_P(AdminServiceContract, BeforeItResumesNobodyAnswers) { EXPECT_EQ(world_->ask(), std::nullopt); }
 
 TEST_P(AdminServiceContract, AQuestionIsAnsweredWithTheSnapshot) {
-    const Dictionary status{{"sessions", Array{Dictionary{{"bundleIdentifier", "org.example.Player"}, {"recording", true}}}},
-                            {"frames", std::int64_t{1234}},
-                            {"rate", 59.5},
-                            {"nothing", Value()}};
+    const Dictionary status{
+        {"sessions", Array{Dictionary{{"bundleIdentifier", "org.example.Player"}, {"recording", true}}}},
+        {"frames", std::int64_t{1234}},
+        {"rate", 59.5},
+        {"nothing", Value()}};
     world_->admin().resume([status] { return status; });
     const auto answer = world_->ask();
     ASSERT_TRUE(answer);

@@ -61,7 +61,8 @@ class ClockContract : public ::testing::TestWithParam<Maker> {
 protected:
     static std::string text(const CalendarFields& f) {
         char buffer[80];
-        std::snprintf(buffer, sizeof buffer, "%04d-%02d-%02d %02d:%02d:%02d", f.year, f.month, f.day, f.hour, f.minute, f.second);
+        std::snprintf(buffer, sizeof buffer, "%04d-%02d-%02d %02d:%02d:%02d", f.year, f.month, f.day, f.hour, f.minute,
+                      f.second);
         return buffer;
     }
     std::unique_ptr<ClockWorld> world_ = GetParam()();
@@ -140,8 +141,10 @@ TEST_P(ClockContract, ALaterRecordingLeavesTheEarlierClockAlone) {
     EXPECT_EQ(clock_.captureClock(), second);
 }
 
-INSTANTIATE_TEST_SUITE_P(Fake, ClockContract, ::testing::Values(Maker([] { return std::make_unique<FakeClockWorld>(); })));
-INSTANTIATE_TEST_SUITE_P(Port, ClockContract, ::testing::Values(Maker([] { return std::make_unique<PortClockWorld>(); })));
+INSTANTIATE_TEST_SUITE_P(Fake, ClockContract,
+                         ::testing::Values(Maker([] { return std::make_unique<FakeClockWorld>(); })));
+INSTANTIATE_TEST_SUITE_P(Port, ClockContract,
+                         ::testing::Values(Maker([] { return std::make_unique<PortClockWorld>(); })));
 
 }  // namespace
 }  // namespace lumacast

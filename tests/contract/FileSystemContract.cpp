@@ -215,8 +215,9 @@ TEST_P(FileSystemContract, WhatLeavesTheTemporaryDirectoryIsRefused) {
     makeDirectory();
     ASSERT_FALSE(fileSystem_.createDirectory(path("a")));
     world_->addOldFile(path("movie.mp4"), 1);
-    for (const std::string& outside : {path("../Lumacast/movie.mp4"), path("a/../movie.mp4"), path(".."), path("a/.."),
-                                       directory_ + "Evil", std::string("/etc/passwd"), fileSystem_.root() + "/private"}) {
+    for (const std::string& outside :
+         {path("../Lumacast/movie.mp4"), path("a/../movie.mp4"), path(".."), path("a/.."), directory_ + "Evil",
+          std::string("/etc/passwd"), fileSystem_.root() + "/private"}) {
         EXPECT_FALSE(fileSystem_.exists(outside)) << outside;
         EXPECT_EQ(code(fileSystem_.attributes(outside)), EACCES) << outside;
         EXPECT_EQ(code(fileSystem_.createDirectory(outside)), EACCES) << outside;

@@ -81,8 +81,8 @@ TEST_P(PreferencesContract, WhatNobodySetIsNone) {
 }
 
 TEST_P(PreferencesContract, EveryKindComesBackAsItWasSet) {
-    for (const Value& each : {Value(true), Value(false), Value(std::int64_t{1'000'000}), Value(std::int64_t{-3}), Value(0.25),
-                              Value("some text"), Value("")}) {
+    for (const Value& each : {Value(true), Value(false), Value(std::int64_t{1'000'000}), Value(std::int64_t{-3}),
+                              Value(0.25), Value("some text"), Value("")}) {
         set("Key", each);
         EXPECT_EQ(value("Key"), each) << describe(each);
     }

@@ -112,7 +112,8 @@ TEST_P(TelemetryContract, ManyLanesMaySend) {
     std::vector<std::thread> lanes;
     for (int lane = 0; lane < 4; ++lane)
         lanes.emplace_back([this] {
-            for (int i = 0; i < 10; ++i) EXPECT_FALSE(world_->telemetry().send({}, {"a", "b"}, 2, 1, {{"key", "value"}}));
+            for (int i = 0; i < 10; ++i)
+                EXPECT_FALSE(world_->telemetry().send({}, {"a", "b"}, 2, 1, {{"key", "value"}}));
         });
     for (std::thread& lane : lanes) lane.join();
     EXPECT_EQ(world_->received().size(), 40u);

@@ -56,7 +56,8 @@ const BundleIdentifier kPlayer("org.example.Player");
 TEST(LinuxBundles, AProgramBelongsToTheEntryThatStartsIt) {
     Disk disk;
     const std::string program = disk.installProgram("bin/player");
-    disk.installEntry("system/applications/org.example.Player.desktop", "Name=Player\nName[de]=Spieler\nExec=player %U\n");
+    disk.installEntry("system/applications/org.example.Player.desktop",
+                      "Name=Player\nName[de]=Spieler\nExec=player %U\n");
     EXPECT_EQ(disk.identifierOf(program), kPlayer);
     const auto bundle = disk.bundles().withIdentifier(kPlayer);
     ASSERT_TRUE(bundle);
@@ -218,11 +219,13 @@ struct Entitled : Disk {
         program = installProgram("bin/player");
         entry = scratch.path("system/applications/org.example.Player.desktop");
         installEntry("system/applications/org.example.Player.desktop", "Exec=player\n");
-        dropIn = scratch.write("entitlements.d/50-player.conf", "[org.example.Player]\n" + std::string(kName) + "=true\n");
+        dropIn =
+            scratch.write("entitlements.d/50-player.conf", "[org.example.Player]\n" + std::string(kName) + "=true\n");
         running.emplace(program);
     }
     std::optional<Value> value(uid_t administrator = ::geteuid()) {
-        Entitlements entitlements(bundles(), {{scratch.path("entitlements.d")}, administrator, std::chrono::seconds(30)});
+        Entitlements entitlements(bundles(),
+                                  {{scratch.path("entitlements.d")}, administrator, std::chrono::seconds(30)});
         return entitlements.value(running->pid(), kName);
     }
     static constexpr const char* kName = "com.orvane.private.luma-cast";
@@ -285,7 +288,8 @@ TEST(Entitlements, WhatBelongsToSomebodyElseDoesNotCount) {
 
 TEST(Entitlements, AnExplanationSaysWhy) {
     Entitled disk;
-    Entitlements entitlements(disk.bundles(), {{disk.scratch.path("entitlements.d")}, ::geteuid(), std::chrono::seconds(30)});
+    Entitlements entitlements(disk.bundles(),
+                              {{disk.scratch.path("entitlements.d")}, ::geteuid(), std::chrono::seconds(30)});
     auto explanation = entitlements.explain(disk.running->pid());
     EXPECT_TRUE(explanation.counts);
     EXPECT_EQ(explanation.application, kPlayer);

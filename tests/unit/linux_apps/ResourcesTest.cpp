@@ -21,8 +21,8 @@ constexpr std::array kRecordingErrors{"UNKNOWN",      "USER_DECLINED",     "DISA
                                       "MIXING_FAILURE"};
 
 StringsTable table(const std::string& language) {
-    return StringsTable::parse(ScratchDirectory::read(std::string(LC_SOURCE_DIR) + "/resources/Lumacast.bundle/" + language +
-                                                      ".lproj/Localizable.strings"));
+    return StringsTable::parse(ScratchDirectory::read(std::string(LC_SOURCE_DIR) + "/resources/Lumacast.bundle/" +
+                                                      language + ".lproj/Localizable.strings"));
 }
 
 std::size_t placeholders(const std::string& text) {

@@ -41,7 +41,8 @@ TEST(StringsTable, HalfASurrogatePairIsAMistake) {
 }
 
 TEST(StringsTable, WhatStandsBeforeAMistakeIsKept) {
-    for (const char* rest : {"\"B\" \"two\";", "\"B\" = \"two\"", "\"B\" = ;", "\"B", "/* open", "= \"x\";", "\"B\" = \"two\\"}) {
+    for (const char* rest :
+         {"\"B\" \"two\";", "\"B\" = \"two\"", "\"B\" = ;", "\"B", "/* open", "= \"x\";", "\"B\" = \"two\\"}) {
         const auto table = StringsTable::parse("\"A\" = \"one\";\n" + std::string(rest));
         EXPECT_FALSE(table.isComplete()) << rest;
         EXPECT_EQ(table.size(), 1u) << rest;

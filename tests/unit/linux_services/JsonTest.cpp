@@ -30,8 +30,8 @@ TEST(Json, BytesThatAreNotUtf8AreReplaced) { EXPECT_EQ(jsonText(Value("a\xFF" "b
 TEST(Json, ADocumentBecomesAValue) {
     const auto value = valueFromJson(R"({"a": [1, -1, 2.5, "x", true, null, 18446744073709551615], "a2": {}})");
     ASSERT_TRUE(value);
-    EXPECT_EQ(*value, Value(Dictionary{{"a", Array{Value(std::int64_t{1}), Value(std::int64_t{-1}), 2.5, "x", true, Value(),
-                                                   Value(UINT64_MAX)}},
+    EXPECT_EQ(*value, Value(Dictionary{{"a", Array{Value(std::int64_t{1}), Value(std::int64_t{-1}), 2.5, "x", true,
+                                                   Value(), Value(UINT64_MAX)}},
                                        {"a2", Dictionary()}}));
 }
 

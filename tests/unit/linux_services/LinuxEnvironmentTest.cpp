@@ -96,7 +96,8 @@ TEST(LinuxEnvironment, ItsDirectoriesAreThisUsersAlone) {
     auto environment = from({{"HOME", scratch.path("home")}, {"XDG_RUNTIME_DIR", scratch.path("run")}});
     EXPECT_FALSE(environment.prepareDirectories());
     EXPECT_FALSE(environment.prepareDirectories()) << "a second start";
-    for (const std::string& path : {environment.runtimeDirectory, environment.stateDirectory, environment.cacheDirectory})
+    for (const std::string& path :
+         {environment.runtimeDirectory, environment.stateDirectory, environment.cacheDirectory})
         EXPECT_EQ(modeOf(path), 0700u) << path;
 }
 

@@ -70,7 +70,8 @@ TEST(LinuxFileSystem, WhatIsMadeIsThisUsersAlone) {
 
 TEST(LinuxFileSystem, AHungDiskIsUnreadableAfter40Milliseconds) {
     Disk disk(40ms);
-    ASSERT_TRUE(until([&] { return !disk.fileSystem->createDirectory(disk.directory) || disk.fileSystem->exists(disk.directory); }));
+    ASSERT_TRUE(until(
+        [&] { return !disk.fileSystem->createDirectory(disk.directory) || disk.fileSystem->exists(disk.directory); }));
     disk.gate->shut();
     const auto begin = std::chrono::steady_clock::now();
     EXPECT_EQ(code(disk.fileSystem->attributes(disk.directory)), ETIMEDOUT);
@@ -87,7 +88,8 @@ TEST(LinuxFileSystem, AHungDiskIsUnreadableAfter40Milliseconds) {
 
 TEST(LinuxFileSystem, AFileBeingWrittenAnswersEvenOnAHungDisk) {
     Disk disk(40ms);
-    ASSERT_TRUE(until([&] { return !disk.fileSystem->createDirectory(disk.directory) || disk.fileSystem->exists(disk.directory); }));
+    ASSERT_TRUE(until(
+        [&] { return !disk.fileSystem->createDirectory(disk.directory) || disk.fileSystem->exists(disk.directory); }));
     disk.writers[disk.directory + "/movie.mp4"] = 4711;
     disk.gate->shut();
     const auto answer = disk.fileSystem->attributes(disk.directory + "//movie.mp4");
