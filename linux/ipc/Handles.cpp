@@ -72,12 +72,12 @@ std::shared_ptr<LinuxIpcEndpoint> LinuxIpcEndpoint::make(Fd doorbell) {
     return std::make_shared<LinuxIpcEndpoint>(std::move(doorbell));
 }
 
-int encodeFrame(FrameKind kind, std::uint16_t message, Array values, const std::function<std::uint64_t()>& nextLease,
+int encodeFrame(FrameKind kind, std::uint16_t message, const Array& values, const std::function<std::uint64_t()>& nextLease,
                 EncodedFrame& out) {
     WireBody body;
     body.bytes.reserve(kUsualMessage);
     body.bytes.resize(kFrameHeaderBytes);
-    if (!encode(Value(std::move(values)), body)) return EMSGSIZE;
+    if (!encodeArray(values, body)) return EMSGSIZE;
     out.header.kind = kind;
     out.header.message = message;
     out.header.valueBytes = static_cast<std::uint32_t>(body.bytes.size() - kFrameHeaderBytes);
@@ -105,11 +105,9 @@ const char* decodeFrame(IncomingFrames::Frame& frame, const std::weak_ptr<PlaneL
             if (handles.back().isNull()) return "a descriptor that is not what its record says";
         }
     }
-    const std::optional<Value> value = decode(frame.value, handles);
-    if (!value) return "a malformed message";
-    const Array* decoded = value->as<Array>();
-    if (!decoded) return "a message whose arguments are no list";
-    values = *decoded;
+    std::optional<Array> decoded = decodeArray(frame.value, handles);
+    if (!decoded) return "a malformed message";
+    values = std::move(*decoded);
     return nullptr;
 }
 

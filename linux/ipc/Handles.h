@@ -28,9 +28,9 @@ struct EncodedFrame {
 };
 
 /// Encodes `values` as a frame; `nextLease` numbers each plane. A plane without a descriptor is copied into memory of its
-/// own. Answers 0, or the system error that says why it can't be sent: EMSGSIZE (over a limit), EINVAL (an endpoint of
+/// own. Answers 0, or the system error that says why it can't be sent: EMSGSIZE (over a limit, or text that is not valid UTF-8), EINVAL (an endpoint of
 /// another transport, a plane whose memory could shrink), or that of the copy.
-[[nodiscard]] int encodeFrame(FrameKind kind, std::uint16_t message, Array values,
+[[nodiscard]] int encodeFrame(FrameKind kind, std::uint16_t message, const Array& values,
                               const std::function<std::uint64_t()>& nextLease, EncodedFrame& out);
 
 /// Decodes a frame's values. Answers null and sets `values`, or answers why the frame must be refused.

@@ -79,7 +79,7 @@ IncomingFrames::Next IncomingFrames::next(Frame& frame, const char*& reason) {
     return unread_.empty() && !descriptors_.empty() ? Next::Malformed : Next::Frame;
 }
 
-void IncomingFrames::endTurn() {
+std::size_t IncomingFrames::endTurn() {
     if (unread_.empty()) {
         if (kept_.capacity() > kKeptCapacity) kept_ = Data();
         kept_.clear();
@@ -89,6 +89,7 @@ void IncomingFrames::endTurn() {
         kept_.erase(kept_.begin(), kept_.end() - static_cast<std::ptrdiff_t>(unread_.size()));
     }
     unread_ = kept_;
+    return kept_.size();
 }
 
 }  // namespace lumacast

@@ -29,8 +29,8 @@ public:
 
     /// Whether a frame has begun and is not complete.
     bool isMidFrame() const { return !unread_.empty(); }
-    /// Keeps what has not been consumed.
-    void endTurn();
+    /// Keeps what has not been consumed. Answers how many bytes that is.
+    std::size_t endTurn();
 
 private:
     Data kept_;  ///< what was left from earlier turns; `unread_` is all of it, or a part of the scratch when it is empty

@@ -7,19 +7,25 @@
 
 namespace lumacast {
 
+bool ByteBudget::take(std::uint64_t bytes) {
+    if (held_.fetch_add(bytes) + bytes <= limitOf(Limit::HeldBytesPerUser)) return true;
+    held_ -= bytes;
+    return false;
+}
+
 UserTable::Seat::~Seat() {
     if (!table_) return;
     const std::lock_guard lock(table_->mutex_);
-    const auto found = table_->open_.find(user_);
-    if (--found->second == 0) table_->open_.erase(found);
+    const auto found = table_->users_.find(user_);
+    if (--found->second.connections == 0) table_->users_.erase(found);
 }
 
 std::optional<UserTable::Seat> UserTable::take(uid_t user) {
     const std::lock_guard lock(mutex_);
-    std::uint64_t& count = open_[user];
-    if (count >= limitOf(Limit::ConnectionsPerUser)) return std::nullopt;
-    ++count;
-    return Seat(shared_from_this(), user);
+    User& entry = users_[user];
+    if (entry.connections >= limitOf(Limit::ConnectionsPerUser)) return std::nullopt;
+    ++entry.connections;
+    return Seat(shared_from_this(), user, entry.budget);
 }
 
 IpcCore::IpcCore(Reactor& theReactor, Log& theLog, EntitlementLookup lookup, std::chrono::nanoseconds deadline)

@@ -4,6 +4,7 @@
 #include <sys/types.h>
 
 #include <array>
+#include <atomic>
 #include <chrono>
 #include <cstdint>
 #include <functional>
@@ -27,30 +28,51 @@ class LinuxIpcConnection;
 /// Answers what the administrator granted to a process under a name. Called on whatever lane asks.
 using EntitlementLookup = std::function<std::optional<Value>(ProcessID, std::string_view)>;
 
-/// Counts the open connections of each user. Thread-safe (a leaf lock).
+/// Counts the bytes that are kept for one user's connections. Lock-free; callable from any lane.
+class ByteBudget {
+public:
+    /// Takes `bytes` more, unless that goes over the limit.
+    [[nodiscard]] bool take(std::uint64_t bytes);
+    /// Takes them in any case: bytes that can't be refused any more.
+    void takeAnyway(std::uint64_t bytes) { held_ += bytes; }
+    void give(std::uint64_t bytes) { held_ -= bytes; }
+
+private:
+    std::atomic<std::uint64_t> held_{0};
+};
+
+/// Counts the open connections of each user, and what is kept for them. Thread-safe (a leaf lock).
 class UserTable : public std::enable_shared_from_this<UserTable> {
 public:
     /// One connection's place in the count, given back when it goes.
     class Seat {
     public:
-        Seat(std::shared_ptr<UserTable> table, uid_t user) : table_(std::move(table)), user_(user) {}
+        Seat(std::shared_ptr<UserTable> table, uid_t user, std::shared_ptr<ByteBudget> budget)
+            : table_(std::move(table)), user_(user), budget_(std::move(budget)) {}
         Seat(Seat&&) = default;
         Seat(const Seat&) = delete;
         Seat& operator=(const Seat&) = delete;
         Seat& operator=(Seat&&) = delete;
         ~Seat();
 
+        const std::shared_ptr<ByteBudget>& budget() const { return budget_; }
+
     private:
         std::shared_ptr<UserTable> table_;
         uid_t user_;
+        std::shared_ptr<ByteBudget> budget_;
     };
 
     /// None when the user has as many connections as the limits table allows.
     std::optional<Seat> take(uid_t user);
 
 private:
+    struct User {
+        std::uint64_t connections = 0;
+        std::shared_ptr<ByteBudget> budget = std::make_shared<ByteBudget>();
+    };
     std::mutex mutex_;
-    std::map<uid_t, std::uint64_t> open_;
+    std::map<uid_t, User> users_;
 };
 
 class IpcCore {

@@ -29,12 +29,17 @@ private:
 
 LinuxIpcConnection::LinuxIpcConnection(std::shared_ptr<IpcCore> core, Fd socket, Peer peer,
                                        std::optional<UserTable::Seat> seat)
-    : core_(std::move(core)), peer_(std::move(peer)), socket_(std::move(socket)) {
+    : core_(std::move(core)),
+      peer_(std::move(peer)),
+      budget_(seat ? seat->budget() : nullptr),
+      socket_(std::move(socket)),
+      outgoing_(budget_) {
     if (seat) seat_.emplace(std::move(*seat));
 }
 
 LinuxIpcConnection::~LinuxIpcConnection() {
     watch_.reset();
+    if (budget_) budget_->give(heldBytes_);
     for (auto& [sequence, pending] : pending_) fail(pending.errorHandler, EPIPE);
     for (OutgoingFrame& frame : outgoing_.takeAll()) fail(frame.onLost, EPIPE);
 }
@@ -145,6 +150,7 @@ void LinuxIpcConnection::deliverLoss() {
     seat.reset();
     leases.clear();
     incoming_ = IncomingFrames();
+    [[maybe_unused]] const bool given = hold(0);
     helloTimer_.reset();
     greeted_ = nullptr;
     const Error error(std::string(kSystemErrorDomain), EPIPE);

@@ -82,6 +82,7 @@ private:
     const char* receiveReply(IncomingFrames::Frame& frame);
     const char* receiveTransport(const FrameHeader& header);
     bool startWatching();
+    [[nodiscard]] bool hold(std::uint64_t bytes);
 
     // The end.
     bool isLost();
@@ -91,6 +92,7 @@ private:
 
     const std::shared_ptr<IpcCore> core_;
     const Peer peer_;
+    const std::shared_ptr<ByteBudget> budget_;  ///< of the peer's user; null where nobody counts
     std::atomic<std::uint64_t> nextLease_{1};
 
     std::mutex mutex_;
@@ -114,6 +116,7 @@ private:
     Data hello_;
     bool isGreeted_ = false;
     bool hasFramesLeft_ = false;
+    std::uint64_t heldBytes_ = 0;  ///< of an unfinished message, as counted in the budget
     Greeted greeted_;
     std::unique_ptr<Timer> helloTimer_;
     std::uint64_t lastSequence_ = 0;

@@ -123,8 +123,18 @@ Reactor::Again LinuxIpcConnection::readFrames() {
         if (next != IncomingFrames::Next::Frame) break;
         dispatch(frame);
     }
-    incoming_.endTurn();
+    if (!hold(incoming_.endTurn())) drop("its user has too many unfinished messages");
     return hasFramesLeft_ ? Reactor::Again::Yes : Reactor::Again::No;
+}
+
+/// Counts `bytes` as kept for the peer, instead of what was counted before.
+bool LinuxIpcConnection::hold(std::uint64_t bytes) {
+    const std::uint64_t before = std::exchange(heldBytes_, bytes);
+    if (!budget_ || before == bytes) return true;
+    budget_->give(before);
+    if (budget_->take(bytes)) return true;
+    heldBytes_ = 0;
+    return false;
 }
 
 void LinuxIpcConnection::dispatch(IncomingFrames::Frame& frame) {

@@ -27,8 +27,7 @@ void LinuxIpcConnection::send(std::uint16_t message, Array arguments, ReplyHandl
     if ((reply && !wantsReply) || !matches(arguments, declaration.arguments)) return fail(errorHandler, EINVAL);
 
     EncodedFrame encoded;
-    int error = encodeFrame(wantsReply ? FrameKind::Request : FrameKind::Message, message, std::move(arguments),
-                            [this] { return nextLease_++; }, encoded);
+    int error = encodeFrame(wantsReply ? FrameKind::Request : FrameKind::Message, message, arguments, [this] { return nextLease_++; }, encoded);
     PendingReply pending{&declaration, std::move(reply), std::move(errorHandler)};
     if (error == 0) error = commit(encoded, pending);
     if (error != 0) fail(pending.errorHandler, error);
@@ -67,7 +66,7 @@ void LinuxIpcConnection::reply(std::uint64_t sequence, const MessageDeclaration&
     int error = EINVAL;
     EncodedFrame encoded;
     if (matches(values, declaration.replyValues)) {
-        error = encodeFrame(FrameKind::Reply, 0, std::move(values), [this] { return nextLease_++; }, encoded);
+        error = encodeFrame(FrameKind::Reply, 0, values, [this] { return nextLease_++; }, encoded);
         encoded.header.sequence = sequence;
         PendingReply nobody{};
         if (error == 0) error = commit(encoded, nobody);

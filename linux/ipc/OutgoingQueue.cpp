@@ -57,33 +57,46 @@ OutgoingQueue::Result OutgoingQueue::send(int socket, OutgoingFrame& frame) {
         if (sent > 0) frame.written = static_cast<std::size_t>(sent);
         if (frame.written == frame.bytes.size()) return Result::Sent;
     }
-    // A frame that has begun must be finished; the queue is empty then, so there is room.
-    const std::uint64_t size = frame.bytes.size() - frame.written;
-    if (waitingBytes_ + size > limitOf(Limit::QueuedBytesPerReader)) return Result::Full;
-    waitingBytes_ += size;
+    if (!hasRoomFor(frame)) return Result::Full;
+    waitingBytes_ += frame.bytes.size() - frame.written;
     waiting_.push_back(std::move(frame));
     return Result::Queued;
+}
+
+bool OutgoingQueue::hasRoomFor(const OutgoingFrame& frame) {
+    const std::uint64_t size = frame.bytes.size() - frame.written;
+    if (frame.written > 0) {
+        // It has begun and must be finished. Nothing else waits then.
+        if (budget_) budget_->takeAnyway(size);
+        return true;
+    }
+    return waitingBytes_ + size <= limitOf(Limit::QueuedBytesPerReader) && (!budget_ || budget_->take(size));
+}
+
+void OutgoingQueue::sent(std::uint64_t bytes) {
+    waitingBytes_ -= bytes;
+    if (budget_) budget_->give(bytes);
 }
 
 OutgoingQueue::Flushed OutgoingQueue::flush(int socket, std::vector<OutgoingFrame>& done) {
     for (int i = 0; i < kWritesPerFlush && !waiting_.empty(); ++i) {
         std::array<iovec, kFramesPerWrite> parts;
-        std::size_t count = 0;
+        std::size_t used = 0;
         for (OutgoingFrame& frame : waiting_) {
             // Descriptors go with the first byte of a write, so a frame that has some begins one.
-            if (count == parts.size() || (count > 0 && !frame.descriptors.empty())) break;
-            parts[count++] = rest(frame);
+            if (used == parts.size() || (used > 0 && !frame.descriptors.empty())) break;
+            parts[used++] = rest(frame);
         }
         std::span<const int> descriptors;
         if (waiting_.front().written == 0) descriptors = waiting_.front().descriptors;
-        ssize_t sent = write(socket, std::span(parts).first(count), descriptors);
-        if (sent < 0) return errno == EAGAIN ? Flushed::Some : Flushed::Broken;
-        waitingBytes_ -= static_cast<std::uint64_t>(sent);
-        while (sent > 0) {
+        const ssize_t count = write(socket, std::span(parts).first(used), descriptors);
+        if (count < 0) return errno == EAGAIN ? Flushed::Some : Flushed::Broken;
+        sent(static_cast<std::uint64_t>(count));
+        for (auto left = static_cast<std::size_t>(count); left > 0;) {
             OutgoingFrame& frame = waiting_.front();
-            const std::size_t part = std::min(static_cast<std::size_t>(sent), frame.bytes.size() - frame.written);
+            const std::size_t part = std::min(left, frame.bytes.size() - frame.written);
             frame.written += part;
-            sent -= static_cast<ssize_t>(part);
+            left -= part;
             if (frame.written < frame.bytes.size()) break;
             done.push_back(std::move(frame));
             waiting_.pop_front();
@@ -93,7 +106,7 @@ OutgoingQueue::Flushed OutgoingQueue::flush(int socket, std::vector<OutgoingFram
 }
 
 std::deque<OutgoingFrame> OutgoingQueue::takeAll() {
-    waitingBytes_ = 0;
+    sent(waitingBytes_);
     return std::exchange(waiting_, {});
 }
 

@@ -1,10 +1,13 @@
 #pragma once
 #include <cstdint>
 #include <deque>
+#include <memory>
+#include <utility>
 #include <vector>
 
 #include "base/Value.h"
 #include "linux/ipc/Fd.h"
+#include "linux/ipc/IpcCore.h"
 #include "platform/IpcConnection.h"
 
 namespace lumacast {
@@ -23,6 +26,12 @@ struct OutgoingFrame {
 /// What waits for a peer that reads slower than we write. Never blocks. Not thread-safe: the connection's lock guards it.
 class OutgoingQueue {
 public:
+    /// `budget`: where the bytes that wait are counted, if anywhere.
+    explicit OutgoingQueue(std::shared_ptr<ByteBudget> budget) : budget_(std::move(budget)) {}
+    OutgoingQueue(const OutgoingQueue&) = delete;
+    OutgoingQueue& operator=(const OutgoingQueue&) = delete;
+    ~OutgoingQueue() { takeAll(); }
+
     enum class Result {
         Sent,  ///< the kernel has it
         Queued,  ///< it waits for flush
@@ -42,6 +51,10 @@ public:
     std::deque<OutgoingFrame> takeAll();
 
 private:
+    bool hasRoomFor(const OutgoingFrame& frame);
+    void sent(std::uint64_t bytes);
+
+    const std::shared_ptr<ByteBudget> budget_;
     std::deque<OutgoingFrame> waiting_;
     std::uint64_t waitingBytes_ = 0;
 };

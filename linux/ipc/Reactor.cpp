@@ -17,6 +17,8 @@ constexpr std::uint64_t kWakeID = 0;
 constexpr int kTasksPerTurn = 64;
 constexpr std::chrono::milliseconds kTaskTimePerTurn{2};
 constexpr std::size_t kEventsPerTurn = 64;
+/// How long watches may run before tasks get their turn again.
+constexpr std::chrono::milliseconds kWatchTimePerTurn{4};
 
 /// Without these two descriptors there is no process to run: the one place that throws, before anything has started.
 Fd required(int descriptor, const char* what) {
@@ -158,19 +160,28 @@ void Reactor::run() {
             const std::lock_guard lock(mutex_);
             sleeping_ = false;
         }
+        tasksDue_ = std::chrono::steady_clock::now() + kWatchTimePerTurn;
         for (int i = 0; i < count && !stop_; ++i) {
             const std::uint64_t id = events[static_cast<std::size_t>(i)].data.u64;
             if (id == kWakeID) continue;
             if (!again.empty()) std::erase(again, id);
             runWatch(id, events[static_cast<std::size_t>(i)].events);
+            runTasksIfDue();
         }
         for (const std::uint64_t id : again) {
             if (stop_) break;
             runWatch(id, 0);
+            runTasksIfDue();
         }
     }
     thread_ = std::thread::id();
     stop_ = false;
+}
+
+void Reactor::runTasksIfDue() {
+    if (std::chrono::steady_clock::now() < tasksDue_) return;
+    runTasks();
+    tasksDue_ = std::chrono::steady_clock::now() + kWatchTimePerTurn;
 }
 
 void Reactor::runTasks() {

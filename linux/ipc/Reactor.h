@@ -75,6 +75,8 @@ private:
     class PendingTimer;
 
     void runTasks();
+    /// Between two watches, so that many ready descriptors don't keep the tasks waiting.
+    void runTasksIfDue();
     void runTimers();
     void runWatch(std::uint64_t id, std::uint32_t events);
     /// Says how long epoll may sleep, in milliseconds; -1 for as long as it takes. Notes that the loop is about to sleep.
@@ -94,7 +96,9 @@ private:
     std::uint64_t nextID_ = 1;
     bool sleeping_ = false;
 
-    std::vector<std::uint64_t> again_;  ///< the loop's own
+    // The loop's own.
+    std::vector<std::uint64_t> again_;
+    Instant tasksDue_;
 };
 
 }  // namespace lumacast

@@ -17,6 +17,8 @@ enum class Limit : std::uint8_t {
     ContextIdentifiersPerRequest,
     HelloBytes,
     PlanesLeased,
+    MessageValues,
+    HeldBytesPerUser,
 };
 
 struct LimitRow {
@@ -36,6 +38,8 @@ inline constexpr std::array kLimits{
     LimitRow{Limit::ContextIdentifiersPerRequest, 64, "window layers named in one start request"},
     LimitRow{Limit::HelloBytes, 64, "bytes a peer may send before its hello is complete"},
     LimitRow{Limit::PlanesLeased, 4, "planes lent to one peer at a time"},
+    LimitRow{Limit::MessageValues, 16'384, "values in one message, at all depths"},
+    LimitRow{Limit::HeldBytesPerUser, 64 << 20, "bytes of unfinished and of unread messages of one user's connections"},
 };
 
 constexpr std::uint64_t limitOf(Limit limit) { return kLimits[static_cast<std::size_t>(limit)].value; }

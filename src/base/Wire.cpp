@@ -15,12 +15,22 @@ enum Tag : std::uint8_t {
     kNull, kBool, kInt64, kUInt64, kDouble, kText, kBytes, kDate, kURL, kArray, kDictionary, kError, kEndpoint, kPlane,
 };
 
+/// Dictionaries look up linearly; more entries than this in one dictionary would let a peer make that slow.
+constexpr std::size_t kMaximumEntries = 1024;
+
 class Encoder {
 public:
     explicit Encoder(WireBody& body) : body_(body) {}
 
+    bool array(const Array& items) {
+        ++values_;
+        tag(kArray);
+        return write(items, 0);
+    }
+
     bool value(const Value& item, unsigned depth) {
         if (depth > limitOf(Limit::MessageDepth) || body_.bytes.size() > limitOf(Limit::MessageBytes)) return false;
+        if (++values_ > limitOf(Limit::MessageValues)) return false;
         tag(static_cast<Tag>(item.storage().index()));
         return std::visit([&](const auto& contents) { return write(contents, depth); }, item.storage());
     }
@@ -31,7 +41,7 @@ private:
     bool write(std::int64_t number, unsigned) { return fixed(static_cast<std::uint64_t>(number), 8); }
     bool write(std::uint64_t number, unsigned) { return fixed(number, 8); }
     bool write(double number, unsigned) { return fixed(std::bit_cast<std::uint64_t>(number), 8); }
-    bool write(const std::string& text, unsigned) { return bytes(text.data(), text.size()); }
+    bool write(const std::string& text, unsigned) { return string(text); }
     bool write(const Data& data, unsigned) { return bytes(data.data(), data.size()); }
     bool write(Date date, unsigned depth) { return write(date.secondsSince1970, depth); }
     bool write(const URL& url, unsigned depth) { return write(url.text(), depth); }
@@ -42,14 +52,14 @@ private:
         return true;
     }
     bool write(const Dictionary& dictionary, unsigned depth) {
-        if (!fixed(dictionary.size(), 4)) return false;
+        if (dictionary.size() > kMaximumEntries || !fixed(dictionary.size(), 4)) return false;
         for (const auto& [key, item] : dictionary.entries())
-            if (!bytes(key.data(), key.size()) || !value(item, depth + 1)) return false;
+            if (!string(key) || !value(item, depth + 1)) return false;
         return true;
     }
     bool write(const Value::ErrorRef& error, unsigned depth) {
-        return bytes(error->domain().data(), error->domain().size()) &&
-               fixed(static_cast<std::uint64_t>(error->code()), 8) && write(error->userInfo(), depth);
+        return string(error->domain()) && fixed(static_cast<std::uint64_t>(error->code()), 8) &&
+               write(error->userInfo(), depth);
     }
     bool write(const Value::EndpointRef& endpoint, unsigned) { return handle(endpoint); }
     bool write(const Value::PlaneRef& plane, unsigned) { return handle(plane); }
@@ -60,6 +70,7 @@ private:
         body_.handles.push_back(std::move(item));
         return true;
     }
+    bool string(const std::string& text) { return isValidUtf8(text) && bytes(text.data(), text.size()); }
     void tag(Tag tag) { body_.bytes.push_back(tag); }
     bool fixed(std::uint64_t number, unsigned size) {
         for (unsigned i = 0; i < size; ++i) body_.bytes.push_back(static_cast<std::uint8_t>(number >> (8 * i)));
@@ -74,6 +85,7 @@ private:
     }
 
     WireBody& body_;
+    std::uint64_t values_ = 0;
 };
 
 class Decoder {
@@ -84,7 +96,7 @@ public:
 
     bool value(Value& out, unsigned depth) {
         std::uint8_t tag = 0;
-        if (depth > limitOf(Limit::MessageDepth) || !byte(tag)) return false;
+        if (depth > limitOf(Limit::MessageDepth) || ++values_ > limitOf(Limit::MessageValues) || !byte(tag)) return false;
         switch (tag) {
             case kNull: out = Value(); return true;
             case kBool: return boolean(out);
@@ -102,6 +114,12 @@ public:
             case kPlane: return handle<Value::PlaneRef>(out);
             default: return false;
         }
+    }
+
+    bool array(Array& out) {
+        std::uint8_t tag = 0;
+        ++values_;
+        return byte(tag) && tag == kArray && items(out, 0);
     }
 
 private:
@@ -158,16 +176,20 @@ private:
         rest_ = rest_.subspan(size);
         return true;
     }
-    bool array(Value& out, unsigned depth) {
+    bool items(Array& out, unsigned depth) {
         std::uint64_t count = 0;
         if (!fixed(count, 4) || count > rest_.size()) return false;
-        Array items;
         for (std::uint64_t i = 0; i < count; ++i) {
             Value item;
             if (!value(item, depth + 1)) return false;
-            items.push_back(std::move(item));
+            out.push_back(std::move(item));
         }
-        out = Value(std::move(items));
+        return true;
+    }
+    bool array(Value& out, unsigned depth) {
+        Array contents;
+        if (!items(contents, depth)) return false;
+        out = Value(std::move(contents));
         return true;
     }
     bool entries(Dictionary& out, unsigned depth) {
@@ -205,22 +227,29 @@ private:
         return true;
     }
 
-    /// Dictionaries look up linearly; more entries than this in one dictionary would let a peer make that slow.
-    static constexpr std::size_t kMaximumEntries = 1024;
-
     std::span<const std::uint8_t> rest_;
     std::span<const Value> handles_;
+    std::uint64_t values_ = 0;
 };
 
 }  // namespace
 
 bool encode(const Value& value, WireBody& body) { return Encoder(body).value(value, 0); }
 
+bool encodeArray(const Array& items, WireBody& body) { return Encoder(body).array(items); }
+
 std::optional<Value> decode(std::span<const std::uint8_t> bytes, std::span<const Value> handles) {
     Decoder decoder(bytes, handles);
     Value value;
     if (!decoder.value(value, 0) || !decoder.done()) return std::nullopt;
     return value;
+}
+
+std::optional<Array> decodeArray(std::span<const std::uint8_t> bytes, std::span<const Value> handles) {
+    Decoder decoder(bytes, handles);
+    Array items;
+    if (!decoder.array(items) || !decoder.done()) return std::nullopt;
+    return items;
 }
 
 }  // namespace lumacast

@@ -21,14 +21,18 @@ struct WireBody {
     std::vector<Value> handles;
 };
 
-/// Appends `value` to `body`. Answers false, leaving `body` unusable, when it is too deep, too long or names too many
-/// handles for the limits table.
+/// Appends `value` to `body`. Answers false, leaving `body` unusable, when decode would refuse it: when it is too deep, too
+/// long, has too many values or names too many handles for the limits table, or has text that is not valid UTF-8.
 [[nodiscard]] bool encode(const Value& value, WireBody& body);
+/// The same for an array that is no value yet.
+[[nodiscard]] bool encodeArray(const Array& items, WireBody& body);
 
 /// Reads exactly one value from all of `bytes`. `handles` are what travelled beside them. Answers none for anything
-/// malformed: truncated, trailing bytes, unknown tag, too deep, a handle out of range or of the wrong kind, a count that
-/// the remaining bytes can't hold, text that is not valid UTF-8, a key given twice. Never allocates more than a small
-/// multiple of the input's size.
+/// malformed: truncated, trailing bytes, unknown tag, too deep, too many values, a handle out of range or of the wrong
+/// kind, a count that the remaining bytes can't hold, text that is not valid UTF-8, a key given twice. Never allocates more
+/// than a small multiple of the input's size.
 [[nodiscard]] std::optional<Value> decode(std::span<const std::uint8_t> bytes, std::span<const Value> handles);
+/// The same for a value that must be an array.
+[[nodiscard]] std::optional<Array> decodeArray(std::span<const std::uint8_t> bytes, std::span<const Value> handles);
 
 }  // namespace lumacast

@@ -74,7 +74,7 @@ std::vector<BadFrame> badFrames() {
         {"OtherTypes", rawFrame(setMicrophone(), encoded(Array{1})), "other types"},
         {"TooFewArguments", rawFrame(setMicrophone(), encoded(Array{})), "other types"},
         {"TooManyArguments", rawFrame(setMicrophone(), encoded(Array{true, true})), "other types"},
-        {"NoList", rawFrame(setMicrophone(), encoded(Value(true))), "no list"},
+        {"NoList", rawFrame(setMicrophone(), encoded(Value(true))), "malformed message"},
         {"NoValue", rawFrame(setMicrophone(), {}), "malformed message"},
         {"TrailingBytes", rawFrame(setMicrophone(), encoded(Array{true}).size() ? arguments({1, 1, 0}) : Data()), "malformed"},
         {"UnknownTag", rawFrame(setMicrophone(), arguments({14})), "malformed"},

@@ -45,8 +45,52 @@ protected:
                 peer.send(helloWith(12, static_cast<std::uint8_t>(limitOf(limit) + 1)));
                 return expectDropped(peer, "its hello is too long");
             case Limit::PlanesLeased: return overflowLeases(peer);
+            case Limit::MessageValues:
+                // One value is the list itself.
+                peer.hello();
+                peer.send(rawFrame(setMicrophone(1), nulls(limitOf(limit) - 1)));
+                expectDropped(peer, "other types");  // as many as the limit are read
+                peer = RawPeer(path());
+                peer.hello();
+                peer.send(rawFrame(setMicrophone(1), nulls(limitOf(limit))));
+                return expectDropped(peer, "malformed message", 1);
+            case Limit::HeldBytesPerUser: return overflowUnfinished();
         }
         FAIL() << "no overflow for this limit";
+    }
+
+    static Data nulls(std::uint64_t count) {
+        Data bytes{9};
+        for (unsigned i = 0; i < 4; ++i) bytes.push_back(static_cast<std::uint8_t>(count >> (8 * i)));
+        bytes.resize(bytes.size() + count);
+        return bytes;
+    }
+
+    void overflowUnfinished() {
+        // Each says almost all of the longest message.
+        const std::uint64_t size = limitOf(Limit::MessageBytes);
+        FrameHeader header = setMicrophone(1);
+        header.valueBytes = static_cast<std::uint32_t>(size - kFrameHeaderBytes);
+        const Data almost = rawFrame(header, Data(header.valueBytes - 1), {}, true);
+        const std::uint64_t fitting = limitOf(Limit::HeldBytesPerUser) / size;
+        std::vector<RawPeer> peers;
+        for (std::uint64_t i = 0; i < fitting; ++i) {
+            ASSERT_TRUE(peers.emplace_back(path()).hello());
+            ASSERT_TRUE(peers.back().send(almost));
+        }
+        EXPECT_TRUE(isServed());
+        EXPECT_TRUE(lines().empty()) << "the limit itself is fine";
+        RawPeer excess(path());
+        excess.hello();
+        excess.send(almost);
+        expectDropped(excess, "its user has too many unfinished messages");
+        peers.pop_back();
+        ASSERT_TRUE(until([&] { return lines().size() == 2; })) << "of the truncated message";
+        RawPeer next(path());
+        ASSERT_TRUE(next.hello());
+        ASSERT_TRUE(next.send(almost));
+        ASSERT_TRUE(next.send(Data{0}));
+        expectDropped(next, "malformed message", 2);
     }
 
     void overflowConnections() {
@@ -142,7 +186,7 @@ TEST_P(IpcLimitTest, IsKept) {
 std::string limitName(const ::testing::TestParamInfo<LimitRow>& info) {
     constexpr std::array kNames{"MessageBytes",     "MessageDepth",         "HandlesPerMessage",
                                 "ConnectionsPerUser", "MessagesInFlight",   "QueuedBytesPerReader",
-                                "ContextIdentifiersPerRequest", "HelloBytes", "PlanesLeased"};
+                                "ContextIdentifiersPerRequest", "HelloBytes", "PlanesLeased", "MessageValues", "HeldBytesPerUser"};
     static_assert(kNames.size() == kLimits.size());
     return kNames.at(static_cast<std::size_t>(info.param.limit));
 }
