@@ -49,11 +49,12 @@ std::uint32_t X11AppStateMonitor::applicationState(const BundleIdentifier& ident
 }
 
 std::uint32_t X11AppStateMonitor::stateOf(X11Connection& connection, const BundleIdentifier& identifier) {
+    // The active window alone answers most questions, and looking at every process may take longer than an answer has.
+    const auto active = frontProcess(connection);
+    if (active && identifierOf_(*active) == identifier) return kRunningForeground;
     const auto processes = processesOf_(identifier);
     if (processes.empty()) return 0;
-    const auto active = frontProcess(connection);
-    if (active && (contains(processes, *active) || identifierOf_(*active) == identifier))
-        return kRunningForeground;
+    if (active && contains(processes, *active)) return kRunningForeground;
     return isToolInFront(connection, processes, active) ? kRunningForeground : kRunningBackground;
 }
 

@@ -89,6 +89,10 @@ public:
         if (!number.empty()) name_ = ":" + number;
     }
 
+    /// A name that nobody else is given while this process runs: for a server that is to be followed by another one of the same
+    /// name.
+    static std::string nameOfOnesOwn() { return ":" + std::to_string(1000 + ::getpid() % 30000); }
+
     /// As in $DISPLAY; empty when the server did not start.
     const std::string& name() const { return name_; }
     void hang() const { server_->send(SIGSTOP); }

@@ -163,13 +163,15 @@ TEST(X11RenderServer, DoesNotAskAServerAgainThatHasNotAnswered) {
 }
 
 TEST(X11RenderServer, WorksWithTheNextServerWhenOneHasDied) {
-    auto display = std::make_unique<test::PrivateDisplay>();
-    const std::string name = display->name();
+    const std::string name = test::PrivateDisplay::nameOfOnesOwn();
+    auto display = std::make_unique<test::PrivateDisplay>("800x600x24", name);
+    ASSERT_EQ(display->name(), name);
     X11RenderServer server(name);
     EXPECT_EQ(server.clientPort(ContextID{0x200001}), nullptr);
     display.reset();
     EXPECT_EQ(server.clientPort(ContextID{0x200001}), nullptr);
     const test::PrivateDisplay next("800x600x24", name);
+    ASSERT_EQ(next.name(), name);
     const test::XClientProcess application(next.name());
     const auto limit = std::chrono::steady_clock::now() + 20s;
     std::unique_ptr<ClientPort> port;

@@ -8,6 +8,8 @@
 #include <algorithm>
 #include <cstdlib>
 #include <filesystem>
+#include <random>
+#include <utility>
 
 #include "linux/display/X11DisplayCapture.h"
 #include "linux/system/LinuxClock.h"
@@ -170,6 +172,39 @@ TEST_F(X11Capture, KeepsTheShapeAndLeavesTheRestBlack) {
     window.resize(320, 240);
     window.paint(kBlue);
     ASSERT_TRUE(frames->waitForColour(kBlue));
+}
+
+TEST_F(X11Capture, ScalesWhatChangesJustAsItScalesTheWhole) {
+    for (const auto& [width, height] : {std::pair{200, 150}, std::pair{500, 375}, std::pair{317, 413}}) {
+        TestWindow window(display.name(), {.place = {0, 0, 320, 240}, .colour = kRed, .repaints = false});
+        frames->clear();
+        frames->keepPlanes = true;
+        const auto made = startOn(window, width, height, 1000);
+        ASSERT_TRUE(frames->waitForCount(1));
+        std::mt19937 random(5);
+        for (std::uint32_t i = 1; i <= 40; ++i) {
+            const int x = static_cast<int>(random() % 300), y = static_cast<int>(random() % 220);
+            const std::size_t before = frames->count();
+            window.paintPart({x, y, 1 + static_cast<int>(random() % 20), 1 + static_cast<int>(random() % 20)}, random() & 0xFFFFFF);
+            ASSERT_TRUE(frames->waitForCount(before + 1));
+            if (i % 4 == 0) frames->clear();
+        }
+        // One that begins now reads and scales everything.
+        const auto whole = std::make_shared<CapturedFrames>();
+        whole->keepPlanes = true;
+        const auto other = capture.makeSource({static_cast<double>(width), static_cast<double>(height)}, MediaTime::make(1, 60));
+        other->setDelegate(whole);
+        other->openGate();
+        other->start();
+        ASSERT_TRUE(whole->waitForCount(1));
+        const auto expected = whole->frames().back().plane;
+        const auto same = [&](const Frames& got) {
+            if (got.empty() || !got.back().plane) return false;
+            const auto a = got.back().plane->pixels(), b = expected->pixels();
+            return std::equal(a.begin(), a.end(), b.begin(), b.end());
+        };
+        EXPECT_TRUE(frames->waitFor(same, std::chrono::seconds(5))) << width << "x" << height;
+    }
 }
 
 TEST_F(X11Capture, TakesOddSizes) {
@@ -447,24 +482,35 @@ TEST_F(X11Capture, DamageTellsWhatDiffersFromTheLastPicture) {
 }
 
 TEST_F(X11Capture, FailsOnceWhenTheServerDiesAndWorksWithTheNextOne) {
-    auto window = std::make_unique<TestWindow>(display.name(), Look{.colour = kRed});
-    const auto made = startOn(*window, 320, 240);
+    const std::string name = PrivateDisplay::nameOfOnesOwn();
+    auto first = std::make_unique<PrivateDisplay>("800x600x24", name);
+    ASSERT_EQ(first->name(), name);
+    X11DisplayCapture lasting(name, clock, scheduler);
+    auto window = std::make_unique<TestWindow>(name, Look{.colour = kRed});
+    lasting.setContexts({window->context()});
+    lasting.setMirroringMode(DisplayCloneControl::kCloneContexts);
+    const auto made = lasting.makeSource({320, 240}, MediaTime::make(1, 60));
+    made->setDelegate(frames);
+    made->openGate();
+    made->start();
     ASSERT_TRUE(frames->waitForColour(kRed));
-    display.kill();
+    first.reset();
     EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kDisplayLost);
     made->start();
     ASSERT_TRUE(frames->waitFor([&](const Frames&) { return frames->failuresUnlocked() >= 2; }));
     EXPECT_EQ(frames->failures()[1], X11CaptureStatus::kNoDisplay);
     window.reset();
 
-    const PrivateDisplay next("800x600x24", display.name());
-    ASSERT_EQ(next.name(), display.name());
-    TestWindow another(next.name(), {.colour = kGreen});
-    capture.setContexts({another.context()});
-    frames->clear();
+    const PrivateDisplay next("800x600x24", name);
+    ASSERT_EQ(next.name(), name);
+    TestWindow another(name, {.colour = kGreen});
+    made->start();
+    ASSERT_TRUE(frames->waitFor([&](const Frames&) { return frames->failuresUnlocked() >= 3; }));
+    EXPECT_EQ(frames->failures()[2], X11CaptureStatus::kWindowGone) << "the old server's windows are nobody's";
+    lasting.setContexts({another.context()});
     made->start();
     ASSERT_TRUE(frames->waitForColour(kGreen));
-    EXPECT_EQ(frames->failures().size(), 2u);
+    EXPECT_EQ(frames->failures().size(), 3u);
 }
 
 TEST_F(X11Capture, NobodyWaitsForAServerThatHangs) {

@@ -12,11 +12,19 @@ namespace {
 constexpr const char* kVariable = "LC_TEST_X_CLIENT";
 
 // The other process: this same program, which does this before anything else when the variable is set.
-[[noreturn]] void serve(const char* display, int report) {
+
+// Ends when its parent ends, which it may have done already.
+void dieWith(pid_t parent) {
     ::prctl(PR_SET_PDEATHSIG, SIGKILL);
+    if (::getppid() != parent) ::_exit(1);
+}
+
+[[noreturn]] void serve(const char* display, int report, pid_t test) {
+    dieWith(test);
+    const pid_t self = ::getpid();
     const pid_t tool = ::fork();
     if (tool == 0) {
-        ::prctl(PR_SET_PDEATHSIG, SIGKILL);
+        dieWith(self);
         while (true) ::pause();
     }
     xcb_connection_t* const x = xcb_connect(display, nullptr);
@@ -38,9 +46,11 @@ const struct Early {
     Early() {
         const char* const text = std::getenv(kVariable);
         if (text == nullptr) return;
-        int report = -1;
+        int report = -1, test = 0;
         char display[64] = "";
-        if (std::sscanf(text, "%d %63s", &report, display) == 2) serve(display, report);
+        // Never the tests themselves.
+        if (std::sscanf(text, "%d %d %63s", &report, &test, display) != 3) ::_exit(1);
+        serve(display, report, test);
     }
 } early;
 
@@ -53,7 +63,8 @@ XClientProcess::XClientProcess(const std::string& display) {
     Fd write(ends[1]);
     process_ = std::make_unique<ChildProcess>(
         std::vector<std::string>{"/proc/self/exe"}, write.get(),
-        std::vector<std::string>{std::string(kVariable) + "=" + std::to_string(write.get()) + " " + display});
+        std::vector<std::string>{std::string(kVariable) + "=" + std::to_string(write.get()) + " " +
+                                 std::to_string(::getpid()) + " " + display});
     write.reset();
     std::string line;
     char letter = 0;
