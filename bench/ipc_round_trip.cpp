@@ -1,5 +1,5 @@
-// The round trip of a request of 100 bytes on the wire and its reply of 30 between two processes: over the transport, each end with its reactor,
-// and over a bare socket with blocking calls, in alternation. Prints microseconds.
+// The round trip of a request of 100 bytes on the wire and its reply of 30 between two processes: over the transport,
+// each end with its reactor, and over a bare socket with blocking calls, in alternation. Prints microseconds.
 //
 //   ipc_round_trip [round trips per run] [runs]
 
@@ -72,7 +72,8 @@ Times bareSocket(int count) {
     Times times;
     for (int i = 0; i < count; ++i) {
         const auto begin = Clock::now();
-        if (send(ours.get(), bytes.data(), kRequestBytes, 0) < 0 || recv(ours.get(), bytes.data(), kReplyBytes, MSG_WAITALL) < 0)
+        if (send(ours.get(), bytes.data(), kRequestBytes, 0) < 0 ||
+            recv(ours.get(), bytes.data(), kReplyBytes, MSG_WAITALL) < 0)
             std::abort();
         times.push_back(microseconds(Clock::now() - begin));
     }
@@ -165,8 +166,11 @@ Times transport(int count) {
 
 void print(const char* name, Times times) {
     std::sort(times.begin(), times.end());
-    const auto at = [&](double part) { return times[static_cast<std::size_t>(part * static_cast<double>(times.size() - 1))]; };
-    std::printf("%-12s p50 %6.1f  p90 %6.1f  p99 %6.1f  (%zu round trips)\n", name, at(0.5), at(0.9), at(0.99), times.size());
+    const auto at = [&](double part) {
+        return times[static_cast<std::size_t>(part * static_cast<double>(times.size() - 1))];
+    };
+    std::printf("%-12s p50 %6.1f  p90 %6.1f  p99 %6.1f  (%zu round trips)\n", name, at(0.5), at(0.9), at(0.99),
+                times.size());
 }
 
 }  // namespace

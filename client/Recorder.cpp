@@ -58,7 +58,9 @@ Answer waitFor(Operation operation) {
 class Recorder::Connection final : public IpcExportedObject, public std::enable_shared_from_this<Connection> {
 public:
     Connection(Events events, const std::string& runtimeDirectory)
-        : events_(std::move(events)), reactor_("lumacast client"), ipc_(reactor_, log_, {.runtimeDirectory = runtimeDirectory}) {}
+        : events_(std::move(events)),
+          reactor_("lumacast client"),
+          ipc_(reactor_, log_, {.runtimeDirectory = runtimeDirectory}) {}
 
     void open() {
         connection_ = ipc_.connectToService(kServiceName);
@@ -86,7 +88,8 @@ public:
         connection_->remoteProxy([](const Error&) {})->send(static_cast<std::uint16_t>(message), std::move(arguments));
     }
 
-    /// Sends a message that has a reply; `answered` is called once, with what `read` makes of the reply or with `failed`.
+    /// Sends a message that has a reply; `answered` is called once, with what `read` makes of the reply or with
+    /// `failed`.
     template <class Answer, class Read>
     void ask(DaemonMessage message, Array arguments, Answer failed, Read read, std::function<void(Answer)> answered) {
         const auto shared = std::make_shared<std::function<void(Answer)>>(std::move(answered));
@@ -98,7 +101,8 @@ public:
                    [answer, read](const Array& values) { answer(read(values)); });
     }
 
-    void receiveMessage(const std::shared_ptr<IpcConnection>&, std::uint16_t message, Array arguments, IpcReply) override {
+    void receiveMessage(const std::shared_ptr<IpcConnection>&, std::uint16_t message, Array arguments,
+                        IpcReply) override {
         if (static_cast<ClientMessage>(message) == ClientMessage::StopRecordingWithError && events_.stopped)
             events_.stopped(errorIn(arguments[0]), urlIn(arguments[1]));
     }
@@ -149,8 +153,8 @@ void Recorder::discard(std::function<void(std::optional<Error>)> answered) {
 }
 
 void Recorder::state(std::function<void(StateAnswer)> answered) {
-    connection_->ask<StateAnswer>(DaemonMessage::SynchronousGetCurrentState, {}, StateAnswer{std::nullopt, notReached()},
-                                  stateAnswer, std::move(answered));
+    connection_->ask<StateAnswer>(DaemonMessage::SynchronousGetCurrentState, {},
+                                  StateAnswer{std::nullopt, notReached()}, stateAnswer, std::move(answered));
 }
 
 StartAnswer Recorder::startAndWait(const StartOptions& options) {

@@ -41,8 +41,8 @@ struct StartAnswer {
 };
 
 struct StopAnswer {
-    /// The finished movie. The file is good until the application records again, discards it, or the device needs the space:
-    /// copy it or open it before.
+    /// The finished movie. The file is good until the application records again, discards it, or the device needs the
+    /// space: copy it or open it before.
     std::optional<URL> movie;
     std::optional<Error> error;
 };
@@ -52,10 +52,10 @@ struct StateAnswer {
     std::optional<Error> error;
 };
 
-/// One application's connection to the daemon. Thread-safe. Every answer and every event comes on a thread of the library's
-/// own, one at a time; answers exactly once each, with a connection error when the daemon can't be reached or goes away (a
-/// request that the daemon never answers waits until then). Destroying the recorder ends a running recording, answers
-/// what is pending and joins that thread: never destroy it from a handler.
+/// One application's connection to the daemon. Thread-safe. Every answer and every event comes on a thread of the
+/// library's own, one at a time; answers exactly once each, with a connection error when the daemon can't be reached or
+/// goes away (a request that the daemon never answers waits until then). Destroying the recorder ends a running
+/// recording, answers what is pending and joins that thread: never destroy it from a handler.
 class Recorder {
 public:
     struct Events {
@@ -65,7 +65,8 @@ public:
         std::function<void()> disconnected;
     };
 
-    /// Connects to the daemon whose sockets are in `runtimeDirectory`; by default the user's ("$XDG_RUNTIME_DIR/lumacast").
+    /// Connects to the daemon whose sockets are in `runtimeDirectory`; by default the user's
+    /// ("$XDG_RUNTIME_DIR/lumacast").
     explicit Recorder(Events events, std::string runtimeDirectory = defaultRuntimeDirectory());
     ~Recorder();
     Recorder(const Recorder&) = delete;
@@ -74,8 +75,8 @@ public:
     void start(const StartOptions& options, std::function<void(StartAnswer)> answered);
     /// Stops and keeps the whole movie. Not answered when nothing is being recorded.
     void stop(std::function<void(StopAnswer)> answered);
-    /// Stops and keeps the movie without its first `fromStart` and last `fromEnd` seconds (rounded to whole ones, both above
-    /// 0). Not answered when the clip can't be made.
+    /// Stops and keeps the movie without its first `fromStart` and last `fromEnd` seconds (rounded to whole ones, both
+    /// above 0). Not answered when the clip can't be made.
     void stopWithClip(double fromStart, double fromEnd, std::function<void(StopAnswer)> answered);
     void pause();
     /// Goes on, recording `window`.

@@ -61,8 +61,9 @@ public:
           renderServer_(environmentVariable("DISPLAY")),
           appState_(environmentVariable("DISPLAY"), scheduler_, [this](ProcessID pid) { return applicationOf(pid); }),
           admin_(scheduler_, environment.runtimeDirectory + "/admin.sock"),
-          platform_{log_,     scheduler_,   clock_,      ipc_,         bundles_,   renderServer_, appState_, capture_, capture_,
-                    writers_, exporters_,   fileSystem_, preferences_, deviceInfo_, telemetry_,   keepAlive_, admin_} {}
+          platform_{log_,         scheduler_,  clock_,     ipc_,       bundles_,   renderServer_,
+                    appState_,    capture_,    capture_,   writers_,   exporters_, fileSystem_,
+                    preferences_, deviceInfo_, telemetry_, keepAlive_, admin_} {}
 
     /// What must be there before the daemon can work; the error when it can't be had.
     std::optional<Error> prepare() { return fileSystem_.prepare(); }
@@ -113,12 +114,14 @@ private:
 std::unique_ptr<PlatformOwner> makePlatform() {
     const LinuxEnvironment environment = LinuxEnvironment::ofThisProcess();
     if (const auto error = environment.prepareDirectories()) {
-        std::fprintf(stderr, "lumacastd: the runtime and state directories can't be made: %s\n", describe(*error).c_str());
+        std::fprintf(stderr, "lumacastd: the runtime and state directories can't be made: %s\n",
+                     describe(*error).c_str());
         return nullptr;
     }
     auto platform = std::make_unique<LinuxPlatform>(environment);
     if (const auto error = platform->prepare()) {
-        std::fprintf(stderr, "lumacastd: the parents of the temporary directory can't be made: %s\n", describe(*error).c_str());
+        std::fprintf(stderr, "lumacastd: the parents of the temporary directory can't be made: %s\n",
+                     describe(*error).c_str());
         return nullptr;
     }
     return platform;

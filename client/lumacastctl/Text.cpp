@@ -32,7 +32,8 @@ std::string durationText(double seconds) {
     const long long whole = tenths / 10, minutes = whole / 60, hours = minutes / 60;
     std::array<char, 64> text{};
     if (hours > 0)
-        std::snprintf(text.data(), text.size(), "%lld:%02lld:%02lld.%lld", hours, minutes % 60, whole % 60, tenths % 10);
+        std::snprintf(text.data(), text.size(), "%lld:%02lld:%02lld.%lld", hours, minutes % 60, whole % 60,
+                      tenths % 10);
     else
         std::snprintf(text.data(), text.size(), "%lld:%02lld.%lld", minutes, whole % 60, tenths % 10);
     return text.data();

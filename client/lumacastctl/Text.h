@@ -16,8 +16,8 @@ std::string bytesText(std::uint64_t bytes);
 /// Anything below zero, and what is no number, is "0:00.0".
 std::string durationText(double seconds);
 
-/// The text with every control character replaced by '?': names and paths come from other programs, and a terminal obeys
-/// what it is sent.
+/// The text with every control character replaced by '?': names and paths come from other programs, and a terminal
+/// obeys what it is sent.
 std::string printable(std::string_view text);
 
 /// A value as it would be written in a configuration file: flags are true and false, texts in quotes.

@@ -46,13 +46,15 @@ int runDoctor(const IdentityQuestion& question) {
 }  // namespace
 
 int main(int argc, char** argv) {
-    CLI::App app("Asks the screen recording daemon how it is, and looks for what keeps it from recording.", "lumacastctl");
+    CLI::App app("Asks the screen recording daemon how it is, and looks for what keeps it from recording.",
+                 "lumacastctl");
     app.footer(kExitStatuses);
     app.require_subcommand(1);
-    CLI::App* status = app.add_subcommand("status", "Show the applications that the daemon knows and the running recording");
+    CLI::App* status =
+        app.add_subcommand("status", "Show the applications that the daemon knows and the running recording");
     status->footer(kExitStatuses);
-    CLI::App* doctor =
-        app.add_subcommand("doctor", "Look at all that recording takes; a line each: ok, warning or problem, and what to do");
+    CLI::App* doctor = app.add_subcommand(
+        "doctor", "Look at all that recording takes; a line each: ok, warning or problem, and what to do");
     doctor->footer(kExitStatuses);
     std::int32_t pid = 0;
     std::string executable;

@@ -57,14 +57,15 @@ Recording::Recording(Loop& loop, CommandTable& commands, SceneWindow& window, Pa
             onLoop([reply, error] { reply(error ? "error " + inWords(*error) : "discarded"); });
         });
     });
-    commands.add("state", "print what the daemon knows of this application", [this](const Arguments&, const Reply& reply) {
-        recorder().state([this, reply](const client::StateAnswer& answer) {
-            onLoop([reply, answer] {
-                if (answer.error) return reply("error " + inWords(*answer.error));
-                reply("state " + (answer.state ? describe(Value(*answer.state)) : std::string("none")));
-            });
-        });
-    });
+    commands.add("state", "print what the daemon knows of this application",
+                 [this](const Arguments&, const Reply& reply) {
+                     recorder().state([this, reply](const client::StateAnswer& answer) {
+                         onLoop([reply, answer] {
+                             if (answer.error) return reply("error " + inWords(*answer.error));
+                             reply("state " + (answer.state ? describe(Value(*answer.state)) : std::string("none")));
+                         });
+                     });
+                 });
 }
 
 Recording::~Recording() {
@@ -99,7 +100,8 @@ void Recording::replyWhenHandled(const char* word, const Reply& reply) {
 void Recording::replyStopped(const client::StopAnswer& answer, const Reply& reply) {
     onLoop([this, answer, reply] {
         if (answer.error) return reply("error " + inWords(*answer.error));
-        reply("stopped frame " + std::to_string(painter_.frame()) + " " + (answer.movie ? answer.movie->path() : "without movie"));
+        reply("stopped frame " + std::to_string(painter_.frame()) + " " +
+              (answer.movie ? answer.movie->path() : "without movie"));
     });
 }
 

@@ -14,8 +14,8 @@
 
 namespace lumacast::example {
 
-/// The commands with which the application records its own window: start, pause, resume, stop, clip, discard, state. Connects
-/// to the daemon at the first of them. Lives on the loop; the library's answers are brought there.
+/// The commands with which the application records its own window: start, pause, resume, stop, clip, discard, state.
+/// Connects to the daemon at the first of them. Lives on the loop; the library's answers are brought there.
 class Recording final {
 public:
     /// Borrows all four.

@@ -48,7 +48,8 @@ std::vector<xcb_window_t> ActiveWindow::applicationWindows() {
     return hasWindowManager() ? windowsIn(clientList_, kMostWindows) : shownWindows();
 }
 
-// From the lowest to the topmost. Menus and hints, which no window manager would manage, don't count where there are others.
+// From the lowest to the topmost. Menus and hints, which no window manager would manage, don't count where there are
+// others.
 std::vector<xcb_window_t> ActiveWindow::shownWindows() {
     xcb_connection_t* const x = connection_.get();
     const Owned<xcb_query_tree_reply_t> tree(

@@ -52,7 +52,8 @@ std::vector<std::uint8_t> contentsOf(const std::string& path) {
 
 }  // namespace
 
-std::optional<AuthorityKey> findKey(std::span<const std::uint8_t> file, std::string_view host, std::string_view number) {
+std::optional<AuthorityKey> findKey(std::span<const std::uint8_t> file, std::string_view host,
+                                    std::string_view number) {
     Reader reader(file);
     while (const auto family = reader.number()) {
         const auto address = reader.text(), display = reader.text(), method = reader.text(), secret = reader.text();

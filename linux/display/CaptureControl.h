@@ -14,7 +14,8 @@
 
 namespace lumacast::x11 {
 
-/// The gate, the clock and the delegate of one source. Thread-safe; nothing waits here but closeGate, for at most 100 ms.
+/// The gate, the clock and the delegate of one source. Thread-safe; nothing waits here but closeGate, for at most 100
+/// ms.
 class CaptureControl final {
 public:
     /// What the frame lane is to do. `run` is another number after each start.

@@ -115,8 +115,8 @@ void CaptureTarget::repaintIsLate(std::int64_t now) {
     repaintDeadline_ = now + kRepaintPatience;
 }
 
-// Black in the picture itself, then the window's background where it has one, then the application's turn. Its damage from
-// before says nothing any more: everything is read anew.
+// Black in the picture itself, then the window's background where it has one, then the application's turn. Its damage
+// from before says nothing any more: everything is read anew.
 void CaptureTarget::paintOver(const DamageRegion& region) {
     xcb_connection_t* const x = connection_.get();
     const xcb_gcontext_t context = xcb_generate_id(x);
@@ -166,7 +166,8 @@ void CaptureTarget::forgetDamage() {
 }
 
 // At first, in one go with the redirection, what the server itself painted is forgotten, so that the application's own
-// painting is waited for. Later, at a change of size, the application may have been faster than this, and its painting must count.
+// painting is waited for. Later, at a change of size, the application may have been faster than this, and its painting
+// must count.
 void CaptureTarget::nameWindow() {
     xcb_connection_t* const x = connection_.get();
     const xcb_pixmap_t pixmap = xcb_generate_id(x);

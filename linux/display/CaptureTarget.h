@@ -20,8 +20,9 @@ struct Strip {
 };
 
 /// A window that is captured, whatever covers it: the server keeps its picture in memory of its own (automatic
-/// redirection), reports what changes in it, and copies what is asked for. Or the whole screen, as it is shown, without the
-/// pointer. Belongs to one thread; `refresh`, `takeDamage` and `read` wait for the server. Times are nanoseconds of the steady clock.
+/// redirection), reports what changes in it, and copies what is asked for. Or the whole screen, as it is shown, without
+/// the pointer. Belongs to one thread; `refresh`, `takeDamage` and `read` wait for the server. Times are nanoseconds of
+/// the steady clock.
 class CaptureTarget final {
 public:
     enum class Kind { Window, Screen };
@@ -57,12 +58,12 @@ public:
     void takeDamage(DamageRegion& into);
     /// Until when to wait for the application to paint what the server uncovered; 0 when there is nothing to wait for.
     std::int64_t repaintDeadline() const { return awaited_.empty() ? 0 : repaintDeadline_; }
-    /// The deadline has passed. What the server uncovered may still show other windows' pixels; once, that is painted over and
-    /// the application asked again, with another deadline. The second time the picture is taken as it is.
+    /// The deadline has passed. What the server uncovered may still show other windows' pixels; once, that is painted
+    /// over and the application asked again, with another deadline. The second time the picture is taken as it is.
     void repaintIsLate(std::int64_t now);
 
-    /// Copies rows of the picture into `memory`, each where it is in a picture with rows of width() pixels and nothing between
-    /// them. False when the server would not; then the picture needs a refresh.
+    /// Copies rows of the picture into `memory`, each where it is in a picture with rows of width() pixels and nothing
+    /// between them. False when the server would not; then the picture needs a refresh.
     bool read(const SharedMemory& memory, std::span<const Strip> strips);
     /// The picture changed before the last read was over, so that it may show parts of two.
     bool overtaken() const;

@@ -43,7 +43,8 @@ bool contains(const PixelRect& outer, const PixelRect& inner) {
 
 PixelRect intersection(const PixelRect& a, const PixelRect& b) {
     const std::int32_t x = std::max(a.x, b.x), y = std::max(a.y, b.y);
-    const PixelRect rect{x, y, std::min(a.x + a.width, b.x + b.width) - x, std::min(a.y + a.height, b.y + b.height) - y};
+    const PixelRect rect{x, y, std::min(a.x + a.width, b.x + b.width) - x,
+                         std::min(a.y + a.height, b.y + b.height) - y};
     return isEmpty(rect) ? PixelRect{} : rect;
 }
 

@@ -12,8 +12,8 @@ std::int32_t scaled(std::int32_t a, std::int32_t b, std::int32_t c) {
     return static_cast<std::int32_t>(std::max<std::int64_t>(1, (2 * static_cast<std::int64_t>(a) * b + c) / (2 * c)));
 }
 
-// First and last pixel (exclusive) of the frame touched by [at, at + length) of the source. A scaler's filter reaches one
-// source pixel to each side, and its rounding one pixel of the frame.
+// First and last pixel (exclusive) of the frame touched by [at, at + length) of the source. A scaler's filter reaches
+// one source pixel to each side, and its rounding one pixel of the frame.
 struct Span {
     std::int32_t begin, end;
 };

@@ -7,7 +7,8 @@
 
 namespace lumacast::x11 {
 
-/// A window's picture in the middle of a frame, as large as it fits with its shape kept; the rest of the frame is black.
+/// A window's picture in the middle of a frame, as large as it fits with its shape kept; the rest of the frame is
+/// black.
 struct Fit {
     std::int32_t sourceWidth = 0, sourceHeight = 0;
     PixelRect target;  ///< where in the frame

@@ -8,9 +8,9 @@
 namespace lumacast::x11 {
 
 /// Keeps frames the minimum interval apart without losing one of a steady stream. Each frame has a slot; the next slot
-/// begins one interval after the later of this slot and this frame. A frame may come up to half an interval before its slot,
-/// so that one that came late doesn't push all later ones back: in the long run frames are never faster than the interval,
-/// and two never closer than half of it. All times are nanoseconds of one steady clock. Not thread-safe.
+/// begins one interval after the later of this slot and this frame. A frame may come up to half an interval before its
+/// slot, so that one that came late doesn't push all later ones back: in the long run frames are never faster than the
+/// interval, and two never closer than half of it. All times are nanoseconds of one steady clock. Not thread-safe.
 class FramePacer {
 public:
     static constexpr std::int64_t kNever = std::numeric_limits<std::int64_t>::max();

@@ -8,8 +8,8 @@
 
 namespace lumacast::x11 {
 
-/// Owns the threads of the frame lanes, so that a source can end on its own lane and the process still joins every thread.
-/// Thread-safe.
+/// Owns the threads of the frame lanes, so that a source can end on its own lane and the process still joins every
+/// thread. Thread-safe.
 class LaneKeeper final {
 public:
     LaneKeeper() = default;

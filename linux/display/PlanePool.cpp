@@ -19,7 +19,8 @@ Picture::Picture(std::shared_ptr<Plane> plane, const DamageRegion& damage, std::
 // Whatever the holder read, it read before the pool writes again.
 Picture::~Picture() { plane_->pictures_.fetch_sub(1, std::memory_order_release); }
 
-PlanePool::PlanePool(std::int32_t width, std::int32_t height) : width_(width), height_(height), stride_(strideOf(width)) {}
+PlanePool::PlanePool(std::int32_t width, std::int32_t height)
+    : width_(width), height_(height), stride_(strideOf(width)) {}
 
 std::optional<std::size_t> PlanePool::make(X11Connection& connection) {
     for (std::size_t i = 0; i < planes_.size(); ++i) {

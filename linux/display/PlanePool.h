@@ -17,8 +17,8 @@
 
 namespace lumacast::x11 {
 
-/// How many planes the holders may have at a time. The pool is larger than all quotas together, so a slow consumer costs
-/// frames and never stops the source.
+/// How many planes the holders may have at a time. The pool is larger than all quotas together, so a slow consumer
+/// costs frames and never stops the source.
 struct PlaneQuota {
     std::size_t encoder = 4;                                ///< waiting in front of the encoder, and in it
     std::size_t extension = limitOf(Limit::PlanesLeased);   ///< lent to a broadcast extension
@@ -29,7 +29,8 @@ inline constexpr PlaneQuota kPlaneQuota;
 inline constexpr std::size_t kPlanes = 14;
 static_assert(kPlaneQuota.encoder + kPlaneQuota.extension + kPlaneQuota.client + kPlaneQuota.source < kPlanes);
 
-/// One piece of frame memory of the pool. Pictures count themselves in and out; the pool writes only what no picture holds.
+/// One piece of frame memory of the pool. Pictures count themselves in and out; the pool writes only what no picture
+/// holds.
 class Plane final {
 public:
     Plane(SharedMemory memory, std::int32_t width, std::int32_t height, std::size_t stride)
@@ -81,8 +82,8 @@ public:
     std::int32_t width() const { return width_; }
     std::int32_t height() const { return height_; }
 
-    /// A plane that no picture holds, of those there are the one that needs the least reading; memory is made when first
-    /// needed. None when all are held or there is no memory. `staleness` says how much of a plane is out of date.
+    /// A plane that no picture holds, of those there are the one that needs the least reading; memory is made when
+    /// first needed. None when all are held or there is no memory. `staleness` says how much of a plane is out of date.
     template <class Staleness>
     std::optional<std::size_t> acquire(X11Connection& connection, const Staleness& staleness) {
         std::optional<std::size_t> best;

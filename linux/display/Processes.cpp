@@ -55,7 +55,8 @@ bool HeldProcess::ended() const {
 
 std::vector<ProcessID> ancestorsOf(ProcessID pid) {
     std::vector<ProcessID> ancestors;
-    for (ProcessID parent = parentOf(pid); number(parent) > 0 && ancestors.size() < kMostAncestors; parent = parentOf(parent))
+    for (ProcessID parent = parentOf(pid); number(parent) > 0 && ancestors.size() < kMostAncestors;
+         parent = parentOf(parent))
         ancestors.push_back(parent);
     return ancestors;
 }
@@ -69,7 +70,8 @@ std::vector<ProcessID> processesOfThisUser() {
         const auto [end, error] = std::from_chars(name.data(), name.data() + name.size(), pid);
         if (error != std::errc{} || end != name.data() + name.size() || pid <= 0) continue;
         struct stat status {};
-        if (::fstatat(::dirfd(directory.get()), entry->d_name, &status, 0) != 0 || status.st_uid != ::geteuid()) continue;
+        if (::fstatat(::dirfd(directory.get()), entry->d_name, &status, 0) != 0 || status.st_uid != ::geteuid())
+            continue;
         processes.push_back(ProcessID{pid});
     }
     return processes;

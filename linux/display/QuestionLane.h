@@ -31,7 +31,8 @@ public:
 };
 
 /// A thread with its own connection to the display server, made when first needed and again when the server has gone. A
-/// question is answered within 100 ms or not at all; a server that has not answered one yet is not asked another. Thread-safe.
+/// question is answered within 100 ms or not at all; a server that has not answered one yet is not asked another.
+/// Thread-safe.
 class QuestionLane final {
 public:
     /// What is asked: on the lane, where it may wait for the server; null when there is no server.

@@ -7,8 +7,8 @@
 
 namespace lumacast::x11 {
 
-/// A thread that takes no signals: those belong to the process's termination thread. Throws std::system_error when there
-/// is none to be had.
+/// A thread that takes no signals: those belong to the process's termination thread. Throws std::system_error when
+/// there is none to be had.
 template <class Body>
 std::thread quietThread(Body body) {
     sigset_t all, before;

@@ -10,9 +10,9 @@
 
 namespace lumacast::x11 {
 
-/// Zeroed memory that the display server writes into. Its size is sealed, and so is its writability: whoever else gets the
-/// descriptor can only read. The mapping and the server's own mapping stay writable. Owns descriptor and mapping; the
-/// server's segment ends with the connection or with detach().
+/// Zeroed memory that the display server writes into. Its size is sealed, and so is its writability: whoever else gets
+/// the descriptor can only read. The mapping and the server's own mapping stay writable. Owns descriptor and mapping;
+/// the server's segment ends with the connection or with detach().
 class SharedMemory final {
 public:
     /// None when there is no memory or the server refuses. Waits for the server.

@@ -104,7 +104,8 @@ std::optional<ProcessID> X11AppStateMonitor::frontProcess(X11Connection& connect
 }
 
 x11::HeldProcess* X11AppStateMonitor::remembered(ProcessID pid) {
-    const auto found = std::find_if(seen_.begin(), seen_.end(), [&](const auto& process) { return process.pid() == pid; });
+    const auto found =
+        std::find_if(seen_.begin(), seen_.end(), [&](const auto& process) { return process.pid() == pid; });
     return found == seen_.end() ? nullptr : &*found;
 }
 
@@ -140,8 +141,8 @@ std::vector<int> X11AppStateMonitor::descriptors() {
 }
 
 void X11AppStateMonitor::readable(int descriptor) {
-    const auto ended =
-        std::find_if(seen_.begin(), seen_.end(), [&](const auto& process) { return process.descriptor() == descriptor; });
+    const auto ended = std::find_if(seen_.begin(), seen_.end(),
+                                    [&](const auto& process) { return process.descriptor() == descriptor; });
     if (ended == seen_.end()) return;
     const ProcessID pid = ended->pid();
     seen_.erase(ended);

@@ -16,8 +16,9 @@
 
 namespace lumacast {
 
-/// An application is in the foreground when one of its processes owns the active window. A tool that has no windows is in the
-/// foreground when the active window belongs to one of its ancestors (the terminal it was started from), or when nothing is active.
+/// An application is in the foreground when one of its processes owns the active window. A tool that has no windows is
+/// in the foreground when the active window belongs to one of its ancestors (the terminal it was started from), or when
+/// nothing is active.
 class X11AppStateMonitor final : public AppStateMonitor, private x11::QuestionLaneObserver {
 public:
     /// The other bit that this monitor gives: the application runs, but not in the foreground.
@@ -30,9 +31,10 @@ public:
     /// The running processes of an application. Called on the monitor's own lane.
     using ProcessesOf = std::function<std::vector<ProcessID>(const BundleIdentifier&)>;
 
-    /// `display` as in $DISPLAY; without such a server every state is 0. The scheduler is borrowed; tasks that it still has
-    /// when the monitor ends do nothing. Without `processesOf` all the user's processes are asked who they are.
-    X11AppStateMonitor(std::string display, Scheduler& scheduler, IdentifierOf identifierOf, ProcessesOf processesOf = {});
+    /// `display` as in $DISPLAY; without such a server every state is 0. The scheduler is borrowed; tasks that it still
+    /// has when the monitor ends do nothing. Without `processesOf` all the user's processes are asked who they are.
+    X11AppStateMonitor(std::string display, Scheduler& scheduler, IdentifierOf identifierOf,
+                       ProcessesOf processesOf = {});
     ~X11AppStateMonitor() override;
 
     std::uint32_t applicationState(const BundleIdentifier& identifier) override;

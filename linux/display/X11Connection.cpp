@@ -153,7 +153,8 @@ void X11Connection::readExtensions() {
 }
 
 bool X11Connection::isRoot(xcb_window_t window) const {
-    for (auto screens = xcb_setup_roots_iterator(xcb_get_setup(connection_)); screens.rem > 0; xcb_screen_next(&screens))
+    for (auto screens = xcb_setup_roots_iterator(xcb_get_setup(connection_)); screens.rem > 0;
+         xcb_screen_next(&screens))
         if (screens.data->root == window) return true;
     return false;
 }

@@ -35,12 +35,12 @@ private:
 };
 
 /// A connection to a display server of this machine, with the extensions that the port uses where the server has them.
-/// Belongs to one thread; only opening, and waiting for replies, blocks, until the server answers, dies, or the interrupt
-/// fires.
+/// Belongs to one thread; only opening, and waiting for replies, blocks, until the server answers, dies, or the
+/// interrupt fires.
 class X11Connection final {
 public:
-    /// `display` as in $DISPLAY. Null when there is no such server, or it is not on this machine: owners and shared memory
-    /// don't exist across a network. The interrupt must outlive the connection.
+    /// `display` as in $DISPLAY. Null when there is no such server, or it is not on this machine: owners and shared
+    /// memory don't exist across a network. The interrupt must outlive the connection.
     static std::unique_ptr<X11Connection> open(const std::string& display, Interrupt& interrupt);
     ~X11Connection();
     X11Connection(const X11Connection&) = delete;

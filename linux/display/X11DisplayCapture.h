@@ -57,7 +57,8 @@ private:
     std::shared_ptr<x11::FrameLane> lane_;
 };
 
-/// Makes sources and chooses what they show. Outlives its sources' last start; its end joins their lanes and must not come on one.
+/// Makes sources and chooses what they show. Outlives its sources' last start; its end joins their lanes and must not
+/// come on one.
 class X11DisplayCapture final : public DisplayCapture, public DisplayCloneControl {
 public:
     /// `display` as in $DISPLAY; it need not exist yet. Clock and scheduler are borrowed.

@@ -7,8 +7,8 @@
 
 namespace lumacast {
 
-/// Owners of X11 windows, from the server's X-Resource extension. The process is held, so a port never answers for another
-/// process that got the same number.
+/// Owners of X11 windows, from the server's X-Resource extension. The process is held, so a port never answers for
+/// another process that got the same number.
 class X11RenderServer final : public RenderServer {
 public:
     /// `display` as in $DISPLAY; without such a server no window has an owner.

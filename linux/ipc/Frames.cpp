@@ -72,7 +72,8 @@ bool readPlane(Cursor& cursor, PlaneRecord& plane) {
     if (!cursor.read(plane.lease) || !cursor.read(plane.width) || !cursor.read(plane.height) ||
         !cursor.read(plane.stride) || !cursor.read(plane.pictureNumber) || !cursor.read(count))
         return false;
-    if (plane.width <= 0 || plane.width > kMaximumSide || plane.height <= 0 || plane.height > kMaximumSide) return false;
+    if (plane.width <= 0 || plane.width > kMaximumSide || plane.height <= 0 || plane.height > kMaximumSide)
+        return false;
     if (plane.stride < 4 * static_cast<std::uint64_t>(plane.width) || plane.stride > kMaximumStride) return false;
     if (count > kMaximumDamage) return false;
     for (std::uint8_t i = 0; i < count; ++i) {

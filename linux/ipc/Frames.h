@@ -1,5 +1,6 @@
 #pragma once
-// What goes over a connection's socket: a hello, then frames. Pure functions on bytes; README.md has the layouts as tables.
+// What goes over a connection's socket: a hello, then frames. Pure functions on bytes; README.md has the layouts as
+// tables.
 //
 // Integers are little-endian. All functions that read foreign bytes answer none (or a reason) for anything malformed.
 

@@ -72,8 +72,8 @@ std::shared_ptr<LinuxIpcEndpoint> LinuxIpcEndpoint::make(Fd doorbell) {
     return std::make_shared<LinuxIpcEndpoint>(std::move(doorbell));
 }
 
-int encodeFrame(FrameKind kind, std::uint16_t message, const Array& values, const std::function<std::uint64_t()>& nextLease,
-                EncodedFrame& out) {
+int encodeFrame(FrameKind kind, std::uint16_t message, const Array& values,
+                const std::function<std::uint64_t()>& nextLease, EncodedFrame& out) {
     WireBody body;
     body.bytes.reserve(kUsualMessage);
     body.bytes.resize(kFrameHeaderBytes);

@@ -27,9 +27,9 @@ struct EncodedFrame {
     std::vector<Lease> leases;
 };
 
-/// Encodes `values` as a frame; `nextLease` numbers each plane. A plane without a descriptor is copied into memory of its
-/// own. Answers 0, or the system error that says why it can't be sent: EMSGSIZE (over a limit, or text that is not valid UTF-8), EINVAL (an endpoint of
-/// another transport, a plane whose memory could shrink), or that of the copy.
+/// Encodes `values` as a frame; `nextLease` numbers each plane. A plane without a descriptor is copied into memory of
+/// its own. Answers 0, or the system error that says why it can't be sent: EMSGSIZE (over a limit, or text that is not
+/// valid UTF-8), EINVAL (an endpoint of another transport, a plane whose memory could shrink), or that of the copy.
 [[nodiscard]] int encodeFrame(FrameKind kind, std::uint16_t message, const Array& values,
                               const std::function<std::uint64_t()>& nextLease, EncodedFrame& out);
 

@@ -33,7 +33,8 @@ public:
     std::size_t endTurn();
 
 private:
-    Data kept_;  ///< what was left from earlier turns; `unread_` is all of it, or a part of the scratch when it is empty
+    Data
+        kept_;  ///< what was left from earlier turns; `unread_` is all of it, or a part of the scratch when it is empty
     Bytes unread_;
     std::deque<Fd> descriptors_;
 };

@@ -48,6 +48,8 @@ int LinuxIpc::descriptorOf(const IpcEndpoint& endpoint) {
     return ours ? ours->descriptor() : -1;
 }
 
-std::shared_ptr<IpcEndpoint> LinuxIpc::endpointFrom(Fd descriptor) { return LinuxIpcEndpoint::make(std::move(descriptor)); }
+std::shared_ptr<IpcEndpoint> LinuxIpc::endpointFrom(Fd descriptor) {
+    return LinuxIpcEndpoint::make(std::move(descriptor));
+}
 
 }  // namespace lumacast

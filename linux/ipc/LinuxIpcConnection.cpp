@@ -121,8 +121,8 @@ void LinuxIpcConnection::lose() {
     state_ = State::Lost;
     watch_.reset();
     if (socket_) {
-        // What was sent before still goes, as far as the peer has room for it. The reactor may be reading at this moment,
-        // so the descriptor itself is closed there.
+        // What was sent before still goes, as far as the peer has room for it. The reactor may be reading at this
+        // moment, so the descriptor itself is closed there.
         outgoing_.flush(socket_.get(), done);
         shutdown(socket_.get(), SHUT_RDWR);
     }

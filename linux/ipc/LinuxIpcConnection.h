@@ -18,8 +18,8 @@
 
 namespace lumacast {
 
-/// A connection over a Unix stream socket. Reads and delivers on the reactor; writes at once on whatever lane sends, and
-/// leaves to the reactor only what the kernel does not take.
+/// A connection over a Unix stream socket. Reads and delivers on the reactor; writes at once on whatever lane sends,
+/// and leaves to the reactor only what the kernel does not take.
 class LinuxIpcConnection final : public IpcConnection,
                                  public PlaneLender,
                                  public std::enable_shared_from_this<LinuxIpcConnection> {
@@ -47,8 +47,8 @@ public:
     void sendHello();
 
     using Greeted = std::function<void(const std::shared_ptr<LinuxIpcConnection>&)>;
-    /// An accepted connection waits for its peer's hello, for a limited time, and only then is shown to anybody: `greeted`
-    /// is called on the reactor. A peer that says something else, or nothing, is dropped. On the reactor.
+    /// An accepted connection waits for its peer's hello, for a limited time, and only then is shown to anybody:
+    /// `greeted` is called on the reactor. A peer that says something else, or nothing, is dropped. On the reactor.
     void awaitHello(Greeted greeted);
 
     using ReplyHandler = std::function<void(Array values)>;

@@ -31,7 +31,8 @@ IpcReply replyOnce(const std::shared_ptr<LinuxIpcConnection>& connection, std::u
     };
     return [answer = std::make_shared<Answer>(connection, sequence, declaration)](Array values) {
         if (answer->given.exchange(true)) return;
-        if (const auto live = answer->connection.lock()) live->reply(answer->sequence, answer->declaration, std::move(values));
+        if (const auto live = answer->connection.lock())
+            live->reply(answer->sequence, answer->declaration, std::move(values));
     };
 }
 

@@ -27,14 +27,16 @@ void LinuxIpcConnection::send(std::uint16_t message, Array arguments, ReplyHandl
     if ((reply && !wantsReply) || !matches(arguments, declaration.arguments)) return fail(errorHandler, EINVAL);
 
     EncodedFrame encoded;
-    int error = encodeFrame(wantsReply ? FrameKind::Request : FrameKind::Message, message, arguments, [this] { return nextLease_++; }, encoded);
+    int error = encodeFrame(
+        wantsReply ? FrameKind::Request : FrameKind::Message, message, arguments, [this] { return nextLease_++; },
+        encoded);
     PendingReply pending{&declaration, std::move(reply), std::move(errorHandler)};
     if (error == 0) error = commit(encoded, pending);
     if (error != 0) fail(pending.errorHandler, error);
 }
 
-/// Numbers the frame and hands it to the kernel or the queue. Answers 0, or why it can't be delivered; then `encoded` and
-/// `pending` are the caller's still.
+/// Numbers the frame and hands it to the kernel or the queue. Answers 0, or why it can't be delivered; then `encoded`
+/// and `pending` are the caller's still.
 int LinuxIpcConnection::commit(EncodedFrame& encoded, PendingReply& pending) {
     const bool isRequest = encoded.header.kind == FrameKind::Request;
     const bool isNumbered = encoded.header.kind != FrameKind::Reply;
@@ -74,7 +76,8 @@ void LinuxIpcConnection::reply(std::uint64_t sequence, const MessageDeclaration&
     }
     if (error == EPIPE) return;
     if (error == ENOBUFS) return drop("it does not read its replies");
-    core_->log.error("IPC: reply of %s to process %d can't be sent: error %d", declaration.name, number(peer_.pid), error);
+    core_->log.error("IPC: reply of %s to process %d can't be sent: error %d", declaration.name, number(peer_.pid),
+                     error);
     sendTransport(FrameKind::NoReply, sequence, static_cast<std::uint16_t>(error));
 }
 

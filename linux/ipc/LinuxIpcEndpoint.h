@@ -7,9 +7,9 @@
 
 namespace lumacast {
 
-/// An endpoint is a descriptor: the ringing end of a listener's doorbell (a SOCK_SEQPACKET pair). Whoever holds it, or a
-/// copy that travelled through a message, connects by making a stream pair and sending one end through it. There is no
-/// name to guess and none to clean up; it works from any sandbox, and dies with the listener.
+/// An endpoint is a descriptor: the ringing end of a listener's doorbell (a SOCK_SEQPACKET pair). Whoever holds it, or
+/// a copy that travelled through a message, connects by making a stream pair and sending one end through it. There is
+/// no name to guess and none to clean up; it works from any sandbox, and dies with the listener.
 class LinuxIpcEndpoint final : public IpcEndpoint {
 public:
     explicit LinuxIpcEndpoint(Fd doorbell) : doorbell_(std::move(doorbell)) {}

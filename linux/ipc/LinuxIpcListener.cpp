@@ -66,10 +66,12 @@ Ring readRing(int doorbell) {
     if ((message.msg_flags & MSG_CTRUNC) || !ring.socket) return ring;
     if (optionOf(ring.socket.get(), SO_DOMAIN) != AF_UNIX || optionOf(ring.socket.get(), SO_TYPE) != SOCK_STREAM)
         return ring;
-    // Whoever rings must have made the pair, so that nobody hands us a connection to somebody else as if it were theirs.
+    // Whoever rings must have made the pair, so that nobody hands us a connection to somebody else as if it were
+    // theirs.
     ucred maker{};
     socklen_t size = sizeof maker;
-    if (getsockopt(ring.socket.get(), SOL_SOCKET, SO_PEERCRED, &maker, &size) != 0 || maker.pid != ring.sender) return ring;
+    if (getsockopt(ring.socket.get(), SOL_SOCKET, SO_PEERCRED, &maker, &size) != 0 || maker.pid != ring.sender)
+        return ring;
     ring.state = Ring::Good;
     return ring;
 }
@@ -160,7 +162,8 @@ Reactor::Again LinuxIpcListener::acceptFromDoorbell(int descriptor) {
             continue;
         }
         if (ring.state == Ring::Malformed)
-            core_->log.error("IPC: an endpoint was closed: process %d sent something else than a connection", ring.sender);
+            core_->log.error("IPC: an endpoint was closed: process %d sent something else than a connection",
+                             ring.sender);
         // Nobody holds the other end any more, or somebody who misuses it.
         const std::lock_guard lock(mutex_);
         const auto found = doorbells_.find(descriptor);

@@ -23,7 +23,8 @@ struct OutgoingFrame {
     std::size_t written = 0;
 };
 
-/// What waits for a peer that reads slower than we write. Never blocks. Not thread-safe: the connection's lock guards it.
+/// What waits for a peer that reads slower than we write. Never blocks. Not thread-safe: the connection's lock guards
+/// it.
 class OutgoingQueue {
 public:
     /// `budget`: where the bytes that wait are counted, if anywhere.

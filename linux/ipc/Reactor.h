@@ -28,8 +28,8 @@ public:
     /// What a watch's task answers: whether it has work left that it wants to go on with in the next turn, although its
     /// descriptor may have nothing new.
     enum class Again : bool { No, Yes };
-    /// Told of a descriptor's readiness (EPOLL* bits; 0 when it is called because it asked to be called again). Should do
-    /// a bounded amount of work: readiness is level-triggered, what is left is reported again.
+    /// Told of a descriptor's readiness (EPOLL* bits; 0 when it is called because it asked to be called again). Should
+    /// do a bounded amount of work: readiness is level-triggered, what is left is reported again.
     using WatchTask = std::function<Again(std::uint32_t events)>;
 
     /// A watched descriptor; destroying it ends the watch. Destroy it before the descriptor is closed. On the reactor's
@@ -79,7 +79,8 @@ private:
     void runTasksIfDue();
     void runTimers();
     void runWatch(std::uint64_t id, std::uint32_t events);
-    /// Says how long epoll may sleep, in milliseconds; -1 for as long as it takes. Notes that the loop is about to sleep.
+    /// Says how long epoll may sleep, in milliseconds; -1 for as long as it takes. Notes that the loop is about to
+    /// sleep.
     int timeUntilNextTurn(bool workLeft);
     void wakeLocked();
 

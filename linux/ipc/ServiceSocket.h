@@ -13,8 +13,8 @@ class ActivatedSockets {
 public:
     ActivatedSockets() = default;
 
-    /// Takes the descriptors that are meant for this process, and the variables out of the environment. Once, before there
-    /// are other threads.
+    /// Takes the descriptors that are meant for this process, and the variables out of the environment. Once, before
+    /// there are other threads.
     static ActivatedSockets fromEnvironment();
 
     /// Adds a listening socket under a name.
@@ -28,7 +28,8 @@ private:
     std::multimap<std::string, Fd> sockets_;
 };
 
-/// The listening socket of a named service in the runtime directory, `<name>.sock`; the name is free again when it goes.
+/// The listening socket of a named service in the runtime directory, `<name>.sock`; the name is free again when it
+/// goes.
 ///
 /// Beside it lies `<name>.lock`, locked as long as the service lives, so that a socket left behind by a dead process is
 /// told from a live one without a race.
@@ -40,8 +41,8 @@ public:
     ~ServiceSocket();
 
     /// Binds and listens. On failure logs one line and answers an object without a descriptor.
-    static ServiceSocket open(const std::string& runtimeDirectory, const std::string& service, ActivatedSockets& activated,
-                              Log& log);
+    static ServiceSocket open(const std::string& runtimeDirectory, const std::string& service,
+                              ActivatedSockets& activated, Log& log);
 
     int descriptor() const { return socket_.get(); }
 

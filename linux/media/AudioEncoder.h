@@ -12,16 +12,16 @@
 
 namespace lumacast::media {
 
-/// AAC-LC. Takes stereo sound of the track's rate, gives packets of packetFrames() frames, the first primingFrames() frames of
-/// which come before the sound. Belongs to one thread.
+/// AAC-LC. Takes stereo sound of the track's rate, gives packets of packetFrames() frames, the first primingFrames()
+/// frames of which come before the sound. Belongs to one thread.
 class AudioEncoder final {
 public:
     using Output = std::function<void(std::span<const std::uint8_t> packet)>;
 
     static std::variant<std::unique_ptr<AudioEncoder>, Error> open(const AudioTrackSettings& settings);
 
-    /// Encodes `packetFrames()` frames of `sound` from `first` on, or what is left of it, filled up with silence. Only the
-    /// last call before drain may fall short.
+    /// Encodes `packetFrames()` frames of `sound` from `first` on, or what is left of it, filled up with silence. Only
+    /// the last call before drain may fall short.
     std::optional<Error> encode(const StereoSound& sound, std::size_t first, const Output& output);
     std::optional<Error> drain(const Output& output);
 

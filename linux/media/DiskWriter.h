@@ -18,8 +18,8 @@
 namespace lumacast::media {
 
 /// Writes one movie file on a thread of its own, behind a bounded buffer. What is appended from the movie's encoder
-/// thread waits there for room; nothing else ever waits for the disk. After the first failure everything is dropped. The
-/// file is brought onto the disk for good whenever the box writer says so: with every fragment, and at the end.
+/// thread waits there for room; nothing else ever waits for the disk. After the first failure everything is dropped.
+/// The file is brought onto the disk for good whenever the box writer says so: with every fragment, and at the end.
 class DiskWriter final : public mp4::BoxSink {
 public:
     /// Bytes that may wait for the disk: more than ten seconds at the highest bit rate a window gets by itself.

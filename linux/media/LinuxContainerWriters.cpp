@@ -12,7 +12,8 @@ namespace {
 
 std::string withSingleSlashes(const std::string& path) {
     std::string result;
-    std::unique_copy(path.begin(), path.end(), std::back_inserter(result), [](char a, char b) { return a == '/' && b == '/'; });
+    std::unique_copy(path.begin(), path.end(), std::back_inserter(result),
+                     [](char a, char b) { return a == '/' && b == '/'; });
     return result;
 }
 

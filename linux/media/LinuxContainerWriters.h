@@ -32,13 +32,13 @@ public:
 
     std::variant<std::unique_ptr<ContainerWriter>, Error> make(const URL& outputURL, ContainerType type) override;
 
-    /// How many bytes were written to the file at `path` (single slashes) by a recording that still writes it; none when
-    /// nothing does. Callable from any lane; does not wait.
+    /// How many bytes were written to the file at `path` (single slashes) by a recording that still writes it; none
+    /// when nothing does. Callable from any lane; does not wait.
     std::optional<std::uint64_t> bytesBeingWritten(const std::string& path);
 
     /// For the end of the process: finishes every movie that is being written, each up to its own clock's time, and
-    /// waits for that, at most kClosingLimit in all. Needs no lane of the daemon; to be called on a thread that may wait. The
-    /// writers take no samples any more.
+    /// waits for that, at most kClosingLimit in all. Needs no lane of the daemon; to be called on a thread that may
+    /// wait. The writers take no samples any more.
     void closeOpenMovies();
 
 private:

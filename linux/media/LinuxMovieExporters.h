@@ -10,8 +10,8 @@ namespace lumacast {
 
 class LinuxMovieExport;
 
-/// Opens movies by libavformat and copies ranges of them into files of our own box writer. Callable from any lane. To be
-/// destroyed after its exporters; that cancels exports that still run, and waits for them.
+/// Opens movies by libavformat and copies ranges of them into files of our own box writer. Callable from any lane. To
+/// be destroyed after its exporters; that cancels exports that still run, and waits for them.
 class LinuxMovieExporters final : public MovieExporters {
 public:
     LinuxMovieExporters();

@@ -7,8 +7,8 @@
 
 namespace lumacast::media {
 
-/// The file of one movie, known by its descriptor alone. Every call may wait for the disk; used on one thread at a time.
-/// Answers are error numbers of the system, 0 for success. Destroying it closes the file as it is.
+/// The file of one movie, known by its descriptor alone. Every call may wait for the disk; used on one thread at a
+/// time. Answers are error numbers of the system, 0 for success. Destroying it closes the file as it is.
 class MovieFile {
 public:
     virtual ~MovieFile() = default;

@@ -42,7 +42,8 @@ public:
 
     /// When a movie ends, nanoseconds after its zero.
     struct End {
-        std::optional<std::int64_t> lastPicture;  ///< until when the last picture lasts; none: as long as it says itself
+        std::optional<std::int64_t>
+            lastPicture;  ///< until when the last picture lasts; none: as long as it says itself
         std::optional<std::int64_t> cut;          ///< what is later is not in the movie
     };
     /// Encodes the rest and writes the index. Not yet on the disk when it returns.

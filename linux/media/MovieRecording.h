@@ -51,7 +51,8 @@ public:
     bool append(std::size_t track, const SampleRef& sample);
     /// Ends the recording at the end of its session, or now. `completion` runs on the encoder thread, once.
     void finish(std::function<void()> completion);
-    /// Nobody will call any more: what was asked for is finished, else the file is closed as it is; then the threads end.
+    /// Nobody will call any more: what was asked for is finished, else the file is closed as it is; then the threads
+    /// end.
     void abandon();
 
     ContainerStatus status() const;

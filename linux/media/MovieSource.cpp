@@ -125,7 +125,8 @@ bool MovieSource::declareTracks(mp4::MovieBoxWriter& movie, std::vector<mp4::Tra
     for (const int index : streamOfTrack_) {
         const AVStream& stream = *file_->streams[index];
         const bool isVideo = stream.codecpar->codec_type == AVMEDIA_TYPE_VIDEO;
-        const auto id = isVideo ? movie.addVideoTrack(describeVideo(stream)) : movie.addAudioTrack(describeAudio(stream));
+        const auto id =
+            isVideo ? movie.addVideoTrack(describeVideo(stream)) : movie.addAudioTrack(describeAudio(stream));
         if (!id) return false;
         ids.push_back(*id);
     }

@@ -105,11 +105,14 @@ private:
         const bool isNeeded = isVideo ? !keyFrame_ || sample.stamp >= *keyFrame_
                                       : nanosecondsOfTicks(end, timescale) > span_.start - kSoundLeadNanoseconds;
         if (!isNeeded) return std::nullopt;
-        if (sample.duration < 0 || sample.duration > std::numeric_limits<std::uint32_t>::max()) return systemError(EPROTO);
+        if (sample.duration < 0 || sample.duration > std::numeric_limits<std::uint32_t>::max())
+            return systemError(EPROTO);
         std::int64_t stamp = sample.stamp;
         if (isVideo) {
-            // The picture that is on show when the range begins begins with it: players drop what begins before an edit.
-            const std::int64_t start = mp4::rescale(span_.start, mp4::kNanosecondTimescale, static_cast<std::uint32_t>(timescale));
+            // The picture that is on show when the range begins begins with it: players drop what begins before an
+            // edit.
+            const std::int64_t start =
+                mp4::rescale(span_.start, mp4::kNanosecondTimescale, static_cast<std::uint32_t>(timescale));
             if (stamp < start && end > start) stamp = start;
             lastPictureEnd_ = end;
         }

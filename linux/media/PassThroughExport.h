@@ -21,9 +21,9 @@ struct ExportResult {
     std::optional<Error> error;
 };
 
-/// Copies a range of a movie without encoding anything. The copy holds the samples from the key frame on that the range's
-/// first picture is decoded from, and an edit list that begins exactly with the range; its end is cut to the tick. Runs to the
-/// end on the caller's thread, or until `cancelled`; anything but Completed leaves no file.
+/// Copies a range of a movie without encoding anything. The copy holds the samples from the key frame on that the
+/// range's first picture is decoded from, and an edit list that begins exactly with the range; its end is cut to the
+/// tick. Runs to the end on the caller's thread, or until `cancelled`; anything but Completed leaves no file.
 ExportResult exportMovie(const ExportPlan& plan, MovieFiles& files, const std::atomic<bool>& cancelled);
 
 }  // namespace lumacast::media

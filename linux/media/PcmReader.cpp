@@ -57,7 +57,8 @@ ReadSample readerOf(const AudioFormat& format, unsigned bytes) {
 ReadSample readerOf(const AudioFormat& format) {
     if (format.bitsPerChannel % 8 != 0) return nullptr;
     const unsigned bytes = format.bitsPerChannel / 8;
-    return format.formatFlags & AudioFormat::kFlagBigEndian ? readerOf<true>(format, bytes) : readerOf<false>(format, bytes);
+    return format.formatFlags & AudioFormat::kFlagBigEndian ? readerOf<true>(format, bytes)
+                                                            : readerOf<false>(format, bytes);
 }
 
 }  // namespace

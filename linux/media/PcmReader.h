@@ -29,8 +29,8 @@ struct StereoSound {
 /// whole bytes, 1 to 16 channels, interleaved, 4 to 384 kHz.
 bool isReadable(const AudioFormat& format);
 
-/// Appends up to `frameCount` frames of `bytes` to `out`; a frame that is not all there is left out. One channel goes to
-/// both sides; of more than two the first two are taken. The format must be readable.
+/// Appends up to `frameCount` frames of `bytes` to `out`; a frame that is not all there is left out. One channel goes
+/// to both sides; of more than two the first two are taken. The format must be readable.
 void readPcm(const AudioFormat& format, std::span<const std::uint8_t> bytes, std::size_t frameCount, StereoSound& out);
 
 }  // namespace lumacast::media

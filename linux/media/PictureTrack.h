@@ -21,8 +21,8 @@ public:
                                                                    EncoderChoice& choice, mp4::MovieBoxWriter& movie);
 
     /// Converts and encodes a picture that is shown from `nanoseconds` after the movie's zero on; lets go of the plane
-    /// before it encodes. The movie starts with its first picture, so that one is shown from zero on. A stamp that is not
-    /// later than the one before is dropped.
+    /// before it encodes. The movie starts with its first picture, so that one is shown from zero on. A stamp that is
+    /// not later than the one before is dropped.
     std::optional<Error> add(SampleRef sample, std::int64_t nanoseconds);
     std::optional<Error> finish();
 

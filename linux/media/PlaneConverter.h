@@ -8,10 +8,11 @@
 
 namespace lumacast::media {
 
-/// Turns captured planes (BGRX) into planar pictures of one size (BT.601, limited range), touching only what changed: the
-/// damaged rectangles where a plane directly follows the one converted before, everything otherwise. A plane of another
-/// size is scaled to the track's; one that is a pixel short of the even size is extended by its edge instead, so that
-/// text stays sharp. Not thread-safe: it belongs to one encoder's thread. Allocates only when the source's size changes.
+/// Turns captured planes (BGRX) into planar pictures of one size (BT.601, limited range), touching only what changed:
+/// the damaged rectangles where a plane directly follows the one converted before, everything otherwise. A plane of
+/// another size is scaled to the track's; one that is a pixel short of the even size is extended by its edge instead,
+/// so that text stays sharp. Not thread-safe: it belongs to one encoder's thread. Allocates only when the source's size
+/// changes.
 class PlaneConverter final {
 public:
     /// The pictures' size; even numbers.

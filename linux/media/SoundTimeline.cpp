@@ -117,7 +117,8 @@ void SoundTimeline::resample(const StereoSound& input) {
         out[side] = reinterpret_cast<std::uint8_t*>(sound_.planes[side].data() + before);
         in[side] = reinterpret_cast<const std::uint8_t*>(input.planes[side].data());
     }
-    const int made = std::max(0, swr_convert(resampler_.get(), out.data(), room, frames > 0 ? in.data() : nullptr, frames));
+    const int made =
+        std::max(0, swr_convert(resampler_.get(), out.data(), room, frames > 0 ? in.data() : nullptr, frames));
     for (auto& plane : sound_.planes) plane.resize(before + static_cast<std::size_t>(made));
     placed_ += made;
 }

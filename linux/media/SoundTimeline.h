@@ -11,8 +11,8 @@
 namespace lumacast::media {
 
 /// Lays the buffers of one sound track one after the other, by their stamps, at the track's rate: holes are filled with
-/// silence, overlaps and what lies before zero cut off, and the slow drift of a device's clock against the stamps is taken
-/// up by resampling a little faster or slower. Belongs to one thread.
+/// silence, overlaps and what lies before zero cut off, and the slow drift of a device's clock against the stamps is
+/// taken up by resampling a little faster or slower. Belongs to one thread.
 class SoundTimeline final {
 public:
     /// A stamp this far from where the sound stands is a hole or an overlap; nearer ones are jitter, or drift. Sound

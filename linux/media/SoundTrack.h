@@ -42,8 +42,8 @@ private:
     std::optional<Error> error_;
 };
 
-/// What the box writer's answer means to a recording: nothing for a sample that it merely left out, the sink's failure as
-/// EIO (the disk's thread knows better and has reported it first).
+/// What the box writer's answer means to a recording: nothing for a sample that it merely left out, the sink's failure
+/// as EIO (the disk's thread knows better and has reported it first).
 std::optional<Error> movieError(mp4::MovieError error);
 
 }  // namespace lumacast::media

@@ -63,7 +63,8 @@ std::optional<VideoTrackSettings> VideoTrackSettings::parse(const Dictionary& se
 }
 
 std::optional<AudioTrackSettings> AudioTrackSettings::parse(const Dictionary& settings) {
-    static constexpr std::array kRates{8000, 11025, 12000, 16000, 22050, 24000, 32000, 44100, 48000, 64000, 88200, 96000};
+    static constexpr std::array kRates{8000,  11025, 12000, 16000, 22050, 24000,
+                                       32000, 44100, 48000, 64000, 88200, 96000};
     const auto format = numberIn(settings, AudioSettings::kFormatID, std::nullopt);
     if (!format || *format != static_cast<double>(kAudioFormatAAC)) return std::nullopt;
     AudioTrackSettings parsed;

@@ -84,7 +84,8 @@ AvOwned<AVBufferRef> makeUploads(AVCodecContext& context) {
 AVBufferRef* shareMemory(const std::shared_ptr<I420Picture>& picture) {
     auto* const holder = new std::shared_ptr<I420Picture>(picture);
     const auto release = [](void* opaque, std::uint8_t*) { delete static_cast<std::shared_ptr<I420Picture>*>(opaque); };
-    AVBufferRef* const buffer = av_buffer_create(picture->y(), picture->byteCount(), release, holder, AV_BUFFER_FLAG_READONLY);
+    AVBufferRef* const buffer =
+        av_buffer_create(picture->y(), picture->byteCount(), release, holder, AV_BUFFER_FLAG_READONLY);
     if (!buffer) delete holder;
     return buffer;
 }

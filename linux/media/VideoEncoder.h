@@ -41,8 +41,8 @@ struct EncodedPicture {
     bool isKeyFrame = false;
 };
 
-/// H.264, High profile, level as needed, no B-pictures and no delay: a picture that goes in comes out. Hardware is probed
-/// by encoding a picture with it, quietly and once; then libx264. Belongs to one thread; opening takes tens of
+/// H.264, High profile, level as needed, no B-pictures and no delay: a picture that goes in comes out. Hardware is
+/// probed by encoding a picture with it, quietly and once; then libx264. Belongs to one thread; opening takes tens of
 /// milliseconds. BT.601 limited range, tagged so.
 class VideoEncoder final {
 public:

@@ -16,7 +16,9 @@ public:
     const std::string& text() const { return text_; }
 
     /// The path of a file URL; empty for any other URL.
-    std::string path() const { return text_.starts_with(kFileScheme) ? text_.substr(sizeof(kFileScheme) - 1) : std::string(); }
+    std::string path() const {
+        return text_.starts_with(kFileScheme) ? text_.substr(sizeof(kFileScheme) - 1) : std::string();
+    }
 
     bool operator==(const URL&) const = default;
 

@@ -8,7 +8,11 @@ namespace lumacast {
 bool isValidUtf8(std::string_view text) {
     for (std::size_t at = 0; at < text.size();) {
         const auto lead = static_cast<std::uint8_t>(text[at]);
-        const std::size_t length = lead < 0x80 ? 1 : lead >> 5 == 0x6 ? 2 : lead >> 4 == 0xE ? 3 : lead >> 3 == 0x1E ? 4 : 0;
+        const std::size_t length = lead < 0x80         ? 1
+                                   : lead >> 5 == 0x6  ? 2
+                                   : lead >> 4 == 0xE  ? 3
+                                   : lead >> 3 == 0x1E ? 4
+                                                       : 0;
         if (length == 0 || length > text.size() - at) return false;
         std::uint32_t code = length == 1 ? lead : lead & (0x7Fu >> length);
         for (std::size_t i = 1; i < length; ++i) {

@@ -96,7 +96,8 @@ public:
 
     bool value(Value& out, unsigned depth) {
         std::uint8_t tag = 0;
-        if (depth > limitOf(Limit::MessageDepth) || ++values_ > limitOf(Limit::MessageValues) || !byte(tag)) return false;
+        if (depth > limitOf(Limit::MessageDepth) || ++values_ > limitOf(Limit::MessageValues) || !byte(tag))
+            return false;
         switch (tag) {
             case kNull: out = Value(); return true;
             case kBool: return boolean(out);

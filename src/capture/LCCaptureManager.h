@@ -7,8 +7,8 @@ namespace lumacast {
 /// The process's one owner of device capture (the `sharedManager` of the process). Thread-safe.
 class LCCaptureManager {
 public:
-    /// When the current capture began on the capture clock: set from the first screen frame of a recording, invalid before
-    /// and after.
+    /// When the current capture began on the capture clock: set from the first screen frame of a recording, invalid
+    /// before and after.
     MediaTime captureStartTime() const { return captureStartTime_.get(); }
     void setCaptureStartTime(MediaTime time) { captureStartTime_.set(time); }
 

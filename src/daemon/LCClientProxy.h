@@ -8,13 +8,14 @@ namespace lumacast {
 
 class Log;
 
-/// The daemon's outbound half of one client connection: turns each call into a one-way message. Holds no recording state and
-/// makes no decisions. Callable from any lane; a connection that has gone is like none.
+/// The daemon's outbound half of one client connection: turns each call into a one-way message. Holds no recording
+/// state and makes no decisions. Callable from any lane; a connection that has gone is like none.
 class LCClientProxy final : public LCClientProtocol {
 public:
     explicit LCClientProxy(Log& log) : log_(log) {}
     /// `initWithBundleIdentifier:connection:`
-    LCClientProxy(Log& log, std::optional<BundleIdentifier> bundleIdentifier, const std::shared_ptr<IpcConnection>& connection)
+    LCClientProxy(Log& log, std::optional<BundleIdentifier> bundleIdentifier,
+                  const std::shared_ptr<IpcConnection>& connection)
         : log_(log), bundleIdentifier_(std::move(bundleIdentifier)) {
         setConnection(connection);
     }

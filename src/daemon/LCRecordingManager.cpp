@@ -27,7 +27,8 @@ std::shared_ptr<LCRecordingManager> LCRecordingManager::init(const SessionServic
 
 void LCRecordingManager::finishStartup() { publicListener_->resume(); }
 
-bool LCRecordingManager::listenerShouldAcceptNewConnection(IpcListener&, const std::shared_ptr<IpcConnection>& connection) {
+bool LCRecordingManager::listenerShouldAcceptNewConnection(IpcListener&,
+                                                           const std::shared_ptr<IpcConnection>& connection) {
     log_.line("LCRecordingManager: shouldAcceptNewConnection:");
     const ProcessID pid = connection->processIdentifier();
     if (pid == ProcessID{0}) return false;

@@ -25,8 +25,8 @@ struct StartRequest {
     bool captureEnabled = false;
 };
 
-/// Owns the sessions, one per client application, and everything that clients ask of them. Everything here runs on the request
-/// lane (the main queue); what comes from other lanes hops there first. One file per concern.
+/// Owns the sessions, one per client application, and everything that clients ask of them. Everything here runs on the
+/// request lane (the main queue); what comes from other lanes hops there first. One file per concern.
 class LCRecordingManager final : public IpcListenerDelegate,
                                  public IpcExportedObject,
                                  public LCRecordingSessionDelegate,
@@ -43,7 +43,8 @@ public:
     void finishStartup();
 
     /// `listener:shouldAcceptNewConnection:`
-    bool listenerShouldAcceptNewConnection(IpcListener& listener, const std::shared_ptr<IpcConnection>& connection) override;
+    bool listenerShouldAcceptNewConnection(IpcListener& listener,
+                                           const std::shared_ptr<IpcConnection>& connection) override;
     void receiveMessage(const std::shared_ptr<IpcConnection>& connection, std::uint16_t message, Array arguments,
                         IpcReply reply) override;
 
@@ -85,8 +86,8 @@ private:
 
     // Starting.
     bool checkContextIDsMatch(const std::vector<ContextID>& contextIDs);
-    void startProper(const std::shared_ptr<LCRecordingSession>& session, const StartRequest& request, std::uint64_t number,
-                     StartHandler handler);
+    void startProper(const std::shared_ptr<LCRecordingSession>& session, const StartRequest& request,
+                     std::uint64_t number, StartHandler handler);
     void refuse(std::uint64_t number, RecordingErrorCode code, std::string_view reason, const StartHandler& handler);
     void stopCurrentRecordingSessionWithHandler(Handler handler);
     void interruptOtherRecordingSessionAgainstSession(const std::shared_ptr<LCRecordingSession>& session);
@@ -101,8 +102,8 @@ private:
                                      const std::optional<URL>& movieURL);
     void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
                                           const std::optional<Error>& error, const std::optional<URL>& movieURL);
-    void recordingSessionInterrupted(const std::shared_ptr<LCRecordingSession>& session, const std::optional<Error>& error,
-                                     const std::optional<URL>& movieURL);
+    void recordingSessionInterrupted(const std::shared_ptr<LCRecordingSession>& session,
+                                     const std::optional<Error>& error, const std::optional<URL>& movieURL);
 
     void beginTransaction() { platform_.keepAlive.beginTransaction(); }
     void endTransaction() { platform_.keepAlive.endTransaction(); }

@@ -84,24 +84,27 @@ void LCRecordingManager::receiveMessage(const std::shared_ptr<IpcConnection>& co
 void LCRecordingManager::pauseRecording() {
     log_.line("LCRecordingManager:pauseRecording");
     const auto session = getCallingConnectionRecordingSession();
-    if (session && !session->isSystemRecording() && session->isRecording() && !session->isPaused()) session->pauseSession();
+    if (session && !session->isSystemRecording() && session->isRecording() && !session->isPaused())
+        session->pauseSession();
 }
 
 void LCRecordingManager::resumeRecordingWithWindowLayerContextID(ContextID contextID) {
     const auto session = getCallingConnectionRecordingSession();
     if (!session) return;
     // Nothing ever accepts the resume of a broadcast: it deliberately ends here, paused or not.
-    if (session->isBroadcasting() && session->isRecording() && !session->isSystemRecording() && !didAcceptResume_) return;
+    if (session->isBroadcasting() && session->isRecording() && !session->isSystemRecording() && !didAcceptResume_)
+        return;
     didAcceptResume_ = false;
     const bool resumable = !session->isSystemRecording() && session->isRecording() && session->isPaused();
     if (checkContextIDsMatch({contextID})) {
         log_.line("LCRecordingManager: resumeRecording");
         if (resumable) session->resumeSessionWithContextID(contextID);
     } else if (resumable) {
-        stopRecordingSession(session, 0, 0, [self = shared_from_this(), session](std::optional<URL> url, std::optional<Error>) {
-            self->recordingSessionStoppedWithError(
-                session, self->services_.errors._lcUserErrorForCode(RecordingErrorCode::NoContextIDMatch), url);
-        });
+        stopRecordingSession(
+            session, 0, 0, [self = shared_from_this(), session](std::optional<URL> url, std::optional<Error>) {
+                self->recordingSessionStoppedWithError(
+                    session, self->services_.errors._lcUserErrorForCode(RecordingErrorCode::NoContextIDMatch), url);
+            });
     }
 }
 

@@ -39,15 +39,18 @@ void LCRecordingManager::startRecording(const StartRequest& request, StartHandle
         const bool* entitled = granted ? granted->as<bool>() : nullptr;
         if (!entitled || !*entitled)
             return refuse(number, RecordingErrorCode::Entitlements, "the application lacks the entitlement", handler);
-        return refuse(number, RecordingErrorCode::FailedToStart, "this daemon does not record the whole display", handler);
+        return refuse(number, RecordingErrorCode::FailedToStart, "this daemon does not record the whole display",
+                      handler);
     }
     if (!checkContextIDsMatch(request.windowLayerContextIDs))
-        return refuse(number, RecordingErrorCode::FailedToStart, "a window layer is not the application's own", handler);
+        return refuse(number, RecordingErrorCode::FailedToStart, "a window layer is not the application's own",
+                      handler);
     log_.line(
         "LCRecordingManager:startRecordingWindowLayerContextID:windowSize:microphoneEnabled:streaming:withHandler:");
     stopCurrentRecordingSessionWithHandler([this, session, &request, number, &handler] {
         if (!session)
-            return refuse(number, RecordingErrorCode::FailedToStart, "the application has no session any more", handler);
+            return refuse(number, RecordingErrorCode::FailedToStart, "the application has no session any more",
+                          handler);
         startProper(session, request, number, std::move(handler));
     });
 }
@@ -71,7 +74,8 @@ void LCRecordingManager::startProper(const std::shared_ptr<LCRecordingSession>& 
         return refuse(number, RecordingErrorCode::UserDeclined,
                       "this daemon can't ask the user; the preference LCSuppressAlert is not set", handler);
     if (request.captureEnabled)
-        return refuse(number, RecordingErrorCode::FailedToStart, "this daemon does not hand samples to clients", handler);
+        return refuse(number, RecordingErrorCode::FailedToStart, "this daemon does not hand samples to clients",
+                      handler);
 
     log_.line("starting...");
     // A stop that will never be answered may have left an older transaction open.
@@ -131,21 +135,23 @@ void LCRecordingManager::discardInterruptedRecording(const std::shared_ptr<LCRec
     auto tellClient = [self = shared_from_this(), session] {
         self->onRequestLane([self, session] {
             if (const auto proxy = session->clientProxy())
-                proxy->stopRecordingWithError(self->services_.errors._lcUserErrorForCode(RecordingErrorCode::Interrupted),
-                                              std::nullopt);
+                proxy->stopRecordingWithError(
+                    self->services_.errors._lcUserErrorForCode(RecordingErrorCode::Interrupted), std::nullopt);
         });
     };
     if (session->managerRecord.startGeneration == generation) {
         session->finishAndCleanupSessionFilesWithHandler(std::move(tellClient));
         return;
     }
-    // The application has started anew meanwhile: only this stop's own movie goes, where the new writer has another path.
+    // The application has started anew meanwhile: only this stop's own movie goes, where the new writer has another
+    // path.
     const auto writer = session->movieWriter();
     if (movieURL && !(writer && writer->outputURL() == *movieURL)) services_.tempStore._srRemoveFile(*movieURL, {});
     tellClient();
 }
 
-void LCRecordingManager::interruptOtherRecordingSessionAgainstSession(const std::shared_ptr<LCRecordingSession>& session) {
+void LCRecordingManager::interruptOtherRecordingSessionAgainstSession(
+    const std::shared_ptr<LCRecordingSession>& session) {
     log_.line("LCRecordingManager:interruptRecordingSessions");
     const auto sessions = bundleIDToRecordingSessionLookup_;
     for (const auto& [id, other] : sessions) {

@@ -17,8 +17,8 @@ void LCRecordingManager::stopRecordingWithStartClipDuration(double startClipDura
         stopRecordingSession(session, startClipDuration, endClipDuration, std::move(handler));
 }
 
-void LCRecordingManager::stopRecordingSession(const std::shared_ptr<LCRecordingSession>& session, double startClipDuration,
-                                              double endClipDuration, StopHandler handler) {
+void LCRecordingManager::stopRecordingSession(const std::shared_ptr<LCRecordingSession>& session,
+                                              double startClipDuration, double endClipDuration, StopHandler handler) {
     log_.line("LCRecordingManager: stopRecordingSession:handler:");
     if (!session->isRecording()) return;
     const std::uint64_t generation = session->managerRecord.startGeneration;
@@ -42,7 +42,8 @@ void LCRecordingManager::stopRecordingSession(const std::shared_ptr<LCRecordingS
 }
 
 void LCRecordingManager::resetAfterStop(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation) {
-    // A newer start has ended this recording's transaction itself and is left alone; so is a session that was reset already.
+    // A newer start has ended this recording's transaction itself and is left alone; so is a session that was reset
+    // already.
     if (session->managerRecord.transactionOf == generation) resetStatesForSession(session);
 }
 
@@ -87,7 +88,8 @@ void LCRecordingManager::recordingSessionStoppedWithError(const std::shared_ptr<
 }
 
 void LCRecordingManager::recordingSessionInterrupted(const std::shared_ptr<LCRecordingSession>& session,
-                                                     const std::optional<Error>& error, const std::optional<URL>& movieURL) {
+                                                     const std::optional<Error>& error,
+                                                     const std::optional<URL>& movieURL) {
     if (const auto proxy = session->clientProxy()) proxy->stopRecordingWithError(error, movieURL);
 }
 

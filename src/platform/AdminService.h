@@ -10,7 +10,8 @@ namespace lumacast {
 class AdminService {
 public:
     virtual ~AdminService() = default;
-    /// Begins to answer. `snapshot` is called on the main queue for each question and describes sessions and recordings.
+    /// Begins to answer. `snapshot` is called on the main queue for each question and describes sessions and
+    /// recordings.
     virtual void resume(std::function<Dictionary()> snapshot) = 0;
 };
 

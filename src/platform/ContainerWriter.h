@@ -47,26 +47,27 @@ public:
     /// Whether the track's own buffer has room. Always true before the first sample, encoder open or not.
     virtual bool isReadyForMoreMediaData() const = 0;
     /// Takes a reference to the sample and returns at once: conversion, encoding and the disk are behind it. Drops, and
-    /// answers true for, a sample that is not to be in the movie: its stamp is not later than the track's one before, or a
-    /// picture's is before the start of the session, or it is after the end of it. False, the sample not taken, when
-    /// there is no room, when the stamp is not valid or the sample of the other kind, and when the writer can't take
-    /// samples (any more): before the session is started, after finishing was asked for and after a failure.
+    /// answers true for, a sample that is not to be in the movie: its stamp is not later than the track's one before,
+    /// or a picture's is before the start of the session, or it is after the end of it. False, the sample not taken,
+    /// when there is no room, when the stamp is not valid or the sample of the other kind, and when the writer can't
+    /// take samples (any more): before the session is started, after finishing was asked for and after a failure.
     virtual bool append(const SampleRef& sample) = 0;
 };
 
 enum class ContainerStatus : std::int32_t { Unknown = 0, Writing = 1, Completed = 2, Failed = 3, Cancelled = 4 };
 
-/// Writes one MPEG-4 file. Unknown becomes Writing by startWriting; Writing becomes Completed or Failed by finishWriting,
-/// and Failed at any time when the disk or an encoder fails; Completed and Failed stay. Its operations are called on one
-/// lane at a time (the movie writer's queue); completions come on a lane of the platform, never inline. The file appears
-/// at creation and can be played while it grows, up to a second ago. Destroying a writer that has not finished closes the
-/// file as it is and never re-creates it.
+/// Writes one MPEG-4 file. Unknown becomes Writing by startWriting; Writing becomes Completed or Failed by
+/// finishWriting, and Failed at any time when the disk or an encoder fails; Completed and Failed stay. Its operations
+/// are called on one lane at a time (the movie writer's queue); completions come on a lane of the platform, never
+/// inline. The file appears at creation and can be played while it grows, up to a second ago. Destroying a writer that
+/// has not finished closes the file as it is and never re-creates it.
 class ContainerWriter {
 public:
     virtual ~ContainerWriter() = default;
 
-    /// Adds a track. Null once writing has started or failed, for a second video track, and for settings that no encoder
-    /// can take. The video track is the picture, the first audio track the application's sound, the second the microphone.
+    /// Adds a track. Null once writing has started or failed, for a second video track, and for settings that no
+    /// encoder can take. The video track is the picture, the first audio track the application's sound, the second the
+    /// microphone.
     virtual std::shared_ptr<TrackInput> addVideoInput(const Dictionary& settings) = 0;
     virtual std::shared_ptr<TrackInput> addAudioInput(const Dictionary& settings) = 0;
 
@@ -96,8 +97,8 @@ enum class ContainerType { Mpeg4 };
 class ContainerWriters {
 public:
     virtual ~ContainerWriters() = default;
-    /// Creates the file and a writer for it, taking the current capture clock. Waits at most 40 ms for the disk. An error
-    /// when the file can't be made (one that exists already is an error too).
+    /// Creates the file and a writer for it, taking the current capture clock. Waits at most 40 ms for the disk. An
+    /// error when the file can't be made (one that exists already is an error too).
     virtual std::variant<std::unique_ptr<ContainerWriter>, Error> make(const URL& outputURL, ContainerType type) = 0;
 };
 

@@ -12,7 +12,8 @@ public:
     virtual std::optional<std::int64_t> userInterfaceIdiom() const = 0;
     /// The device information "ChipID"; none when the device does not answer.
     virtual std::optional<std::int64_t> chipID() const = 0;
-    /// The chip identifier of the one tablet generation whose capture is capped at 1600 pixels; none when not configured.
+    /// The chip identifier of the one tablet generation whose capture is capped at 1600 pixels; none when not
+    /// configured.
     virtual std::optional<std::int64_t> reducedCaptureChipID() const = 0;
 };
 

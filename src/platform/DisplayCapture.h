@@ -13,13 +13,13 @@ namespace lumacast {
 
 class DisplayCaptureSource;
 
-/// Told of frames and failures by a capture source. Frames come on the source's own delivery thread (the frame lane), one
-/// at a time; failures on the main queue. Nothing is called inline from an operation of the source.
+/// Told of frames and failures by a capture source. Frames come on the source's own delivery thread (the frame lane),
+/// one at a time; failures on the main queue. Nothing is called inline from an operation of the source.
 class DisplayCaptureDelegate {
 public:
     virtual ~DisplayCaptureDelegate() = default;
-    /// One frame, stamped with the recording's capture clock, its duration the minimum interval. `transformFlags`: bit 0
-    /// flip y, bit 1 flip x, bit 2 rotate clockwise.
+    /// One frame, stamped with the recording's capture clock, its duration the minimum interval. `transformFlags`: bit
+    /// 0 flip y, bit 1 flip x, bit 2 rotate clockwise.
     virtual void screenCaptureControllerDidReceiveSampleBuffer(DisplayCaptureSource& source, const SampleRef& sample,
                                                                std::uint32_t transformFlags) = 0;
     /// Capture failed with this status and has ended.
@@ -32,13 +32,13 @@ public:
 
 enum class GateWait : bool { No, UntilDelivered };
 
-/// Delivers what the display clone shows, as frames. Frames come when something changed, in the long run never faster than
-/// the minimum interval (one that came late may be followed by the next after half of it, so that no picture of a steady
-/// stream is lost); the first at once after a start, and at least one each second.
+/// Delivers what the display clone shows, as frames. Frames come when something changed, in the long run never faster
+/// than the minimum interval (one that came late may be followed by the next after half of it, so that no picture of a
+/// steady stream is lost); the first at once after a start, and at least one each second.
 ///
-/// Lifetime: shared; the delegate is held weakly. All operations are callable from any lane, also from within a delivery,
-/// and never wait for the delivery thread, but for a bounded closeGate. Destroying the last reference from within a
-/// delivery is legal.
+/// Lifetime: shared; the delegate is held weakly. All operations are callable from any lane, also from within a
+/// delivery, and never wait for the delivery thread, but for a bounded closeGate. Destroying the last reference from
+/// within a delivery is legal.
 class DisplayCaptureSource {
 public:
     virtual ~DisplayCaptureSource() = default;
@@ -46,17 +46,18 @@ public:
     /// Whom to deliver to; an empty pointer for nobody. A delivery in progress ends as it began.
     virtual void setDelegate(std::weak_ptr<DisplayCaptureDelegate> delegate) = 0;
 
-    /// Opens the capture gate and takes the clock of the current recording. A source starts closed, and stays so before the
-    /// first recording.
+    /// Opens the capture gate and takes the clock of the current recording. A source starts closed, and stays so before
+    /// the first recording.
     virtual void openGate() = 0;
-    /// Closes the gate: from its return on (with `UntilDelivered`, which waits at most 100 ms for a delivery in progress,
-    /// and not at all on the delivery thread itself) nothing is delivered, the capture clock stands, and start does
-    /// nothing. Delivery ends as by stop(): once the gate is open again it takes a start.
+    /// Closes the gate: from its return on (with `UntilDelivered`, which waits at most 100 ms for a delivery in
+    /// progress, and not at all on the delivery thread itself) nothing is delivered, the capture clock stands, and
+    /// start does nothing. Delivery ends as by stop(): once the gate is open again it takes a start.
     virtual void closeGate(GateWait wait) = 0;
 
-    /// Starts delivery, if the gate is open. Idempotent. A source that was started before in the same recording (the same
-    /// capture clock) first delivers its last picture once more with the stamp it had, then at once the current picture
-    /// with the clock's time, so that the gap of a pause is zero on the clock. The clock runs from the first picture on.
+    /// Starts delivery, if the gate is open. Idempotent. A source that was started before in the same recording (the
+    /// same capture clock) first delivers its last picture once more with the stamp it had, then at once the current
+    /// picture with the clock's time, so that the gap of a pause is zero on the clock. The clock runs from the first
+    /// picture on.
     virtual void start() = 0;
     /// Ends delivery. A delivery in progress may still be running at return.
     virtual void stop() = 0;

@@ -24,10 +24,10 @@ template <class T>
 using Result = std::variant<T, Error>;
 
 /// Paths are absolute; a doubled slash counts as one. Names are resolved beneath the temporary directory: a path that
-/// would leave it through ".." or a link, or whose file name holds a slash, is refused. Asks the disk on a thread of its
-/// own: what the disk has not answered within 40 ms counts as unreadable, so no call blocks longer (list, remove and
-/// move wait for the disk: they run on background lanes only). A file that is being written answers with the bytes its
-/// writer has written. Callable from any lane.
+/// would leave it through ".." or a link, or whose file name holds a slash, is refused. Asks the disk on a thread of
+/// its own: what the disk has not answered within 40 ms counts as unreadable, so no call blocks longer (list, remove
+/// and move wait for the disk: they run on background lanes only). A file that is being written answers with the bytes
+/// its writer has written. Callable from any lane.
 class FileSystem {
 public:
     virtual ~FileSystem() = default;

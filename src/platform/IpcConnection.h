@@ -22,27 +22,27 @@ using IpcReply = std::function<void(Array values)>;
 class IpcExportedObject {
 public:
     virtual ~IpcExportedObject() = default;
-    /// One message of the exported interface, on the main queue, in the order of arrival; `arguments` match the declaration.
-    /// `reply` is empty for a message that has none.
-    virtual void receiveMessage(const std::shared_ptr<IpcConnection>& connection, std::uint16_t message, Array arguments,
-                                IpcReply reply) = 0;
+    /// One message of the exported interface, on the main queue, in the order of arrival; `arguments` match the
+    /// declaration. `reply` is empty for a message that has none.
+    virtual void receiveMessage(const std::shared_ptr<IpcConnection>& connection, std::uint16_t message,
+                                Array arguments, IpcReply reply) = 0;
 };
 
 /// Sends messages of the remote interface. Made anew for each message; holds the connection.
 class IpcRemoteProxy {
 public:
     virtual ~IpcRemoteProxy() = default;
-    /// Sends; never blocks on the receiver. When the message can't be delivered (connection gone or invalid, peer too slow,
-    /// message over a limit) the proxy's error handler is called later, on the main queue, and `reply` is not. `reply` is
-    /// called on the main queue.
+    /// Sends; never blocks on the receiver. When the message can't be delivered (connection gone or invalid, peer too
+    /// slow, message over a limit) the proxy's error handler is called later, on the main queue, and `reply` is not.
+    /// `reply` is called on the main queue.
     virtual void send(std::uint16_t message, Array arguments, std::function<void(Array values)> reply = {}) = 0;
 };
 
-/// A connection: configured, then resumed; delivers everything on the main queue, never inline from one of its operations.
-/// It reports its loss once: the interruption handler when the peer's end broke while the connection could be restored
-/// (this transport never does), otherwise the invalidation handler. Handlers are read when the loss is delivered (one that
-/// was replaced before is not called), copied before the call, and called at most once. The exported object is held
-/// weakly. All operations are callable from any lane and from the connection's own handlers.
+/// A connection: configured, then resumed; delivers everything on the main queue, never inline from one of its
+/// operations. It reports its loss once: the interruption handler when the peer's end broke while the connection could
+/// be restored (this transport never does), otherwise the invalidation handler. Handlers are read when the loss is
+/// delivered (one that was replaced before is not called), copied before the call, and called at most once. The
+/// exported object is held weakly. All operations are callable from any lane and from the connection's own handlers.
 ///
 /// Ownership: the listener role owns an accepted connection until it is invalid and its handlers have run, or it was
 /// invalidated by its user; others hold it weakly.

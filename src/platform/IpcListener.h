@@ -34,11 +34,12 @@ public:
 class Ipc {
 public:
     virtual ~Ipc() = default;
-    /// A listener on the named service; an error (resume will then accept nobody) is answered by a listener that logs it.
+    /// A listener on the named service; an error (resume will then accept nobody) is answered by a listener that logs
+    /// it.
     virtual std::shared_ptr<IpcListener> listenerForService(const std::string& name) = 0;
     virtual std::shared_ptr<IpcListener> anonymousListener() = 0;
-    /// A connection to a named service, or to an endpoint's listener. Never null: one that can't be made is lost as soon
-    /// as it is resumed.
+    /// A connection to a named service, or to an endpoint's listener. Never null: one that can't be made is lost as
+    /// soon as it is resumed.
     virtual std::shared_ptr<IpcConnection> connectToService(const std::string& name) = 0;
     virtual std::shared_ptr<IpcConnection> connectToEndpoint(const std::shared_ptr<IpcEndpoint>& endpoint) = 0;
 };

@@ -51,8 +51,8 @@ public:
     virtual Platform& platform() = 0;
 };
 
-/// Makes the platform of this process. Defined by the port that is linked in. Null, after a line on standard error, when
-/// a service the daemon can't live without is missing.
+/// Makes the platform of this process. Defined by the port that is linked in. Null, after a line on standard error,
+/// when a service the daemon can't live without is missing.
 std::unique_ptr<PlatformOwner> makePlatform();
 
 }  // namespace lumacast

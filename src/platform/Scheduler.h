@@ -11,23 +11,24 @@ namespace lumacast {
 
 using Task = std::function<void()>;
 
-/// A serial task queue: tasks run in order, one at a time. Held by shared_ptr; it may be released from its own work, and
-/// work that was submitted before still runs.
+/// A serial task queue: tasks run in order, one at a time. Held by shared_ptr; it may be released from its own work,
+/// and work that was submitted before still runs.
 class SerialQueue {
 public:
     virtual ~SerialQueue() = default;
     virtual const std::string& label() const = 0;
     /// Submits; returns at once. Callable from any lane.
     virtual void async(Task task) = 0;
-    /// Runs `task` on the queue, after what was submitted before, and returns when it is done. On the queue itself (in a
-    /// task of it, at any depth) it runs inline. Never call it for the main queue from a lane the main queue waits for.
+    /// Runs `task` on the queue, after what was submitted before, and returns when it is done. On the queue itself (in
+    /// a task of it, at any depth) it runs inline. Never call it for the main queue from a lane the main queue waits
+    /// for.
     virtual void sync(const Task& task) = 0;
     /// Whether the caller runs in a task of this queue.
     virtual bool isCurrent() const = 0;
 };
 
-/// The process's main queue as the platform makes it: a serial queue whose tasks run in run(), on the thread that calls it,
-/// together with whatever else the platform waits for there.
+/// The process's main queue as the platform makes it: a serial queue whose tasks run in run(), on the thread that calls
+/// it, together with whatever else the platform waits for there.
 class MainLoop : public SerialQueue {
 public:
     /// Runs tasks until requestStop.

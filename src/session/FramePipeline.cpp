@@ -13,7 +13,8 @@ void LCRecordingSession::screenCaptureControllerDidReceiveSampleBuffer(DisplayCa
     const auto& image = sample->image();
     log_.sample("Screen sampled at w:%zu h:%zu", image ? image->width() : std::size_t{0},
                 image ? image->height() : std::size_t{0});
-    if (compare(firstSampleTimestamp_.get(), kZeroMediaTime) == 0) firstSampleTimestamp_.set(sample->presentationTime());
+    if (compare(firstSampleTimestamp_.get(), kZeroMediaTime) == 0)
+        firstSampleTimestamp_.set(sample->presentationTime());
     updateDuartionWithSample(sample);
     _processSampleBuffer(sample, transformFlags);
 }
@@ -22,7 +23,8 @@ void LCRecordingSession::updateDuartionWithSample(const SampleRef& sample) {
     // Deliberately raw ticks, and paused time is not taken out.
     const MediaTime pts = sample->presentationTime();
     const MediaTime duration = MediaTime::make(pts.value - firstSampleTimestamp_.get().value, pts.timescale);
-    if (const auto delegate = delegate_.get().lock()) delegate->broadcastSessionDidUpdateDuration(*this, duration.seconds());
+    if (const auto delegate = delegate_.get().lock())
+        delegate->broadcastSessionDidUpdateDuration(*this, duration.seconds());
 }
 
 void LCRecordingSession::_processSampleBuffer(const SampleRef& sample, std::uint32_t transformFlags) {

@@ -11,8 +11,8 @@ namespace lumacast {
 class IpcConnection;
 class SharedPlane;
 
-/// What the daemon tells one client, as the recording session sees it. Every message is one-way, callable from any lane and
-/// never blocks on the client; one that can't be delivered is only logged.
+/// What the daemon tells one client, as the recording session sees it. Every message is one-way, callable from any lane
+/// and never blocks on the client; one that can't be delivered is only logged.
 class LCClientProtocol {
 public:
     virtual ~LCClientProtocol() = default;

@@ -12,7 +12,8 @@ constexpr int kCaptureRate = 60;  // frames per second
 /// "MM-dd-yyyy HH:mm:ss" with every ":" replaced by "-".
 std::string dateInFileName(const CalendarFields& f) {
     char text[64];
-    std::snprintf(text, sizeof text, "%02d-%02d-%04d %02d-%02d-%02d", f.month, f.day, f.year, f.hour, f.minute, f.second);
+    std::snprintf(text, sizeof text, "%02d-%02d-%04d %02d-%02d-%02d", f.month, f.day, f.year, f.hour, f.minute,
+                  f.second);
     return text;
 }
 
@@ -33,7 +34,8 @@ void LCRecordingSession::setWindowSize(Size size) {
 std::string LCRecordingSession::outputPath() const {
     if (systemRecording_) {
         const Clock& clock = services_.platform.clock;
-        return services_.tempStore.pathFor("ScreenRecording_" + dateInFileName(clock.localCalendar(clock.now())) + ".mp4");
+        return services_.tempStore.pathFor("ScreenRecording_" + dateInFileName(clock.localCalendar(clock.now())) +
+                                           ".mp4");
     }
     const auto name = services_.localization._lcLocalizedAppNameFromBundleID(bundleID_);
     return services_.tempStore.pathFor(name.value_or("(null)") + ".mp4");
@@ -66,9 +68,8 @@ void LCRecordingSession::startSessionWithHandler(Handler handler) {
     movieWriter_.set(writer);
 
     startIsPending_ = true;
-    auto continuation = [self = shared_from_this(), start = ++starts_, stops = stops_.load(), handler = std::move(handler)] {
-        self->continueStart(start, stops, handler);
-    };
+    auto continuation = [self = shared_from_this(), start = ++starts_, stops = stops_.load(),
+                         handler = std::move(handler)] { self->continueStart(start, stops, handler); };
     writer->startWritingHandler([lane = services_.requestLane, continuation = std::move(continuation)] {
         if (lane)
             lane->async(continuation);
@@ -166,7 +167,8 @@ void LCRecordingSession::stopRecordingWithNotification(bool notification, const 
     isBroadcasting_ = false;
     stopIsRunning_ = false;
     if (notification)
-        if (const auto delegate = delegate_.get().lock()) delegate->recordingSessionStoppedWithError(shared_from_this(), error);
+        if (const auto delegate = delegate_.get().lock())
+            delegate->recordingSessionStoppedWithError(shared_from_this(), error);
     reportSummaryEvent(error ? error->code() : 0);
 }
 

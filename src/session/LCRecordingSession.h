@@ -38,11 +38,11 @@ struct SessionServices {
 /// How a session's samples leave it.
 enum class BroadcastProcessMode : std::int64_t { MovieClips = 0, SampleBuffers = 1 };
 
-/// One recording session per client application, kept by the manager under its bundle identifier. Held by shared_ptr: its own
-/// work keeps it alive after the registry has let it go.
+/// One recording session per client application, kept by the manager under its bundle identifier. Held by shared_ptr:
+/// its own work keeps it alive after the registry has let it go.
 ///
-/// Lanes: the manager's requests on the request lane; frames on the capture source's frame lane; source failures on the request
-/// lane. Flags are atomics; times and objects that cross lanes sit behind leaf locks.
+/// Lanes: the manager's requests on the request lane; frames on the capture source's frame lane; source failures on the
+/// request lane. Flags are atomics; times and objects that cross lanes sit behind leaf locks.
 class LCRecordingSession : public DisplayCaptureDelegate, public std::enable_shared_from_this<LCRecordingSession> {
 public:
     using Handler = std::function<void()>;
@@ -93,14 +93,16 @@ public:
     /// Seconds of active capture of the current recording so far: the finished stretches and the running one.
     double activeDuration() const;
 
-    // File naming: recomputed at each call, deliberately, so that a system recording's path names the second of the call.
+    // File naming: recomputed at each call, deliberately, so that a system recording's path names the second of the
+    // call.
     std::string outputPath() const;
     std::string trimmedOutputPath() const;
     URL outputURL() const { return URL::file(outputPath()); }
     URL trimmedOutputURL() const { return URL::file(trimmedOutputPath()); }
 
     // Lifecycle.
-    /// `startSessionWithHandler:` — makes the writer and begins to capture; the handler is always called, whatever came of it.
+    /// `startSessionWithHandler:` — makes the writer and begins to capture; the handler is always called, whatever came
+    /// of it.
     void startSessionWithHandler(Handler handler);
     /// `pauseSession` — only when not paused.
     void pauseSession();
@@ -110,12 +112,14 @@ public:
     /// `stopRecordingWithNotification:error:` — only while recording. Callable from the frame lane.
     void stopRecordingWithNotification(bool notification, const std::optional<Error>& error);
     /// `finishSessionWithHandler:` — the whole movie.
-    void finishSessionWithHandler(FinishHandler handler) { finishSessionWithStartClipDuration(0, 0, std::move(handler)); }
+    void finishSessionWithHandler(FinishHandler handler) {
+        finishSessionWithStartClipDuration(0, 0, std::move(handler));
+    }
     /// `finishSessionWithStartClipDuration:endClipDuration:handler:` — only while recording; otherwise the handler is
     /// deliberately never called, nor when trimming fails. Seconds; both above 0 give a clip.
     void finishSessionWithStartClipDuration(double startClipDuration, double endClipDuration, FinishHandler handler);
-    /// `finishAndCleanupSessionFilesWithHandler:` — stops and removes the movie, unless a later writer has its path. The
-    /// handler is called on the store's background queue.
+    /// `finishAndCleanupSessionFilesWithHandler:` — stops and removes the movie, unless a later writer has its path.
+    /// The handler is called on the store's background queue.
     void finishAndCleanupSessionFilesWithHandler(Handler handler);
     /// `getRecordedFileSize` — bytes; 0 for anything but a plain recording.
     std::uint64_t getRecordedFileSize();
@@ -148,7 +152,9 @@ public:
     ManagerRecord managerRecord;
 
 private:
-    static bool isNativeScreenOrientationPortrait() { return true; }  // deliberately fixed; kept so that the rule stays general
+    static bool isNativeScreenOrientationPortrait() {
+        return true;
+    }  // deliberately fixed; kept so that the rule stays general
     void continueStart(std::uint64_t start, std::uint64_t stops, const Handler& handler);
     void _resumeOrStartSession();
     void finishMovie(double startClipDuration, double endClipDuration, FinishHandler handler);

@@ -28,8 +28,8 @@ struct UsageMetrics {
     std::int64_t endReason = 0;
 };
 
-/// Collects the counters of one recording and sends them as one event; keeps no history. Thread-safe (a leaf lock around
-/// the counters): frames, sound and requests count from their own lanes.
+/// Collects the counters of one recording and sends them as one event; keeps no history. Thread-safe (a leaf lock
+/// around the counters): frames, sound and requests count from their own lanes.
 class LCReportingAgent {
 public:
     /// `initWithServiceName:` — all counters zero, all flags false.

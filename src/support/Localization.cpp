@@ -33,7 +33,8 @@ std::shared_ptr<const Bundle> Localization::fallbackBundle() {
 
 std::optional<std::string> Localization::_lcLocalizedStringFromFrameworkBundleWithKey(std::string_view key) {
     using Finder = std::shared_ptr<const Bundle> (Localization::*)();
-    for (const Finder find : {&Localization::localizedBundle, &Localization::fallbackBundle, &Localization::_lcFrameworkBundle})
+    for (const Finder find :
+         {&Localization::localizedBundle, &Localization::fallbackBundle, &Localization::_lcFrameworkBundle})
         if (const auto bundle = (this->*find)())
             if (auto text = bundle->string(key, kTable)) return text;
     return std::nullopt;

@@ -18,24 +18,25 @@ struct BaseIdentifier {
     bool operator==(const BaseIdentifier&) const = default;
 };
 
-/// Finds the client framework's resource bundle, picks the language and looks texts up. Callable from any lane; blocks no
-/// longer than the Bundles role.
+/// Finds the client framework's resource bundle, picks the language and looks texts up. Callable from any lane; blocks
+/// no longer than the Bundles role.
 class Localization {
 public:
     explicit Localization(Bundles& bundles) : bundles_(bundles) {}
 
-    /// `_lcFrameworkBundle` — the client framework's resource bundle, opened once and kept; null when it is not installed.
+    /// `_lcFrameworkBundle` — the client framework's resource bundle, opened once and kept; null when it is not
+    /// installed.
     std::shared_ptr<const Bundle> _lcFrameworkBundle();
     /// `localizedBundle` — its language folder that best matches the user's preferred languages, or null.
     std::shared_ptr<const Bundle> localizedBundle();
     /// `fallbackBundle` — its language folder for the base language of the user's first preferred language, or null.
     std::shared_ptr<const Bundle> fallbackBundle();
-    /// `_lcLocalizedStringFromFrameworkBundleWithKey:` — the text of the table "Localizable": from localizedBundle, else
-    /// fallbackBundle, else the framework bundle itself. None when all three lack it.
+    /// `_lcLocalizedStringFromFrameworkBundleWithKey:` — the text of the table "Localizable": from localizedBundle,
+    /// else fallbackBundle, else the framework bundle itself. None when all three lack it.
     std::optional<std::string> _lcLocalizedStringFromFrameworkBundleWithKey(std::string_view key);
 
-    /// `_lcLocalizedAppName` — the bundle's display name in the user's language, else the plain one, else the bundle's name,
-    /// else "".
+    /// `_lcLocalizedAppName` — the bundle's display name in the user's language, else the plain one, else the bundle's
+    /// name, else "".
     static std::string _lcLocalizedAppName(const Bundle& bundle);
     /// `_lcLocalizedAppNameFromBundleID:` — the same for an installed bundle; none when it can't be found.
     std::optional<std::string> _lcLocalizedAppNameFromBundleID(const BundleIdentifier& identifier);

@@ -42,8 +42,9 @@ class RecordingErrors {
 public:
     explicit RecordingErrors(Localization& localization) : localization_(localization) {}
 
-    /// `_lcUserErrorForCode:userInfo:` — an error with this code, exactly as given, whose user info is `userInfo` with the
-    /// code's localised description set over it. Without a localised text the user info stays as it is. Cannot fail.
+    /// `_lcUserErrorForCode:userInfo:` — an error with this code, exactly as given, whose user info is `userInfo` with
+    /// the code's localised description set over it. Without a localised text the user info stays as it is. Cannot
+    /// fail.
     Error _lcUserErrorForCode(std::int64_t code, Dictionary userInfo = {}) const;
     Error _lcUserErrorForCode(RecordingErrorCode code, Dictionary userInfo = {}) const {
         return _lcUserErrorForCode(static_cast<std::int64_t>(code), std::move(userInfo));

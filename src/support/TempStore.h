@@ -30,8 +30,8 @@ public:
     /// `_srSetupTempDirectory` — creates the directory, not its parents, when nothing is there.
     void _srSetupTempDirectory();
 
-    /// `_srRemoveFile:completion:` — removes a file on the background queue, in the order asked. Completes there, with none
-    /// when the file did not exist.
+    /// `_srRemoveFile:completion:` — removes a file on the background queue, in the order asked. Completes there, with
+    /// none when the file did not exist.
     void _srRemoveFile(const URL& url, Completion completion);
 
     /// `_srDeviceFreeDiskSpace` — bytes free where the directory is; 0 when unreadable.
@@ -41,8 +41,8 @@ public:
 
     /// A number for a writer that is about to write `path`; later writers of the same path get larger ones.
     std::uint64_t claimPath(const std::string& path);
-    /// The same removal for the file that the writer with this claim has left: when it is its turn and a later writer has
-    /// claimed the path, the file is that writer's and stays; completes with none then.
+    /// The same removal for the file that the writer with this claim has left: when it is its turn and a later writer
+    /// has claimed the path, the file is that writer's and stays; completes with none then.
     void removeFileOfClaim(const URL& url, std::uint64_t claim, Completion completion);
 
 private:

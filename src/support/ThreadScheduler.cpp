@@ -16,7 +16,8 @@ constexpr std::chrono::nanoseconds kLongestWait = std::chrono::hours(24 * 365 * 
 
 class ThreadSemaphore final : public Semaphore {
 public:
-    ThreadSemaphore(int initialCount, std::shared_ptr<ThreadPool> pool) : pool_(std::move(pool)), count_(initialCount) {}
+    ThreadSemaphore(int initialCount, std::shared_ptr<ThreadPool> pool)
+        : pool_(std::move(pool)), count_(initialCount) {}
 
     void signal() override {
         // Told under the lock, so that a waiter may destroy the semaphore as soon as it was let through.

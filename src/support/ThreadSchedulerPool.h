@@ -20,9 +20,9 @@ struct ThreadPoolLimits {
     std::chrono::milliseconds idleTime{5000};
 };
 
-/// Runs jobs on threads that are made when a job finds no idle one and end after a while without work. A worker that waits
-/// through the scheduler says so and does not count against the bound of runnable ones: its place is taken by another
-/// worker as long as jobs wait. Thread-safe.
+/// Runs jobs on threads that are made when a job finds no idle one and end after a while without work. A worker that
+/// waits through the scheduler says so and does not count against the bound of runnable ones: its place is taken by
+/// another worker as long as jobs wait. Thread-safe.
 class ThreadPool final {
 public:
     explicit ThreadPool(ThreadPoolLimits limits);

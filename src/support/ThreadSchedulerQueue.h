@@ -16,8 +16,8 @@
 namespace lumacast {
 
 /// A serial queue without a thread of its own: a list of work that whoever holds the queue takes its turn from. It is
-/// held by a pool worker, or by the thread that called sync: an idle queue is taken over at once, a busy one is handed to
-/// the waiting thread when its turn has come, so a task given to sync always runs on its caller's thread.
+/// held by a pool worker, or by the thread that called sync: an idle queue is taken over at once, a busy one is handed
+/// to the waiting thread when its turn has come, so a task given to sync always runs on its caller's thread.
 class ThreadSerialQueue final : public SerialQueue {
 public:
     ThreadSerialQueue(std::string label, std::shared_ptr<ThreadPool> pool);

@@ -83,8 +83,8 @@ bool LCMovieWriter::appendVideoSampleBuffer(const SampleRef& sample, const Affin
 void LCMovieWriter::dispatchedAppendVideoSampleBuffer(const SampleRef& sample, const AffineTransform& windowTransform) {
     const Tracks current = tracks();
     if (!current.assetWriter || !sample) return;
-    // Deliberately, the start path is taken until the first sample was processed, even when the writer writes already: its
-    // second start then fails.
+    // Deliberately, the start path is taken until the first sample was processed, even when the writer writes already:
+    // its second start then fails.
     if (current.assetWriter->status() == ContainerStatus::Writing && didProcessFirstSample_)
         drainVideo(current, sample);
     else
@@ -227,16 +227,16 @@ void LCMovieWriter::dispatchedFinishWritingWithHandler(URLHandler handler) {
 
 void LCMovieWriter::trimMovieWithURL(const URL& url, double startClipDuration, double endClipDuration,
                                      const URL& outputFileURL, std::function<void(URL)> handler) {
-    movieWriterQueue_->async(
-        [self = shared_from_this(), url, startClipDuration, endClipDuration, outputFileURL, handler = std::move(handler)] {
-            self->dispatchedTrimMovieWithURL(url, startClipDuration, endClipDuration, outputFileURL, handler);
-        });
+    movieWriterQueue_->async([self = shared_from_this(), url, startClipDuration, endClipDuration, outputFileURL,
+                              handler = std::move(handler)] {
+        self->dispatchedTrimMovieWithURL(url, startClipDuration, endClipDuration, outputFileURL, handler);
+    });
 }
 
 void LCMovieWriter::dispatchedTrimMovieWithURL(const URL& url, double startClipDuration, double endClipDuration,
                                                const URL& outputFileURL, std::function<void(URL)> handler) {
-    tempStore_._srRemoveFile(outputFileURL, [self = shared_from_this(), url, startClipDuration, endClipDuration, outputFileURL,
-                                             handler = std::move(handler)](std::optional<Error>) {
+    tempStore_._srRemoveFile(outputFileURL, [self = shared_from_this(), url, startClipDuration, endClipDuration,
+                                             outputFileURL, handler = std::move(handler)](std::optional<Error>) {
         const auto movie = self->platform_.movieExporters.openMovie(url);
         const auto exporter =
             self->platform_.movieExporters.makeExporter(movie, ExportPreset::PassThrough, outputFileURL);

@@ -17,12 +17,12 @@
 
 namespace lumacast {
 
-/// Turns the screen frames and the two sound streams of one recording into one MPEG-4 file: a picture track and two sound
-/// tracks. Single use: one file per writer. Held by shared_ptr; its own work keeps it alive.
+/// Turns the screen frames and the two sound streams of one recording into one MPEG-4 file: a picture track and two
+/// sound tracks. Single use: one file per writer. Held by shared_ptr; its own work keeps it alive.
 ///
-/// Lanes: appends and the two notifications are synchronous on the writer's queue; start, finish and trim asynchronous on
-/// it. The set-up of startWritingHandler and its handler run on the temporary store's background queue; owners append
-/// only after that handler has been called.
+/// Lanes: appends and the two notifications are synchronous on the writer's queue; start, finish and trim asynchronous
+/// on it. The set-up of startWritingHandler and its handler run on the temporary store's background queue; owners
+/// append only after that handler has been called.
 class LCMovieWriter : public std::enable_shared_from_this<LCMovieWriter> {
 public:
     using Handler = std::function<void()>;
@@ -36,8 +36,8 @@ public:
     void setSystemRecording(bool systemRecording) { systemRecording_ = systemRecording; }
     bool systemRecording() const { return systemRecording_; }
 
-    /// The store's claim on the output path, see TempStore::claimPath: a start that comes late then leaves the file of a later
-    /// writer alone. Set before the start.
+    /// The store's claim on the output path, see TempStore::claimPath: a start that comes late then leaves the file of
+    /// a later writer alone. Set before the start.
     void setPathClaim(std::uint64_t claim) { pathClaim_ = claim; }
 
     Size windowSize() const { return windowSize_; }
@@ -49,13 +49,14 @@ public:
     /// The container writer; null before set-up and when it failed. Any lane.
     std::shared_ptr<ContainerWriter> assetWriter() const { return tracks().assetWriter; }
 
-    /// `startWritingHandler:` — removes a stale file at the output path, sets up, and calls the handler whatever came of it.
+    /// `startWritingHandler:` — removes a stale file at the output path, sets up, and calls the handler whatever came
+    /// of it.
     void startWritingHandler(Handler handler);
     /// `setupAssetWriter` — the set-up alone, synchronously; no stale file is removed.
     void setupAssetWriter();
 
-    /// `appendVideoSampleBuffer:withWindowTransform:` — always true: a frame the writer can't use is dropped and logged, and
-    /// a failure shows when the movie is finished.
+    /// `appendVideoSampleBuffer:withWindowTransform:` — always true: a frame the writer can't use is dropped and
+    /// logged, and a failure shows when the movie is finished.
     bool appendVideoSampleBuffer(const SampleRef& sample, const AffineTransform& windowTransform);
     /// `appendAudio1SampleBuffer:` — the application's sound.
     void appendAudio1SampleBuffer(const SampleRef& sample);
@@ -66,13 +67,13 @@ public:
     /// `notifyRecordingResumed` — takes that back.
     void notifyRecordingResumed();
 
-    /// `finishWritingWithHandler:` — the movie's URL, or none when no picture was written. The handler of a second finish is
-    /// deliberately never called.
+    /// `finishWritingWithHandler:` — the movie's URL, or none when no picture was written. The handler of a second
+    /// finish is deliberately never called.
     void finishWritingWithHandler(URLHandler handler);
 
-    /// `trimMovieWithURL:startClipDuration:endClipDuration:outputFileURL:handler:` — copies a finished movie without its first
-    /// and last seconds, both rounded to whole ones, over `outputFileURL`. The handler is deliberately not called when that
-    /// fails.
+    /// `trimMovieWithURL:startClipDuration:endClipDuration:outputFileURL:handler:` — copies a finished movie without
+    /// its first and last seconds, both rounded to whole ones, over `outputFileURL`. The handler is deliberately not
+    /// called when that fails.
     void trimMovieWithURL(const URL& url, double startClipDuration, double endClipDuration, const URL& outputFileURL,
                           std::function<void(URL)> handler);
 

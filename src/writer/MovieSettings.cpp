@@ -51,7 +51,8 @@ double evenLength(double pixels) {
     return std::fmod(whole, 2.0) == 0.0 ? whole : whole + 1.0;
 }
 
-Dictionary videoSettings(const Platform& platform, Size windowSize, const std::optional<LCBroadcastConfiguration>& config) {
+Dictionary videoSettings(const Platform& platform, Size windowSize,
+                         const std::optional<LCBroadcastConfiguration>& config) {
     const std::int64_t bitRate = averageVideoBitRate(platform.preferences, platform.deviceInfo, windowSize);
     platform.log.line("bit rate set to %ld", bitRate);
     Dictionary compression{

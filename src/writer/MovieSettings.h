@@ -17,7 +17,8 @@ double evenLength(double pixels);
 
 /// The settings of the picture track. Logs the bit rate, and whether `config` brings compression properties of its own,
 /// which are merged over ours.
-Dictionary videoSettings(const Platform& platform, Size windowSize, const std::optional<LCBroadcastConfiguration>& config);
+Dictionary videoSettings(const Platform& platform, Size windowSize,
+                         const std::optional<LCBroadcastConfiguration>& config);
 
 /// The settings of both sound tracks: AAC, stereo, 44.1 kHz, 128 kbit/s.
 Dictionary audioSettings();

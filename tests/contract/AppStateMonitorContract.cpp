@@ -240,7 +240,8 @@ protected:
                 helper.connection(), xcb_intern_atom(helper.connection(), 0, sizeof name - 1, name), nullptr));
             const x11::Owned<xcb_get_property_reply_t> property(xcb_get_property_reply(
                 helper.connection(),
-                xcb_get_property(helper.connection(), 0, helper.screen().root, atom->atom, XCB_ATOM_WINDOW, 0, 1), nullptr));
+                xcb_get_property(helper.connection(), 0, helper.screen().root, atom->atom, XCB_ATOM_WINDOW, 0, 1),
+                nullptr));
             return property && property->value_len == 1;
         }));
     }
@@ -286,7 +287,8 @@ TEST_F(X11AppState, TellsWhenAnApplicationHasEnded) {
 }
 
 TEST_F(X11AppState, BelievesTheWindowManager) {
-    const test::ChildProcess manager({"openbox", "--config-file", "/dev/null"}, -1, {"DISPLAY=" + world_.display().name()});
+    const test::ChildProcess manager({"openbox", "--config-file", "/dev/null"}, -1,
+                                     {"DISPLAY=" + world_.display().name()});
     waitForManager();
     world_.openTwoApplications();
     const auto updates = std::make_shared<Updates>();

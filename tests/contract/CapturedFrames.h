@@ -35,7 +35,9 @@ struct CapturedFrame {
 
 inline std::uint32_t colourAt(const SharedPlane& plane, int x, int y) {
     std::uint32_t pixel = 0;
-    std::memcpy(&pixel, plane.pixels().data() + static_cast<std::size_t>(y) * plane.stride() + static_cast<std::size_t>(x) * 4, 4);
+    std::memcpy(&pixel,
+                plane.pixels().data() + static_cast<std::size_t>(y) * plane.stride() + static_cast<std::size_t>(x) * 4,
+                4);
     return pixel & 0xFFFFFF;
 }
 
@@ -57,7 +59,8 @@ public:
                             colourAt(*plane, plane->width() / 2, plane->height() / 2), true,
                             std::chrono::steady_clock::now(), nullptr};
         for (int y = 0; y < plane->height() && frame.oneColour; y += checkEvery)
-            for (int x = 0; x < plane->width(); x += checkEvery) frame.oneColour &= sameColour(colourAt(*plane, x, y), frame.colour);
+            for (int x = 0; x < plane->width(); x += checkEvery)
+                frame.oneColour &= sameColour(colourAt(*plane, x, y), frame.colour);
         {
             const std::lock_guard lock(mutex_);
             if (keepPlanes) frame.plane = plane;
@@ -95,7 +98,8 @@ public:
     }
     std::optional<std::int32_t> waitForFailure() {
         std::unique_lock lock(mutex_);
-        if (!changed_.wait_until(lock, std::chrono::steady_clock::now() + kGenerous, [&] { return !failures_.empty(); }))
+        if (!changed_.wait_until(lock, std::chrono::steady_clock::now() + kGenerous,
+                                 [&] { return !failures_.empty(); }))
             return std::nullopt;
         return failures_.back();
     }

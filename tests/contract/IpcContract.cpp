@@ -679,7 +679,8 @@ TEST_P(IpcContract, AMessageOverALimitFailsAtTheSenderAndTheConnectionStays) {
     Array endpoints;
     world->on(Side::Client, [&] {
         const auto anonymous = world->ipc(Side::Client).anonymousListener();
-        for (std::uint64_t i = 0; i <= limitOf(Limit::HandlesPerMessage); ++i) endpoints.push_back(anonymous->endpoint());
+        for (std::uint64_t i = 0; i <= limitOf(Limit::HandlesPerMessage); ++i)
+            endpoints.push_back(anonymous->endpoint());
     });
     Outcome handles;
     ask(*l.client, DaemonMessage::SetupBroadcast, setup(endpoints), handles);

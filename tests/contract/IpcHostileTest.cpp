@@ -1,5 +1,5 @@
-// Peers that break the rules: each is dropped with one line that says why, nothing it sent reaches anybody, no descriptor
-// is left behind, and everybody else is served on.
+// Peers that break the rules: each is dropped with one line that says why, nothing it sent reaches anybody, no
+// descriptor is left behind, and everybody else is served on.
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -78,7 +78,8 @@ TEST_F(IpcHostileTest, APeerThatSaysNothingIsDroppedAfterTheDeadline) {
 TEST_F(IpcHostileTest, AGoodMessageInSingleBytesArrives) {
     RawPeer peer(path());
     for (const std::uint8_t byte : makeHello()) ASSERT_TRUE(peer.send(Data{byte}));
-    for (const std::uint8_t byte : message(DaemonMessage::SetMicrophoneEnabled, {true}, 1)) ASSERT_TRUE(peer.send(Data{byte}));
+    for (const std::uint8_t byte : message(DaemonMessage::SetMicrophoneEnabled, {true}, 1))
+        ASSERT_TRUE(peer.send(Data{byte}));
     ASSERT_TRUE(until([&] { return object->count() == 1; }));
     EXPECT_EQ(object->received.get().front().arguments, (Array{true}));
     EXPECT_TRUE(lines().empty());
@@ -155,7 +156,8 @@ TEST_F(IpcHostileTest, GarbageNeverReachesAnybodyAndNeverStopsTheService) {
     const auto any = [&](std::uint32_t below) { return static_cast<std::uint32_t>(random() % below); };
     for (int round = 0; round < 600; ++round) {
         Data frame = message(static_cast<DaemonMessage>(any(20)), {"text", Data(any(64)), Dictionary{{"k", 1.5}}}, 1);
-        for (std::uint32_t flips = any(6); flips > 0; --flips) frame[any(frame.size())] = static_cast<std::uint8_t>(random());
+        for (std::uint32_t flips = any(6); flips > 0; --flips)
+            frame[any(frame.size())] = static_cast<std::uint8_t>(random());
         if (any(4) == 0) frame.resize(any(frame.size()) + 1);
         RawPeer peer(path());
         ASSERT_TRUE(peer.hello());

@@ -101,7 +101,8 @@ protected:
                         encoded(arguments));
     }
 
-    /// Expects the peer to be dropped with one line with its process and `reason`, and the friendly client to be served.
+    /// Expects the peer to be dropped with one line with its process and `reason`, and the friendly client to be
+    /// served.
     void expectDropped(RawPeer& peer, std::string_view reason, std::size_t linesBefore = 0) {
         EXPECT_TRUE(peer.seesEnd());
         ASSERT_TRUE(until([&] { return lines().size() > linesBefore; })) << "no line says why";
@@ -166,7 +167,8 @@ inline FrameHeader setMicrophone(std::uint64_t sequence = 2, std::uint8_t handle
     return messageHeader(FrameKind::Message, id(DaemonMessage::SetMicrophoneEnabled), sequence, handles);
 }
 
-inline PlaneRecord plane(std::int32_t width, std::int32_t height, std::uint64_t stride, std::vector<PixelRect> damage = {}) {
+inline PlaneRecord plane(std::int32_t width, std::int32_t height, std::uint64_t stride,
+                         std::vector<PixelRect> damage = {}) {
     return {1, width, height, stride, 1, std::move(damage)};
 }
 

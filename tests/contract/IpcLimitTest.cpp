@@ -128,7 +128,8 @@ protected:
         });
         peer.hello();
         const std::uint64_t enough = 4 * limitOf(Limit::QueuedBytesPerReader) / limitOf(Limit::MessageBytes);
-        for (std::uint64_t i = 1; i <= enough; ++i) peer.send(message(DaemonMessage::SynchronousGetCurrentState, {}, i));
+        for (std::uint64_t i = 1; i <= enough; ++i)
+            peer.send(message(DaemonMessage::SynchronousGetCurrentState, {}, i));
         ASSERT_TRUE(until([&] { return !lines().empty(); }));
         expectLine("it does not read its replies");
     }
@@ -184,9 +185,17 @@ TEST_P(IpcLimitTest, IsKept) {
 }
 
 std::string limitName(const ::testing::TestParamInfo<LimitRow>& info) {
-    constexpr std::array kNames{"MessageBytes",     "MessageDepth",         "HandlesPerMessage",
-                                "ConnectionsPerUser", "MessagesInFlight",   "QueuedBytesPerReader",
-                                "ContextIdentifiersPerRequest", "HelloBytes", "PlanesLeased", "MessageValues", "HeldBytesPerUser"};
+    constexpr std::array kNames{"MessageBytes",
+                                "MessageDepth",
+                                "HandlesPerMessage",
+                                "ConnectionsPerUser",
+                                "MessagesInFlight",
+                                "QueuedBytesPerReader",
+                                "ContextIdentifiersPerRequest",
+                                "HelloBytes",
+                                "PlanesLeased",
+                                "MessageValues",
+                                "HeldBytesPerUser"};
     static_assert(kNames.size() == kLimits.size());
     return kNames.at(static_cast<std::size_t>(info.param.limit));
 }

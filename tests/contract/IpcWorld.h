@@ -138,7 +138,10 @@ struct Outcome {
 class PlainPlane final : public SharedPlane {
 public:
     PlainPlane(std::int32_t width, std::int32_t height, std::vector<PixelRect> damage = {}, std::uint64_t number = 1)
-        : width_(width), height_(height), pixels_(stride() * static_cast<std::size_t>(height)), damage_(std::move(damage)),
+        : width_(width),
+          height_(height),
+          pixels_(stride() * static_cast<std::size_t>(height)),
+          damage_(std::move(damage)),
           number_(number) {
         for (std::size_t i = 0; i < pixels_.size(); ++i) pixels_[i] = static_cast<std::uint8_t>(i * 7 + number);
     }

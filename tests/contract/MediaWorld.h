@@ -1,5 +1,6 @@
 #pragma once
-// What the suites of the movie roles share: a clock that is moved by hand, planes that are painted, and files of their own.
+// What the suites of the movie roles share: a clock that is moved by hand, planes that are painted, and files of their
+// own.
 
 #include <atomic>
 #include <chrono>
@@ -60,7 +61,8 @@ public:
         }
     }
     void setPixel(std::int32_t x, std::int32_t y, std::uint8_t red, std::uint8_t green, std::uint8_t blue) {
-        std::uint8_t* const pixel = pixels_.data() + static_cast<std::size_t>(y) * stride() + static_cast<std::size_t>(x) * 4;
+        std::uint8_t* const pixel =
+            pixels_.data() + static_cast<std::size_t>(y) * stride() + static_cast<std::size_t>(x) * 4;
         pixel[0] = blue;
         pixel[1] = green;
         pixel[2] = red;
@@ -179,7 +181,8 @@ inline SampleRef picture(std::shared_ptr<PaintedPlane> plane, MediaTime stamp) {
     return SampleBuffer::makeVideo(PixelBuffer(std::move(plane)), stamp, kInvalidMediaTime);
 }
 
-inline SampleRef greyPicture(std::int32_t width, std::int32_t height, std::uint64_t number, std::uint8_t grey, MediaTime stamp) {
+inline SampleRef greyPicture(std::int32_t width, std::int32_t height, std::uint64_t number, std::uint8_t grey,
+                             MediaTime stamp) {
     auto plane = std::make_shared<PaintedPlane>(width, height, number);
     plane->fill({0, 0, width, height}, grey);
     return picture(std::move(plane), stamp);

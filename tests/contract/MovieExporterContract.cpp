@@ -87,8 +87,8 @@ protected:
         writer.startSession(atSeconds(3));
         for (int i = 0; i < 100; ++i) {
             ASSERT_TRUE(eventually([&] { return input->isReadyForMoreMediaData(); }));
-            ASSERT_TRUE(input->append(greyPicture(64, 64, static_cast<std::uint64_t>(i), static_cast<std::uint8_t>(i + 50),
-                                                  atSeconds(3 + i * 0.1))));
+            ASSERT_TRUE(input->append(greyPicture(64, 64, static_cast<std::uint64_t>(i),
+                                                  static_cast<std::uint8_t>(i + 50), atSeconds(3 + i * 0.1))));
         }
         writer.endSession(atSeconds(13));
         Happening done;
@@ -98,7 +98,8 @@ protected:
     }
 
     std::shared_ptr<MovieExporter> exporter(const URL& output) {
-        return world_->exporters().makeExporter(world_->exporters().openMovie(movie_), ExportPreset::PassThrough, output);
+        return world_->exporters().makeExporter(world_->exporters().openMovie(movie_), ExportPreset::PassThrough,
+                                                output);
     }
     ExportStatus exportRange(std::optional<MediaTimeRange> range, const URL& output) {
         const auto made = exporter(output);
@@ -122,7 +123,8 @@ TEST_P(MovieExporterContract, WhatIsNoMovieLastsNothing) {
     const auto missing = world_->exporters().openMovie(world_->url("missing.mp4"));
     ASSERT_TRUE(missing);
     EXPECT_EQ(compare(missing->duration(), kZeroMediaTime), 0);
-    EXPECT_EQ(compare(world_->exporters().openMovie(URL("https://example.org/movie.mp4"))->duration(), kZeroMediaTime), 0);
+    EXPECT_EQ(compare(world_->exporters().openMovie(URL("https://example.org/movie.mp4"))->duration(), kZeroMediaTime),
+              0);
 }
 
 TEST_P(MovieExporterContract, WithoutARangeTheWholeMovieIsCopied) {
@@ -164,7 +166,8 @@ TEST_P(MovieExporterContract, ARangeThatIsNotInTheMovieFailsAndLeavesNoFile) {
         {atSeconds(1), MediaTime::fromSeconds(1e300, 1)},
     };
     for (const MediaTimeRange& range : wrong) {
-        EXPECT_EQ(exportRange(range, copy_), ExportStatus::Failed) << range.start.seconds() << " " << range.duration.seconds();
+        EXPECT_EQ(exportRange(range, copy_), ExportStatus::Failed)
+            << range.start.seconds() << " " << range.duration.seconds();
         EXPECT_FALSE(world_->fileExists(copy_));
     }
 }

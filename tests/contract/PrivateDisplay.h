@@ -89,8 +89,8 @@ public:
         if (!number.empty()) name_ = ":" + number;
     }
 
-    /// A name that nobody else is given while this process runs: for a server that is to be followed by another one of the same
-    /// name.
+    /// A name that nobody else is given while this process runs: for a server that is to be followed by another one of
+    /// the same name.
     static std::string nameOfOnesOwn() { return ":" + std::to_string(1000 + ::getpid() % 30000); }
 
     /// As in $DISPLAY; empty when the server did not start.

@@ -113,7 +113,8 @@ inline Data encoded(const Value& value) {
     return encode(value, body) ? body.bytes : Data();
 }
 
-inline FrameHeader messageHeader(FrameKind kind, std::uint16_t message, std::uint64_t sequence, std::uint8_t handles = 0) {
+inline FrameHeader messageHeader(FrameKind kind, std::uint16_t message, std::uint64_t sequence,
+                                 std::uint8_t handles = 0) {
     FrameHeader header;
     header.kind = kind;
     header.message = message;
@@ -125,7 +126,8 @@ inline FrameHeader messageHeader(FrameKind kind, std::uint16_t message, std::uin
 /// Memory for a plane of `bytes` bytes.
 inline Fd planeMemory(std::size_t bytes, int seals) {
     Fd memory(memfd_create("test", MFD_CLOEXEC | MFD_ALLOW_SEALING));
-    if (ftruncate(memory.get(), static_cast<off_t>(bytes)) != 0 || fcntl(memory.get(), F_ADD_SEALS, seals) != 0) return Fd();
+    if (ftruncate(memory.get(), static_cast<off_t>(bytes)) != 0 || fcntl(memory.get(), F_ADD_SEALS, seals) != 0)
+        return Fd();
     return memory;
 }
 

@@ -44,7 +44,8 @@ TEST_F(ReactorTest, TasksOfManyThreadsAllRunEachThreadsInOrder) {
     std::vector<std::thread> threads;
     for (int t = 0; t < kThreads; ++t)
         threads.emplace_back([&, t] {
-            for (int i = 0; i < kTasks; ++i) reactor.async([&, t, i] { ran[static_cast<std::size_t>(t)].push_back(i); });
+            for (int i = 0; i < kTasks; ++i)
+                reactor.async([&, t, i] { ran[static_cast<std::size_t>(t)].push_back(i); });
         });
     for (std::thread& one : threads) one.join();
     reactor.sync([] {});

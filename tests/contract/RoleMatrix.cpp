@@ -69,7 +69,8 @@ std::vector<ContractOutcome> outcomesOfThisRun() {
         const ::testing::TestSuite& suite = *unit.GetTestSuite(s);
         for (int t = 0; t < suite.total_test_count(); ++t) {
             const ::testing::TestInfo& test = *suite.GetTestInfo(t);
-            if (test.should_run() && !test.result()->Skipped()) outcomes.push_back({suite.name(), test.result()->Passed()});
+            if (test.should_run() && !test.result()->Skipped())
+                outcomes.push_back({suite.name(), test.result()->Passed()});
         }
     }
     return outcomes;
@@ -88,7 +89,8 @@ public:
         std::printf("%s", matrix.text().c_str());
         if (!isWholeRun()) return;
         for (const std::string& cell : matrix.emptyCells()) ADD_FAILURE() << "no contract test passed: " << cell;
-        for (const std::string& suite : matrix.unknownSuites()) ADD_FAILURE() << "not a role of the platform: " << suite;
+        for (const std::string& suite : matrix.unknownSuites())
+            ADD_FAILURE() << "not a role of the platform: " << suite;
     }
 };
 
@@ -110,7 +112,8 @@ TEST(RoleMatrix, ACellIsEmptyUntilATestOfItHasPassed) {
 }
 
 TEST(RoleMatrix, ASuiteOfAnUnknownRoleIsNamed) {
-    const RoleMatrix matrix({"Clock"}, {{"Fake/ClocksContract", true}, {"Fake/ClocksContract", true}, {"LimitsTest", true}});
+    const RoleMatrix matrix({"Clock"},
+                            {{"Fake/ClocksContract", true}, {"Fake/ClocksContract", true}, {"LimitsTest", true}});
     EXPECT_EQ(matrix.unknownSuites(), (std::vector<std::string>{"Fake/ClocksContract"}));
 }
 

@@ -1,4 +1,5 @@
-// What every scheduler must do: the contract of Scheduler, SerialQueue, GlobalQueue, Semaphore, OwnerlessLock and Timer.
+// What every scheduler must do: the contract of Scheduler, SerialQueue, GlobalQueue, Semaphore, OwnerlessLock and
+// Timer.
 
 #include <gtest/gtest.h>
 
@@ -150,7 +151,8 @@ TEST_P(SchedulerContract, AQueueIsCurrentInItsTasksOnly) {
     const auto queue = scheduler_.serialQueue("queue"), other = scheduler_.serialQueue("other");
     EXPECT_FALSE(queue->isCurrent());
     std::atomic<int> seen = 0;
-    queue->async([&] { seen += queue->isCurrent() && !other->isCurrent() && !scheduler_.mainQueue().isCurrent() ? 1 : 100; });
+    queue->async(
+        [&] { seen += queue->isCurrent() && !other->isCurrent() && !scheduler_.mainQueue().isCurrent() ? 1 : 100; });
     other->async([&] { seen += !queue->isCurrent() && other->isCurrent() ? 1 : 100; });
     scheduler_.mainQueue().async([&] { seen += !queue->isCurrent() && scheduler_.mainQueue().isCurrent() ? 1 : 100; });
     global([&] { seen += !queue->isCurrent() && !scheduler_.mainQueue().isCurrent() ? 1 : 100; });
@@ -445,7 +447,8 @@ Maker simulated(std::uint64_t seed) {
     return [seed] { return std::make_unique<SimSchedulerWorld>(seed); };
 }
 
-INSTANTIATE_TEST_SUITE_P(Fake, SchedulerContract, ::testing::Values(simulated(1), simulated(2), simulated(3), simulated(4)));
+INSTANTIATE_TEST_SUITE_P(Fake, SchedulerContract,
+                         ::testing::Values(simulated(1), simulated(2), simulated(3), simulated(4)));
 INSTANTIATE_TEST_SUITE_P(Port, SchedulerContract,
                          ::testing::Values(Maker([] { return std::make_unique<PortSchedulerWorld>(); })));
 

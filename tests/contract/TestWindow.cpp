@@ -94,7 +94,8 @@ void TestWindow::configure(std::uint16_t mask, std::array<std::uint32_t, 4> valu
 }
 
 void TestWindow::move(int x, int y) {
-    configure(XCB_CONFIG_WINDOW_X | XCB_CONFIG_WINDOW_Y, {static_cast<std::uint32_t>(x), static_cast<std::uint32_t>(y)});
+    configure(XCB_CONFIG_WINDOW_X | XCB_CONFIG_WINDOW_Y,
+              {static_cast<std::uint32_t>(x), static_cast<std::uint32_t>(y)});
 }
 
 void TestWindow::resize(int width, int height) {

@@ -19,8 +19,8 @@
 
 namespace lumacast::test {
 
-/// One window on a connection of its own. It is painted when told to, and by a thread of its own whenever the server asks for
-/// that (Expose). Colours are 0xRRGGBB. Every operation returns when the server has done it.
+/// One window on a connection of its own. It is painted when told to, and by a thread of its own whenever the server
+/// asks for that (Expose). Colours are 0xRRGGBB. Every operation returns when the server has done it.
 class TestWindow final {
 public:
     struct Look {

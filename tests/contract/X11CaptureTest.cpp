@@ -1,5 +1,5 @@
-// What is special about capturing on X11: windows that are covered, hidden, resized, moved and destroyed, and servers that
-// hang or die.
+// What is special about capturing on X11: windows that are covered, hidden, resized, moved and destroyed, and servers
+// that hang or die.
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
@@ -49,7 +49,8 @@ protected:
     }
 
     std::shared_ptr<DisplayCaptureSource> source(int width, int height, int perSecond = 60) {
-        auto made = capture.makeSource({static_cast<double>(width), static_cast<double>(height)}, MediaTime::make(1, perSecond));
+        auto made = capture.makeSource({static_cast<double>(width), static_cast<double>(height)},
+                                       MediaTime::make(1, perSecond));
         made->setDelegate(frames);
         return made;
     }
@@ -185,14 +186,16 @@ TEST_F(X11Capture, ScalesWhatChangesJustAsItScalesTheWhole) {
         for (std::uint32_t i = 1; i <= 40; ++i) {
             const int x = static_cast<int>(random() % 300), y = static_cast<int>(random() % 220);
             const std::size_t before = frames->count();
-            window.paintPart({x, y, 1 + static_cast<int>(random() % 20), 1 + static_cast<int>(random() % 20)}, random() & 0xFFFFFF);
+            window.paintPart({x, y, 1 + static_cast<int>(random() % 20), 1 + static_cast<int>(random() % 20)},
+                             random() & 0xFFFFFF);
             ASSERT_TRUE(frames->waitForCount(before + 1));
             if (i % 4 == 0) frames->clear();
         }
         // One that begins now reads and scales everything.
         const auto whole = std::make_shared<CapturedFrames>();
         whole->keepPlanes = true;
-        const auto other = capture.makeSource({static_cast<double>(width), static_cast<double>(height)}, MediaTime::make(1, 60));
+        const auto other =
+            capture.makeSource({static_cast<double>(width), static_cast<double>(height)}, MediaTime::make(1, 60));
         other->setDelegate(whole);
         other->openGate();
         other->start();
@@ -434,8 +437,8 @@ TEST_F(X11Capture, BringsEveryPlaneUpToDate) {
     }
 }
 
-// An application and a source that are equally fast: every picture once, in order, none torn. On a machine that is busy with
-// something else some may be missed, but none is ever shown twice as new.
+// An application and a source that are equally fast: every picture once, in order, none torn. On a machine that is busy
+// with something else some may be missed, but none is ever shown twice as new.
 TEST_F(X11Capture, TakesEveryPictureOfASteadyApplicationOnce) {
     frames->checkEvery = 32;
     for (const int perSecond : {60, 30}) {
@@ -473,9 +476,10 @@ TEST_F(X11Capture, DamageTellsWhatDiffersFromTheLastPicture) {
     const std::size_t before = frames->count();
     window.paintPart({100, 200, 30, 20}, kGreen);
     ASSERT_TRUE(frames->waitFor([&](const Frames& got) {
-        return std::any_of(got.begin() + static_cast<std::ptrdiff_t>(before), got.end(), [](const CapturedFrame& frame) {
-            return frame.damage == std::vector<PixelRect>{{100, 200, 30, 20}};
-        });
+        return std::any_of(got.begin() + static_cast<std::ptrdiff_t>(before), got.end(),
+                           [](const CapturedFrame& frame) {
+                               return frame.damage == std::vector<PixelRect>{{100, 200, 30, 20}};
+                           });
     }));
     const Frames got = frames->frames();
     for (std::size_t i = 1; i < got.size(); ++i) EXPECT_EQ(got[i].number, got[i - 1].number + 1);

@@ -9,7 +9,8 @@
 
 namespace lumacast::test {
 
-/// Another process with one window of 200x150, mapped, which has a tool without windows for a child. Ends with this object.
+/// Another process with one window of 200x150, mapped, which has a tool without windows for a child. Ends with this
+/// object.
 class XClientProcess final {
 public:
     explicit XClientProcess(const std::string& display);

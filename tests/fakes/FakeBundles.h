@@ -48,7 +48,8 @@ public:
     std::shared_ptr<const Bundle> withIdentifier(const BundleIdentifier& identifier) override;
     std::string frameworkBundlePath() override { return "/fake/Lumacast.framework"; }
     std::vector<std::string> preferredLanguages() override;
-    /// A wanted language suits a localization with the same tag, and one with the tag that is left without its last parts.
+    /// A wanted language suits a localization with the same tag, and one with the tag that is left without its last
+    /// parts.
     std::vector<std::string> preferredLocalizations(const std::vector<std::string>& available) override;
 
     /// Makes the bundle findable under its path, and under its identifier where it has one.

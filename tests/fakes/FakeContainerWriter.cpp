@@ -54,8 +54,12 @@ public:
     explicit FakeContainerWriter(std::shared_ptr<FakeRecording> recording) : recording_(std::move(recording)) {}
     ~FakeContainerWriter() override { recording_->abandon(); }
 
-    std::shared_ptr<TrackInput> addVideoInput(const Dictionary& settings) override { return add(MediaType::Video, settings); }
-    std::shared_ptr<TrackInput> addAudioInput(const Dictionary& settings) override { return add(MediaType::Audio, settings); }
+    std::shared_ptr<TrackInput> addVideoInput(const Dictionary& settings) override {
+        return add(MediaType::Video, settings);
+    }
+    std::shared_ptr<TrackInput> addAudioInput(const Dictionary& settings) override {
+        return add(MediaType::Audio, settings);
+    }
     ContainerStatus status() const override { return recording_->status(); }
     std::optional<Error> error() const override { return recording_->error(); }
     URL outputURL() const override { return recording_->outputURL(); }

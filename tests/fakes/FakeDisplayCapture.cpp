@@ -77,9 +77,10 @@ void FakeDisplayCaptureSource::start() {
     lane_->async([weak, run] {
         if (const auto self = weak.lock()) self->beginRun(run);
     });
-    auto timer = settings_->scheduler.timer(lane_, std::chrono::nanoseconds(nanosecondsOf(minimumInterval_)), [weak, run] {
-        if (const auto self = weak.lock()) self->tick(run);
-    });
+    auto timer =
+        settings_->scheduler.timer(lane_, std::chrono::nanoseconds(nanosecondsOf(minimumInterval_)), [weak, run] {
+            if (const auto self = weak.lock()) self->tick(run);
+        });
     const std::lock_guard lock(mutex_);
     if (running_ && run_ == run) timer_.swap(timer);
 }
@@ -211,7 +212,8 @@ void FakeDisplayCaptureSource::endAndTell(std::function<void(DisplayCaptureDeleg
 }
 
 void FakeDisplayCaptureSource::fail(std::int32_t status) {
-    endAndTell([status](auto& delegate, auto& source) { delegate.screenCaptureControllerDidFailWithStatus(source, status); });
+    endAndTell(
+        [status](auto& delegate, auto& source) { delegate.screenCaptureControllerDidFailWithStatus(source, status); });
 }
 
 void FakeDisplayCaptureSource::preempt() {

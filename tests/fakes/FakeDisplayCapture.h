@@ -24,9 +24,9 @@ struct FakeCaptureSettings {
     std::atomic<std::uint32_t> transformFlags{0};
 };
 
-/// One source. Its frame lane is a serial queue of its own. A picture comes at once after a start, when the test says that
-/// something has changed (never faster than the minimum interval), and at least once a second; with the clock, gate and
-/// resume stamps of the contract. Thread-safe.
+/// One source. Its frame lane is a serial queue of its own. A picture comes at once after a start, when the test says
+/// that something has changed (never faster than the minimum interval), and at least once a second; with the clock,
+/// gate and resume stamps of the contract. Thread-safe.
 class FakeDisplayCaptureSource final : public DisplayCaptureSource,
                                        public std::enable_shared_from_this<FakeDisplayCaptureSource> {
 public:

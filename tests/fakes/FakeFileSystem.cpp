@@ -141,7 +141,8 @@ std::optional<Error> FakeFileSystem::move(const std::string& from, const std::st
     if (newName.starts_with(oldName + "/")) return fakeSystemError(EINVAL);
     std::map<std::string, std::shared_ptr<FakeFile>> moved;
     for (const auto& [path, file] : nodes_)
-        if (path == oldName || path.starts_with(oldName + "/")) moved.emplace(newName + path.substr(oldName.size()), file);
+        if (path == oldName || path.starts_with(oldName + "/"))
+            moved.emplace(newName + path.substr(oldName.size()), file);
     std::erase_if(nodes_, [&](const auto& n) { return n.first == oldName || n.first.starts_with(oldName + "/"); });
     nodes_.erase(newName);
     nodes_.merge(moved);

@@ -23,9 +23,9 @@ struct FakeFile {
     std::shared_ptr<const FakeMovie> movie;  ///< what it holds, where it is a movie
 };
 
-/// The temporary directory's file system in memory. The parents of the temporary directory exist; it itself does not until
-/// it is made. Refuses what leaves the temporary directory. A failing call (FaultPlan "FileSystem.<operation>") is
-/// answered like a disk that does not answer. Thread-safe; never waits.
+/// The temporary directory's file system in memory. The parents of the temporary directory exist; it itself does not
+/// until it is made. Refuses what leaves the temporary directory. A failing call (FaultPlan "FileSystem.<operation>")
+/// is answered like a disk that does not answer. Thread-safe; never waits.
 class FakeFileSystem final : public FileSystem {
 public:
     FakeFileSystem(const Clock& clock, FaultPlan& faults, std::string root = {});

@@ -151,7 +151,8 @@ std::shared_ptr<IpcConnection> FakeIpc::connectToEndpoint(const std::shared_ptr<
 
 std::shared_ptr<IpcConnection> FakeIpc::connectTo(const std::shared_ptr<FakeListenerState>& listener) {
     const bool works = isOpen(listener) && process_->isAlive() && !process_->faults.fails("Ipc.connect");
-    const auto near = std::make_shared<FakeIpcConnection>(process_, works ? listener->process->pid : ProcessID{0}, false);
+    const auto near =
+        std::make_shared<FakeIpcConnection>(process_, works ? listener->process->pid : ProcessID{0}, false);
     {
         const std::lock_guard lock(process_->mutex);
         std::erase_if(process_->ends, [](const auto& end) { return end.expired(); });

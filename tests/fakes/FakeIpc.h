@@ -25,10 +25,10 @@ struct FakeIpcMachine {
     std::size_t acceptedConnections = 0;
 };
 
-/// The Ipc role of one process: listeners and connections whose messages are encoded, checked and decoded like on the real
-/// wire, with the limits of the table. Everything is delivered on the process's main queue. A failing call ("Ipc.send") is
-/// a message that could not be delivered. Several of them on one machine are several processes, each with a main queue of its
-/// own. Thread-safe.
+/// The Ipc role of one process: listeners and connections whose messages are encoded, checked and decoded like on the
+/// real wire, with the limits of the table. Everything is delivered on the process's main queue. A failing call
+/// ("Ipc.send") is a message that could not be delivered. Several of them on one machine are several processes, each
+/// with a main queue of its own. Thread-safe.
 class FakeIpc final : public Ipc {
 public:
     /// `mainQueue` is this process's; `log` takes the lines about what was dropped.
@@ -43,7 +43,8 @@ public:
 
     /// What this process is told when it asks for the entitlement of a peer with this number.
     void grant(ProcessID peer, const std::string& name, Value value);
-    /// The process dies: its listeners close, its connections break as its peers see it, and it is told nothing any more.
+    /// The process dies: its listeners close, its connections break as its peers see it, and it is told nothing any
+    /// more.
     void kill();
     /// While false, the process reads nothing: what is sent to it waits, up to the limit.
     void setReading(bool reading);

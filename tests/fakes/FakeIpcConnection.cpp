@@ -27,11 +27,17 @@ private:
 class FakeIpcConnection::LentPlane final : public SharedPlane {
 public:
     LentPlane(const SharedPlane& plane, std::weak_ptr<FakeIpcConnection> lender, std::uint64_t lease)
-        : width_(plane.width()), height_(plane.height()), stride_(plane.stride()), pictureNumber_(plane.pictureNumber()),
-          damage_(plane.damage().begin(), plane.damage().end()), lender_(std::move(lender)), lease_(lease) {
+        : width_(plane.width()),
+          height_(plane.height()),
+          stride_(plane.stride()),
+          pictureNumber_(plane.pictureNumber()),
+          damage_(plane.damage().begin(), plane.damage().end()),
+          lender_(std::move(lender)),
+          lease_(lease) {
         const auto* fake = dynamic_cast<const FakePlane*>(&plane);
-        pixels_ = fake ? fake->sharedPixels()
-                       : std::make_shared<const std::vector<std::uint8_t>>(plane.pixels().begin(), plane.pixels().end());
+        pixels_ = fake
+                      ? fake->sharedPixels()
+                      : std::make_shared<const std::vector<std::uint8_t>>(plane.pixels().begin(), plane.pixels().end());
     }
     ~LentPlane() override {
         if (const auto lender = lender_.lock()) lender->giveBack(lease_);
@@ -127,7 +133,10 @@ void FakeIpcConnection::resume() {
         arrived = incoming_.size();
     }
     if (!joined) return lose(false);
-    for (; arrived > 0; --arrived) process_->queue->async([weak = weak_from_this()] { if (auto self = weak.lock()) self->deliverOne(); });
+    for (; arrived > 0; --arrived)
+        process_->queue->async([weak = weak_from_this()] {
+            if (auto self = weak.lock()) self->deliverOne();
+        });
 }
 
 void FakeIpcConnection::readOn() {
@@ -136,7 +145,10 @@ void FakeIpcConnection::readOn() {
         const std::lock_guard lock(mutex_);
         arrived = resumed_ ? incoming_.size() : 0;
     }
-    for (; arrived > 0; --arrived) process_->queue->async([weak = weak_from_this()] { if (auto self = weak.lock()) self->deliverOne(); });
+    for (; arrived > 0; --arrived)
+        process_->queue->async([weak = weak_from_this()] {
+            if (auto self = weak.lock()) self->deliverOne();
+        });
 }
 
 void FakeIpcConnection::invalidate() { lose(true); }
@@ -256,7 +268,8 @@ bool FakeIpcConnection::receive(FakeFrame frame) {
     {
         const std::lock_guard lock(mutex_);
         if (lost_) return true;
-        if (frame.kind != FakeFrame::Kind::End && incomingBytes_ + frame.body.bytes.size() > limitOf(Limit::QueuedBytesPerReader))
+        if (frame.kind != FakeFrame::Kind::End &&
+            incomingBytes_ + frame.body.bytes.size() > limitOf(Limit::QueuedBytesPerReader))
             return false;
         incomingBytes_ += frame.body.bytes.size();
         incoming_.push_back(std::move(frame));

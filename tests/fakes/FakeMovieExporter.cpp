@@ -58,8 +58,8 @@ struct Export {
         if (!movie || compare(movie->duration(), kZeroMediaTime) <= 0) return fakeSystemError(ENODATA);
         const MediaTimeRange part = range.value_or(MediaTimeRange{kZeroMediaTime, movie->duration()});
         const MediaTime partEnd = add(part.start, part.duration);
-        if (!partEnd.isValid() || compare(part.start, kZeroMediaTime) < 0 || compare(part.duration, kZeroMediaTime) <= 0 ||
-            compare(partEnd, movie->duration()) > 0)
+        if (!partEnd.isValid() || compare(part.start, kZeroMediaTime) < 0 ||
+            compare(part.duration, kZeroMediaTime) <= 0 || compare(partEnd, movie->duration()) > 0)
             return fakeSystemError(EINVAL);
         auto created = files.create(outputURL.path());
         if (const Error* error = std::get_if<Error>(&created)) return *error;
@@ -84,7 +84,8 @@ struct Export {
 
 class FakeMovieExporter final : public MovieExporter {
 public:
-    FakeMovieExporter(Scheduler& scheduler, std::shared_ptr<Export> job) : scheduler_(scheduler), export_(std::move(job)) {}
+    FakeMovieExporter(Scheduler& scheduler, std::shared_ptr<Export> job)
+        : scheduler_(scheduler), export_(std::move(job)) {}
     ~FakeMovieExporter() override { export_->cancelled = true; }
 
     URL outputURL() const override { return export_->outputURL; }

@@ -8,8 +8,9 @@
 
 namespace lumacast {
 
-/// Opens and exports the movies of the FakeFileSystem. Exports run on the scheduler's default global queue. A range must lie
-/// within the movie. Failing calls: "MovieExporters.openMovie" (a movie that can't be read), "MovieExporter.export".
+/// Opens and exports the movies of the FakeFileSystem. Exports run on the scheduler's default global queue. A range
+/// must lie within the movie. Failing calls: "MovieExporters.openMovie" (a movie that can't be read),
+/// "MovieExporter.export".
 class FakeMovieExporters final : public MovieExporters {
 public:
     FakeMovieExporters(Scheduler& scheduler, FakeFileSystem& files, FaultPlan& faults)

@@ -8,8 +8,8 @@
 
 namespace lumacast {
 
-/// A picture in ordinary memory. Its pixels are made when somebody looks at them: every byte is the low byte of the picture
-/// number, but for the first eight, which are the number itself (little-endian). Thread-safe; never changes.
+/// A picture in ordinary memory. Its pixels are made when somebody looks at them: every byte is the low byte of the
+/// picture number, but for the first eight, which are the number itself (little-endian). Thread-safe; never changes.
 class FakePlane final : public SharedPlane {
 public:
     using Pixels = std::shared_ptr<const std::vector<std::uint8_t>>;

@@ -7,8 +7,8 @@
 
 namespace lumacast {
 
-/// Window layers and their owners as the test sets them. A failing call ("RenderServer.clientPort") finds nothing, like a
-/// server that does not answer in time. Thread-safe; outlives the ports it gave out.
+/// Window layers and their owners as the test sets them. A failing call ("RenderServer.clientPort") finds nothing, like
+/// a server that does not answer in time. Thread-safe; outlives the ports it gave out.
 class FakeRenderServer final : public RenderServer {
 public:
     explicit FakeRenderServer(FaultPlan& faults) : faults_(faults) {}

@@ -11,8 +11,9 @@
 
 namespace lumacast {
 
-/// Decides which calls of the fakes fail. A fake asks fails("Role.operation") once per call; nothing fails until the test
-/// says so. The calls are numbered over all roles, so that a test can let every single one fail in turn. Thread-safe.
+/// Decides which calls of the fakes fail. A fake asks fails("Role.operation") once per call; nothing fails until the
+/// test says so. The calls are numbered over all roles, so that a test can let every single one fail in turn.
+/// Thread-safe.
 class FaultPlan {
 public:
     /// Whether this call fails now. Counts the call.

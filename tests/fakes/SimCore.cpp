@@ -128,7 +128,8 @@ bool SimCore::wait(std::string what, std::optional<std::chrono::nanoseconds> lim
     if (&self == &driver_) driverWaits_ = false;
     if (&self == &driver_ && std::exchange(deadlocked_, false)) {
         std::string report = "the test waits for what never comes:";
-        for (const SimBlockedTask& task : blockedTasks()) report += " [" + task.lane + " waits for " + task.waitsFor + "]";
+        for (const SimBlockedTask& task : blockedTasks())
+            report += " [" + task.lane + " waits for " + task.waitsFor + "]";
         throw std::runtime_error(report);
     }
     if (std::exchange(self.mustUnwind, false)) throw SimTaskUnwound{};

@@ -67,9 +67,9 @@ public:
     /// One scheduling point in this many lets another task go first (8 at first); 0 for never.
     void setYieldOneIn(std::uint64_t points) { core_->setYieldOneIn(points); }
 
-    /// Driver only. Ends the world while what the tasks use is still there: what was submitted is dropped, tasks that wait are
-    /// unwound (SimTaskUnwound is thrown out of their semaphore and lock waits; waits for a queue end as if its turn had
-    /// come). Afterwards nothing is submitted, nothing waits, and sync runs inline.
+    /// Driver only. Ends the world while what the tasks use is still there: what was submitted is dropped, tasks that
+    /// wait are unwound (SimTaskUnwound is thrown out of their semaphore and lock waits; waits for a queue end as if
+    /// its turn had come). Afterwards nothing is submitted, nothing waits, and sync runs inline.
     void endWorld() { core_->endWorld(); }
 
 private:

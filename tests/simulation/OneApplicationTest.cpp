@@ -1,5 +1,5 @@
-// One application records itself, in every interleaving that a seed gives: connect, start, pause, resume, stop, death at any
-// step. LC_SEED=n replays one seed; LC_SEEDS=n runs so many.
+// One application records itself, in every interleaving that a seed gives: connect, start, pause, resume, stop, death
+// at any step. LC_SEED=n replays one seed; LC_SEEDS=n runs so many.
 
 #include <gtest/gtest.h>
 
@@ -71,7 +71,9 @@ private:
             case 3: case 4: application_.tell(DaemonMessage::PauseRecording); ++outcome_.pauses; break;
             case 5: case 6: application_.tell(DaemonMessage::ResumeRecording, {number(application_.window)}); break;
             case 7: stops_.push_back(application_.ask(DaemonMessage::StopRecording)); break;
-            case 8: stops_.push_back(application_.ask(DaemonMessage::StopRecordingWithClipDurations, {1.0, 1.0})); break;
+            case 8:
+                stops_.push_back(application_.ask(DaemonMessage::StopRecordingWithClipDurations, {1.0, 1.0}));
+                break;
             case 9: application_.ask(DaemonMessage::DiscardRecording); break;
             case 10: application_.ask(DaemonMessage::SynchronousGetCurrentState); break;
             default:
@@ -94,7 +96,8 @@ private:
     void checkAlways() {
         EXPECT_FALSE(fakes().keepAlive.endedWithoutBegin());
         EXPECT_LE(fakes().keepAlive.open(), 1);
-        for (const auto& asked : application_.asked()) EXPECT_LE(asked->answers + asked->failures, 1) << describeMessage(*asked);
+        for (const auto& asked : application_.asked())
+            EXPECT_LE(asked->answers + asked->failures, 1) << describeMessage(*asked);
     }
 
     static std::string_view describeMessage(const SimulatedApplication::Asked& asked) {
@@ -124,7 +127,8 @@ private:
             EXPECT_TRUE(path == folder + "Player.mp4" || path == folder + "Player_trimmed.mp4") << path;
     }
 
-    /// A session that has come to rest holds no transaction; only a clip that could not be made leaves its stop unanswered.
+    /// A session that has come to rest holds no transaction; only a clip that could not be made leaves its stop
+    /// unanswered.
     void checkNothingIsHeldWhenIdle() {
         for (const auto& stop : stops_)
             if (stop->message == DaemonMessage::StopRecordingWithClipDurations && stop->answers == 0) return;

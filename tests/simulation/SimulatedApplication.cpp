@@ -5,7 +5,8 @@ namespace lumacast {
 class SimulatedApplication::Inbox final : public IpcExportedObject {
 public:
     explicit Inbox(std::shared_ptr<std::vector<Told>> told) : told_(std::move(told)) {}
-    void receiveMessage(const std::shared_ptr<IpcConnection>&, std::uint16_t message, Array arguments, IpcReply) override {
+    void receiveMessage(const std::shared_ptr<IpcConnection>&, std::uint16_t message, Array arguments,
+                        IpcReply) override {
         told_->push_back({static_cast<ClientMessage>(message), std::move(arguments)});
     }
 
@@ -13,8 +14,8 @@ private:
     const std::shared_ptr<std::vector<Told>> told_;
 };
 
-SimulatedApplication::SimulatedApplication(FakePlatform& machine, BundleIdentifier theIdentifier, const std::string& theName,
-                                           ProcessID pid, ContextID theWindow)
+SimulatedApplication::SimulatedApplication(FakePlatform& machine, BundleIdentifier theIdentifier,
+                                           const std::string& theName, ProcessID pid, ContextID theWindow)
     : identifier(std::move(theIdentifier)), name(theName), window(theWindow), machine_(machine), pid_(pid) {
     machine_.bundles.installApplication(identifier, name);
     machine_.appStateMonitor.setState(identifier, AppStateMonitor::kRunningForeground);

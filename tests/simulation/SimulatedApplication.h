@@ -13,7 +13,8 @@
 
 namespace lumacast {
 
-/// A client process with one window. Everything it is told arrives on its own main queue; the counters are read between steps.
+/// A client process with one window. Everything it is told arrives on its own main queue; the counters are read between
+/// steps.
 class SimulatedApplication {
 public:
     /// One request that has a reply: how often it was answered and with what.

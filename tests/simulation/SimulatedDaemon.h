@@ -6,7 +6,8 @@
 
 namespace lumacast {
 
-/// The whole daemon in a simulation, started, with the question to the user suppressed and a screen that changes all the time.
+/// The whole daemon in a simulation, started, with the question to the user suppressed and a screen that changes all
+/// the time.
 class SimulatedDaemon {
 public:
     explicit SimulatedDaemon(std::uint64_t seed) : world(seed) {

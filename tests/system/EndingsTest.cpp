@@ -62,7 +62,9 @@ TEST(Endings, AKilledClientLeavesNothing) {
         ASSERT_TRUE(world.waitForElapsed(0.5));
         warm->kill();
     }
-    const auto atRest = [&] { return world.status()["sessions"].empty() && !std::filesystem::exists(world.moviePath()); };
+    const auto atRest = [&] {
+        return world.status()["sessions"].empty() && !std::filesystem::exists(world.moviePath());
+    };
     ASSERT_TRUE(waitUntil(atRest)) << world.status();
     const std::size_t before = world.daemonDescriptors();
     for (int i = 0; i < 3; ++i) {
@@ -74,7 +76,8 @@ TEST(Endings, AKilledClientLeavesNothing) {
         application->kill();
         EXPECT_TRUE(waitUntil(atRest)) << world.status();
     }
-    EXPECT_TRUE(waitUntil([&] { return world.daemonDescriptors() <= before; })) << before << " " << world.daemonDescriptors();
+    EXPECT_TRUE(waitUntil([&] { return world.daemonDescriptors() <= before; }))
+        << before << " " << world.daemonDescriptors();
 }
 
 TEST(Endings, ATerminatedDaemonFinishesItsMovieAndLeavesWithStatusZero) {
@@ -95,7 +98,7 @@ TEST(Endings, AStartThatIsNotAllowedIsRefusedWithItsReason) {
     const auto application = world.application({"--size", "320x180", "--fps", "30"});
     ASSERT_TRUE(application->waitForFrame(1));
     EXPECT_TRUE(application->ask("start").starts_with("error -5801")) << world.daemonLog();
-    EXPECT_NE(world.daemonLog().find("start request 1 refused with -5801: "), std::string::npos) << world.daemonLog();
+    EXPECT_NE(world.daemonLog().find(" refused with -5801: "), std::string::npos) << world.daemonLog();
 }
 
 TEST(Endings, AProgramThatIsNoApplicationIsNotServed) {

@@ -37,9 +37,10 @@ checkers::FrameReport judge(const std::string& movie, const FrameExpectation& ex
 }
 
 /// Every picture has its place on the time line of the log, and no step from one to the next is longer than the
-/// application's own by more than a frame time. The very first picture shows what had stood there before the start, and is
-/// left out.
-void judgeTimeLine(const std::string& movie, const std::vector<NumberRange>& forbidden, const checkers::FramesLog& drawn) {
+/// application's own by more than a frame time. The very first picture shows what had stood there before the start, and
+/// is left out.
+void judgeTimeLine(const std::string& movie, const std::vector<NumberRange>& forbidden,
+                   const checkers::FramesLog& drawn) {
     auto pictures = picturesOf(movie);
     ASSERT_GT(pictures.size(), 2u);
     std::chrono::nanoseconds slowest = kLargestHole / 2;
@@ -51,7 +52,8 @@ void judgeTimeLine(const std::string& movie, const std::vector<NumberRange>& for
     expectation.allowedRepeats = 8;
     expectation.drawn = drawn;
     expectation.largestHole = slowest + kLargestHole / 2;
-    for (const auto& finding : checkers::checkFrameNumbers(pictures, expectation).findings) ADD_FAILURE() << finding.text;
+    for (const auto& finding : checkers::checkFrameNumbers(pictures, expectation).findings)
+        ADD_FAILURE() << finding.text;
 }
 
 TEST(Recording, ShowsEveryFrameThatWasDrawnInOrderAndOnTime) {
@@ -156,7 +158,8 @@ TEST(Recording, TrimmedToAClipBeginsOnThePictureOfThatMoment) {
     EXPECT_LE(*pictures.front().number, *atOneSecond + 1);
     EXPECT_GT(*pictures.front().number, first);
     const double seconds = std::chrono::duration<double>(checkers::MovieReader(clip).duration()).count();
-    const double wholeSeconds = std::chrono::duration<double>(checkers::MovieReader(world.moviePath()).duration()).count();
+    const double wholeSeconds =
+        std::chrono::duration<double>(checkers::MovieReader(world.moviePath()).duration()).count();
     EXPECT_NEAR(seconds, wholeSeconds - 3, 0.1);
 }
 
@@ -202,10 +205,16 @@ TEST(Recording, EndsWithAnErrorWhenItsWindowIsGone) {
     const auto recorded = world.application(kMoving);
     ASSERT_TRUE(recorded->waitForFrame(3));
     (void)recorded->askForFrame("start");
+    // Stopped, so that the application does not go with its display: the end of the connection would come first.
+    ::kill(recorded->pid(), SIGSTOP);
     ::kill(world.display().pid(), SIGTERM);
     EXPECT_TRUE(waitUntil([&] { return world.recording().is_null(); })) << world.daemonLog();
-    EXPECT_NE(world.daemonLog().find("LCRecordingSession: screenCaptureController: didFailWithStatus:"), std::string::npos);
-    EXPECT_NE(world.daemonLog().find("LCClientProxy:stopRecordingWithError:movieURL:"), std::string::npos);
+    const auto isLogged = [&](const char* line) {
+        return waitUntil([&] { return world.daemonLog().find(line) != std::string::npos; });
+    };
+    EXPECT_TRUE(isLogged("LCRecordingSession: screenCaptureController: didFailWithStatus:")) << world.daemonLog();
+    EXPECT_TRUE(isLogged("LCClientProxy:stopRecordingWithError:movieURL:")) << world.daemonLog();
+    ::kill(recorded->pid(), SIGCONT);
 }
 
 }  // namespace

@@ -24,7 +24,8 @@ struct DaemonFacts {
 };
 
 /// Asks both sockets, each for at most `patience`. What connects to the service says nothing and leaves at once.
-DaemonFacts probeDaemon(const std::string& runtimeDirectory, bool runtimeVariableIsSet, std::chrono::milliseconds patience);
+DaemonFacts probeDaemon(const std::string& runtimeDirectory, bool runtimeVariableIsSet,
+                        std::chrono::milliseconds patience);
 
 Findings checkDaemon(const DaemonFacts& facts);
 

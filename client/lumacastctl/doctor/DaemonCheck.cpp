@@ -12,9 +12,10 @@ Finding checkService(const DaemonFacts& facts) {
     switch (facts.service) {
         case Socket::Answers: return ok(kSubject, "applications can connect at " + facts.servicePath + ".");
         case Socket::Silent:
-            return problem(kSubject, "somebody listens at " + facts.servicePath +
-                                         " but does not greet, so applications can't connect; when lumacastd hangs, end it and "
-                                         "start it anew, and see its log.");
+            return problem(kSubject,
+                           "somebody listens at " + facts.servicePath +
+                               " but does not greet, so applications can't connect; when lumacastd hangs, end it and "
+                               "start it anew, and see its log.");
         case Socket::Closed: break;
     }
     return problem(kSubject, "nobody listens at " + facts.servicePath +
@@ -41,9 +42,10 @@ Findings checkDaemon(const DaemonFacts& facts) {
         return {problem(kSubject, "the runtime directory's path is too long for sockets: " + facts.runtimeDirectory +
                                       "; set XDG_RUNTIME_DIR to a shorter one.")};
     if (!facts.runtimeVariableIsSet)
-        findings.push_back(warning(kSubject, "XDG_RUNTIME_DIR is not set, so " + facts.runtimeDirectory +
-                                                 " is taken; set it as the session has it, for the daemon, the applications and "
-                                                 "this tool alike."));
+        findings.push_back(
+            warning(kSubject, "XDG_RUNTIME_DIR is not set, so " + facts.runtimeDirectory +
+                                  " is taken; set it as the session has it, for the daemon, the applications and "
+                                  "this tool alike."));
     if (facts.admin == Socket::Closed && facts.service == Socket::Closed) {
         findings.push_back(problem(kSubject, "it isn't running: nobody listens in " + facts.runtimeDirectory +
                                                  "; start lumacastd as this user, with the same XDG_RUNTIME_DIR."));

@@ -42,7 +42,8 @@ bool greets(int socket, std::chrono::milliseconds patience) {
 
 }  // namespace
 
-DaemonFacts probeDaemon(const std::string& runtimeDirectory, bool runtimeVariableIsSet, std::chrono::milliseconds patience) {
+DaemonFacts probeDaemon(const std::string& runtimeDirectory, bool runtimeVariableIsSet,
+                        std::chrono::milliseconds patience) {
     using Socket = DaemonFacts::Socket;
     DaemonFacts facts;
     facts.runtimeDirectory = runtimeDirectory;

@@ -12,7 +12,9 @@ constexpr char kServers[] = "use a display server that has it, such as a current
 
 Finding checkExtension(const char* name, const std::optional<Version>& version, Version needed, const char* without) {
     const auto text = [](Version v) { return std::to_string(v.major) + "." + std::to_string(v.minor); };
-    if (!version) return problem(kSubject, std::string("the extension ") + name + " is missing: " + without + "; " + kServers + ".");
+    if (!version)
+        return problem(kSubject,
+                       std::string("the extension ") + name + " is missing: " + without + "; " + kServers + ".");
     if (*version < needed)
         return problem(kSubject, std::string("the extension ") + name + " is of version " + text(*version) + ", " +
                                      text(needed) + " is needed: " + without + "; " + kServers + ".");
@@ -22,13 +24,15 @@ Finding checkExtension(const char* name, const std::optional<Version>& version, 
 Finding reachFinding(const DisplayFacts& facts) {
     switch (facts.reach) {
         case Reach::NotLocal:
-            return problem(kSubject, "DISPLAY=" + facts.name +
-                                         " is no display of this machine, and only those can be recorded; set DISPLAY to one "
-                                         "like :0.");
+            return problem(kSubject,
+                           "DISPLAY=" + facts.name +
+                               " is no display of this machine, and only those can be recorded; set DISPLAY to one "
+                               "like :0.");
         case Reach::NoServer:
-            return problem(kSubject, "DISPLAY=" + facts.name +
-                                         " can't be reached: no server is there, or it does not let this user in; start it, or "
-                                         "set DISPLAY and XAUTHORITY as the session has them.");
+            return problem(kSubject,
+                           "DISPLAY=" + facts.name +
+                               " can't be reached: no server is there, or it does not let this user in; start it, or "
+                               "set DISPLAY and XAUTHORITY as the session has them.");
         case Reach::NoAnswer:
             return problem(kSubject, "DISPLAY=" + facts.name + " does not answer; see whether its server hangs.");
         case Reach::Connected: break;
@@ -52,15 +56,17 @@ void checkWhatCapturingTakes(const DisplayFacts& facts, Findings& findings) {
     }
     if (!present.empty()) findings.push_back(ok(kSubject, "extensions: " + listText(present)));
     if (facts.sharedMemory >= Version{1, 2})
-        findings.push_back(facts.takesMemoryByDescriptor
-                               ? ok(kSubject, "shared memory is taken by descriptor.")
-                               : problem(kSubject,
-                                         "MIT-SHM refuses memory that is passed by descriptor, so no window can be captured; "
-                                         "see whether the server runs on this machine and outside of a sandbox."));
+        findings.push_back(
+            facts.takesMemoryByDescriptor
+                ? ok(kSubject, "shared memory is taken by descriptor.")
+                : problem(kSubject,
+                          "MIT-SHM refuses memory that is passed by descriptor, so no window can be captured; "
+                          "see whether the server runs on this machine and outside of a sandbox."));
     if (!facts.pixelsAreBgrx)
-        findings.push_back(problem(kSubject,
-                                   "its pixels are not 24-bit colours in little-endian order, so no window can be captured; "
-                                   "start the server with a depth of 24."));
+        findings.push_back(
+            problem(kSubject,
+                    "its pixels are not 24-bit colours in little-endian order, so no window can be captured; "
+                    "start the server with a depth of 24."));
 }
 
 }  // namespace
@@ -68,16 +74,18 @@ void checkWhatCapturingTakes(const DisplayFacts& facts, Findings& findings) {
 Findings checkDisplay(const DisplayFacts& facts) {
     Findings findings;
     if (facts.isWaylandSession)
-        findings.push_back(warning(kSubject,
-                                   "this is a Wayland session: windows of X11 applications can be recorded, through Xwayland; "
-                                   "windows of Wayland applications can't yet. Start the application as an X11 one (for example "
-                                   "GDK_BACKEND=x11, QT_QPA_PLATFORM=xcb, SDL_VIDEODRIVER=x11)."));
+        findings.push_back(
+            warning(kSubject,
+                    "this is a Wayland session: windows of X11 applications can be recorded, through Xwayland; "
+                    "windows of Wayland applications can't yet. Start the application as an X11 one (for example "
+                    "GDK_BACKEND=x11, QT_QPA_PLATFORM=xcb, SDL_VIDEODRIVER=x11)."));
     if (facts.name.empty()) {
-        findings.push_back(problem(kSubject, facts.isWaylandSession
-                                                 ? "DISPLAY is not set, so there are no windows that could be recorded; turn on "
-                                                   "Xwayland in the compositor."
-                                                 : "DISPLAY is not set, so there are no windows that could be recorded; start "
-                                                   "lumacastd from the session, or set DISPLAY as the session has it."));
+        findings.push_back(
+            problem(kSubject, facts.isWaylandSession
+                                  ? "DISPLAY is not set, so there are no windows that could be recorded; turn on "
+                                    "Xwayland in the compositor."
+                                  : "DISPLAY is not set, so there are no windows that could be recorded; start "
+                                    "lumacastd from the session, or set DISPLAY as the session has it."));
         return findings;
     }
     findings.push_back(reachFinding(facts));

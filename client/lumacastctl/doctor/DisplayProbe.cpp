@@ -34,8 +34,8 @@ using Connection = std::unique_ptr<xcb_connection_t, Disconnect>;
 
 constexpr std::size_t kMemoryBytes = 4096;
 
-/// The same server, named so that no way but the local socket is tried: the daemon, too, uses no other. None for a server
-/// of another machine.
+/// The same server, named so that no way but the local socket is tried: the daemon, too, uses no other. None for a
+/// server of another machine.
 std::optional<std::string> localName(const std::string& display) {
     char* host = nullptr;
     int number = 0, screen = 0;

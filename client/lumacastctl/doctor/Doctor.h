@@ -6,7 +6,8 @@
 namespace lumacast::ctl {
 
 /// Looks at everything that recording takes, as the daemon would meet it if it were started with this environment. Each
-/// subject has its facts, a probe that gathers them and a pure check that judges them. Blocks for some seconds at worst.
+/// subject has its facts, a probe that gathers them and a pure check that judges them. Blocks for some seconds at
+/// worst.
 Findings examine(const LinuxEnvironment& environment, const LinuxEnvironment::Variables& variables,
                  const IdentityQuestion& question);
 

@@ -48,12 +48,14 @@ Findings checkEncoders(const EncoderFacts& facts) {
     const bool mayHaveHardware = !hardware.empty() && !facts.devices.empty();
     const std::string tried = listText(hardware) + " (there is " + listText(facts.devices) + ")";
     if (!hasSoftware)
-        return {mayHaveHardware
-                    ? warning(kSubject, facts.library + " has no " + software + ": recording depends on " + tried +
-                                            ", which only a recording can try; install a " + facts.library + " with " + software + ".")
-                    : problem(kSubject, facts.library + " has no " + software + ", and there is no hardware to encode with; install a " +
-                                            facts.library + " with " + software + ".")};
-    if (mayHaveHardware) return {ok(kSubject, "a recording tries " + tried + ", then " + software + ", which is there.")};
+        return {mayHaveHardware ? warning(kSubject, facts.library + " has no " + software + ": recording depends on " +
+                                                        tried + ", which only a recording can try; install a " +
+                                                        facts.library + " with " + software + ".")
+                                : problem(kSubject, facts.library + " has no " + software +
+                                                        ", and there is no hardware to encode with; install a " +
+                                                        facts.library + " with " + software + ".")};
+    if (mayHaveHardware)
+        return {ok(kSubject, "a recording tries " + tried + ", then " + software + ", which is there.")};
     return {ok(kSubject, software + " is there; no hardware was found, so pictures are encoded by the processor.")};
 }
 

@@ -19,7 +19,8 @@ struct EncoderFacts {
     std::vector<std::string> devices;  ///< of graphics hardware, that this user may open
 };
 
-/// Loads the encoding library for as long as it takes, rather than with every run of the tool: it brings a hundred others.
+/// Loads the encoding library for as long as it takes, rather than with every run of the tool: it brings a hundred
+/// others.
 EncoderFacts probeEncoders();
 
 Findings checkEncoders(const EncoderFacts& facts);

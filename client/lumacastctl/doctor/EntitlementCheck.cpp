@@ -14,7 +14,8 @@ std::string entitlementsText(const Dictionary& entitlements) {
 }
 
 Finding passedOver(const std::string& finding) {
-    return warning(kSubject, finding + "; make the drop-in and its folders the administrator's (chown root, chmod go-w).");
+    return warning(kSubject,
+                   finding + "; make the drop-in and its folders the administrator's (chown root, chmod go-w).");
 }
 
 }  // namespace
@@ -42,7 +43,8 @@ Findings checkEntitlements(const EntitlementFacts& facts) {
     for (const std::string& finding : explanation.findings)
         if (finding.starts_with("passed over ")) findings.push_back(passedOver(finding));
     if (explanation.entitlements.empty())
-        findings.push_back(ok(kSubject, application + " has none (looked for *.conf in " + listText(facts.directories) + ")" + none));
+        findings.push_back(
+            ok(kSubject, application + " has none (looked for *.conf in " + listText(facts.directories) + ")" + none));
     else
         findings.push_back(ok(kSubject, application + " has " + entitlementsText(explanation.entitlements) + "."));
     return findings;

@@ -20,21 +20,25 @@ std::string howToGetOne(const IdentityFacts& facts) {
     const std::string place = facts.applicationDirectories.empty() ? "an XDG data directory's applications"
                                                                    : facts.applicationDirectories.front();
     return "put a desktop entry named like org.example.Player.desktop into " + place +
-           " whose Exec (or X-Lumacast-Executable) is this program, or a manifest.json with an \"identifier\" beside the program. "
+           " whose Exec (or X-Lumacast-Executable) is this program, or a manifest.json with an \"identifier\" beside "
+           "the program. "
            "Scripts have no identity of their own: their interpreter runs";
 }
 
 Finding unknownProgram(const IdentityFacts& facts) {
     if (facts.question.pid)
-        return problem(kSubject, processText(*facts.question.pid) +
-                                     " is not there, is another user's, or runs a program whose path means another file here "
-                                     "(a container); give the pid of a running process of this user.");
-    return problem(kSubject, "\"" + facts.question.executable.value_or("") + "\" is no program that can be found; give its path.");
+        return problem(kSubject,
+                       processText(*facts.question.pid) +
+                           " is not there, is another user's, or runs a program whose path means another file here "
+                           "(a container); give the pid of a running process of this user.");
+    return problem(
+        kSubject, "\"" + facts.question.executable.value_or("") + "\" is no program that can be found; give its path.");
 }
 
 }  // namespace
 
-IdentityFacts probeIdentity(LinuxBundles& bundles, const LinuxBundles::Options& options, const IdentityQuestion& question) {
+IdentityFacts probeIdentity(LinuxBundles& bundles, const LinuxBundles::Options& options,
+                            const IdentityQuestion& question) {
     IdentityFacts facts;
     facts.question = question;
     facts.applicationDirectories = options.applicationDirectories;
@@ -68,16 +72,19 @@ Findings checkIdentity(const IdentityFacts& facts) {
         if (!facts.name.empty()) text += " (\"" + facts.name + "\")";
         findings.push_back(ok(kSubject, text + ", by " + facts.bundlePath.value_or("") + "."));
     } else if (nobodyAsked) {
-        findings.push_back(ok(kSubject, whoText(facts) + ", which started this tool, belongs to no application; ask about yours "
-                                                         "with --pid or --exe."));
+        findings.push_back(ok(kSubject, whoText(facts) +
+                                            ", which started this tool, belongs to no application; ask about yours "
+                                            "with --pid or --exe."));
     } else {
-        findings.push_back(problem(kSubject, whoText(facts) + " belongs to no application, so the daemon refuses its connection; " +
+        findings.push_back(problem(kSubject, whoText(facts) +
+                                                 " belongs to no application, so the daemon refuses its connection; " +
                                                  howToGetOne(facts) + "."));
     }
     if (nobodyAsked)
-        findings.push_back(ok(kSubject, "an application is known by its executable: from a desktop entry in " +
-                                            listText(facts.applicationDirectories) +
-                                            ", else from a manifest.json in the executable's folder or one of the three above it."));
+        findings.push_back(
+            ok(kSubject, "an application is known by its executable: from a desktop entry in " +
+                             listText(facts.applicationDirectories) +
+                             ", else from a manifest.json in the executable's folder or one of the three above it."));
     return findings;
 }
 

@@ -33,7 +33,8 @@ struct EntitlementFacts {
 };
 
 /// Asks as the daemon does; what the disk does not answer in time is missing.
-IdentityFacts probeIdentity(LinuxBundles& bundles, const LinuxBundles::Options& options, const IdentityQuestion& question);
+IdentityFacts probeIdentity(LinuxBundles& bundles, const LinuxBundles::Options& options,
+                            const IdentityQuestion& question);
 EntitlementFacts probeEntitlements(LinuxBundles& bundles, std::vector<std::string> directories,
                                    const IdentityQuestion& question);
 

@@ -31,16 +31,20 @@ Preference probePreference(const LinuxPreferences& preferences, const Preference
 
 const bool* flagOf(const Preference& preference) { return preference.value ? preference.value->as<bool>() : nullptr; }
 
-std::string placeText(const Preference& preference) { return preference.path.empty() ? "" : " (" + preference.path + ")"; }
+std::string placeText(const Preference& preference) {
+    return preference.path.empty() ? "" : " (" + preference.path + ")";
+}
 
 /// "LCFullResCapture=1 (file)"
 std::string preferenceText(const std::string& key, const Preference& preference) {
     return key + "=" + (preference.value ? settingText(*preference.value) : "") + placeText(preference);
 }
 
-Finding notAFlag(const std::string& key, const Preference& preference, Severity severity, const std::string& consequence) {
+Finding notAFlag(const std::string& key, const Preference& preference, Severity severity,
+                 const std::string& consequence) {
     return {severity, kSubject,
-            preferenceText(key, preference) + " is neither true nor false, " + consequence + "; write " + key + "=true or =false."};
+            preferenceText(key, preference) + " is neither true nor false, " + consequence + "; write " + key +
+                "=true or =false."};
 }
 
 Findings checkFiles(const std::vector<File>& files) {
@@ -50,11 +54,13 @@ Findings checkFiles(const std::vector<File>& files) {
         if (file.state == File::State::Read) read.push_back(file.path);
         if (file.state == File::State::Missing) missing.push_back(file.path);
         if (file.state == File::State::Unreadable)
-            findings.push_back(warning(kSubject, file.path + " counts as missing: it can't be read, is no file, or is larger than "
-                                                             "64 KiB; mend or remove it."));
+            findings.push_back(
+                warning(kSubject, file.path + " counts as missing: it can't be read, is no file, or is larger than "
+                                              "64 KiB; mend or remove it."));
     }
     std::string text = read.empty() ? "no file is there" : "read from " + listText(read);
-    if (!missing.empty()) text += read.empty() ? "; looked for " + listText(missing) : "; not there: " + listText(missing);
+    if (!missing.empty())
+        text += read.empty() ? "; looked for " + listText(missing) : "; not there: " + listText(missing);
     findings.push_back(ok(kSubject, text + "."));
     return findings;
 }
@@ -68,16 +74,19 @@ Finding checkSuppressAlert(const PreferenceFacts& facts) {
         return ok(kSubject, preferenceText("LCSuppressAlert", preference) +
                                 ": applications may record themselves without the user being asked.");
     if (preference.value && !flag) return notAFlag("LCSuppressAlert", preference, Severity::Problem, refused);
-    return problem(kSubject, (flag ? preferenceText("LCSuppressAlert", preference) : std::string("LCSuppressAlert is not set")) +
-                                 ", " + refused + "; write LCSuppressAlert=true into " + file +
-                                 " (a line before any [section]). It counts from the next start on.");
+    return problem(kSubject,
+                   (flag ? preferenceText("LCSuppressAlert", preference) : std::string("LCSuppressAlert is not set")) +
+                       ", " + refused + "; write LCSuppressAlert=true into " + file +
+                       " (a line before any [section]). It counts from the next start on.");
 }
 
 Finding checkBitRate(const Preference& preference) {
-    if (!preference.value) return ok(kSubject, "LCBitRateOverride is not set: the bit rate follows from the movie's size.");
+    if (!preference.value)
+        return ok(kSubject, "LCBitRateOverride is not set: the bit rate follows from the movie's size.");
     const auto* rate = preference.value->as<std::int64_t>();
     const std::string setting = preferenceText("LCBitRateOverride", preference);
-    if (rate && *rate > 0) return ok(kSubject, setting + ": movies get this many bits per second, whatever their size.");
+    if (rate && *rate > 0)
+        return ok(kSubject, setting + ": movies get this many bits per second, whatever their size.");
     return warning(kSubject, setting + " is no bit rate; write a whole number of bits per second, or remove it.");
 }
 
@@ -85,9 +94,11 @@ Finding checkFullResolution(const Preference& preference) {
     const bool* flag = flagOf(preference);
     if (preference.value && !flag)
         return notAFlag("LCFullResCapture", preference, Severity::Warning, "so it counts as not set");
-    if (flag && *flag) return ok(kSubject, preferenceText("LCFullResCapture", preference) + ": movies keep the window's full size.");
-    return ok(kSubject, (flag ? preferenceText("LCFullResCapture", preference) : std::string("LCFullResCapture is not set")) +
-                            ": a movie's longer side has at most 1920 pixels (on devices of reduced capture 1600).");
+    if (flag && *flag)
+        return ok(kSubject, preferenceText("LCFullResCapture", preference) + ": movies keep the window's full size.");
+    return ok(kSubject,
+              (flag ? preferenceText("LCFullResCapture", preference) : std::string("LCFullResCapture is not set")) +
+                  ": a movie's longer side has at most 1920 pixels (on devices of reduced capture 1600).");
 }
 
 }  // namespace

@@ -42,8 +42,8 @@ Findings checkSound(const SoundFacts& facts) {
         (socket.answers ? answering : silent).push_back(socket.server + " at " + socket.path);
     const std::string servers = answering.empty() ? "no sound server answers (looked for " + listText(silent) + ")"
                                                   : listText(answering) + " can be reached";
-    return {warning("sound", "this daemon does not record sound yet, so movies are silent whatever is played; " + servers +
-                                 ", which makes no difference for now. There is nothing to do.")};
+    return {warning("sound", "this daemon does not record sound yet, so movies are silent whatever is played; " +
+                                 servers + ", which makes no difference for now. There is nothing to do.")};
 }
 
 }  // namespace lumacast::ctl

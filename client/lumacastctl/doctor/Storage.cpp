@@ -19,15 +19,19 @@ std::string withoutTrailingSlashes(std::string path) {
 
 Finding checkPlace(const StorageFacts& facts) {
     if (facts.state == StorageFacts::State::SomethingElse)
-        return problem(kSubject, facts.path + " is no directory (links count as none), so no movie can be written; remove what is there.");
+        return problem(
+            kSubject,
+            facts.path + " is no directory (links count as none), so no movie can be written; remove what is there.");
     if (!facts.isWritable)
-        return problem(kSubject, (facts.state == StorageFacts::State::Directory
-                                      ? facts.path + " can't be written to by this user"
-                                      : facts.path + " is missing and can't be made: " + facts.nearest +
-                                            " can't be written to by this user") +
-                                     "; give it to the user who runs the daemon, or let Root= in /etc/lumacast/daemon.conf name "
-                                     "another place.");
-    if (facts.state == StorageFacts::State::Missing) return ok(kSubject, facts.path + " is not there yet; the daemon makes it.");
+        return problem(kSubject,
+                       (facts.state == StorageFacts::State::Directory
+                            ? facts.path + " can't be written to by this user"
+                            : facts.path + " is missing and can't be made: " + facts.nearest +
+                                  " can't be written to by this user") +
+                           "; give it to the user who runs the daemon, or let Root= in /etc/lumacast/daemon.conf name "
+                           "another place.");
+    if (facts.state == StorageFacts::State::Missing)
+        return ok(kSubject, facts.path + " is not there yet; the daemon makes it.");
     return ok(kSubject, facts.path + " can be written to.");
 }
 
@@ -62,9 +66,10 @@ StorageFacts probeStorage(const std::string& root, const std::optional<std::stri
 Findings checkStorage(const StorageFacts& facts) {
     Findings findings{checkPlace(facts), checkSpace(facts)};
     if (facts.daemonsPath && *facts.daemonsPath != facts.path)
-        findings.push_back(warning(kSubject, "the running daemon uses " + *facts.daemonsPath +
-                                                 " instead: it was started with other XDG variables or before daemon.conf was "
-                                                 "changed. Start it anew, or ask from where it was started."));
+        findings.push_back(
+            warning(kSubject, "the running daemon uses " + *facts.daemonsPath +
+                                  " instead: it was started with other XDG variables or before daemon.conf was "
+                                  "changed. Start it anew, or ask from where it was started."));
     return findings;
 }
 

@@ -35,8 +35,8 @@ struct DaemonStatus {
     std::vector<ApplicationSession> sessions;
 };
 
-/// Reads the admin service's answer to `status`. Else why it is none, for people: the daemon's own error, or that the answer
-/// can't be understood. Pure; entries that are unknown are passed over.
+/// Reads the admin service's answer to `status`. Else why it is none, for people: the daemon's own error, or that the
+/// answer can't be understood. Pure; entries that are unknown are passed over.
 std::variant<DaemonStatus, std::string> readStatus(std::string_view answer);
 
 /// The status for people, several lines with a newline each: the running recording, the applications, the free space.

@@ -27,7 +27,8 @@ std::string stateText(const ApplicationSession& session) {
 std::string framesText(const RunningRecording& recording) {
     std::string text = recording.frames ? std::to_string(*recording.frames) : "unknown";
     if (recording.delivered && recording.dropped)
-        text += " (" + std::to_string(*recording.delivered) + " captured, " + std::to_string(*recording.dropped) + " dropped)";
+        text += " (" + std::to_string(*recording.delivered) + " captured, " + std::to_string(*recording.dropped) +
+                " dropped)";
     return text;
 }
 

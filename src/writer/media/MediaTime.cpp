@@ -9,7 +9,8 @@ namespace lumacast {
 
 namespace {
 
-constexpr std::uint32_t kNotFinite = MediaTime::kPositiveInfinity | MediaTime::kNegativeInfinity | MediaTime::kIndefinite;
+constexpr std::uint32_t kNotFinite =
+    MediaTime::kPositiveInfinity | MediaTime::kNegativeInfinity | MediaTime::kIndefinite;
 
 /// GCC and Clang both have it; pedantic mode wants to be told that this is on purpose.
 __extension__ typedef __int128 Wide;
@@ -34,14 +35,17 @@ MediaTime sum(const MediaTime& a, const MediaTime& b, int sign) {
     if (!a.isValid() || !b.isValid()) return kInvalidMediaTime;
     if ((a.flags | b.flags) & kNotFinite) {
         const auto direction = [](const MediaTime& time, int factor) {
-            return factor * (time.flags & MediaTime::kPositiveInfinity ? 1 : time.flags & MediaTime::kNegativeInfinity ? -1 : 0);
+            return factor * (time.flags & MediaTime::kPositiveInfinity   ? 1
+                             : time.flags & MediaTime::kNegativeInfinity ? -1
+                                                                         : 0);
         };
         const int total = direction(a, 1) + direction(b, sign);
         if ((a.flags | b.flags) & MediaTime::kIndefinite || total == 0) return special(MediaTime::kIndefinite);
         return special(total > 0 ? MediaTime::kPositiveInfinity : MediaTime::kNegativeInfinity);
     }
     const Wide scaleA = std::max(a.timescale, 1), scaleB = std::max(b.timescale, 1);
-    const Wide multiple = scaleA / std::gcd(static_cast<std::int64_t>(scaleA), static_cast<std::int64_t>(scaleB)) * scaleB;
+    const Wide multiple =
+        scaleA / std::gcd(static_cast<std::int64_t>(scaleA), static_cast<std::int64_t>(scaleB)) * scaleB;
     const bool exact = multiple <= std::numeric_limits<std::int32_t>::max();
     const Wide scale = exact ? multiple : std::max(scaleA, scaleB);
     // Two 95-bit products; their sum stays below 2^97.

@@ -20,7 +20,9 @@ struct MediaTime {
     std::int64_t epoch = 0;  ///< always 0 in this system
 
     /// A valid time of `value` ticks.
-    static constexpr MediaTime make(std::int64_t value, std::int32_t timescale) { return {value, timescale, kValid, 0}; }
+    static constexpr MediaTime make(std::int64_t value, std::int32_t timescale) {
+        return {value, timescale, kValid, 0};
+    }
 
     /// The nearest tick to `seconds`, halves away from zero. Seconds that are not finite give the infinities or the
     /// indefinite time; seconds beyond the range of ticks give an infinity; a timescale below 1 the invalid time.
@@ -28,7 +30,8 @@ struct MediaTime {
 
     constexpr bool isValid() const { return (flags & kValid) != 0; }
 
-    /// value / timescale. 0 for a timescale of 0 and for invalid and indefinite times; the infinities for infinite ones.
+    /// value / timescale. 0 for a timescale of 0 and for invalid and indefinite times; the infinities for infinite
+    /// ones.
     double seconds() const;
 };
 static_assert(sizeof(MediaTime) == 24);
@@ -40,9 +43,9 @@ inline constexpr MediaTime kZeroMediaTime = MediaTime::make(0, 1);
 /// the invalid time and is unequal to (and above) every valid one. Finite times are compared exactly.
 int compare(const MediaTime& a, const MediaTime& b);
 
-/// Exact sums and differences. The result has the operands' timescale, or their least common multiple where that fits 32
-/// bits, otherwise the larger of the two, rounded and flagged so. An invalid operand gives the invalid time; infinities
-/// win over finite times, and opposite infinities give the indefinite time.
+/// Exact sums and differences. The result has the operands' timescale, or their least common multiple where that fits
+/// 32 bits, otherwise the larger of the two, rounded and flagged so. An invalid operand gives the invalid time;
+/// infinities win over finite times, and opposite infinities give the indefinite time.
 MediaTime add(const MediaTime& a, const MediaTime& b);
 MediaTime subtract(const MediaTime& a, const MediaTime& b);
 

@@ -5,8 +5,8 @@
 
 namespace lumacast {
 
-/// An unsorted, unbounded first-in-first-out queue of samples. It holds a reference to each. Not thread-safe: it belongs
-/// to its owner's lane.
+/// An unsorted, unbounded first-in-first-out queue of samples. It holds a reference to each. Not thread-safe: it
+/// belongs to its owner's lane.
 class SampleQueue {
 public:
     /// Takes a reference. 0 on success, a non-zero status for a missing buffer (nothing is queued then).

@@ -37,7 +37,8 @@ const std::map<std::string_view, std::set<std::string_view>> kMayInclude{
      {"src/base", "src/writer/media", "src/broadcast/LCBroadcastConfiguration.h", "linux/ipc",
       "src/platform/IpcConnection.h", "src/platform/IpcEndpoint.h", "src/platform/IpcListener.h",
       "src/platform/Scheduler.h"}},
-    // The administrator's tool is no client of the daemon: it asks the admin service and looks at what the port looks at.
+    // The administrator's tool is no client of the daemon: it asks the admin service and looks at what the port looks
+    // at.
     {"client/lumacastctl", {"client", "linux", "linux/ipc", "src/platform", "src/writer/media", "src/base"}},
     {"extensions",
      {"client", "src/base", "src/writer/media", "src/broadcast/LCBroadcastConfiguration.h", "linux/ipc",
@@ -116,7 +117,8 @@ TEST(IncludeTable, TheLayersHaveNoCycle) {
                                               "src/daemon"};
     for (std::size_t at = 0; at < order.size(); ++at) {
         const std::set<std::string_view> before(order.begin(), order.begin() + static_cast<std::ptrdiff_t>(at));
-        for (const std::string_view to : kMayInclude.at(order[at])) EXPECT_TRUE(before.contains(to)) << order[at] << " " << to;
+        for (const std::string_view to : kMayInclude.at(order[at]))
+            EXPECT_TRUE(before.contains(to)) << order[at] << " " << to;
     }
 }
 

@@ -52,7 +52,8 @@ std::string codeOf(std::string_view text) {
                 if (c == '/' && next == '*') in = In::BlockComment;
                 if (c == '"') in = In::Text;
                 // A quote between digits separates them.
-                if (c == '\'' && (at == 0 || !std::isalnum(static_cast<unsigned char>(code[at - 1])))) in = In::Character;
+                if (c == '\'' && (at == 0 || !std::isalnum(static_cast<unsigned char>(code[at - 1]))))
+                    in = In::Character;
                 continue;
             case In::LineComment:
                 if (c == '\n') in = In::Code;

@@ -35,7 +35,8 @@ std::vector<std::string> foreignHeaders(const SourceFile& file) {
     std::vector<std::string> found;
     for (const Include& include : includesOf(file.text)) {
         if (include.isQuoted) continue;
-        if (std::find(std::begin(kStandardHeaders), std::end(kStandardHeaders), include.name) == std::end(kStandardHeaders))
+        if (std::find(std::begin(kStandardHeaders), std::end(kStandardHeaders), include.name) ==
+            std::end(kStandardHeaders))
             found.push_back(file.path + ":" + std::to_string(include.line) + " includes <" + include.name + ">");
     }
     return found;
@@ -59,7 +60,10 @@ TEST(StandardOnly, SrcIncludesNoForeignHeader) {
 }
 
 TEST(StandardOnly, AForeignHeaderIsSeen) {
-    EXPECT_EQ(foreignHeaders({"src/a.h", "#include <vector>\n#include <unistd.h>\n#include <xcb/xcb.h>\n#include <math.h>\n"}).size(), 3u);
+    EXPECT_EQ(
+        foreignHeaders({"src/a.h", "#include <vector>\n#include <unistd.h>\n#include <xcb/xcb.h>\n#include <math.h>\n"})
+            .size(),
+        3u);
     EXPECT_TRUE(foreignHeaders({"src/a.h", "#include <vector>\n#include \"base/Value.h\"\n"}).empty());
 }
 
@@ -69,11 +73,15 @@ TEST(StandardOnly, SrcWaitsOnlyThroughTheScheduler) {
 }
 
 TEST(StandardOnly, ABlockingPrimitiveIsSeen) {
-    const auto count = [](const std::string& path, const std::string& text) { return blockingNames({path, text}).size(); };
+    const auto count = [](const std::string& path, const std::string& text) {
+        return blockingNames({path, text}).size();
+    };
     EXPECT_EQ(count("src/daemon/a.cpp", "std::condition_variable wake_;"), 1u);
     EXPECT_EQ(count("src/daemon/a.cpp", "auto t = std::thread([] {});\nstd::this_thread::yield();"), 2u);
     EXPECT_EQ(count("src/daemon/a.cpp", "thread_local int x = 1'000;"), 1u);
-    EXPECT_EQ(count("src/daemon/a.cpp", "// std::thread\n/* std::future<int> */ const char* s = \"std::promise \\\" x\";"), 0u);
+    EXPECT_EQ(
+        count("src/daemon/a.cpp", "// std::thread\n/* std::future<int> */ const char* s = \"std::promise \\\" x\";"),
+        0u);
     EXPECT_EQ(count("src/daemon/a.cpp", "char c = '\"'; std::async(f); // \""), 1u);
     EXPECT_EQ(count("src/daemon/a.cpp", "std::thread_maker m; xstd::thread y;"), 0u);
     EXPECT_EQ(count("src/support/ThreadSchedulerPool.h", "std::thread t;"), 0u);

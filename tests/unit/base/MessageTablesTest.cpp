@@ -46,7 +46,8 @@ TEST(MessageTables, NamesAreDistinctAndHaveAColonForEachArgumentAndTheHandler) {
 }
 
 TEST(MessageTables, NoMessageToAClientHasAReply) {
-    for (const MessageDeclaration& message : clientProtocol().messages) EXPECT_EQ(message.reply, Reply::None) << message.name;
+    for (const MessageDeclaration& message : clientProtocol().messages)
+        EXPECT_EQ(message.reply, Reply::None) << message.name;
 }
 
 TEST(MessageTables, TheCountMustBeRight) {
@@ -78,18 +79,39 @@ TEST(MessageTables, EachTypeTakesItsKindAndNoOther) {
         std::set<std::size_t> kinds;  ///< indexes of Value::Storage
         bool nullable;
     };
-    const std::vector<Value> values{Value(), true, std::int64_t{1}, std::uint64_t{1}, 1.0, "x", Data{1}, Date{1}, URL("u"),
-                                    Array{}, Dictionary{}, Error("d", 1), Value::EndpointRef(std::make_shared<Endpoint>()),
+    const std::vector<Value> values{Value(),
+                                    true,
+                                    std::int64_t{1},
+                                    std::uint64_t{1},
+                                    1.0,
+                                    "x",
+                                    Data{1},
+                                    Date{1},
+                                    URL("u"),
+                                    Array{},
+                                    Dictionary{},
+                                    Error("d", 1),
+                                    Value::EndpointRef(std::make_shared<Endpoint>()),
                                     Value::PlaneRef(std::make_shared<FakePlane>(1, 1, 1, std::vector<PixelRect>()))};
-    const std::vector<Row> rows{
-        {ArgumentType::Bool, {1}, false}, {ArgumentType::Int32, {2}, false}, {ArgumentType::UInt32, {3}, false},
-        {ArgumentType::Int64, {2}, false}, {ArgumentType::Double, {4}, false}, {ArgumentType::Size, {}, false},
-        {ArgumentType::ContextIDs, {9}, false}, {ArgumentType::Text, {5}, false}, {ArgumentType::Data, {6}, false},
-        {ArgumentType::NullableData, {6}, true}, {ArgumentType::Dictionary, {10}, false},
-        {ArgumentType::NullableDictionary, {10}, true}, {ArgumentType::Array, {9}, false}, {ArgumentType::URL, {8}, false},
-        {ArgumentType::NullableURL, {8}, true}, {ArgumentType::NullableEndpoint, {12}, true},
-        {ArgumentType::NullableError, {11}, true}, {ArgumentType::SharedPlaneObject, {13}, true},
-        {ArgumentType::Any, {1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13}, true}};
+    const std::vector<Row> rows{{ArgumentType::Bool, {1}, false},
+                                {ArgumentType::Int32, {2}, false},
+                                {ArgumentType::UInt32, {3}, false},
+                                {ArgumentType::Int64, {2}, false},
+                                {ArgumentType::Double, {4}, false},
+                                {ArgumentType::Size, {}, false},
+                                {ArgumentType::ContextIDs, {9}, false},
+                                {ArgumentType::Text, {5}, false},
+                                {ArgumentType::Data, {6}, false},
+                                {ArgumentType::NullableData, {6}, true},
+                                {ArgumentType::Dictionary, {10}, false},
+                                {ArgumentType::NullableDictionary, {10}, true},
+                                {ArgumentType::Array, {9}, false},
+                                {ArgumentType::URL, {8}, false},
+                                {ArgumentType::NullableURL, {8}, true},
+                                {ArgumentType::NullableEndpoint, {12}, true},
+                                {ArgumentType::NullableError, {11}, true},
+                                {ArgumentType::SharedPlaneObject, {13}, true},
+                                {ArgumentType::Any, {1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13}, true}};
     ASSERT_EQ(rows.size(), static_cast<std::size_t>(ArgumentType::Any) + 1) << "a type without a row";
     for (const Row& row : rows)
         for (const Value& value : values) {

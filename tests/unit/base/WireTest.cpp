@@ -33,9 +33,11 @@ Value everything() {
     return Dictionary{
         {"null", Value()},
         {"bools", Array{true, false}},
-        {"ints", Array{std::numeric_limits<std::int64_t>::min(), std::int64_t{-1}, std::numeric_limits<std::int64_t>::max()}},
+        {"ints",
+         Array{std::numeric_limits<std::int64_t>::min(), std::int64_t{-1}, std::numeric_limits<std::int64_t>::max()}},
         {"uint", std::numeric_limits<std::uint64_t>::max()},
-        {"doubles", Array{0.1, -0.0, std::numeric_limits<double>::infinity(), std::numeric_limits<double>::denorm_min()}},
+        {"doubles",
+         Array{0.1, -0.0, std::numeric_limits<double>::infinity(), std::numeric_limits<double>::denorm_min()}},
         {"text", "sch\u00f6n \U0001F600"},
         {"empty", ""},
         {"zero", std::string("a\0b", 3)},
@@ -59,7 +61,8 @@ TEST(Wire, EveryKindComesBackAsItWent) {
 TEST(Wire, TheBytesAreWhatTheLayoutSays) {
     WireBody body;
     ASSERT_TRUE(encode(Value(Array{true, std::int64_t{-2}, "ab"}), body));
-    EXPECT_EQ(body.bytes, (Data{9, 3, 0, 0, 0, 1, 1, 2, 0xFE, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 5, 2, 0, 0, 0, 'a', 'b'}));
+    EXPECT_EQ(body.bytes,
+              (Data{9, 3, 0, 0, 0, 1, 1, 2, 0xFE, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 5, 2, 0, 0, 0, 'a', 'b'}));
 }
 
 TEST(Wire, HandlesTravelBesideTheBytesInTheOrderOfTheirNumbers) {
@@ -84,7 +87,8 @@ TEST(Wire, TrailingBytesAreRefused) {
 }
 
 TEST(Wire, UnknownTagsAreRefused) {
-    for (int tag = 14; tag < 256; ++tag) EXPECT_FALSE(decodeBytes({static_cast<std::uint8_t>(tag), 0, 0, 0, 0, 0, 0, 0, 0}));
+    for (int tag = 14; tag < 256; ++tag)
+        EXPECT_FALSE(decodeBytes({static_cast<std::uint8_t>(tag), 0, 0, 0, 0, 0, 0, 0, 0}));
 }
 
 TEST(Wire, ATruthIsZeroOrOne) {

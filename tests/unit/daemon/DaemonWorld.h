@@ -106,7 +106,8 @@ private:
     class Inbox final : public IpcExportedObject {
     public:
         explicit Inbox(TestClient& client) : client_(client) {}
-        void receiveMessage(const std::shared_ptr<IpcConnection>&, std::uint16_t message, Array arguments, IpcReply) override {
+        void receiveMessage(const std::shared_ptr<IpcConnection>&, std::uint16_t message, Array arguments,
+                            IpcReply) override {
             client_.told.push_back({static_cast<ClientMessage>(message), std::move(arguments)});
             client_.journal.push_back("told " + std::to_string(message));
         }

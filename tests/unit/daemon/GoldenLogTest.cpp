@@ -70,7 +70,8 @@ TEST_F(GoldenLog, AWholeRecordingWithItsPauseLogsTheseLinesInThisOrder) {
     };
     EXPECT_EQ(fakes_.logSink.logged(), expected);
     ASSERT_EQ(fakes_.logSink.printed().size(), 1u);
-    EXPECT_TRUE(fakes_.logSink.printed()[0].starts_with("LCReportingAgent: reportingEvent:1 payload:{\"ActiveDuration\" = 1;"))
+    EXPECT_TRUE(
+        fakes_.logSink.printed()[0].starts_with("LCReportingAgent: reportingEvent:1 payload:{\"ActiveDuration\" = 1;"))
         << fakes_.logSink.printed()[0];
 }
 

@@ -25,27 +25,48 @@ const Data kTiming(72, 3), kFormat(40, 4), kSound{1, 2, 3, 4, 5};
 std::vector<Case> cases() {
     const std::string refused = " error getting remote proxy: 32";
     return {
-        {ClientMessage::UpdateScreenRecordingState, [](auto& p) { p.updateScreenRecordingState(true); }, {true},
-         "LCClientProxy:updateScreenRecordingState:", "LCClientProxy:updateScreenRecordingState:" + refused},
-        {ClientMessage::StopRecordingWithError, [](auto& p) { p.stopRecordingWithError(kError, std::nullopt); },
-         {kError, Value()}, "LCClientProxy:stopRecordingWithError:movieURL:",
+        {ClientMessage::UpdateScreenRecordingState,
+         [](auto& p) { p.updateScreenRecordingState(true); },
+         {true},
+         "LCClientProxy:updateScreenRecordingState:",
+         "LCClientProxy:updateScreenRecordingState:" + refused},
+        {ClientMessage::StopRecordingWithError,
+         [](auto& p) { p.stopRecordingWithError(kError, std::nullopt); },
+         {kError, Value()},
+         "LCClientProxy:stopRecordingWithError:movieURL:",
          "LCClientProxy:recordingDidStopWithError:" + refused},
-        {ClientMessage::UpdateBroadcastServiceInfo, [](auto& p) { p.updateBroadcastServiceInfo({{"viewers", std::int64_t{3}}}); },
-         {Dictionary{{"viewers", std::int64_t{3}}}}, "LCClientProxy:updateBroadcastServiceInfo:",
+        {ClientMessage::UpdateBroadcastServiceInfo,
+         [](auto& p) {
+             p.updateBroadcastServiceInfo({{"viewers", std::int64_t{3}}});
+         },
+         {Dictionary{{"viewers", std::int64_t{3}}}},
+         "LCClientProxy:updateBroadcastServiceInfo:",
          "LCClientProxy:updateBroadcastServiceInfo:" + refused},
-        {ClientMessage::UpdateBroadcastURL, [](auto& p) { p.updateBroadcastURL(URL("https://example.org/live")); },
-         {URL("https://example.org/live")}, "LCClientProxy:updateBroadcastURL:", "LCClientProxy:updateBroadcastURL:" + refused},
-        {ClientMessage::CaptureHandlerWithSample, [](auto& p) { p.captureHandlerWithSample(nullptr, kTiming); },
-         {Value(), kTiming}, "LCClientProxy:captureHandlerWithSample:", "LCClientProxy:captureHandlerWithSample:" + refused},
+        {ClientMessage::UpdateBroadcastURL,
+         [](auto& p) { p.updateBroadcastURL(URL("https://example.org/live")); },
+         {URL("https://example.org/live")},
+         "LCClientProxy:updateBroadcastURL:",
+         "LCClientProxy:updateBroadcastURL:" + refused},
+        {ClientMessage::CaptureHandlerWithSample,
+         [](auto& p) { p.captureHandlerWithSample(nullptr, kTiming); },
+         {Value(), kTiming},
+         "LCClientProxy:captureHandlerWithSample:",
+         "LCClientProxy:captureHandlerWithSample:" + refused},
         {ClientMessage::CaptureHandlerWithAudioSample,
          [](auto& p) { p.captureHandlerWithAudioSample(kSound, kFormat, 1024, 2, kTiming); },
-         {kSound, kFormat, std::int64_t{1024}, std::int64_t{2}, kTiming}, "LCClientProxy:captureHandlerWithAudioSample:",
+         {kSound, kFormat, std::int64_t{1024}, std::int64_t{2}, kTiming},
+         "LCClientProxy:captureHandlerWithAudioSample:",
          "LCClientProxy:captureHandlerWithAudioSample:" + refused},
-        {ClientMessage::RecordingLockInterrupted, [](auto& p) { p.recordingLockInterrupted("locked"); }, {"locked"},
+        {ClientMessage::RecordingLockInterrupted,
+         [](auto& p) { p.recordingLockInterrupted("locked"); },
+         {"locked"},
          "LCClientProxy:recordingLockInterrupted:",
          "LCClientProxy:recodingDidStopAndSavedToCameraRoll: video saved to camera roll: 32"},
-        {ClientMessage::RecordingTimerDidUpdate, [](auto& p) { p.recordingTimerDidUpdate(12.5); }, {12.5},
-         "LCClientProxy:recordingTimerDidUpdate:", "LCClientProxy:recordingTimerDidUpdate:" + refused},
+        {ClientMessage::RecordingTimerDidUpdate,
+         [](auto& p) { p.recordingTimerDidUpdate(12.5); },
+         {12.5},
+         "LCClientProxy:recordingTimerDidUpdate:",
+         "LCClientProxy:recordingTimerDidUpdate:" + refused},
     };
 }
 
@@ -72,7 +93,8 @@ protected:
         connection->resume();
         return true;
     }
-    void receiveMessage(const std::shared_ptr<IpcConnection>&, std::uint16_t message, Array arguments, IpcReply) override {
+    void receiveMessage(const std::shared_ptr<IpcConnection>&, std::uint16_t message, Array arguments,
+                        IpcReply) override {
         received_.emplace_back(static_cast<ClientMessage>(message), std::move(arguments));
     }
 

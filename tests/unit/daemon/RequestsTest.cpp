@@ -27,8 +27,13 @@ protected:
 
 TEST_F(Requests, TheStateHasSevenKeysInOrderAndAnEighthWithABroadcastURL) {
     const auto client = makeConnected();
-    Lines keys{"isRecording",  "isBroadcasting", "microphoneEnabled", "isSystemRecording", "hasUserConsentForMicrophone",
-               "hasUserConsentForCamera", "microphoneEnabledPersistent"};
+    Lines keys{"isRecording",
+               "isBroadcasting",
+               "microphoneEnabled",
+               "isSystemRecording",
+               "hasUserConsentForMicrophone",
+               "hasUserConsentForCamera",
+               "microphoneEnabledPersistent"};
     const Dictionary idle = state(*client);
     EXPECT_EQ(keysOf(idle), keys);
     for (const auto& [key, value] : idle.entries()) EXPECT_EQ(value, Value(false)) << key;

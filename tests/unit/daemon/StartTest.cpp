@@ -98,8 +98,11 @@ TEST_F(Start, AnEntitlementCountsOnlyWhenItIsTrue) {
 TEST_F(Start, WindowsThatAreNotTheCallersAreRefusedBeforeTheCurrentRecordingIsStopped) {
     const auto other = makeRecording("Editor", 501, 8);
     const auto client = makeConnected();
-    const std::vector<std::vector<ContextID>> lists{
-        {other->window}, {ContextID{0}}, {ContextID{4711}}, {client->window, other->window}, {client->window, ContextID{0}}};
+    const std::vector<std::vector<ContextID>> lists{{other->window},
+                                                    {ContextID{0}},
+                                                    {ContextID{4711}},
+                                                    {client->window, other->window},
+                                                    {client->window, ContextID{0}}};
     for (const auto& windows : lists) {
         fakes_.logSink.clear();
         const auto asked = client->start(windows);
@@ -190,8 +193,9 @@ TEST_F(Start, ABroadcastWithoutSetUpIsRefusedWithoutDescriptionAndItsTransaction
     const Lines lines = fakes_.logSink.logged();
     const auto at = std::find(lines.begin(), lines.end(), "starting...");
     ASSERT_NE(at, lines.end());
-    EXPECT_EQ(Lines(at, std::min(at + 3, lines.end())),
-              (Lines{"starting...", "broadcast requested", "attempted to start broadcast without a session, bailing out"}));
+    EXPECT_EQ(
+        Lines(at, std::min(at + 3, lines.end())),
+        (Lines{"starting...", "broadcast requested", "attempted to start broadcast without a session, bailing out"}));
 }
 
 TEST_F(Start, ASecondStartOfTheSameApplicationInterruptsItsOwnRecording) {

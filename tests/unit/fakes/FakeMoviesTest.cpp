@@ -17,13 +17,17 @@ protected:
     }
     ~FakeMoviesTest() override { world.scheduler.endWorld(); }
 
-    URL url(const std::string& name) const { return URL::file(world.fakes.fileSystem.temporaryDirectory() + "/" + name); }
+    URL url(const std::string& name) const {
+        return URL::file(world.fakes.fileSystem.temporaryDirectory() + "/" + name);
+    }
     static Dictionary videoSettings() {
         return {{std::string(VideoSettings::kCodec), "avc1"},
                 {std::string(VideoSettings::kWidth), 64.0},
                 {std::string(VideoSettings::kHeight), 64.0}};
     }
-    static Dictionary audioSettings() { return {{std::string(AudioSettings::kFormatID), std::uint64_t{kAudioFormatAAC}}}; }
+    static Dictionary audioSettings() {
+        return {{std::string(AudioSettings::kFormatID), std::uint64_t{kAudioFormatAAC}}};
+    }
     static MediaTime seconds(double value) { return MediaTime::fromSeconds(value, 1'000'000'000); }
     static SampleRef picture(double at) { return SampleBuffer::makeVideo(PixelBuffer(), seconds(at), seconds(0.01)); }
 

@@ -60,7 +60,9 @@ std::uint64_t playSeed(std::uint64_t seed, int& messages) {
     int replies = 0, errors = 0;
     for (int i = 0; i < 20; ++i)
         world.scheduler.globalQueue(QueuePriority::Default).async([&] {
-            connection->remoteProxy([&](const Error&) { ++errors; })->send(kGetState, {}, [&](const Array&) { ++replies; });
+            connection->remoteProxy([&](const Error&) { ++errors; })->send(kGetState, {}, [&](const Array&) {
+                ++replies;
+            });
         });
     for (int steps = static_cast<int>(world.scheduler.fork().below(60)); steps > 0; --steps) world.scheduler.step();
     world.fakes.endProcess(*process);
@@ -126,7 +128,9 @@ TEST(FakePlatform, ItWorksOnRealThreadsToo) {
         connections.back()->setRemoteInterface(daemonProtocol());
         connections.back()->resume();
         for (int message = 0; message < 50; ++message)
-            connections.back()->remoteProxy([&](const Error&) { ++errors; })->send(kGetState, {}, [&](const Array&) { ++replies; });
+            connections.back()->remoteProxy([&](const Error&) { ++errors; })->send(kGetState, {}, [&](const Array&) {
+                ++replies;
+            });
     }
     const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(30);
     while (replies < 200 && std::chrono::steady_clock::now() < end) std::this_thread::yield();

@@ -86,7 +86,12 @@ TEST(SimScheduler, NoTwoTasksOfOneQueueOverlapThoughTheyWait) {
                 --inside;
             });
         for (int i = 0; i < 4; ++i)
-            sim.globalQueue(QueuePriority::Default).async([&] { queue->sync([&] { EXPECT_EQ(++inside, 1); --inside; }); });
+            sim.globalQueue(QueuePriority::Default).async([&] {
+                queue->sync([&] {
+                    EXPECT_EQ(++inside, 1);
+                    --inside;
+                });
+            });
         for (int i = 0; i < 4; ++i) sim.globalQueue(QueuePriority::Background).async([&] { semaphore->signal(); });
         sim.runUntilIdle();
         EXPECT_EQ(inside, 0);

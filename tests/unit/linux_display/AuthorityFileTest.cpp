@@ -46,7 +46,8 @@ TEST(AuthorityFile, StopsAtABrokenEntryWhereverItBreaks) {
     Bytes file;
     addEntry(file, 256, "here", "0", kCookie, "the one");
     for (std::size_t length = 0; length < file.size(); ++length)
-        EXPECT_EQ(findKey(Bytes(file.begin(), file.begin() + static_cast<std::ptrdiff_t>(length)), "here", "0"), std::nullopt);
+        EXPECT_EQ(findKey(Bytes(file.begin(), file.begin() + static_cast<std::ptrdiff_t>(length)), "here", "0"),
+                  std::nullopt);
     Bytes lying{1, 0, 0xff, 0xff, 'h'};
     EXPECT_EQ(findKey(lying, "here", "0"), std::nullopt);
 }

@@ -104,7 +104,8 @@ TEST(Disk, ThatDoesNotAnswerIsNotWaitedFor) {
     for (int i = 0; i < 200; ++i) {
         longest = std::max(longest, secondsTaken([&] {
             movie.video->isReadyForMoreMediaData();
-            movie.video->append(greyPicture(128, 96, static_cast<std::uint64_t>(i), 100, atNanoseconds(i * 20 * kMillisecond)));
+            movie.video->append(
+                greyPicture(128, 96, static_cast<std::uint64_t>(i), 100, atNanoseconds(i * 20 * kMillisecond)));
         }));
     }
     Happening done;
@@ -237,8 +238,8 @@ TEST(Daemon, WaitsForADeadDiskOnlyForAWhileAtTheEnd) {
     faulty.disk->thaw();
 }
 
-/// What the child of the next test does: records pictures in real time at `rate`, the luma telling the number, and tells
-/// through the pipe when each was appended.
+/// What the child of the next test does: records pictures in real time at `rate`, the luma telling the number, and
+/// tells through the pipe when each was appended.
 [[noreturn]] void recordForEver(const std::string& path, int pipe, int rate) {
     HandClock clock;
     clock.startCaptureClock();
@@ -284,7 +285,8 @@ TEST_P(Killed, AMoviePlaysUpToItsLastSecond) {
         std::int64_t stamp = 0;
         ::fcntl(ends[0], F_SETFL, O_NONBLOCK);
         while (std::chrono::steady_clock::now() < killing) {
-            if (::read(ends[0], &stamp, sizeof stamp) != sizeof stamp) std::this_thread::sleep_for(std::chrono::milliseconds(1));
+            if (::read(ends[0], &stamp, sizeof stamp) != sizeof stamp)
+                std::this_thread::sleep_for(std::chrono::milliseconds(1));
         }
         ::kill(child, SIGKILL);
         int status = 0;

@@ -58,7 +58,8 @@ protected:
 
     /// Whether the copy of [start, end) shows what the movie showed then.
     void expectPictures(const std::string& path, double start, double end) {
-        const auto from = static_cast<std::int64_t>(std::llround(start * 1e9)), to = static_cast<std::int64_t>(std::llround(end * 1e9));
+        const auto from = static_cast<std::int64_t>(std::llround(start * 1e9)),
+                   to = static_cast<std::int64_t>(std::llround(end * 1e9));
         EXPECT_NEAR(movieNanoseconds(path), to - from, kTick);
         const auto shown = shownPictures(path);
         const int first = static_cast<int>(from * kRate / kSecond);
@@ -83,7 +84,8 @@ TEST_F(Export, FromTwoToTwentyFourSecondsBeginsWithTheRightPicture) {
 }
 
 TEST_F(Export, BeginsBetweenKeyFramesAndBetweenPictures) {
-    const std::pair<double, double> ranges[] = {{0, 30}, {0, 0.05}, {0.5, 1.5}, {3.45, 7.2}, {3.46, 7.23}, {29.9, 30}, {12.5, 12.51}};
+    const std::pair<double, double> ranges[] = {{0, 30},      {0, 0.05},  {0.5, 1.5},   {3.45, 7.2},
+                                                {3.46, 7.23}, {29.9, 30}, {12.5, 12.51}};
     int number = 0;
     for (const auto& [start, end] : ranges) {
         SCOPED_TRACE(start);

@@ -21,7 +21,8 @@ TEST(Pictures, AppearAtTheirStampsInTheirOrder) {
     std::mt19937 random(7);
     std::vector<std::int64_t> stamps{zero};
     for (int i = 1; i < 100; ++i) stamps.push_back(stamps.back() + 1 * kMillisecond + random() % 90'000'000);
-    for (std::size_t i = 0; i < stamps.size(); ++i) ASSERT_TRUE(movie.appendGrey(static_cast<int>(i * 2 + 20), stamps[i]));
+    for (std::size_t i = 0; i < stamps.size(); ++i)
+        ASSERT_TRUE(movie.appendGrey(static_cast<int>(i * 2 + 20), stamps[i]));
     movie.clock.advance(std::chrono::nanoseconds(stamps.back() + kSecond));
     ASSERT_EQ(movie.finish(), ContainerStatus::Completed);
 
@@ -193,7 +194,8 @@ std::vector<std::int64_t> keyFrames(const std::string& path) {
     const media::AvOwned<AVPacket> packet(av_packet_alloc());
     while (av_read_frame(opened, packet.get()) == 0) {
         if (packet->flags & AV_PKT_FLAG_KEY) {
-            keys.push_back(av_rescale_q(packet->pts, opened->streams[packet->stream_index]->time_base, {1, 1'000'000'000}));
+            keys.push_back(
+                av_rescale_q(packet->pts, opened->streams[packet->stream_index]->time_base, {1, 1'000'000'000}));
         }
         av_packet_unref(packet.get());
     }

@@ -28,7 +28,8 @@ inline std::vector<ShownPicture> shownPictures(const std::string& path) {
     EXPECT_EQ(reader.error(), "");
     const bool whole = reader.readPictures([&](const checkers::DecodedPicture& picture) {
         const auto& luma = picture.luma;
-        const std::size_t middle = static_cast<std::size_t>(luma.height / 2) * luma.stride + static_cast<std::size_t>(luma.width / 2);
+        const std::size_t middle =
+            static_cast<std::size_t>(luma.height / 2) * luma.stride + static_cast<std::size_t>(luma.width / 2);
         shown.push_back({picture.time.count(), luma.samples[middle]});
     });
     EXPECT_TRUE(whole) << reader.error();
@@ -69,7 +70,8 @@ public:
         return video->append(sample);
     }
     bool appendGrey(int grey, std::int64_t nanoseconds) {
-        return append(greyPicture(width_, height_, ++number_, static_cast<std::uint8_t>(grey), atNanoseconds(nanoseconds)));
+        return append(
+            greyPicture(width_, height_, ++number_, static_cast<std::uint8_t>(grey), atNanoseconds(nanoseconds)));
     }
     ContainerStatus finish() {
         Happening done;

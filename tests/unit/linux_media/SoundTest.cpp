@@ -142,7 +142,8 @@ TEST(Sound, OfAClockThatDriftsStaysWithTheStamps) {
     for (double at = 0; at < seconds; at += 0.02 * 1.001, frame += block) {
         ASSERT_TRUE(eventually([&] { return movie.sound->isReadyForMoreMediaData(); }));
         Data data = tone(format, 441, frame, block);
-        ASSERT_TRUE(movie.sound->append(soundBuffer(format, std::move(data), block, static_cast<std::int64_t>(at * 1e9))));
+        ASSERT_TRUE(
+            movie.sound->append(soundBuffer(format, std::move(data), block, static_cast<std::int64_t>(at * 1e9))));
     }
     movie.clock.advance(std::chrono::seconds(40));
     ASSERT_EQ(movie.finish(), ContainerStatus::Completed);
@@ -153,7 +154,8 @@ TEST(Sound, OfAClockThatDriftsStaysWithTheStamps) {
     const auto sound = reader.readSound();
     ASSERT_TRUE(sound);
     double quietest = 1;
-    for (double at = 0.1; at < seconds - 0.2; at += 0.02) quietest = std::min(quietest, loudness(*sound, at, at + 0.02));
+    for (double at = 0.1; at < seconds - 0.2; at += 0.02)
+        quietest = std::min(quietest, loudness(*sound, at, at + 0.02));
     EXPECT_GT(quietest, 0.9 * kToneLoudness) << "no hole was cut into it";
 }
 

@@ -23,9 +23,11 @@ inline Data tone(const AudioFormat& format, double hertz, std::int64_t first, st
         const double value = 0.5 * std::sin(2 * std::numbers::pi * hertz * static_cast<double>(i) / format.sampleRate);
         std::uint64_t word = 0;
         if (format.formatFlags & AudioFormat::kFlagFloat) {
-            word = width == 4 ? std::bit_cast<std::uint32_t>(static_cast<float>(value)) : std::bit_cast<std::uint64_t>(value);
+            word = width == 4 ? std::bit_cast<std::uint32_t>(static_cast<float>(value))
+                              : std::bit_cast<std::uint64_t>(value);
         } else {
-            word = static_cast<std::uint64_t>(static_cast<std::int64_t>(value * std::ldexp(1, static_cast<int>(width) * 8 - 1)));
+            word = static_cast<std::uint64_t>(
+                static_cast<std::int64_t>(value * std::ldexp(1, static_cast<int>(width) * 8 - 1)));
             if (!(format.formatFlags & AudioFormat::kFlagSignedInteger)) word += 1ULL << (width * 8 - 1);
         }
         for (unsigned channel = 0; channel < format.channelsPerFrame; ++channel) {
@@ -40,7 +42,8 @@ inline Data tone(const AudioFormat& format, double hertz, std::int64_t first, st
 
 inline SampleRef soundBuffer(const AudioFormat& format, Data data, std::int64_t frames, std::int64_t nanoseconds) {
     const MediaTime length = MediaTime::make(frames, static_cast<std::int32_t>(format.sampleRate));
-    return SampleBuffer::makeAudio(format, std::move(data), frames, {length, atNanoseconds(nanoseconds), kInvalidMediaTime});
+    return SampleBuffer::makeAudio(format, std::move(data), frames,
+                                   {length, atNanoseconds(nanoseconds), kInvalidMediaTime});
 }
 
 inline AudioFormat formatOf(double rate, unsigned bits, unsigned channels, std::uint32_t flags) {

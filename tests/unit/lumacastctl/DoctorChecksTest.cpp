@@ -115,8 +115,9 @@ TEST(DisplayCheck, OfAWaylandSessionSaysWhatWorksAndWhatDoesNot) {
 TEST(SoundCheck, SaysThatSoundIsNotRecordedWhateverServerThereIs) {
     SoundFacts facts{{{"PulseAudio", "/p", false}, {"PipeWire", "/w", false}}};
     EXPECT_THAT(checkSound(facts),
-                ElementsAre(Finds(kWarning, "does not record sound yet, so movies are silent whatever is played; no sound server "
-                                            "answers (looked for PulseAudio at /p, PipeWire at /w)")));
+                ElementsAre(Finds(kWarning,
+                                  "does not record sound yet, so movies are silent whatever is played; no sound server "
+                                  "answers (looked for PulseAudio at /p, PipeWire at /w)")));
     facts.sockets[1].answers = true;
     EXPECT_THAT(checkSound(facts), ElementsAre(Finds(kWarning, "; PipeWire at /w can be reached")));
 }
@@ -130,7 +131,8 @@ TEST(EncoderCheck, IsWellWithSoftwareAlone) {
 
 TEST(EncoderCheck, SaysWhatHardwareIsTried) {
     const EncoderFacts facts{"libavcodec.so.59", true, {"h264_vaapi", "libx264"}, {"/dev/dri/renderD128"}};
-    EXPECT_THAT(checkEncoders(facts), ElementsAre(Finds(kOk, "tries h264_vaapi (there is /dev/dri/renderD128), then libx264")));
+    EXPECT_THAT(checkEncoders(facts),
+                ElementsAre(Finds(kOk, "tries h264_vaapi (there is /dev/dri/renderD128), then libx264")));
 }
 
 TEST(EncoderCheck, IsAProblemWithoutAnyAndAWarningWithHardwareAlone) {
@@ -156,7 +158,8 @@ StorageFacts goodStorage() {
 }
 
 TEST(StorageCheck, OfAGoodDirectoryIsWell) {
-    EXPECT_THAT(checkStorage(goodStorage()), ElementsAre(Finds(kOk, "/root/tmp can be written to"), Finds(kOk, "5.0 GB are free")));
+    EXPECT_THAT(checkStorage(goodStorage()),
+                ElementsAre(Finds(kOk, "/root/tmp can be written to"), Finds(kOk, "5.0 GB are free")));
 }
 
 TEST(StorageCheck, OfAMissingDirectoryIsWellWhereItCanBeMade) {
@@ -165,7 +168,8 @@ TEST(StorageCheck, OfAMissingDirectoryIsWellWhereItCanBeMade) {
     facts.nearest = "/root";
     EXPECT_THAT(checkStorage(facts), Contains(Finds(kOk, "the daemon makes it")));
     facts.isWritable = false;
-    EXPECT_THAT(checkStorage(facts), Contains(Finds(kProblem, "/root/tmp is missing and can't be made: /root can't be written to")));
+    EXPECT_THAT(checkStorage(facts),
+                Contains(Finds(kProblem, "/root/tmp is missing and can't be made: /root can't be written to")));
 }
 
 TEST(StorageCheck, FindsADirectoryThatIsNoneOrCannotBeWrittenTo) {
@@ -223,7 +227,8 @@ DaemonFacts goodDaemon() {
 }
 
 TEST(DaemonCheck, OfARunningDaemonIsWell) {
-    EXPECT_THAT(checkDaemon(goodDaemon()), ElementsAre(Finds(kOk, "it answers at"), Finds(kOk, "applications can connect")));
+    EXPECT_THAT(checkDaemon(goodDaemon()),
+                ElementsAre(Finds(kOk, "it answers at"), Finds(kOk, "applications can connect")));
 }
 
 TEST(DaemonCheck, ThatIsNotRunningIsOneProblem) {

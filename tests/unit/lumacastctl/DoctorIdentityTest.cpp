@@ -44,7 +44,8 @@ TEST(IdentityCheck, OfAProgramNamesNoProcess) {
 TEST(IdentityCheck, WithoutAnApplicationIsAProblemForWhoeverIsAskedAbout) {
     IdentityFacts facts = playersProcess();
     facts.identifier = facts.bundlePath = std::nullopt;
-    EXPECT_THAT(checkIdentity(facts), ElementsAre(Finds(kProblem, "process 42 (/opt/player) belongs to no application")));
+    EXPECT_THAT(checkIdentity(facts),
+                ElementsAre(Finds(kProblem, "process 42 (/opt/player) belongs to no application")));
     EXPECT_THAT(checkIdentity(facts), ElementsAre(Finds(kProblem, "into /home/share/applications whose Exec")));
 }
 
@@ -52,8 +53,9 @@ TEST(IdentityCheck, WithoutAnApplicationIsWellForWhoeverCalledTheTool) {
     IdentityFacts facts = playersProcess();
     facts.identifier = facts.bundlePath = std::nullopt;
     facts.question.isExample = true;
-    EXPECT_THAT(checkIdentity(facts), ElementsAre(Finds(kOk, "which started this tool, belongs to no application"),
-                                                  Finds(kOk, "a desktop entry in /home/share/applications, /share/applications")));
+    EXPECT_THAT(checkIdentity(facts),
+                ElementsAre(Finds(kOk, "which started this tool, belongs to no application"),
+                            Finds(kOk, "a desktop entry in /home/share/applications, /share/applications")));
 }
 
 TEST(IdentityCheck, OfNothingThatRunsIsAProblemForWhoeverIsAskedAbout) {
@@ -78,12 +80,14 @@ EntitlementFacts playersEntitlements() {
 TEST(EntitlementCheck, TellsWhatAnApplicationHas) {
     EntitlementFacts facts = playersEntitlements();
     facts.explanation->entitlements = {{"com.orvane.private.luma-cast", true}, {"other", "text"}};
-    EXPECT_THAT(checkEntitlements(facts),
-                ElementsAre(Finds(kOk, "org.example.Player has com.orvane.private.luma-cast = true, other = \"text\".")));
+    EXPECT_THAT(
+        checkEntitlements(facts),
+        ElementsAre(Finds(kOk, "org.example.Player has com.orvane.private.luma-cast = true, other = \"text\".")));
 }
 
 TEST(EntitlementCheck, SaysWhereItLookedInVain) {
-    EXPECT_THAT(checkEntitlements(playersEntitlements()), ElementsAre(Finds(kOk, "looked for *.conf in /etc/entitlements.d")));
+    EXPECT_THAT(checkEntitlements(playersEntitlements()),
+                ElementsAre(Finds(kOk, "looked for *.conf in /etc/entitlements.d")));
 }
 
 TEST(EntitlementCheck, SaysWhyNoneCanCount) {
@@ -91,7 +95,8 @@ TEST(EntitlementCheck, SaysWhyNoneCanCount) {
     facts.explanation->counts = false;
     facts.explanation->findings = {"nothing counts: /home belongs to somebody else"};
     EXPECT_THAT(checkEntitlements(facts),
-                ElementsAre(Finds(kOk, "none can count for org.example.Player (nothing counts: /home belongs to somebody else)")));
+                ElementsAre(Finds(
+                    kOk, "none can count for org.example.Player (nothing counts: /home belongs to somebody else)")));
 }
 
 TEST(EntitlementCheck, WarnsOfDropInsThatArePassedOver) {

@@ -29,15 +29,18 @@ protected:
 
 TEST_F(DoctorPreferences, WithoutFilesTellWhereTheyWouldBeAndThatStartsAreRefused) {
     const Findings findings = findingsOn(nullptr);
-    EXPECT_THAT(findings, Contains(Finds(kOk, "no file is there; looked for " + usersFile() + ", " + administratorsFile())));
-    EXPECT_THAT(findings, Contains(Finds(kProblem, "LCSuppressAlert is not set, so every start is refused with -5801")));
+    EXPECT_THAT(findings,
+                Contains(Finds(kOk, "no file is there; looked for " + usersFile() + ", " + administratorsFile())));
+    EXPECT_THAT(findings,
+                Contains(Finds(kProblem, "LCSuppressAlert is not set, so every start is refused with -5801")));
     EXPECT_THAT(findings, Contains(Finds(kProblem, "write LCSuppressAlert=true into " + usersFile())));
     EXPECT_THAT(findings, Contains(Finds(kOk, "LCBitRateOverride is not set")));
     EXPECT_THAT(findings, Contains(Finds(kOk, "LCFullResCapture is not set")));
 }
 
 TEST_F(DoctorPreferences, ThatAreSetAreToldWithTheFileThatDecides) {
-    const Findings findings = findingsOn("LCBitRateOverride=8000000\n", "LCSuppressAlert=yes\nLCFullResCapture=true\nLCBitRateOverride=1\n");
+    const Findings findings =
+        findingsOn("LCBitRateOverride=8000000\n", "LCSuppressAlert=yes\nLCFullResCapture=true\nLCBitRateOverride=1\n");
     EXPECT_THAT(findings, AllAre(kOk));
     EXPECT_THAT(findings, Contains(Finds(kOk, "read from " + usersFile() + ", " + administratorsFile())));
     EXPECT_THAT(findings, Contains(Finds(kOk, "LCSuppressAlert=true (" + administratorsFile() + ")")));
@@ -52,13 +55,16 @@ TEST_F(DoctorPreferences, ThatSuppressNothingAreAProblem) {
 
 TEST_F(DoctorPreferences, OfTheWrongKindAreFound) {
     const Findings findings = findingsOn("LCSuppressAlert=1\nLCBitRateOverride=fast\nLCFullResCapture=2\n");
-    EXPECT_THAT(findings, Contains(Finds(kProblem, "LCSuppressAlert=1 (" + usersFile() + ") is neither true nor false")));
+    EXPECT_THAT(findings,
+                Contains(Finds(kProblem, "LCSuppressAlert=1 (" + usersFile() + ") is neither true nor false")));
     EXPECT_THAT(findings, Contains(Finds(kWarning, "LCBitRateOverride=\"fast\" (" + usersFile() + ") is no bit rate")));
-    EXPECT_THAT(findings, Contains(Finds(kWarning, "LCFullResCapture=2 (" + usersFile() + ") is neither true nor false")));
+    EXPECT_THAT(findings,
+                Contains(Finds(kWarning, "LCFullResCapture=2 (" + usersFile() + ") is neither true nor false")));
 }
 
 TEST_F(DoctorPreferences, BehindASectionDoNotCount) {
-    EXPECT_THAT(findingsOn("[General]\nLCSuppressAlert=true\n"), Contains(Finds(kProblem, "a line before any [section]")));
+    EXPECT_THAT(findingsOn("[General]\nLCSuppressAlert=true\n"),
+                Contains(Finds(kProblem, "a line before any [section]")));
 }
 
 TEST_F(DoctorPreferences, InAFileThatCannotBeReadAreMissing) {

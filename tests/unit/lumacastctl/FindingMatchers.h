@@ -17,7 +17,8 @@ MATCHER_P2(Finds, severity, part, "") {
 /// All findings are of that severity, and there is at least one.
 MATCHER_P(AllAre, severity, "") {
     (void)result_listener;
-    return !arg.empty() && std::all_of(arg.begin(), arg.end(), [this](const Finding& f) { return f.severity == severity; });
+    return !arg.empty() &&
+           std::all_of(arg.begin(), arg.end(), [this](const Finding& f) { return f.severity == severity; });
 }
 
 }  // namespace lumacast::ctl

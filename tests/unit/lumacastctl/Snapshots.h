@@ -25,8 +25,11 @@ inline Dictionary snapshotOfARecording() {
                              {"framesDropped", std::uint64_t{6}}};
     const Dictionary player{{"bundleID", "org.example.Player"}, {"connected", true}, {"recording", true},
                             {"transactionOpen", true},          {"pid", 4711},       {"current", current}};
-    const Dictionary tea{
-        {"bundleID", "org.example.Tea"}, {"connected", true}, {"recording", false}, {"transactionOpen", false}, {"pid", 12}};
+    const Dictionary tea{{"bundleID", "org.example.Tea"},
+                         {"connected", true},
+                         {"recording", false},
+                         {"transactionOpen", false},
+                         {"pid", 12}};
     const Dictionary gone{
         {"bundleID", "org.example.Gone"}, {"connected", false}, {"recording", false}, {"transactionOpen", false}};
     Dictionary snapshot = emptySnapshot();

@@ -19,7 +19,8 @@ public:
     enum class Lane { Runs, Hangs };
 
     /// Both sockets in `runtimeDirectory`. On a lane that hangs the admin service soon says that the daemon is busy.
-    explicit StandInDaemon(const std::string& runtimeDirectory, std::function<Dictionary()> snapshot, Lane lane = Lane::Runs)
+    explicit StandInDaemon(const std::string& runtimeDirectory, std::function<Dictionary()> snapshot,
+                           Lane lane = Lane::Runs)
         : ipc_(*reactor_, log_, {.runtimeDirectory = runtimeDirectory}),
           listener_(ipc_.listenerForService("com.orvane.lumacastd")),
           admin_(scheduler_, runtimeDirectory + "/admin.sock", {.snapshot = std::chrono::milliseconds(50)}) {

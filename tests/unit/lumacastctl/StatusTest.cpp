@@ -85,8 +85,8 @@ TEST(Status, OfADaemonThatHasNoneIsItsOwnError) {
 }
 
 TEST(Status, ThatCannotBeUnderstoodIsNone) {
-    for (const char* answer : {"", "nonsense", "[]", "{}", R"({"sessions":3})", R"({"sessions":[3]})", R"({"sessions":[{}]})",
-                               R"({"sessions":[{"bundleID":"a"})"}) {
+    for (const char* answer : {"", "nonsense", "[]", "{}", R"({"sessions":3})", R"({"sessions":[3]})",
+                               R"({"sessions":[{}]})", R"({"sessions":[{"bundleID":"a"})"}) {
         const auto result = readStatus(answer);
         ASSERT_TRUE(std::holds_alternative<std::string>(result)) << answer;
         EXPECT_NE(std::get<std::string>(result).find("can't be understood"), std::string::npos) << answer;

@@ -37,7 +37,8 @@ TEST(SampleBuffer, AudioCarriesItsFormatAndBytes) {
 }
 
 TEST(SampleBuffer, ACopyWithNewTimingSharesThePayloadAndLeavesTheOriginal) {
-    const SampleRef sample = SampleBuffer::makeAudio({}, Data{9}, 1, {kZeroMediaTime, kZeroMediaTime, kInvalidMediaTime});
+    const SampleRef sample =
+        SampleBuffer::makeAudio({}, Data{9}, 1, {kZeroMediaTime, kZeroMediaTime, kInvalidMediaTime});
     const SampleRef copy =
         sample->copyWithTiming({{kZeroMediaTime, MediaTime::make(3, 1), kInvalidMediaTime}, {}});
     EXPECT_EQ(copy->data(), sample->data());

@@ -12,8 +12,9 @@ TEST(FrameGeometry, EachOfTheEightFlagsHasItsTransform) {
         double a, b, c, d;
     };
     constexpr double kZero = 6.123233995736766e-17;  // the cosine of a quarter turn
-    const Row rows[8] = {{1, 0, 0, 1},           {1, 0, 0, -1},          {-1, 0, 0, 1},           {-1, 0, 0, -1},
-                         {kZero, 1, -1, kZero},  {kZero, 1, 1, -kZero},  {-kZero, -1, -1, kZero}, {-kZero, -1, 1, -kZero}};
+    const Row rows[8] = {
+        {1, 0, 0, 1},          {1, 0, 0, -1},         {-1, 0, 0, 1},           {-1, 0, 0, -1},
+        {kZero, 1, -1, kZero}, {kZero, 1, 1, -kZero}, {-kZero, -1, -1, kZero}, {-kZero, -1, 1, -kZero}};
     Log log;
     for (std::uint32_t flags = 0; flags < 8; ++flags) {
         const AffineTransform t = frameTransformFromFlags(log, flags);

@@ -30,9 +30,9 @@ TEST_F(SessionLifecycle, AStartLogsItsStepsInOrderAndIsAnsweredOnce) {
     fakes_.log.setVerbose(false);
     start();
     EXPECT_EQ(startAnswers_, 1);
-    EXPECT_EQ(fakes_.logSink.logged(),
-              (Lines{"LCRecordingSession: startSession", "LCMovieWriter: startWritingHandler",
-                     "LCMovieWriter: setupAssetWriter", "bit rate set to 3000000", "app window mode", "starting capture"}));
+    EXPECT_EQ(fakes_.logSink.logged(), (Lines{"LCRecordingSession: startSession", "LCMovieWriter: startWritingHandler",
+                                              "LCMovieWriter: setupAssetWriter", "bit rate set to 3000000",
+                                              "app window mode", "starting capture"}));
 }
 
 TEST_F(SessionLifecycle, AStartClonesTheWindowsAndCapturesAtSixtyFramesASecond) {
@@ -171,10 +171,11 @@ TEST_F(SessionLifecycle, AFinishLogsItsStepsAndHandsTheMovieOver) {
     EXPECT_EQ(answer.url, URL::file(path_));
     EXPECT_FALSE(answer.error);
     EXPECT_FALSE(session_->isRecording());
-    EXPECT_EQ(fakes_.logSink.logged(),
-              (Lines{"LCRecordingSession: finishSessionWithHandler", "LCRecordingSession: stop",
-                     "LCRecordingSession: stopAllCapture", "Stop mirroring", "recordedFileSize for URL 1000 bytes",
-                     "LCMovieWriter: finishWritingWithHandler: status = 1", "LCRecordingSession: finishWritingWithHandler"}));
+    EXPECT_EQ(
+        fakes_.logSink.logged(),
+        (Lines{"LCRecordingSession: finishSessionWithHandler", "LCRecordingSession: stop",
+               "LCRecordingSession: stopAllCapture", "Stop mirroring", "recordedFileSize for URL 1000 bytes",
+               "LCMovieWriter: finishWritingWithHandler: status = 1", "LCRecordingSession: finishWritingWithHandler"}));
     EXPECT_TRUE(delegate_->stops.empty()) << "a finish notifies nobody";
 }
 
@@ -225,7 +226,8 @@ TEST_F(SessionLifecycle, BothClipDurationsGiveAClip) {
     const Lines lines = fakes_.logSink.logged();
     const auto trimming = std::find(lines.begin(), lines.end(), "trimming");
     ASSERT_NE(trimming, lines.end());
-    EXPECT_EQ(Lines(trimming, lines.end()), (Lines{"trimming", "LCMovieWriter: Export Trim succeeded", "finished trimming"}));
+    EXPECT_EQ(Lines(trimming, lines.end()),
+              (Lines{"trimming", "LCMovieWriter: Export Trim succeeded", "finished trimming"}));
 }
 
 TEST_F(SessionLifecycle, OneClipDurationAloneGivesTheWholeMovie) {

@@ -17,11 +17,14 @@ namespace lumacast {
 /// Remembers what a session reports.
 class RecordingDelegate final : public LCRecordingSessionDelegate {
 public:
-    void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>&, const std::optional<Error>& error) override {
+    void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>&,
+                                          const std::optional<Error>& error) override {
         stops.push_back(error ? error->code() : 0);
     }
     void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<LCRecordingSession>&, const Dictionary&) override {}
-    void broadcastSessionDidUpdateDuration(LCRecordingSession&, double seconds) override { durations.push_back(seconds); }
+    void broadcastSessionDidUpdateDuration(LCRecordingSession&, double seconds) override {
+        durations.push_back(seconds);
+    }
 
     std::vector<std::int64_t> stops;  ///< the codes of the errors, 0 for none
     std::vector<double> durations;

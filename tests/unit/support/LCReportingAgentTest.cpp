@@ -28,10 +28,11 @@ TEST_F(LCReportingAgentTest, TheSummaryHasItsFifteenEntriesInOrder) {
     std::vector<std::string> keys;
     const Dictionary metrics = agent_.collectSummaryEventMetrics();
     for (const auto& [key, value] : metrics.entries()) keys.push_back(key);
-    EXPECT_EQ(keys, (std::vector<std::string>{
-                        "ActiveDuration", "VideoCaptureWidth", "VideoCaptureHeight", "VideoCaptureRate", "VideoFrameCount",
-                        "AppAudioCaptureRate", "AppAudioFrameCount", "MicCaptureRate", "MicFrameCount", "FrontCameraUsed",
-                        "BackCameraUsed", "RecordedFileSize", "BroadcastExtensionBundleID", "ClientAppBundleID", "EndReason"}));
+    EXPECT_EQ(keys, (std::vector<std::string>{"ActiveDuration", "VideoCaptureWidth", "VideoCaptureHeight",
+                                              "VideoCaptureRate", "VideoFrameCount", "AppAudioCaptureRate",
+                                              "AppAudioFrameCount", "MicCaptureRate", "MicFrameCount",
+                                              "FrontCameraUsed", "BackCameraUsed", "RecordedFileSize",
+                                              "BroadcastExtensionBundleID", "ClientAppBundleID", "EndReason"}));
     EXPECT_EQ(metric("AppAudioCaptureRate"), Value(std::int64_t{2}));
     EXPECT_EQ(metric("MicCaptureRate"), Value(std::int64_t{43}));
     EXPECT_EQ(metric("FrontCameraUsed"), Value(false));

@@ -113,7 +113,8 @@ TEST_F(TempStoreTest, RemovalsRunInTheOrderAsked) {
         TempStore store(world.fakes.platform());
         std::vector<int> order;
         for (int i = 0; i < 8; ++i)
-            store._srRemoveFile(URL::file(store.pathFor("a.mp4")), [&order, i](std::optional<Error>) { order.push_back(i); });
+            store._srRemoveFile(URL::file(store.pathFor("a.mp4")),
+                                [&order, i](std::optional<Error>) { order.push_back(i); });
         world.scheduler.runUntilIdle();
         EXPECT_EQ(order, (std::vector<int>{0, 1, 2, 3, 4, 5, 6, 7})) << seed;
     }

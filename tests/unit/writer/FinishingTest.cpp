@@ -5,7 +5,8 @@
 namespace lumacast {
 namespace {
 
-constexpr char kNoFirstSample[] = "LCMovieWriter: finishWritingWithHandler: first sample buffer was not processed or appended";
+constexpr char kNoFirstSample[] =
+    "LCMovieWriter: finishWritingWithHandler: first sample buffer was not processed or appended";
 
 class MovieWriterFinishing : public WriterWorld {
 protected:

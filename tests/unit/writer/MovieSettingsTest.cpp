@@ -115,7 +115,8 @@ TEST_F(MovieSettings, TheWriterGivesTheSettingsToItsThreeTracks) {
     const FakeMovie movie = recording().movie();
     ASSERT_EQ(movie.tracks.size(), 3u);
     EXPECT_EQ(movie.tracks[0].type, MediaType::Video);
-    EXPECT_EQ(at(compressionOf(movie.tracks[0].settings), VideoSettings::kAverageBitRate), Value(std::int64_t{5000000}));
+    EXPECT_EQ(at(compressionOf(movie.tracks[0].settings), VideoSettings::kAverageBitRate),
+              Value(std::int64_t{5000000}));
     EXPECT_EQ(movie.tracks[1].settings, audioSettings());
     EXPECT_EQ(movie.tracks[2].settings, audioSettings());
 }

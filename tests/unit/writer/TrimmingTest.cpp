@@ -103,7 +103,8 @@ public:
         const URL url;
     };
     std::shared_ptr<MovieAsset> openMovie(const URL&) override { return std::make_shared<Asset>(); }
-    std::shared_ptr<MovieExporter> makeExporter(std::shared_ptr<MovieAsset>, ExportPreset thePreset, const URL& url) override {
+    std::shared_ptr<MovieExporter> makeExporter(std::shared_ptr<MovieAsset>, ExportPreset thePreset,
+                                                const URL& url) override {
         preset = thePreset;
         return std::make_shared<Exporter>(*this, url);
     }

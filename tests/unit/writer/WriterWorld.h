@@ -14,8 +14,8 @@
 
 namespace lumacast {
 
-/// A fresh world per test. The test's own thread drives the simulation: a synchronous call returns when it is done, what
-/// was submitted runs in settle().
+/// A fresh world per test. The test's own thread drives the simulation: a synchronous call returns when it is done,
+/// what was submitted runs in settle().
 class WriterWorld : public ::testing::Test {
 protected:
     static constexpr std::int32_t kTimescale = 600;
@@ -67,7 +67,8 @@ protected:
     std::vector<std::int64_t> ticks(std::size_t track) {
         std::vector<std::int64_t> result;
         const FakeMovie movie = recording().movie();
-        for (const SampleRef& sample : movie.tracks.at(track).samples) result.push_back(sample->presentationTime().value);
+        for (const SampleRef& sample : movie.tracks.at(track).samples)
+            result.push_back(sample->presentationTime().value);
         return result;
     }
     using Ticks = std::vector<std::int64_t>;
