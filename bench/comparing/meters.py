@@ -1,0 +1,58 @@
+"""What processes cost, as the kernel counts it."""
+
+import collections
+import os
+import pathlib
+
+TICK = 1 / os.sysconf("SC_CLK_TCK")
+
+
+def cpu_seconds(pid):
+    """utime + stime of all threads, those that have ended too; steps of a clock tick."""
+    fields = pathlib.Path(f"/proc/{pid}/stat").read_text().rpartition(")")[2].split()
+    return (int(fields[11]) + int(fields[12])) * TICK
+
+
+class Threads:
+    """The living threads of a process at one moment: name, seconds on a processor, voluntary switches."""
+
+    def __init__(self, pid):
+        self.of = {}
+        for task in pathlib.Path(f"/proc/{pid}/task").iterdir():
+            try:
+                name = (task / "comm").read_text().strip()
+                seconds = int((task / "schedstat").read_text().split()[0]) / 1e9
+                status = (task / "status").read_text()
+            except (FileNotFoundError, ProcessLookupError):
+                continue  # it has just ended
+            switches = int(status.partition("\nvoluntary_ctxt_switches:")[2].split()[0])
+            self.of[int(task.name)] = (name, seconds, switches)
+
+    def seconds_since(self, earlier):
+        return sum(self._since(earlier, 1))
+
+    def switches_since(self, earlier):
+        return sum(self._since(earlier, 2))
+
+    def by_name_since(self, earlier):
+        """Seconds per thread, those of one name told apart by a number."""
+        seconds, seen = {}, collections.Counter()
+        for task, (name, spent, _) in sorted(self.of.items()):
+            seen[name] += 1
+            seconds[f"{name} {seen[name]}"] = spent - earlier.of.get(task, ("", 0, 0))[1]
+        return seconds
+
+    def _since(self, earlier, field):
+        return (values[field] - earlier.of.get(task, ("", 0, 0))[field] for task, values in self.of.items())
+
+
+def pss(pid):
+    """Bytes of memory, what is shared divided among its users."""
+    for line in pathlib.Path(f"/proc/{pid}/smaps_rollup").read_text().splitlines():
+        if line.startswith("Pss:"):
+            return int(line.split()[1]) * 1024
+    raise RuntimeError(f"process {pid} tells no memory")
+
+
+def load():
+    return float(pathlib.Path("/proc/loadavg").read_text().split()[0])

@@ -1,0 +1,56 @@
+"""What a recorded movie holds, and how like what was drawn it is."""
+
+import json
+import re
+import subprocess
+
+SAMPLE = 30  # pictures whose likeness is measured
+
+
+def probe(movie):
+    """What ffprobe says of the picture track."""
+    fields = "codec_name,profile,level,pix_fmt,width,height,duration,bit_rate,nb_read_packets"
+    out = subprocess.run(["ffprobe", "-v", "error", "-select_streams", "v:0", "-count_packets", "-show_entries",
+                          f"stream={fields}", "-of", "json", str(movie)], check=True, capture_output=True, text=True)
+    stream = json.loads(out.stdout)["streams"][0]
+    return {"codec": stream["codec_name"], "profile": stream["profile"], "level": stream["level"],
+            "pix_fmt": stream["pix_fmt"], "size": f"{stream['width']}x{stream['height']}",
+            "seconds": float(stream["duration"]), "bit_rate": int(stream["bit_rate"]),
+            "pictures": int(stream["nb_read_packets"])}
+
+
+def encoder_options(movie):
+    """What the encoder wrote of its options into the stream."""
+    found = re.search(rb"x264 - core .*? - options: ([^\0\x80]*)", movie.read_bytes(), re.S)
+    return dict(option.split("=", 1) for option in found.group(1).decode().split() if "=" in option) if found else None
+
+
+def numbers(binaries, movie):
+    """The frame number in each picture, None where none can be read."""
+    out = subprocess.run([str(binaries / "scene_pictures"), "numbers", str(movie)], check=True, capture_output=True, text=True)
+    return [None if number == "-" else int(number) for _, number in map(str.split, out.stdout.splitlines())]
+
+
+def spread(items):
+    """At most SAMPLE of them, evenly."""
+    if len(items) <= SAMPLE:
+        return list(items)
+    return [items[round(index * (len(items) - 1) / (SAMPLE - 1))] for index in range(SAMPLE)]
+
+
+def ssim(binaries, movie, size, sample):
+    """Structural similarity (ffmpeg's filter) of pictures with what was drawn: sample is (index in the movie, frame number).
+    Judged is what lies above the clock of the scene, as the time that it showed is not known any more."""
+    drawn = subprocess.run([str(binaries / "scene_pictures"), "redraw", size, *(str(number) for _, number in sample)],
+                           check=True, capture_output=True).stdout
+    width = int(size.split("x")[0])
+    area = f"{width}:{len(drawn) // (width * 4 * len(sample))}"
+    chosen = "+".join(f"eq(n,{index})" for index, _ in sample)
+    graph = (f"[0:v]select='{chosen}',setpts=N/60/TB,crop={area}:0:0,settb=1/60[movie];"
+             "[1:v]scale=flags=bicubic+accurate_rnd:out_color_matrix=bt601:out_range=tv,format=yuv420p,"
+             "setpts=N/60/TB,settb=1/60[drawn];[movie][drawn]ssim")
+    out = subprocess.run(["ffmpeg", "-hide_banner", "-i", str(movie), "-f", "rawvideo", "-pix_fmt", "bgr0", "-video_size",
+                          area.replace(":", "x"), "-framerate", "60", "-i", "pipe:0", "-lavfi", graph, "-f", "null", "-"],
+                         check=True, input=drawn, capture_output=True)
+    found = re.search(r"SSIM Y:([\d.]+).*All:([\d.]+)", out.stderr.decode())
+    return {"luma": float(found.group(1)), "all": float(found.group(2)), "pictures": len(sample)}
