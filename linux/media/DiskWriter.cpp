@@ -1,5 +1,7 @@
 #include "linux/media/DiskWriter.h"
 
+#include <pthread.h>
+
 #include <algorithm>
 #include <utility>
 
@@ -62,6 +64,7 @@ void DiskWriter::close(Pending pending) {
 }
 
 void DiskWriter::run(const std::shared_ptr<MovieFiles>& files, const std::string& path) {
+    pthread_setname_np(pthread_self(), "lc-disk");
     {
         auto made = files->create(path);
         auto* const file = std::get_if<0>(&made);

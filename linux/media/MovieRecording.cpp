@@ -1,5 +1,7 @@
 #include "linux/media/MovieRecording.h"
 
+#include <pthread.h>
+
 #include <algorithm>
 #include <utility>
 
@@ -158,6 +160,7 @@ std::optional<MovieRecording::Item> MovieRecording::takeItem() {
 // --- The encoder thread ----------------------------------------------------------------------------------------------
 
 void MovieRecording::run() {
+    pthread_setname_np(pthread_self(), "lc-encoder");  // the encoder's own threads inherit it
     {
         std::unique_lock lock(mutex_);
         if (status_ == ContainerStatus::Writing) runPipeline(lock);
