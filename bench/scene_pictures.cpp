@@ -1,7 +1,7 @@
 // What a comparison of recorders needs to know of the recorded scene:
-//   scene_pictures numbers MOVIE        each decoded picture: its time in ns and the frame number found in it, "-" when none
-//   scene_pictures redraw WxH N...      frames as they were drawn, raw B, G, R, X, one after the other, without the lines from
-//                                       the clock on: the time it showed is not known any more
+//   scene_pictures numbers MOVIE     each decoded picture: its time in ns and the frame number in it, "-" when none
+//   scene_pictures redraw WxH N...   frames as they were drawn, raw B, G, R, X, one after the other, without the lines
+//                                    from the clock on: the time it showed is not known any more
 
 #include <cinttypes>
 #include <cstdio>

@@ -1,5 +1,5 @@
-"""A machine of the comparison's own: directories, a display, the recorded application, the daemon. Everything it starts is
-ended by pid."""
+"""A machine of the comparison's own: directories, a display, the recorded application, the daemon. Everything it starts
+is ended by pid."""
 
 import os
 import pathlib
@@ -61,7 +61,8 @@ class Machine:
         return (self.folder / name).read_text(errors="replace")
 
     def _make_folders(self):
-        self.environment = {"PATH": os.environ.get("PATH", ""), "LANG": "C", "WAYLAND_DISPLAY": "", "HOME": str(self.folder)}
+        self.environment = {"PATH": os.environ.get("PATH", ""), "HOME": str(self.folder), "LANG": "C",
+                            "WAYLAND_DISPLAY": ""}
         for variable in ("RUNTIME_DIR", "CONFIG_HOME", "DATA_HOME", "STATE_HOME", "CACHE_HOME"):
             path = self.folder / variable.split("_")[0].lower()
             path.mkdir(mode=0o700)

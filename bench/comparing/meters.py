@@ -56,3 +56,10 @@ def pss(pid):
 
 def load():
     return float(pathlib.Path("/proc/loadavg").read_text().split()[0])
+
+
+def machine():
+    """What the figures were measured on, one line."""
+    model = next((line.partition(":")[2].strip() for line in pathlib.Path("/proc/cpuinfo").read_text().splitlines()
+                  if line.startswith("model name")), "unknown processor")
+    return f"{len(os.sched_getaffinity(0))} cores, {model}, {os.uname().sysname} {os.uname().release.split('-')[0]}"

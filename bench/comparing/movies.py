@@ -22,12 +22,15 @@ def probe(movie):
 def encoder_options(movie):
     """What the encoder wrote of its options into the stream."""
     found = re.search(rb"x264 - core .*? - options: ([^\0\x80]*)", movie.read_bytes(), re.S)
-    return dict(option.split("=", 1) for option in found.group(1).decode().split() if "=" in option) if found else None
+    if not found:
+        return None
+    return dict(option.split("=", 1) for option in found.group(1).decode().split() if "=" in option)
 
 
 def numbers(binaries, movie):
     """The frame number in each picture, None where none can be read."""
-    out = subprocess.run([str(binaries / "scene_pictures"), "numbers", str(movie)], check=True, capture_output=True, text=True)
+    out = subprocess.run([str(binaries / "scene_pictures"), "numbers", str(movie)], check=True, capture_output=True,
+                         text=True)
     return [None if number == "-" else int(number) for _, number in map(str.split, out.stdout.splitlines())]
 
 
@@ -39,8 +42,8 @@ def spread(items):
 
 
 def ssim(binaries, movie, size, sample):
-    """Structural similarity (ffmpeg's filter) of pictures with what was drawn: sample is (index in the movie, frame number).
-    Judged is what lies above the clock of the scene, as the time that it showed is not known any more."""
+    """Structural similarity (ffmpeg's filter) of pictures with what was drawn: sample is (index in the movie, frame
+    number). Judged is what lies above the clock of the scene, as the time that it showed is not known any more."""
     drawn = subprocess.run([str(binaries / "scene_pictures"), "redraw", size, *(str(number) for _, number in sample)],
                            check=True, capture_output=True).stdout
     width = int(size.split("x")[0])
@@ -49,8 +52,8 @@ def ssim(binaries, movie, size, sample):
     graph = (f"[0:v]select='{chosen}',setpts=N/60/TB,crop={area}:0:0,settb=1/60[movie];"
              "[1:v]scale=flags=bicubic+accurate_rnd:out_color_matrix=bt601:out_range=tv,format=yuv420p,"
              "setpts=N/60/TB,settb=1/60[drawn];[movie][drawn]ssim")
-    out = subprocess.run(["ffmpeg", "-hide_banner", "-i", str(movie), "-f", "rawvideo", "-pix_fmt", "bgr0", "-video_size",
-                          area.replace(":", "x"), "-framerate", "60", "-i", "pipe:0", "-lavfi", graph, "-f", "null", "-"],
-                         check=True, input=drawn, capture_output=True)
+    raw = ["-f", "rawvideo", "-pix_fmt", "bgr0", "-video_size", area.replace(":", "x"), "-framerate", "60"]
+    out = subprocess.run(["ffmpeg", "-hide_banner", "-i", str(movie), *raw, "-i", "pipe:0", "-lavfi", graph,
+                          "-f", "null", "-"], check=True, input=drawn, capture_output=True)
     found = re.search(r"SSIM Y:([\d.]+).*All:([\d.]+)", out.stderr.decode())
     return {"luma": float(found.group(1)), "all": float(found.group(2)), "pictures": len(sample)}

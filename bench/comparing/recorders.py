@@ -7,8 +7,8 @@ import signal
 
 from . import machine as machines
 
-# What linux/media/VideoEncoder.cpp gives libx264 (`describe` and `tune`), as options of ffmpeg's command line. The bit rate
-# comes from the daemon's log (`ENCODER` has a place for it).
+# What linux/media/VideoEncoder.cpp gives libx264 (`describe` and `tune`), as options of ffmpeg's command line. The bit
+# rate comes from the daemon's log.
 ENCODER = ("-pix_fmt yuv420p -c:v libx264 -threads 2 -preset ultrafast -tune zerolatency -profile:v high -g 60 -bf 0 "
            "-b:v {rate} -maxrate {rate} -bufsize {rate} -crf 20 -forced-idr 1 "
            "-x264-params 8x8dct=1:cabac=1:force-cfr=1:scenecut=0:keyint-min=1 "
@@ -48,8 +48,8 @@ class Ffmpeg:
         self.machine, self.movie = machine, machine.folder / "ffmpeg.mp4"
         self.process = None
         self.command = ["ffmpeg", "-nostdin", "-hide_banner", "-loglevel", "warning", "-f", "x11grab",
-                        "-window_id", machine.window, "-draw_mouse", "0", "-video_size", machine.size, "-framerate", "60",
-                        "-i", machine.environment["DISPLAY"]]
+                        "-window_id", machine.window, "-draw_mouse", "0", "-video_size", machine.size,
+                        "-framerate", "60", "-i", machine.environment["DISPLAY"]]
         self.command += [word.format(rate=rate) for word in ENCODER] + [str(self.movie)]
 
     def begin(self):

@@ -45,6 +45,7 @@ def lines(kind):
         ("bit rate, kbit/s", lambda f: f["movie"]["bit_rate"] / 1000, "{:.0f}"),
         ("SSIM, luma", lambda f: f["ssim"]["luma"], "{:.4f}"),
         ("SSIM, all planes", lambda f: f["ssim"]["all"], "{:.4f}"),
+        ("pictures judged by SSIM", lambda f: f["ssim"]["pictures"], "{:.0f}"),
         ("load average", lambda f: f["load"], "{:.2f}"),
     ]
 
@@ -61,14 +62,16 @@ def verdicts(kind, pairs):
     ratio = median(pairs, 0, both(unit)) / median(pairs, 1, both(unit))
     luma = [round(median(pairs, side, lambda figures: figures["ssim"]["luma"]), 3) for side in (0, 1)]
     return [
-        {"what": f"recorder + share, CPU per {'picture' if moving else 'second'}, ours / ffmpeg", "value": round(ratio, 4),
-         "target": f"<= {limit}", "met": ratio <= limit},
-        {"what": "SSIM of luma to three decimals, ours", "value": luma[0], "target": f">= {luma[1]}", "met": luma[0] >= luma[1]},
+        {"what": f"recorder + share, CPU per {'picture' if moving else 'second'}, ours / ffmpeg",
+         "value": round(ratio, 4), "target": f"<= {limit}", "met": ratio <= limit},
+        {"what": "SSIM of luma to three decimals, ours",
+         "value": luma[0], "target": f">= {luma[1]}", "met": luma[0] >= luma[1]},
     ]
 
 
 def show(kind, pairs):
-    print(f"\n{kind} window, {len(pairs)} rounds of {pairs[0][0]['seconds']:.0f} s; medians, then each round ours/ffmpeg\n")
+    print(f"\n{kind} window, {len(pairs)} rounds of {pairs[0][0]['seconds']:.0f} s;", end=" ")
+    print("medians, then each round ours/ffmpeg\n")
     print(f"| {'':<42} | {'ours':>9} | {'ffmpeg':>9} | {'ratio':>6} | rounds")
     print(f"|{'-' * 44}|{'-' * 11}|{'-' * 11}|{'-' * 8}|{'-' * 8}")
     for what, read, form in lines(kind):
@@ -78,7 +81,8 @@ def show(kind, pairs):
         print(f"| {what:<42} | {form.format(ours):>9} | {form.format(theirs):>9} | {ratio} | {each}")
     print()
     for verdict in verdicts(kind, pairs):
-        print(f"{'met   ' if verdict['met'] else 'MISSED'}  {verdict['what']}: {verdict['value']}, target {verdict['target']}")
+        word = "met   " if verdict["met"] else "MISSED"
+        print(f"{word}  {verdict['what']}: {verdict['value']}, target {verdict['target']}")
     show_likeness(pairs)
 
 

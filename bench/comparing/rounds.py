@@ -58,7 +58,7 @@ def record(kind, make, settings, rate, movie):
 
 
 def costs(display, recorder, alone, during, kind):
-    # A display with more to do draws fewer frames: a moving window's share without recording is counted per frame drawn.
+    # A busy machine draws fewer frames: what the display spends without recording is counted per frame drawn.
     scale = during.drawn / alone.drawn if kind == "moving" and alone.drawn > 0 else during.seconds / alone.seconds
     return {
         "seconds": during.seconds, "load": during.load, "drawn_alone": alone.drawn,
@@ -78,18 +78,19 @@ def contents(figures, during, kind):
     numbers = figures["numbers"]
     if kind == "still":
         pictures = figures["movie"]["pictures"] * during.seconds / figures["movie"]["seconds"]
-        return {"drawn": 1, "distinct": len({number for number in numbers if number}), "pictures": pictures,
+        return {"drawn": 1, "distinct": len(set(numbers) - {None}), "pictures": pictures,
                 "unreadable": numbers.count(None)}
     inside = [number for number in numbers if number and during.first <= number <= during.last]
-    return {"drawn": during.drawn, "distinct": len(set(inside)), "pictures": len(inside), "unreadable": numbers.count(None),
-            "first": during.first, "last": during.last}
+    return {"drawn": during.drawn, "distinct": len(set(inside)), "pictures": len(inside),
+            "unreadable": numbers.count(None), "first": during.first, "last": during.last}
 
 
 def sample(kind, ours, theirs):
     """Pictures of both movies to be judged: (index, frame number) each. Where the window moves, the same frames."""
     both = [ours["numbers"], theirs["numbers"]]
     if kind == "still":
-        return [[(index, numbers[index]) for index in movies.spread(range(len(numbers))) if numbers[index]] for numbers in both]
+        return [[(index, numbers[index]) for index in movies.spread(range(len(numbers))) if numbers[index]]
+                for numbers in both]
     common = sorted((set(both[0]) & set(both[1])) - {None})
     if not common:
         raise RuntimeError("the two movies have no frame in common")
