@@ -39,7 +39,7 @@ std::string unescaped(std::string_view text) {
 }
 
 /// The arguments of an Exec value (section "The Exec key"): separated by blanks, quoted in whole by double quotes,
-/// where a backslash protects what follows. None when a quote is not closed.
+/// where a backslash protects what follows; "%%" is a percent sign. None when a quote is not closed.
 std::optional<std::vector<std::string>> arguments(std::string_view exec) {
     std::vector<std::string> result;
     bool inArgument = false;
@@ -58,6 +58,8 @@ std::optional<std::vector<std::string>> arguments(std::string_view exec) {
         if (c == '"')
             quoted = !quoted;
         else if (quoted && c == '\\' && at + 1 < exec.size())
+            result.back() += exec[++at];
+        else if (c == '%' && exec.substr(at).starts_with("%%"))
             result.back() += exec[++at];
         else
             result.back() += c;

@@ -75,6 +75,8 @@ TEST(DesktopEntry, TheProgramIsTheFirstArgumentUnquoted) {
     EXPECT_EQ(program("player %f --x"), "player");
     EXPECT_EQ(program("\"a \\\\\"b\\\\\" c\" d"), "a \"b\" c");
     EXPECT_EQ(program("  player"), "player");
+    EXPECT_EQ(program("\"100 %% player\""), "100 % player");
+    EXPECT_EQ(program("player%%"), "player%");
 }
 
 TEST(DesktopEntry, EnvAndItsVariablesArePassedOver) {
