@@ -24,6 +24,7 @@ LCRecordingSession::LCRecordingSession(const SessionServices& services, BundleId
       log_(services.platform.log),
       bundleID_(std::move(bundleID)),
       broadcastServiceInfoQueue_(services.platform.scheduler.serialQueue("com.orvane.lumacastd.ServiceInfoQueue")),
+      pathClaim_(services.tempStore.lastClaim()),
       shouldStopLock_(services.platform.scheduler.ownerlessLock()) {}
 
 void LCRecordingSession::setWindowSize(Size size) {

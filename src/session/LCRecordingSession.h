@@ -189,8 +189,9 @@ private:
     std::optional<LCBroadcastConfiguration> broadcastConfiguration_;
     std::int64_t chipId_ = 0;
 
-    /// The claim of this session's last writer on its path, see TempStore::claimPath.
-    std::uint64_t pathClaim_ = 0;
+    /// The claim of this session's last writer on its path, see TempStore::claimPath; what was written before a session
+    /// began is its own too: the application came back.
+    std::uint64_t pathClaim_;
     std::atomic<std::uint64_t> starts_{0};  ///< counts startSessionWithHandler
     std::atomic<std::uint64_t> stops_{0};  ///< counts stops of a running recording
     std::atomic<bool> stopIsRunning_{false};  ///< the frame lane and the request lane may both stop; one does

@@ -94,6 +94,11 @@ std::uint64_t TempStore::claimPath(const std::string& path) {
     return removals_->claims[path] = ++removals_->lastClaim;
 }
 
+std::uint64_t TempStore::lastClaim() const {
+    const std::lock_guard lock(removals_->mutex);
+    return removals_->lastClaim;
+}
+
 std::uint64_t TempStore::_srDeviceFreeDiskSpace() const {
     const auto answer = fileSystem_.freeSize(_srTempPath());
     const auto* bytes = std::get_if<std::uint64_t>(&answer);

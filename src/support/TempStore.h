@@ -41,6 +41,9 @@ public:
 
     /// A number for a writer that is about to write `path`; later writers of the same path get larger ones.
     std::uint64_t claimPath(const std::string& path);
+    /// The last claim that was given out: who has not written yet removes as its holder, and so spares what is begun
+    /// from now on.
+    std::uint64_t lastClaim() const;
     /// The same removal for the file that the writer with this claim has left: when it is its turn and a later writer
     /// has claimed the path, the file is that writer's and stays; completes with none then.
     void removeFileOfClaim(const URL& url, std::uint64_t claim, Completion completion);
