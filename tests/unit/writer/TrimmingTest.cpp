@@ -95,7 +95,7 @@ public:
     struct Exporter final : MovieExporter {
         Exporter(CancellingExporters& theOwner, URL theURL) : owner(theOwner), url(std::move(theURL)) {}
         URL outputURL() const override { return url; }
-        void setTimeRange(MediaTimeRange range) override { owner.range = range; }
+        void setTimeRange(MediaTimeRange given) override { owner.range = given; }
         void exportAsynchronously(Completion completion) override {
             completion(ExportStatus::Cancelled, Error("cancelled", 125));
         }
