@@ -26,7 +26,6 @@ constexpr std::array kInt32{A::Int32};
 constexpr std::array kUInt32{A::UInt32};
 constexpr std::array kStateReply{A::NullableDictionary};
 constexpr std::array kStopped{A::NullableError, A::NullableURL};
-constexpr std::array kServiceInfo{A::NullableDictionary};
 constexpr std::array kVideoSample{A::SharedPlaneObject, A::Data};
 constexpr std::array kAudioSample{A::Data, A::Data, A::Int64, A::Int64, A::Data};
 constexpr std::array kAny{A::Any};
@@ -45,7 +44,7 @@ constexpr std::array kDaemonMessages{
     MessageDeclaration{"stopRecordingWithHandler:", kNothing, Reply::Expected, kStopReply},
     MessageDeclaration{"stopRecordingWithStartClipDuration:endClipDuration:handler:", kClip, Reply::Expected,
                        kStopReply},
-    MessageDeclaration{"saveVideoToCameraRoll:handler:", kURL, Reply::Expected, kErrorReply},
+    MessageDeclaration{"saveVideoToCameraRoll:handler:", kNullableURL, Reply::Expected, kErrorReply},
     MessageDeclaration{"pauseRecording", kNothing},
     MessageDeclaration{"resumeRecordingWithWindowLayerContextID:", kUInt32},
     MessageDeclaration{"setMicrophoneEnabled:", kBool},
@@ -64,7 +63,7 @@ constexpr std::array kDaemonMessages{
 constexpr std::array kClientMessages{
     MessageDeclaration{"updateScreenRecordingState:", kBool},
     MessageDeclaration{"stopRecordingWithError:movieURL:", kStopped},
-    MessageDeclaration{"updateBroadcastServiceInfo:", kServiceInfo},
+    MessageDeclaration{"updateBroadcastServiceInfo:", kAny},
     MessageDeclaration{"updateBroadcastURL:", kNullableURL},
     MessageDeclaration{"captureHandlerWithSample:timingData:", kVideoSample},
     MessageDeclaration{"captureHandlerWithAudioSample:absdData:itemCount:bufferType:timingData:", kAudioSample},

@@ -24,7 +24,7 @@ void LCClientProxy::stopRecordingWithError(const std::optional<Error>& error, co
     });
 }
 
-void LCClientProxy::updateBroadcastServiceInfo(const Dictionary& info) {
+void LCClientProxy::updateBroadcastServiceInfo(const Value& info) {
     log_.line("LCClientProxy:updateBroadcastServiceInfo:");
     send(ClientMessage::UpdateBroadcastServiceInfo, {info}, [&log = log_](const Error& error) {
         log.line("LCClientProxy:updateBroadcastServiceInfo: error getting remote proxy: %d", error.code());

@@ -26,7 +26,7 @@ public:
 
     void updateScreenRecordingState(bool on) override;
     void stopRecordingWithError(const std::optional<Error>& error, const std::optional<URL>& movieURL) override;
-    void updateBroadcastServiceInfo(const Dictionary& info) override;
+    void updateBroadcastServiceInfo(const Value& info) override;
     void updateBroadcastURL(const URL& url) override;
     void captureHandlerWithSample(const std::shared_ptr<SharedPlane>& plane, const Data& timingData) override;
     void captureHandlerWithAudioSample(const Data& sample, const Data& absdData, std::int64_t itemCount,

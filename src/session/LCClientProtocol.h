@@ -25,7 +25,8 @@ public:
 
     virtual void updateScreenRecordingState(bool on) = 0;
     virtual void stopRecordingWithError(const std::optional<Error>& error, const std::optional<URL>& movieURL) = 0;
-    virtual void updateBroadcastServiceInfo(const Dictionary& info) = 0;
+    /// `info` is whatever the extension sent.
+    virtual void updateBroadcastServiceInfo(const Value& info) = 0;
     virtual void updateBroadcastURL(const URL& url) = 0;
     /// `timingData` is the frame's SampleTiming record, 72 bytes.
     virtual void captureHandlerWithSample(const std::shared_ptr<SharedPlane>& plane, const Data& timingData) = 0;

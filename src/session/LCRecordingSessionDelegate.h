@@ -15,9 +15,9 @@ public:
     /// `recordingSession:stoppedWithError:` — the session stopped by itself, or was told to stop with notification.
     virtual void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
                                                   const std::optional<Error>& error) = 0;
-    /// `broadcastSession:didUpdateServiceInfo:`
+    /// `broadcastSession:didUpdateServiceInfo:` — whatever the extension sent, passed on as it is.
     virtual void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<LCRecordingSession>& session,
-                                                      const Dictionary& info) = 0;
+                                                      const Value& info) = 0;
     /// `broadcastSession:didUpdateDuration:` — sent for every captured sample, from its lane.
     virtual void broadcastSessionDidUpdateDuration(LCRecordingSession& session, double seconds) = 0;
 };

@@ -16,7 +16,10 @@ constexpr TelemetrySession kSession{23, 1, 0, true, true};
 constexpr std::int64_t kCategory = 2;
 
 /// To single precision and then to the nearest whole number.
-std::int64_t rounded(double value) { return std::lround(static_cast<float>(value)); }
+std::int64_t rounded(double value) {
+    const float single = static_cast<float>(value);
+    return std::abs(single) < 0x1p63F ? std::llround(single) : 0;  // what no whole number is near counts as 0
+}
 
 }  // namespace
 

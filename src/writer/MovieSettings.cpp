@@ -21,7 +21,8 @@ constexpr std::size_t kChannelLayoutSize = 32;
 /// The integer a preference stands for; a text is read as its leading integer, anything else counts as 0.
 std::int64_t integerValue(const Value& value) {
     if (const auto* number = value.as<std::int64_t>()) return *number;
-    if (const auto* number = value.as<double>()) return static_cast<std::int64_t>(*number);
+    if (const auto* number = value.as<double>())
+        return std::abs(*number) < 0x1p63 ? static_cast<std::int64_t>(*number) : 0;  // not a number: 0 too
     if (const auto* flag = value.as<bool>()) return *flag ? 1 : 0;
     if (const auto* text = value.as<std::string>()) return std::strtoll(text->c_str(), nullptr, 10);
     return 0;

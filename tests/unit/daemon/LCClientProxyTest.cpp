@@ -37,7 +37,7 @@ std::vector<Case> cases() {
          "LCClientProxy:recordingDidStopWithError:" + refused},
         {ClientMessage::UpdateBroadcastServiceInfo,
          [](auto& p) {
-             p.updateBroadcastServiceInfo({{"viewers", std::int64_t{3}}});
+             p.updateBroadcastServiceInfo(Dictionary{{"viewers", std::int64_t{3}}});
          },
          {Dictionary{{"viewers", std::int64_t{3}}}},
          "LCClientProxy:updateBroadcastServiceInfo:",

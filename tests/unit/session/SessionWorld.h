@@ -21,7 +21,7 @@ public:
                                           const std::optional<Error>& error) override {
         stops.push_back(error ? error->code() : 0);
     }
-    void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<LCRecordingSession>&, const Dictionary&) override {}
+    void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<LCRecordingSession>&, const Value&) override {}
     void broadcastSessionDidUpdateDuration(LCRecordingSession&, double seconds) override {
         durations.push_back(seconds);
     }
