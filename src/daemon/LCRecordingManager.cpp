@@ -14,11 +14,13 @@ constexpr char kServiceName[] = "com.orvane.lumacastd";
 
 }  // namespace
 
-LCRecordingManager::LCRecordingManager(const SessionServices& services)
-    : services_(services), platform_(services.platform), log_(services.platform.log) {}
+LCRecordingManager::LCRecordingManager(const SessionServices& services, AlertQueue& alertQueue)
+    : services_(services), platform_(services.platform), log_(services.platform.log), alertQueue_(alertQueue) {}
 
-std::shared_ptr<LCRecordingManager> LCRecordingManager::init(const SessionServices& services) {
-    std::shared_ptr<LCRecordingManager> manager(new LCRecordingManager(services));
+std::shared_ptr<LCRecordingManager> LCRecordingManager::init(const SessionServices& services, AlertQueue& alertQueue,
+                                                             SessionMaker makeSession) {
+    std::shared_ptr<LCRecordingManager> manager(new LCRecordingManager(services, alertQueue));
+    manager->makeSession_ = std::move(makeSession);
     services.tempStore._srSetupTempDirectory();
     manager->publicListener_ = services.platform.ipc.listenerForService(kServiceName);
     manager->publicListener_->setDelegate(manager);
@@ -41,11 +43,16 @@ bool LCRecordingManager::listenerShouldAcceptNewConnection(IpcListener&,
     connection->setExportedObject(weak_from_this());
     connection->setExportedInterface(daemonProtocol());
     connection->setRemoteInterface(clientProtocol());
-    connection->setInterruptionHandler([self = shared_from_this(), id = *bundleID] {
+    // Weak: the registry holds the connection.
+    connection->setInterruptionHandler([weak = weak_from_this(), id = *bundleID] {
+        const auto self = weak.lock();
+        if (!self) return;
         self->log_.line("connection INTERRUPTED");
         self->applicationDisconnectedWithBundleID(id);
     });
-    connection->setInvalidationHandler([self = shared_from_this(), id = *bundleID] {
+    connection->setInvalidationHandler([weak = weak_from_this(), id = *bundleID] {
+        const auto self = weak.lock();
+        if (!self) return;
         self->log_.line("connection INVALID");
         self->applicationDisconnectedWithBundleID(id);
     });
@@ -60,7 +67,9 @@ bool LCRecordingManager::listenerShouldAcceptNewConnection(IpcListener&,
         }
     }
     session->setClientProxy(std::make_shared<LCClientProxy>(log_, *bundleID, connection));
+    session->managerRecord.connection = connection;
     connection->resume();
+    expireAcknowledgementExemptionsForBundleID(*bundleID);
     return true;
 }
 
@@ -73,11 +82,9 @@ void LCRecordingManager::applicationDisconnectedWithBundleID(const BundleIdentif
         if (const auto proxy = session->clientProxy()) proxy->setConnection(nullptr);
         return;
     }
-    const bool wasRecording = session->isRecording();
     stopRecordingSession(session, 0, 0, {});
     removeSessionForBundleID(bundleID);
-    // A stop that will never be answered (a failed trim, say) has left its transaction open.
-    if (!wasRecording && session->managerRecord.transactionOf) resetStatesForSession(session);
+    resetUnansweredStops(session);
 }
 
 std::optional<BundleIdentifier> LCRecordingManager::bundleIDOfProcess(ProcessID pid) {
@@ -105,7 +112,8 @@ std::shared_ptr<LCRecordingSession> LCRecordingManager::recordingSessionForBundl
     log_.line("LCRecordingManager:recordingSessionForBundleID");
     if (auto session = registeredSession(bundleID)) return session;
     log_.line("no session, creating a new one");
-    auto session = std::make_shared<LCRecordingSession>(services_, bundleID);
+    auto session = makeSession_ ? makeSession_(services_, bundleID)
+                                : std::make_shared<LCRecordingSession>(services_, bundleID);
     bundleIDToRecordingSessionLookup_.emplace_back(bundleID, session);
     return session;
 }

@@ -2,13 +2,16 @@
 // The daemon's one central object.
 
 #include <functional>
+#include <map>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
 #include "base/Identifiers.h"
 #include "base/MessageTables.h"
+#include "daemon/AlertQueue.h"
 #include "platform/Platform.h"
 #include "session/LCRecordingSession.h"
 
@@ -36,8 +39,17 @@ public:
     using StopHandler = std::function<void(std::optional<URL>, std::optional<Error>)>;
     using Handler = std::function<void()>;
 
-    /// `init` — sets up the temporary directory and the listener, which is not resumed yet.
-    static std::shared_ptr<LCRecordingManager> init(const SessionServices& services);
+    /// Makes the session of an application.
+    using SessionMaker =
+        std::function<std::shared_ptr<LCRecordingSession>(const SessionServices&, const BundleIdentifier&)>;
+
+    /// `init` — sets up the temporary directory and the listener, which is not resumed yet. An empty maker makes the
+    /// real sessions.
+    static std::shared_ptr<LCRecordingManager> init(const SessionServices& services, AlertQueue& alertQueue,
+                                                    SessionMaker makeSession);
+
+    /// `lumaAlertQueue` — the process's, see AlertQueue.
+    SerialQueue& lumaAlertQueue() { return alertQueue_.get(); }
 
     /// `finishStartup` — from now on connections are accepted.
     void finishStartup();
@@ -55,6 +67,17 @@ public:
     /// The registered session, or null; creates nothing.
     std::shared_ptr<LCRecordingSession> registeredSession(const BundleIdentifier& bundleID) const;
 
+    // Exemptions from the question to the user.
+    /// `exemptBundleIdentifiers` — deliberately the set of recordings with the microphone while one is wanted.
+    const std::set<BundleIdentifier>& exemptBundleIdentifiers() const;
+    bool isExemptFromAcknowledgementAlertSession(const LCRecordingSession& session) const;
+    void updateExemptionListWithSession(const LCRecordingSession& session);
+    void expireAcknowledgementExemptionsForBundleID(const std::optional<BundleIdentifier>& bundleID);
+
+    /// `isMicrophoneRecording` and `isCameraRecording` — what the last start that got that far asked for.
+    bool isMicrophoneRecording() const { return microphoneRecording_; }
+    bool isCameraRecording() const { return cameraRecording_; }
+
     /// Sessions and their recordings, for the administrator.
     Dictionary snapshot() const;
 
@@ -62,18 +85,24 @@ public:
     void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
                                           const std::optional<Error>& error) override;
     void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<LCRecordingSession>& session,
-                                              const Dictionary& info) override;
+                                              const Value& info) override;
     /// Deliberately does nothing.
     void broadcastSessionDidUpdateDuration(LCRecordingSession&, double) override {}
 
 private:
-    explicit LCRecordingManager(const SessionServices& services);
+    LCRecordingManager(const SessionServices& services, AlertQueue& alertQueue);
 
     // Connections.
     void applicationDisconnectedWithBundleID(const BundleIdentifier& bundleID);
     std::optional<BundleIdentifier> bundleIDOfProcess(ProcessID pid);
     std::optional<BundleIdentifier> getCallingConnectionBundleID();
     std::shared_ptr<LCRecordingSession> getCallingConnectionRecordingSession();
+
+    // Alerts that this system does not show: they deliberately answer true at once.
+    static bool showAlertForRecordingSession(const LCRecordingSession&, const std::optional<Error>&) { return true; }
+    static bool showAlertForBroadcastSession(const LCRecordingSession&, const std::optional<Error>&) { return true; }
+    static bool showResumeBroadcastAlertWithSession(const LCRecordingSession&, ContextID) { return true; }
+    static bool showStopRecordingAlert() { return true; }
 
     // Requests.
     void startRecording(const StartRequest& request, StartHandler handler);
@@ -82,12 +111,17 @@ private:
     void pauseRecording();
     void resumeRecordingWithWindowLayerContextID(ContextID contextID);
     void discardRecordingWithHandler(Handler handler);
+    void setMicrophoneEnabled(bool enabled);
+    void updateProcessIDForAudioCaptureWithPID(ProcessID pid);
+    void clientDidBecomeActive();
+    void clientDidResignActive();
     std::optional<Dictionary> synchronousGetCurrentState();
 
     // Starting.
     bool checkContextIDsMatch(const std::vector<ContextID>& contextIDs);
     void startProper(const std::shared_ptr<LCRecordingSession>& session, const StartRequest& request,
                      std::uint64_t number, StartHandler handler);
+    void logRefusal(std::uint64_t number, RecordingErrorCode code, std::string_view reason);
     void refuse(std::uint64_t number, RecordingErrorCode code, std::string_view reason, const StartHandler& handler);
     void stopCurrentRecordingSessionWithHandler(Handler handler);
     void interruptOtherRecordingSessionAgainstSession(const std::shared_ptr<LCRecordingSession>& session);
@@ -96,10 +130,17 @@ private:
     // Stopping.
     void stopRecordingSession(const std::shared_ptr<LCRecordingSession>& session, double startClipDuration,
                               double endClipDuration, StopHandler handler);
-    void resetStatesForSession(const std::shared_ptr<LCRecordingSession>& session);
+    /// `resetStatesForSession:` — ends what the start with this generation began; a newer start's flags are left alone.
+    void resetStatesForSession(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation);
     void resetAfterStop(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation);
+    /// Notes that a stop may still be answered, until the last copy of what is returned has gone.
+    std::shared_ptr<void> noteStopUnderWay(const std::shared_ptr<LCRecordingSession>& session,
+                                           std::uint64_t generation);
+    /// Resets after stops that never will be answered: a failed trim, say.
+    void resetUnansweredStops(const std::shared_ptr<LCRecordingSession>& session);
+    void clearSystemRecordingUI(const LCRecordingSession& session);
     void discardInterruptedRecording(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation,
-                                     const std::optional<URL>& movieURL);
+                                     std::uint64_t claim, const std::optional<URL>& movieURL);
     void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
                                           const std::optional<Error>& error, const std::optional<URL>& movieURL);
     void recordingSessionInterrupted(const std::shared_ptr<LCRecordingSession>& session,
@@ -113,8 +154,12 @@ private:
     const SessionServices services_;
     const Platform platform_;
     Log& log_;
+    AlertQueue& alertQueue_;
 
+    SessionMaker makeSession_;
     std::shared_ptr<IpcListener> publicListener_;
+    std::set<BundleIdentifier> exemptBundleIdentifiers_, exemptWithMicRecordingEnabledBundleIdentifiers_;
+    std::map<BundleIdentifier, Date> lastBackgroundDateByBundleIdentifier_;
     std::vector<std::pair<BundleIdentifier, std::shared_ptr<LCRecordingSession>>> bundleIDToRecordingSessionLookup_;
     bool didAcceptResume_ = false;
     bool microphoneRecording_ = false, cameraRecording_ = false;

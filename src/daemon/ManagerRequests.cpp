@@ -74,6 +74,13 @@ void LCRecordingManager::receiveMessage(const std::shared_ptr<IpcConnection>& co
         case DaemonMessage::SetMicrophoneEnabledPersistent:
             withSession([&](LCRecordingSession& s) { s.setMicrophoneEnabledPersistent(argument<bool>(arguments, 0)); });
             break;
+        case DaemonMessage::SetMicrophoneEnabled: setMicrophoneEnabled(argument<bool>(arguments, 0)); break;
+        case DaemonMessage::UpdateProcessIDForAudioCapture:
+            updateProcessIDForAudioCaptureWithPID(
+                ProcessID{static_cast<std::int32_t>(argument<std::int64_t>(arguments, 0))});
+            break;
+        case DaemonMessage::ClientDidBecomeActive: clientDidBecomeActive(); break;
+        case DaemonMessage::ClientDidResignActive: clientDidResignActive(); break;
         case DaemonMessage::ReportCameraUsage: break;  // deliberately accepted and ignored
         default:
             log_.error("message %d is declared, but this daemon does not serve it", message);
@@ -92,20 +99,36 @@ void LCRecordingManager::resumeRecordingWithWindowLayerContextID(ContextID conte
     const auto session = getCallingConnectionRecordingSession();
     if (!session) return;
     // Nothing ever accepts the resume of a broadcast: it deliberately ends here, paused or not.
-    if (session->isBroadcasting() && session->isRecording() && !session->isSystemRecording() && !didAcceptResume_)
+    if (session->isBroadcasting() && session->isRecording() && !session->isSystemRecording() && !didAcceptResume_) {
+        showResumeBroadcastAlertWithSession(*session, contextID);
         return;
+    }
     didAcceptResume_ = false;
-    const bool resumable = !session->isSystemRecording() && session->isRecording() && session->isPaused();
+    const auto isResumable = [&] {
+        return !session->isSystemRecording() && session->isRecording() && session->isPaused();
+    };
     if (checkContextIDsMatch({contextID})) {
         log_.line("LCRecordingManager: resumeRecording");
-        if (resumable) session->resumeSessionWithContextID(contextID);
-    } else if (resumable) {
+        if (isResumable()) session->resumeSessionWithContextID(contextID);
+    } else if (isResumable()) {
         stopRecordingSession(
             session, 0, 0, [self = shared_from_this(), session](std::optional<URL> url, std::optional<Error>) {
                 self->recordingSessionStoppedWithError(
                     session, self->services_.errors._lcUserErrorForCode(RecordingErrorCode::NoContextIDMatch), url);
             });
     }
+}
+
+void LCRecordingManager::setMicrophoneEnabled(bool enabled) {
+    log_.line("LCRecordingManager: setMicrophoneEnabled:%i", enabled);
+    const auto session = getCallingConnectionRecordingSession();
+    if (session && session->isRecording()) session->setMicrophoneEnabled(enabled);
+}
+
+void LCRecordingManager::updateProcessIDForAudioCaptureWithPID(ProcessID pid) {
+    log_.line("LCRecordingManager: updateProcessIDForAudioCaptureWithPID:%i", pid);
+    const auto session = getCallingConnectionRecordingSession();
+    if (session && session->isRecording()) session->setFrontmostPIDForAudioTap(pid);
 }
 
 std::optional<Dictionary> LCRecordingManager::synchronousGetCurrentState() {

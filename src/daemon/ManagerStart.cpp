@@ -23,9 +23,13 @@ bool LCRecordingManager::checkContextIDsMatch(const std::vector<ContextID>& cont
     return true;  // an empty list deliberately passes
 }
 
+void LCRecordingManager::logRefusal(std::uint64_t number, RecordingErrorCode code, std::string_view reason) {
+    log_.line("start request %lu refused with %d: %@", number, code, reason);
+}
+
 void LCRecordingManager::refuse(std::uint64_t number, RecordingErrorCode code, std::string_view reason,
                                 const StartHandler& handler) {
-    log_.line("start request %lu refused with %d: %@", number, code, reason);
+    logRefusal(number, code, reason);
     handler(services_.errors._lcUserErrorForCode(code), false, false);
 }
 
@@ -47,12 +51,8 @@ void LCRecordingManager::startRecording(const StartRequest& request, StartHandle
                       handler);
     log_.line(
         "LCRecordingManager:startRecordingWindowLayerContextID:windowSize:microphoneEnabled:streaming:withHandler:");
-    stopCurrentRecordingSessionWithHandler([this, session, &request, number, &handler] {
-        if (!session)
-            return refuse(number, RecordingErrorCode::FailedToStart, "the application has no session any more",
-                          handler);
-        startProper(session, request, number, std::move(handler));
-    });
+    stopCurrentRecordingSessionWithHandler(
+        [this, session, &request, number, &handler] { startProper(session, request, number, std::move(handler)); });
 }
 
 void LCRecordingManager::startProper(const std::shared_ptr<LCRecordingSession>& session, const StartRequest& request,
@@ -61,7 +61,8 @@ void LCRecordingManager::startProper(const std::shared_ptr<LCRecordingSession>& 
         log_.line("insufficient disk space for recording, calling handler with error");
         return refuse(number, RecordingErrorCode::InsufficientStorage, "100 MB must be free", handler);
     }
-    if (!isApplicationInForegroundWithBundleIdentifier(session->bundleID())) {
+    // A session that has gone is nobody's, and nobody is in the foreground.
+    if (!session || !isApplicationInForegroundWithBundleIdentifier(session->bundleID())) {
         log_.line("app is not in the foreground, calling handler with error");
         return refuse(number, RecordingErrorCode::FailedToStart, "the application is not in the foreground", handler);
     }
@@ -70,7 +71,7 @@ void LCRecordingManager::startProper(const std::shared_ptr<LCRecordingSession>& 
     const auto preference = platform_.preferences.value(kPreferenceDomain, "LCSuppressAlert");
     const bool* suppressAlert = preference ? preference->as<bool>() : nullptr;
     log_.line("LCRecordingManager: suppressAlert=%d", suppressAlert && *suppressAlert);
-    if (!suppressAlert || !*suppressAlert)
+    if ((!suppressAlert || !*suppressAlert) && !isExemptFromAcknowledgementAlertSession(*session))
         return refuse(number, RecordingErrorCode::UserDeclined,
                       "this daemon can't ask the user; the preference LCSuppressAlert is not set", handler);
     if (request.captureEnabled)
@@ -78,15 +79,15 @@ void LCRecordingManager::startProper(const std::shared_ptr<LCRecordingSession>& 
                       handler);
 
     log_.line("starting...");
-    // A stop that will never be answered may have left an older transaction open.
-    if (session->managerRecord.transactionOf) resetStatesForSession(session);
+    resetUnansweredStops(session);
     const std::uint64_t generation = ++session->managerRecord.startGeneration;
-    session->managerRecord.transactionOf = generation;
+    session->managerRecord.openTransactions.push_back(generation);
     beginTransaction();
     if (request.broadcast) {
         log_.line("broadcast requested");
         log_.line("attempted to start broadcast without a session, bailing out");
-        resetStatesForSession(session);
+        resetStatesForSession(session, generation);
+        logRefusal(number, RecordingErrorCode::InvalidBroadcastSession, "no broadcast has been set up");
         // Deliberately without user info, so without description.
         handler(Error(std::string(kRecordingErrorDomain),
                       static_cast<std::int64_t>(RecordingErrorCode::InvalidBroadcastSession)),
@@ -120,18 +121,20 @@ void LCRecordingManager::stopCurrentRecordingSessionWithHandler(Handler handler)
     const auto sessions = bundleIDToRecordingSessionLookup_;
     for (const auto& [id, session] : sessions) {
         if (!session->isRecording()) continue;
-        const std::uint64_t generation = session->managerRecord.startGeneration;
-        stopRecordingSession(session, 0, 0, [self = shared_from_this(), session, generation](std::optional<URL> url,
-                                                                                         std::optional<Error>) {
-            self->discardInterruptedRecording(session, generation, url);
-        });
+        stopRecordingSession(session, 0, 0,
+                             [self = shared_from_this(), session,
+                              generation = session->managerRecord.startGeneration,
+                              claim = session->pathClaim()](const std::optional<URL>& url, const std::optional<Error>&) {
+                                 self->discardInterruptedRecording(session, generation, claim, url);
+                             });
     }
     // Deliberately without waiting for the stops to complete.
     if (handler) handler();
 }
 
 void LCRecordingManager::discardInterruptedRecording(const std::shared_ptr<LCRecordingSession>& session,
-                                                     std::uint64_t generation, const std::optional<URL>& movieURL) {
+                                                     std::uint64_t generation, std::uint64_t claim,
+                                                     const std::optional<URL>& movieURL) {
     auto tellClient = [self = shared_from_this(), session] {
         self->onRequestLane([self, session] {
             if (const auto proxy = session->clientProxy())
@@ -143,10 +146,9 @@ void LCRecordingManager::discardInterruptedRecording(const std::shared_ptr<LCRec
         session->finishAndCleanupSessionFilesWithHandler(std::move(tellClient));
         return;
     }
-    // The application has started anew meanwhile: only this stop's own movie goes, where the new writer has another
-    // path.
-    const auto writer = session->movieWriter();
-    if (movieURL && !(writer && writer->outputURL() == *movieURL)) services_.tempStore._srRemoveFile(*movieURL, {});
+    // The application has started anew meanwhile: only this stop's own movie goes, and not where a later writer has
+    // its path.
+    if (movieURL) services_.tempStore.removeFileOfClaim(*movieURL, claim, {});
     tellClient();
 }
 
@@ -157,15 +159,16 @@ void LCRecordingManager::interruptOtherRecordingSessionAgainstSession(
     for (const auto& [id, other] : sessions) {
         if (id == session->bundleID()) continue;
         // Idle sessions are asked too: they stay silent.
-        other->finishSessionWithHandler([self = shared_from_this(), other = other](std::optional<URL> url,
-                                                                                   std::optional<Error> error) {
-            self->onRequestLane([self, other, url, error] {
-                self->log_.line("interrupted session");
-                self->recordingSessionInterrupted(other, error, url);
-                other->setInterruptedMovieURL(url);
-                self->resetStatesForSession(other);
+        other->finishSessionWithHandler(
+            [self = shared_from_this(), other = other, generation = other->managerRecord.startGeneration](
+                const std::optional<URL>& url, const std::optional<Error>& error) {
+                self->onRequestLane([self, other, generation, url, error] {
+                    self->log_.line("interrupted session");
+                    self->recordingSessionInterrupted(other, error, url);
+                    other->setInterruptedMovieURL(url);
+                    self->resetStatesForSession(other, generation);
+                });
             });
-        });
     }
 }
 

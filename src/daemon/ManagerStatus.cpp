@@ -33,7 +33,7 @@ Dictionary LCRecordingManager::snapshot() const {
         Dictionary entry{{"bundleID", id.text()},
                          {"connected", connection != nullptr},
                          {"recording", session->isRecording()},
-                         {"transactionOpen", session->managerRecord.transactionOf.has_value()}};
+                         {"transactionOpen", !session->managerRecord.openTransactions.empty()}};
         if (connection) entry.set("pid", number(connection->processIdentifier()));
         if (session->isRecording()) entry.set("current", describeRecording(*session));
         sessions.emplace_back(std::move(entry));

@@ -20,20 +20,22 @@ void LCRecordingManager::stopRecordingWithStartClipDuration(double startClipDura
 void LCRecordingManager::stopRecordingSession(const std::shared_ptr<LCRecordingSession>& session,
                                               double startClipDuration, double endClipDuration, StopHandler handler) {
     log_.line("LCRecordingManager: stopRecordingSession:handler:");
+    clearSystemRecordingUI(*session);
     if (!session->isRecording()) return;
     const std::uint64_t generation = session->managerRecord.startGeneration;
+    const auto underWay = noteStopUnderWay(session, generation);
     if (!handler) {
         // A recording that nobody waits for is deliberately thrown away.
         log_.line("recording stopped without handler!");
-        session->finishAndCleanupSessionFilesWithHandler([self = shared_from_this(), session, generation] {
+        session->finishAndCleanupSessionFilesWithHandler([self = shared_from_this(), session, generation, underWay] {
             self->onRequestLane([self, session, generation] { self->resetAfterStop(session, generation); });
         });
         return;
     }
     session->finishSessionWithStartClipDuration(
         startClipDuration, endClipDuration,
-        [self = shared_from_this(), session, generation, handler = std::move(handler)](std::optional<URL> url,
-                                                                                       std::optional<Error> error) {
+        [self = shared_from_this(), session, generation, underWay, handler = std::move(handler)](
+            const std::optional<URL>& url, const std::optional<Error>& error) {
             self->onRequestLane([self, session, generation, handler, url, error] {
                 handler(url, error);
                 self->resetAfterStop(session, generation);
@@ -41,20 +43,42 @@ void LCRecordingManager::stopRecordingSession(const std::shared_ptr<LCRecordingS
         });
 }
 
-void LCRecordingManager::resetAfterStop(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation) {
-    // A newer start has ended this recording's transaction itself and is left alone; so is a session that was reset
-    // already.
-    if (session->managerRecord.transactionOf == generation) resetStatesForSession(session);
+std::shared_ptr<void> LCRecordingManager::noteStopUnderWay(const std::shared_ptr<LCRecordingSession>& session,
+                                                           std::uint64_t generation) {
+    session->managerRecord.stopsUnderWay.push_back(generation);
+    // Answered or dropped, the completion lets this go.
+    return {nullptr, [self = shared_from_this(), session, generation](std::nullptr_t) {
+                self->onRequestLane([session, generation] { std::erase(session->managerRecord.stopsUnderWay, generation); });
+            }};
 }
 
-void LCRecordingManager::resetStatesForSession(const std::shared_ptr<LCRecordingSession>& session) {
+void LCRecordingManager::resetUnansweredStops(const std::shared_ptr<LCRecordingSession>& session) {
+    const auto& underWay = session->managerRecord.stopsUnderWay;
+    const auto open = session->managerRecord.openTransactions;
+    for (const std::uint64_t generation : open)
+        if (std::find(underWay.begin(), underWay.end(), generation) == underWay.end())
+            resetStatesForSession(session, generation);
+}
+
+void LCRecordingManager::resetAfterStop(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation) {
+    // A session that was reset already is left alone.
+    if (session->managerRecord.hasTransactionOf(generation)) resetStatesForSession(session, generation);
+}
+
+void LCRecordingManager::resetStatesForSession(const std::shared_ptr<LCRecordingSession>& session,
+                                               std::uint64_t generation) {
     log_.line("LCRecordingManager:resetStatesForSession:");
-    session->setRecording(false);
-    session->setPaused(false);
-    if (session->managerRecord.transactionOf) {
-        session->managerRecord.transactionOf.reset();
-        endTransaction();
+    if (session->managerRecord.startGeneration == generation) {
+        session->setRecording(false);
+        session->setPaused(false);
     }
+    if (std::erase(session->managerRecord.openTransactions, generation) > 0) endTransaction();
+}
+
+void LCRecordingManager::clearSystemRecordingUI(const LCRecordingSession& session) {
+    if (!session.isSystemRecording()) return;
+    log_.line("stop monitoring foreground apps");
+    platform_.appStateMonitor.setHandler({});
 }
 
 void LCRecordingManager::discardRecordingWithHandler(Handler handler) {
@@ -76,7 +100,7 @@ void LCRecordingManager::recordingSessionStoppedWithError(const std::shared_ptr<
         if (session->startCount() != start) return;
         self->recordingSessionStoppedWithError(session, error, std::nullopt);
         // A session that stopped by itself is finished by nobody else.
-        if (session->managerRecord.transactionOf) self->resetStatesForSession(session);
+        self->resetAfterStop(session, session->managerRecord.startGeneration);
     });
 }
 
@@ -84,6 +108,9 @@ void LCRecordingManager::recordingSessionStoppedWithError(const std::shared_ptr<
                                                           const std::optional<Error>& error,
                                                           const std::optional<URL>& movieURL) {
     log_.line("LCRecordingManager:recordingSessionStoppedWithError:movieURL:");
+    if (session->isSystemRecording())
+        lumaAlertQueue().async([session, error] { showAlertForRecordingSession(*session, error); });
+    clearSystemRecordingUI(*session);
     if (const auto proxy = session->clientProxy()) proxy->stopRecordingWithError(error, movieURL);
 }
 
@@ -94,7 +121,7 @@ void LCRecordingManager::recordingSessionInterrupted(const std::shared_ptr<LCRec
 }
 
 void LCRecordingManager::broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<LCRecordingSession>& session,
-                                                              const Dictionary& info) {
+                                                              const Value& info) {
     log_.line("LCRecordingManager:broadcastSessionDidUpdateServiceInfo:");
     if (const auto proxy = session->clientProxy()) proxy->updateBroadcastServiceInfo(info);
 }

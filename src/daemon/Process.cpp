@@ -2,10 +2,20 @@
 
 namespace lumacast {
 
-Process::Process(const Platform& platform)
-    : platform_(platform), tempStore_(platform_), localization_(platform_.bundles), errors_(localization_) {
+Process::Process(const Platform& platform, LCRecordingManager::SessionMaker makeSession)
+    : platform_(platform),
+      tempStore_(platform_),
+      localization_(platform_.bundles),
+      errors_(localization_),
+      alertQueue_(platform_.scheduler) {
     manager_ = LCRecordingManager::init(
-        {platform_, tempStore_, localization_, errors_, captureManager_, &platform_.scheduler.mainQueue()});
+        {platform_, tempStore_, localization_, errors_, captureManager_, &platform_.scheduler.mainQueue()}, alertQueue_,
+        std::move(makeSession));
+}
+
+const std::shared_ptr<LCClientProxy>& Process::clientProxy() {
+    std::call_once(clientProxyOnce_, [this] { clientProxy_ = std::make_shared<LCClientProxy>(platform_.log); });
+    return clientProxy_;
 }
 
 void Process::start() {

@@ -2,6 +2,8 @@
 #include <memory>
 
 #include "capture/LCCaptureManager.h"
+#include "daemon/AlertQueue.h"
+#include "daemon/LCClientProxy.h"
 #include "daemon/LCRecordingManager.h"
 #include "platform/Platform.h"
 #include "support/Localization.h"
@@ -14,7 +16,8 @@ namespace lumacast {
 /// platform's lanes must have come to rest before it is destroyed.
 class Process {
 public:
-    explicit Process(const Platform& platform);
+    /// An empty maker makes the real sessions.
+    explicit Process(const Platform& platform, LCRecordingManager::SessionMaker makeSession = {});
 
     /// Sends the manager `finishStartup` and opens the administrator's service. On the main queue's thread.
     void start();
@@ -22,6 +25,8 @@ public:
     LCRecordingManager& manager() { return *manager_; }
     TempStore& tempStore() { return tempStore_; }
     LCCaptureManager& captureManager() { return captureManager_; }
+    /// `+clientProxy` — the proxy of nobody, the same one at every call. Nothing uses it.
+    const std::shared_ptr<LCClientProxy>& clientProxy();
 
 private:
     const Platform platform_;
@@ -29,6 +34,9 @@ private:
     Localization localization_;
     RecordingErrors errors_;
     LCCaptureManager captureManager_;
+    AlertQueue alertQueue_;
+    std::once_flag clientProxyOnce_;
+    std::shared_ptr<LCClientProxy> clientProxy_;
     std::shared_ptr<LCRecordingManager> manager_;
 };
 

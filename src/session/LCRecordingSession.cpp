@@ -24,6 +24,7 @@ LCRecordingSession::LCRecordingSession(const SessionServices& services, BundleId
       log_(services.platform.log),
       bundleID_(std::move(bundleID)),
       broadcastServiceInfoQueue_(services.platform.scheduler.serialQueue("com.orvane.lumacastd.ServiceInfoQueue")),
+      resetQueue_(services.platform.scheduler.serialQueue("com.orvane.lumacastd.MediaServicesReset")),
       pathClaim_(services.tempStore.lastClaim()),
       shouldStopLock_(services.platform.scheduler.ownerlessLock()) {}
 
@@ -289,11 +290,21 @@ void LCRecordingSession::screenCaptureControllerWasPreempted(DisplayCaptureSourc
 
 void LCRecordingSession::screenCaptureControllerMediaServicesWereReset(DisplayCaptureSource&) {
     log_.line("LCRecordingSession: screenCaptureControllerMediaServicesWereReset");
-    // Only the flag is set under the lock: the stop may wait for the source, and a frame may wait for the lock.
-    shouldStopLock_->lock();
-    shouldStop_ = true;
-    shouldStopLock_->unlock();
-    stopRecordingWithNotification(true, services_.errors._lcUserErrorForCode(RecordingErrorCode::MediaServicesFailed));
+    // The lock may be held for ever by a frame of a pause, so it is waited for where nobody else waits. Only the flag is
+    // set under it: the stop may wait for the source, and a frame may wait for the lock.
+    resetQueue_->async([self = shared_from_this()] {
+        self->shouldStopLock_->lock();
+        self->shouldStop_ = true;
+        self->shouldStopLock_->unlock();
+        const Task stop = [self] {
+            self->stopRecordingWithNotification(
+                true, self->services_.errors._lcUserErrorForCode(RecordingErrorCode::MediaServicesFailed));
+        };
+        if (self->services_.requestLane)
+            self->services_.requestLane->async(stop);
+        else
+            stop();
+    });
 }
 
 }  // namespace lumacast

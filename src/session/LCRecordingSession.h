@@ -1,6 +1,7 @@
 #pragma once
 // One client's recording, from start to end.
 
+#include <algorithm>
 #include <atomic>
 #include <cstdint>
 #include <functional>
@@ -68,6 +69,9 @@ public:
     void setCaptureRecording(bool capturing) { captureRecording_ = capturing; }
     bool microphoneEnabled() const { return microphoneEnabled_; }
     void setMicrophoneEnabled(bool enabled) { microphoneEnabled_ = enabled; }
+    /// The process whose sound is captured; below 1 none is.
+    ProcessID frontmostPIDForAudioTap() const { return frontmostPIDForAudioTap_; }
+    void setFrontmostPIDForAudioTap(ProcessID pid) { frontmostPIDForAudioTap_ = pid; }
     bool microphoneEnabledPersistent() const { return microphoneEnabledPersistent_; }
     void setMicrophoneEnabledPersistent(bool enabled) { microphoneEnabledPersistent_ = enabled; }
     bool hasUserConsentForCamera() const { return hasUserConsentForCamera_; }
@@ -75,6 +79,12 @@ public:
     bool hasUserConsentForMicrophone() const { return hasUserConsentForMicrophone_; }
     void setHasUserConsentForMicrophone(bool consent) { hasUserConsentForMicrophone_ = consent; }
     std::optional<URL> broadcastURL() const { return broadcastURL_; }
+    std::optional<LCBroadcastConfiguration> broadcastConfiguration() const { return broadcastConfiguration_; }
+    void setBroadcastConfiguration(std::optional<LCBroadcastConfiguration> configuration) {
+        broadcastConfiguration_ = std::move(configuration);
+    }
+    std::int64_t broadcastProcessMode() const { return broadcastProcessMode_; }
+    void setBroadcastProcessMode(std::int64_t mode) { broadcastProcessMode_ = mode; }
     void setBroadcastURL(std::optional<URL> url) { broadcastURL_ = std::move(url); }
     std::optional<URL> interruptedMovieURL() const { return interruptedMovieURL_; }
     void setInterruptedMovieURL(std::optional<URL> url) { interruptedMovieURL_ = std::move(url); }
@@ -88,6 +98,8 @@ public:
     std::shared_ptr<DisplayCaptureSource> screenCaptureController() const { return screenCaptureController_.get(); }
     std::shared_ptr<LCReportingAgent> reportingAgent() const { return reportingAgent_.get(); }
     std::optional<Date> captureStartTime() const { return captureStartTime_.get(); }
+    /// The claim of this session's last writer on its path, see TempStore::claimPath. Request lane.
+    std::uint64_t pathClaim() const { return pathClaim_; }
     /// How often startSessionWithHandler was called: tells reports of an older start from the current one's. Any lane.
     std::uint64_t startCount() const { return starts_; }
     /// Seconds of active capture of the current recording so far: the finished stretches and the running one.
@@ -117,7 +129,8 @@ public:
     }
     /// `finishSessionWithStartClipDuration:endClipDuration:handler:` — only while recording; otherwise the handler is
     /// deliberately never called, nor when trimming fails. Seconds; both above 0 give a clip.
-    void finishSessionWithStartClipDuration(double startClipDuration, double endClipDuration, FinishHandler handler);
+    virtual void finishSessionWithStartClipDuration(double startClipDuration, double endClipDuration,
+                                                    FinishHandler handler);
     /// `finishAndCleanupSessionFilesWithHandler:` — stops and removes the movie, unless a later writer has its path.
     /// The handler is called on the store's background queue.
     void finishAndCleanupSessionFilesWithHandler(Handler handler);
@@ -147,7 +160,14 @@ public:
     /// The manager's bookkeeping of this session, touched on the request lane only.
     struct ManagerRecord {
         std::uint64_t startGeneration = 0;  ///< counts this session's starts; completions of older ones leave it alone
-        std::optional<std::uint64_t> transactionOf;  ///< the start whose keep-alive transaction is open
+        std::vector<std::uint64_t> openTransactions;  ///< the starts whose keep-alive transaction is open
+        std::vector<std::uint64_t> stopsUnderWay;     ///< the starts whose stop may still be answered
+        /// The accepted connection, kept while it is lost too: the proxy's messages then still end in their errors.
+        std::shared_ptr<IpcConnection> connection;
+
+        bool hasTransactionOf(std::uint64_t generation) const {
+            return std::find(openTransactions.begin(), openTransactions.end(), generation) != openTransactions.end();
+        }
     };
     ManagerRecord managerRecord;
 
@@ -170,12 +190,14 @@ private:
     Log& log_;
     const BundleIdentifier bundleID_;
     const std::shared_ptr<SerialQueue> broadcastServiceInfoQueue_;
+    const std::shared_ptr<SerialQueue> resetQueue_;
 
     Guarded<std::shared_ptr<LCClientProtocol>> clientProxy_;
     Guarded<std::weak_ptr<LCRecordingSessionDelegate>> delegate_;
     std::atomic<bool> recording_{false}, paused_{false}, systemRecording_{false}, isBroadcasting_{false},
         captureRecording_{false}, microphoneEnabled_{false}, microphoneEnabledPersistent_{false},
         hasUserConsentForCamera_{false}, hasUserConsentForMicrophone_{false}, sessionWasResumed_{false};
+    std::atomic<ProcessID> frontmostPIDForAudioTap_{ProcessID{0}};
     std::optional<URL> broadcastURL_, interruptedMovieURL_;
     std::vector<ContextID> contextIDs_;
     Size windowSize_, originalWindowSize_;
@@ -189,8 +211,7 @@ private:
     std::optional<LCBroadcastConfiguration> broadcastConfiguration_;
     std::int64_t chipId_ = 0;
 
-    /// The claim of this session's last writer on its path, see TempStore::claimPath; what was written before a session
-    /// began is its own too: the application came back.
+    /// At first that of whatever was written before: an application that comes back can discard what it left.
     std::uint64_t pathClaim_;
     std::atomic<std::uint64_t> starts_{0};  ///< counts startSessionWithHandler
     std::atomic<std::uint64_t> stops_{0};  ///< counts stops of a running recording

@@ -15,8 +15,14 @@ public:
     void endTransaction() override {
         const std::lock_guard lock(mutex_);
         if (++ended_ > begun_) endedWithoutBegin_ = true;
+        if (ended_ == begun_) ++idle_;
     }
 
+    /// How often the last open transaction has ended.
+    int timesIdle() const {
+        const std::lock_guard lock(mutex_);
+        return idle_;
+    }
     int begun() const {
         const std::lock_guard lock(mutex_);
         return begun_;
@@ -38,6 +44,7 @@ public:
 
 private:
     mutable std::mutex mutex_;
+    int idle_ = 0;
     int begun_ = 0;
     int ended_ = 0;
     bool endedWithoutBegin_ = false;

@@ -49,7 +49,8 @@ TEST_F(Connections, TheFirstConnectionMakesAnIdleSession) {
     EXPECT_EQ(session(*client)->clientProxy()->bundleIdentifier(), client->id);
     EXPECT_EQ(fakes_.logSink.logged(),
               (Lines{"LCRecordingManager: shouldAcceptNewConnection:", "accepted client connection PID: 500",
-                     "LCRecordingManager:recordingSessionForBundleID", "no session, creating a new one"}));
+                     "LCRecordingManager:recordingSessionForBundleID", "no session, creating a new one",
+                     "LCRecordingManager:removeAcknowledgementExemptionIfOverThreshholdForBundleID:"}));
 }
 
 TEST_F(Connections, ASecondConnectionRetiresTheFirstWithoutStoppingTheRecording) {

@@ -78,7 +78,7 @@ public:
     };
     AskedRef start(const std::vector<ContextID>& windows, Flags flags) {
         Array ids;
-        for (const ContextID id : windows) ids.emplace_back(number(id));
+        for (const ContextID layer : windows) ids.emplace_back(number(layer));
         return ask(DaemonMessage::StartRecording,
                    {std::move(ids), Array{640.0, 360.0}, flags.microphone, flags.camera, flags.broadcast, flags.system,
                     flags.capture, Value()});

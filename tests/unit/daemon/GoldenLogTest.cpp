@@ -29,6 +29,7 @@ TEST_F(GoldenLog, AWholeRecordingWithItsPauseLogsTheseLinesInThisOrder) {
         "accepted client connection PID: 500",
         "LCRecordingManager:recordingSessionForBundleID",
         "no session, creating a new one",
+        "LCRecordingManager:removeAcknowledgementExemptionIfOverThreshholdForBundleID:",
         // The start.
         "LCRecordingManager:startRecordingWindowLayerContextID:windowSize:microphoneEnabled:streaming:withHandler:",
         "LCRecordingManager:stopCurrentRecordingSession:",

@@ -88,11 +88,7 @@ TEST_F(Requests, WhatIsNotServedIsOnlyLogged) {
         {DaemonMessage::SetupBroadcast, {"a", "b", Data(), Value()}},
         {DaemonMessage::GetCurrentBroadcastImages, {}},
         {DaemonMessage::GetSystemBroadcastExtensionInfo, {}},
-        {DaemonMessage::SaveVideoToCameraRoll, {URL("file:///a.mp4")}},
-        {DaemonMessage::SetMicrophoneEnabled, {true}},
-        {DaemonMessage::UpdateProcessIDForAudioCapture, {std::int32_t{5}}},
-        {DaemonMessage::ClientDidBecomeActive, {}},
-        {DaemonMessage::ClientDidResignActive, {}}};
+        {DaemonMessage::SaveVideoToCameraRoll, {URL("file:///a.mp4")}}};
     const auto client = makeRecording();
     for (const auto& [message, arguments] : unserved) {
         fakes_.logSink.clear();

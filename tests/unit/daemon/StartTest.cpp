@@ -221,6 +221,112 @@ TEST_F(Start, ASecondStartOfTheSameApplicationInterruptsItsOwnRecording) {
     EXPECT_EQ(fakes_.keepAlive.open(), 0);
 }
 
+TEST_F(Start, ARestartEndsTheOlderRecordingOnlyWhenItsStopIsAnswered) {
+    const auto client = makeRecording();
+    advance(seconds(1));
+    started(*client);
+    const auto lines = fakes_.logSink.logged();
+    const auto at = [&](std::string_view line) {
+        return std::find(lines.begin(), lines.end(), line) - lines.begin();
+    };
+    EXPECT_EQ(logged("LCRecordingManager:resetStatesForSession:"), 1u);
+    EXPECT_LT(at("LCRecordingSession: finishWritingWithHandler"), at("LCClientProxy:stopRecordingWithError:movieURL:"));
+    EXPECT_LT(at("LCClientProxy:stopRecordingWithError:movieURL:"), at("LCRecordingManager:resetStatesForSession:"));
+    EXPECT_TRUE(session(*client)->isRecording());
+    EXPECT_EQ(fakes_.keepAlive.timesIdle(), 0) << "the daemon was idle between two recordings";
+}
+
+TEST_F(Start, ABroadcastThatNobodySetUpStillDiscardsTheRecordingItEnded) {
+    const auto client = makeRecording();
+    advance(seconds(1));
+    ASSERT_TRUE(fakes_.fileSystem.exists(pathOf("Player")));
+    EXPECT_EQ(started(*client, {.broadcast = true})->code(), -5808);
+    EXPECT_EQ(client->toldOfStop(-5806), 1);
+    EXPECT_FALSE(fakes_.fileSystem.exists(pathOf("Player")));
+    EXPECT_FALSE(session(*client)->isRecording());
+    EXPECT_EQ(fakes_.keepAlive.open(), 0);
+    EXPECT_EQ(logged("start request 2 refused with -5808: no broadcast has been set up"), 1u);
+}
+
+TEST_F(Start, AStopThatIsNeverAnsweredIsResetByTheNextStart) {
+    const auto client = makeRecording();
+    fakes_.faults.failNext("MovieExporter.export");
+    client->ask(DaemonMessage::StopRecordingWithClipDurations, {1.0, 1.0});
+    settle();
+    EXPECT_EQ(fakes_.keepAlive.open(), 1) << "the trim failed";
+    EXPECT_EQ(started(*client)->code(), 0);
+    EXPECT_EQ(fakes_.keepAlive.open(), 1);
+    EXPECT_EQ(logged("LCRecordingManager:resetStatesForSession:"), 1u);
+}
+
+/// A session that answers a finish although it does not record.
+class AnsweringSession final : public LCRecordingSession {
+public:
+    using LCRecordingSession::LCRecordingSession;
+    void finishSessionWithStartClipDuration(double, double, FinishHandler handler) override {
+        handler(URL("file:///left.mp4"), std::nullopt);
+    }
+};
+
+TEST(Interruption, WhatAnswersAFinishIsToldOfItAndReset) {
+    SimWorld world(1);
+    world.fakes.preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
+    Process process(world.fakes.platform(), [](const SessionServices& services, const BundleIdentifier& id) {
+        std::shared_ptr<LCRecordingSession> session;
+        if (id.text() == "org.example.Editor")
+            session = std::make_shared<AnsweringSession>(services, id);
+        else
+            session = std::make_shared<LCRecordingSession>(services, id);
+        return session;
+    });
+    world.scheduler.mainQueue().sync([&] { process.start(); });
+    TestClient player(world.fakes, "org.example.Player", "Player", ProcessID{500}, ContextID{7});
+    TestClient editor(world.fakes, "org.example.Editor", "Editor", ProcessID{501}, ContextID{8});
+    player.connect();
+    editor.connect();
+    world.scheduler.runUntilIdle();
+    const auto other = process.manager().registeredSession(editor.id);
+    other->setPaused(true);
+    const auto asked = player.start();
+    world.scheduler.runUntilIdle();
+    EXPECT_EQ(asked->code(), 0);
+    EXPECT_EQ(world.fakes.logSink.count("interrupted session"), 1u);
+    ASSERT_EQ(editor.told.size(), 1u);
+    EXPECT_TRUE(editor.told[0].arguments[0].isNull()) << "the finish had no error";
+    EXPECT_EQ(editor.told[0].arguments[1], Value(URL("file:///left.mp4")));
+    EXPECT_EQ(other->interruptedMovieURL(), URL("file:///left.mp4"));
+    EXPECT_FALSE(other->isPaused());
+    EXPECT_EQ(world.fakes.keepAlive.ended(), 0) << "a reset without a beginning ends nothing";
+    world.scheduler.endWorld();
+}
+
+TEST(Interruption, AnIdleSessionStaysSilent) {
+    SimWorld world(1);
+    world.fakes.preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
+    Process process(world.fakes.platform());
+    world.scheduler.mainQueue().sync([&] { process.start(); });
+    TestClient player(world.fakes, "org.example.Player", "Player", ProcessID{500}, ContextID{7});
+    TestClient editor(world.fakes, "org.example.Editor", "Editor", ProcessID{501}, ContextID{8});
+    player.connect();
+    editor.connect();
+    world.scheduler.runUntilIdle();
+    const auto asked = player.start();
+    world.scheduler.runUntilIdle();
+    EXPECT_EQ(asked->code(), 0);
+    EXPECT_EQ(world.fakes.logSink.count("interrupted session"), 0u);
+    EXPECT_TRUE(editor.told.empty());
+    world.scheduler.endWorld();
+}
+
+TEST(AlertQueueTest, IsMadeOnceHoweverOftenItIsAskedFor) {
+    SimWorld world(1);
+    Process process(world.fakes.platform());
+    SerialQueue& queue = process.manager().lumaAlertQueue();
+    EXPECT_EQ(&queue, &process.manager().lumaAlertQueue());
+    EXPECT_EQ(queue.label(), "com.lumacast.alertQueue");
+    world.scheduler.endWorld();
+}
+
 TEST_F(Start, ASecondStartLeavesTheLastMovieWholeInEveryInterleaving) {
     for (std::uint64_t seed = 1; seed <= 60; ++seed) {
         SCOPED_TRACE(seed);

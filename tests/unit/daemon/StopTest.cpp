@@ -118,6 +118,37 @@ TEST_F(Stop, ADiscardAfterwardsDeletesTheMovieAndAnswersWithNothing) {
     EXPECT_FALSE(fakes_.fileSystem.exists(pathOf("Player")));
 }
 
+TEST_F(Stop, WhoComesBackCanDiscardWhatItLeft) {
+    const auto client = makeRecording();
+    stopped(*client);
+    client->connection.reset();
+    client->die();
+    settle();
+    ASSERT_TRUE(fakes_.fileSystem.exists(pathOf("Player")));
+    const auto again = makeConnected();
+    const auto asked = again->ask(DaemonMessage::DiscardRecording);
+    settle();
+    EXPECT_EQ(asked->answers, 1);
+    EXPECT_FALSE(fakes_.fileSystem.exists(pathOf("Player")));
+}
+
+TEST_F(Stop, AClientThatLeavesBeforeItsMovieIsFinishedKeepsTheDaemonUpUntilItIs) {
+    const auto client = makeRecording();
+    client->ask(DaemonMessage::StopRecording);
+    const auto untilLogged = [&](const char* line) {
+        return world_.scheduler.runUntil([&] { return logged(line) == 1; }, seconds(1));
+    };
+    ASSERT_TRUE(untilLogged("LCRecordingSession: finishSessionWithHandler"));
+    ASSERT_EQ(logged("LCRecordingSession: finishWritingWithHandler"), 0u);
+    client->connection.reset();
+    client->die();
+    ASSERT_TRUE(untilLogged("LCRecordingManager: applicationDisconnected"));
+    EXPECT_EQ(fakes_.keepAlive.open(), logged("LCRecordingSession: finishWritingWithHandler") == 0 ? 1 : 0);
+    settle();
+    EXPECT_EQ(fakes_.keepAlive.open(), 0);
+    EXPECT_EQ(logged("LCRecordingManager:resetStatesForSession:"), 1u);
+}
+
 TEST_F(Stop, AFailedSourceTellsTheClientOnceAndResets) {
     const auto client = makeRecording();
     fakes_.displayCapture.lastSource()->fail(-1);

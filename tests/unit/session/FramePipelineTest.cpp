@@ -190,6 +190,7 @@ TEST_F(FramePipeline, ADeadSessionDropsFramesSilentlyAndReleasesTheLock) {
     startQuietly();
     deliver(1000);
     session_->screenCaptureControllerMediaServicesWereReset(*source());
+    settle();
     fakes_.logSink.clear();
     deliver(1010);
     deliver(1020);
