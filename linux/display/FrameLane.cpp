@@ -190,7 +190,9 @@ bool FrameLane::followSelection(const Order& order) {
     const auto wanted = setup_.selection->wanted();
     selectionVersion_ = wanted.version;
     const CaptureTarget* const before = target_.get();
-    if (!chooseTarget(wanted)) return fail(order, X11CaptureStatus::kWindowGone), false;
+    if (!chooseTarget(wanted))
+        return fail(order, connection_->broken() ? X11CaptureStatus::kDisplayLost : X11CaptureStatus::kWindowGone),
+               false;
     if (target_.get() != before) pictureWanted_ = true;
     drainEvents(true);
     return true;

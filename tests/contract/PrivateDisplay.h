@@ -98,6 +98,8 @@ public:
     void hang() const { server_->send(SIGSTOP); }
     void goOn() const { server_->send(SIGCONT); }
     void kill() const { server_->end(SIGTERM); }
+    /// At once, without closing its windows first.
+    void crash() const { server_->end(SIGKILL); }
     pid_t pid() const { return server_->pid(); }
 
 private:

@@ -498,8 +498,9 @@ TEST_F(X11Capture, FailsOnceWhenTheServerDiesAndWorksWithTheNextOne) {
     made->openGate();
     made->start();
     ASSERT_TRUE(frames->waitForColour(kRed));
-    first.reset();
+    first->crash();
     EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kDisplayLost);
+    first.reset();
     made->start();
     ASSERT_TRUE(frames->waitFor([&](const Frames&) { return frames->failuresUnlocked() >= 2; }));
     EXPECT_EQ(frames->failures()[1], X11CaptureStatus::kNoDisplay);
