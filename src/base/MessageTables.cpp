@@ -19,7 +19,6 @@ constexpr std::array kImagesReply{A::NullableData, A::NullableData};
 constexpr std::array kExtensionsReply{A::Array, A::NullableError};
 constexpr std::array kStopReply{A::NullableURL, A::NullableError};
 constexpr std::array kClip{A::Double, A::Double};
-constexpr std::array kURL{A::URL};
 constexpr std::array kNullableURL{A::NullableURL};
 constexpr std::array kBool{A::Bool};
 constexpr std::array kInt32{A::Int32};
