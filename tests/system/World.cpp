@@ -31,10 +31,12 @@ bool longTests() {
     return wanted && std::strcmp(wanted, "1") == 0;
 }
 
-Application::Application(World& world, const std::vector<std::string>& options) : log_(world.path("frames.txt")) {
-    std::vector<std::string> command{LC_SELF_RECORDER, "--name", "Self Recorder", "--frames-log", log_};
+Application::Application(World& world, const std::string& program, const std::string& name,
+                         const std::vector<std::string>& options)
+    : log_(world.path(name + " frames.txt")) {
+    std::vector<std::string> command{program, "--name", name, "--frames-log", log_};
     command.insert(command.end(), options.begin(), options.end());
-    child_ = std::make_unique<checkers::Child>(command, world.environment(), world.path("application.log"));
+    child_ = std::make_unique<checkers::Child>(command, world.environment(), world.path(name + ".log"));
     const std::string line = child_->readLine();
     if (line.starts_with("window 0x")) window_ = static_cast<std::uint32_t>(std::stoul(line.substr(9), nullptr, 16));
     EXPECT_NE(window_, 0u) << line;
@@ -53,6 +55,14 @@ std::string Application::ask(const std::string& command) {
         } else {
             return line;
         }
+    }
+}
+
+std::string Application::answer() {
+    for (;;) {
+        std::string line = child_->readLine();
+        if (!line.starts_with("event ")) return line;
+        events_.push_back(std::move(line));
     }
 }
 
@@ -141,7 +151,14 @@ int World::endDaemon(int signal) {
 }
 
 std::unique_ptr<Application> World::application(std::vector<std::string> options) {
-    return std::make_unique<Application>(*this, options);
+    return std::make_unique<Application>(*this, LC_SELF_RECORDER, "Self Recorder", options);
+}
+
+std::unique_ptr<Application> World::otherApplication(const std::string& name, std::vector<std::string> options) {
+    const std::string program = path(name);
+    fs::copy_file(LC_SELF_RECORDER, program);
+    install("org.lumacast." + name, name, program);
+    return std::make_unique<Application>(*this, program, name, options);
 }
 
 nlohmann::json World::status() {
@@ -168,8 +185,8 @@ std::size_t World::daemonDescriptors() {
     return static_cast<std::size_t>(std::distance(fs::begin(open), fs::end(open)));
 }
 
-std::string World::moviePath() const {
-    return path("state/lumacast/root/private/var/mobile/Library/Lumacast/Self Recorder.mp4");
+std::string World::moviePath(const std::string& name) const {
+    return path("state/lumacast/root/private/var/mobile/Library/Lumacast/" + name + ".mp4");
 }
 
 std::string World::daemonLog() const {

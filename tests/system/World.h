@@ -29,10 +29,14 @@ class World;
 /// One example application, driven by its standard input.
 class Application {
 public:
-    Application(World& world, const std::vector<std::string>& options);
+    Application(World& world, const std::string& program, const std::string& name,
+                const std::vector<std::string>& options);
 
     /// Answers the line that answers `command`; "event ..." lines are put aside.
     std::string ask(const std::string& command);
+    /// The two halves of that: several commands may be under way.
+    void send(const std::string& command) { child_->send(command); }
+    std::string answer();
     /// The number that stands behind "frame" in an answer; fails the test when there is none.
     std::uint32_t askForFrame(const std::string& command);
     /// Waits until a frame with at least this number is shown.
@@ -70,6 +74,8 @@ public:
     int endDaemon(int signal);
 
     std::unique_ptr<Application> application(std::vector<std::string> options);
+    /// Another application: the same program under another name and identifier ("org.lumacast.<name>").
+    std::unique_ptr<Application> otherApplication(const std::string& name, std::vector<std::string> options);
 
     /// What `status` of the administrator's socket answers.
     nlohmann::json status();
@@ -78,8 +84,8 @@ public:
     /// Waits until the running recording is at least so old.
     bool waitForElapsed(double seconds);
     std::size_t daemonDescriptors();
-    /// The movie that the example's recordings are written to.
-    std::string moviePath() const;
+    /// The movie that the recordings of an application are written to.
+    std::string moviePath(const std::string& name = "Self Recorder") const;
     std::string daemonLog() const;
 
     std::string path(const std::string& name) const { return folder_ + "/" + name; }
