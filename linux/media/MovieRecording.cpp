@@ -233,11 +233,12 @@ void MovieRecording::finishPipeline(std::unique_lock<std::mutex>& lock, MoviePip
 
 void MovieRecording::runCompletions(std::unique_lock<std::mutex>& lock) {
     while (!completions_.empty()) {
-        const auto completions = std::exchange(completions_, {});
+        auto completions = std::exchange(completions_, {});
         lock.unlock();
         for (const auto& completion : completions) {
             if (completion) completion();
         }
+        completions.clear();  // without the lock: one of them may hold the last reference to the writer
         lock.lock();
     }
 }

@@ -210,6 +210,26 @@ TEST_P(ContainerWriterContract, AWriterCanBeLetGoOfInItsCompletion) {
     EXPECT_TRUE(done.waitFor());
 }
 
+TEST_P(ContainerWriterContract, ACompletionMayHoldTheLastReferenceToTheWriter) {
+    std::shared_ptr<ContainerWriter> writer = make();
+    const auto input = writer->addVideoInput(videoSettings(kWidth, kHeight));
+    ASSERT_TRUE(writer->startWriting());
+    writer->startSession(atSeconds(0));
+    ASSERT_TRUE(input->append(pictureAt(0)));
+    Happening gone;
+    struct AtEnd {
+        Happening& happening;
+        ~AtEnd() { happening.happen(); }
+    };
+    auto atEnd = std::make_shared<AtEnd>(gone);
+    ContainerWriter& finishing = *writer;
+    finishing.finishWriting([atEnd, held = std::move(writer)] {});  // `held` goes first
+    atEnd.reset();
+    ASSERT_TRUE(gone.waitFor());
+    // Others still go on: nobody holds a lock of the one that has gone.
+    EXPECT_TRUE(make("another.mp4"));
+}
+
 TEST_P(ContainerWriterContract, AWriterThatIsLetGoOfWhileFinishingStillCompletes) {
     auto writer = make();
     const auto input = writer->addVideoInput(videoSettings(kWidth, kHeight));
