@@ -19,7 +19,8 @@ struct FileAttributes {
     bool isDirectory = false;
 };
 
-/// An answer or the error that came instead. Error codes are the system's error numbers.
+/// An answer or the error that came instead. Error codes are the system's error numbers: ENOENT is what is not there
+/// (ENOTDIR where a file stands on the way to it), ETIMEDOUT a disk that has not answered.
 template <class T>
 using Result = std::variant<T, Error>;
 
@@ -36,6 +37,8 @@ public:
     /// none.
     virtual std::string root() const = 0;
 
+    /// False also when the disk has not answered. Who has to tell that from nothing being there asks for the
+    /// attributes, or removes.
     virtual bool exists(const std::string& path) = 0;
     /// Creates one directory, not its parents, with default attributes.
     virtual std::optional<Error> createDirectory(const std::string& path) = 0;

@@ -2,23 +2,26 @@
 // The private temporary directory in which all movies live first.
 
 #include <cstdint>
-#include <deque>
 #include <functional>
-#include <map>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 
+#include "base/Date.h"
 #include "base/Value.h"
 #include "platform/Platform.h"
+#include "support/FileRemovals.h"
 
 namespace lumacast {
 
-/// Paths of, and operations on, the temporary directory. Callable from any lane; removals run on the background queue.
+/// Paths of, and operations on, the temporary directory. Callable from any lane but where an operation says otherwise;
+/// what runs on a global queue completes there.
 class TempStore {
 public:
-    using Completion = std::function<void(std::optional<Error>)>;
+    using Completion = FileRemovals::Completion;
+
+    /// A day in seconds: what ages out when the storage is not short.
+    static constexpr double kOneDay = 86400;
 
     explicit TempStore(const Platform& platform);
 
@@ -30,9 +33,29 @@ public:
     /// `_srSetupTempDirectory` — creates the directory, not its parents, when nothing is there.
     void _srSetupTempDirectory();
 
-    /// `_srRemoveFile:completion:` — removes a file on the background queue, in the order asked. Completes there, with
-    /// none when the file did not exist.
+    /// `_srSizeOfTempDir:` — bytes of the directory's own entry, deliberately not of its files; 0, and the reason in
+    /// `error` where one is given, when they can't be read.
+    std::int64_t _srSizeOfTempDir(std::optional<Error>* error = nullptr) const;
+
+    /// `_srDeleteAllTempFiles` — deletes every file, whatever its age, and answers the bytes freed. A path that a
+    /// writer has claimed after `lastClaim` (by default: after the call began) is that writer's, and its file is
+    /// spared. Waits for the disk: not on the request lane.
+    std::uint64_t _srDeleteAllTempFiles(std::optional<std::uint64_t> lastClaim = {});
+    /// `_srDeleteFilesOlderThanTimeToLiveInSeconds:` — the same for files that were last modified strictly longer ago;
+    /// 0 for all. Goes on after a failure, but from the first one on deliberately counts nothing any more.
+    std::uint64_t _srDeleteFilesOlderThanTimeToLiveInSeconds(double timeToLive,
+                                                             std::optional<std::uint64_t> lastClaim = {});
+
+    /// `_srRemoveFile:completion:` — removes a file on the background queue, in the order asked for its path. Completes
+    /// there, with none when the file did not exist.
     void _srRemoveFile(const URL& url, Completion completion);
+    /// `_srMoveFileFromURL:toURL:completion:` — moves a file on the default queue, over one that is there.
+    void _srMoveFileFromURL(const URL& from, const URL& to, Completion completion);
+    /// `_srDeleteFilesWithPrefix:` — deletes, on the default queue, all files whose names begin with it, case and
+    /// diacritics aside.
+    void _srDeleteFilesWithPrefix(const std::string& prefix);
+    /// `_srGetCreationDateForFile:` — none when it can't be read.
+    std::optional<Date> _srGetCreationDateForFile(const URL& url) const;
 
     /// `_srDeviceFreeDiskSpace` — bytes free where the directory is; 0 when unreadable.
     std::uint64_t _srDeviceFreeDiskSpace() const;
@@ -40,29 +63,26 @@ public:
     bool _srDeviceHasSufficientFreeSpaceForRecording() const;
 
     /// A number for a writer that is about to write `path`; later writers of the same path get larger ones.
-    std::uint64_t claimPath(const std::string& path);
+    std::uint64_t claimPath(const std::string& path) { return removals_->claim(path); }
     /// The last claim that was given out: who has not written yet removes as its holder, and so spares what is begun
     /// from now on.
-    std::uint64_t lastClaim() const;
+    std::uint64_t lastClaim() const { return removals_->lastClaim(); }
+    /// Keeps a claim for as long as its writer lives; may be released after the store is gone.
+    std::shared_ptr<void> holdClaim(const std::string& path, std::uint64_t claim) {
+        return removals_->holdClaim(path, claim);
+    }
+    /// How many paths are claimed now, for tests.
+    std::size_t claimedPathCount() const { return removals_->claimedPathCount(); }
     /// The same removal for the file that the writer with this claim has left: when it is its turn and a later writer
     /// has claimed the path, the file is that writer's and stays; completes with none then.
     void removeFileOfClaim(const URL& url, std::uint64_t claim, Completion completion);
 
 private:
-    struct Removal {
-        URL url;
-        std::optional<std::uint64_t> claim;
-        Completion completion;
-    };
-    /// What the background task needs, alive as long as a removal is under way.
-    struct Removals;
-
-    void enqueue(Removal removal);
-
     Log& log_;
     FileSystem& fileSystem_;
-    GlobalQueue& background_;
-    std::shared_ptr<Removals> removals_;
+    const Clock& clock_;
+    GlobalQueue& default_;
+    const std::shared_ptr<FileRemovals> removals_;
 };
 
 }  // namespace lumacast

@@ -37,8 +37,11 @@ public:
     bool systemRecording() const { return systemRecording_; }
 
     /// The store's claim on the output path, see TempStore::claimPath: a start that comes late then leaves the file of
-    /// a later writer alone. Set before the start.
-    void setPathClaim(std::uint64_t claim) { pathClaim_ = claim; }
+    /// a later writer alone. Set before the start; released with the writer.
+    void setPathClaim(std::uint64_t claim) {
+        pathClaim_ = claim;
+        pathClaimHold_ = tempStore_.holdClaim(outputPath_, claim);
+    }
 
     Size windowSize() const { return windowSize_; }
     const std::string& outputPath() const { return outputPath_; }
@@ -108,6 +111,7 @@ private:
     std::optional<LCBroadcastConfiguration> broadcastConfig_;
     bool systemRecording_ = false;
     std::optional<std::uint64_t> pathClaim_;
+    std::shared_ptr<void> pathClaimHold_;
 
     Guarded<Tracks> tracks_;
     std::atomic<bool> didProcessFirstSample_{false};
