@@ -15,6 +15,7 @@
 #include "linux/media/LinuxContainerWriters.h"
 #include "linux/media/LinuxMovieExporters.h"
 #include "linux/storage/LinuxFileSystem.h"
+#include "linux/storage/LinuxStoragePurgeService.h"
 #include "linux/system/LinuxClock.h"
 #include "linux/system/LinuxDeviceInfo.h"
 #include "linux/system/LinuxEnvironment.h"
@@ -61,9 +62,10 @@ public:
           renderServer_(environmentVariable("DISPLAY")),
           appState_(environmentVariable("DISPLAY"), scheduler_, [this](ProcessID pid) { return applicationOf(pid); }),
           admin_(scheduler_, environment.runtimeDirectory + "/admin.sock"),
+          storagePurge_(scheduler_, fileSystem_),
           platform_{log_,         scheduler_,  clock_,     ipc_,       bundles_,   renderServer_,
                     appState_,    capture_,    capture_,   writers_,   exporters_, fileSystem_,
-                    preferences_, deviceInfo_, telemetry_, keepAlive_, admin_} {}
+                    preferences_, deviceInfo_, telemetry_, keepAlive_, admin_,    storagePurge_} {}
 
     /// What must be there before the daemon can work; the error when it can't be had.
     std::optional<Error> prepare() { return fileSystem_.prepare(); }
@@ -106,6 +108,7 @@ private:
     X11RenderServer renderServer_;
     X11AppStateMonitor appState_;
     LinuxAdminService admin_;
+    LinuxStoragePurgeService storagePurge_;
     Platform platform_;
 };
 

@@ -12,6 +12,7 @@
 #include "client/lumacastctl/ExitStatus.h"
 #include "client/lumacastctl/doctor/Doctor.h"
 #include "client/lumacastctl/status/StatusCommand.h"
+#include "client/lumacastctl/storage/StorageCommand.h"
 #include "linux/system/IniFile.h"
 
 namespace {
@@ -22,7 +23,7 @@ using namespace lumacast::ctl;
 constexpr char kExitStatuses[] =
     "Exit status:\n"
     "  0  all is well\n"
-    "  1  the daemon isn't running or does not answer (status), or the output could not be written\n"
+    "  1  the daemon isn't running or does not answer (status, storage), or the output could not be written\n"
     "  2  wrong usage\n"
     "  3  the doctor found problems (warnings alone are none)";
 
@@ -65,6 +66,23 @@ int main(int argc, char** argv) {
                                  ->type_name("PATH")
                                  ->excludes(byPid);
 
+    CLI::App* storage = app.add_subcommand("storage", "Show the temporary movies, or have old ones deleted");
+    storage->footer(kExitStatuses);
+    storage->require_subcommand(0, 1);
+    bool json = false;
+    storage->add_flag("--json", json, "Answer one line of JSON");
+    CLI::App* list = storage->add_subcommand("list", "Show the movies: size, date, and whether one is being recorded");
+    CLI::App* purgeable = storage->add_subcommand("purgeable", "Show what a purge could give back");
+    CLI::App* purge = storage->add_subcommand(
+        "purge", "Delete as if space were so short: from urgency 3 on a running recording is stopped and every movie "
+                 "deleted; below 3 nothing goes but where a recording has just ended");
+    for (CLI::App* command : {list, purgeable, purge}) {
+        command->footer(kExitStatuses);
+        command->add_flag("--json", json, "Answer one line of JSON");
+    }
+    std::int32_t urgency = 0;
+    purge->add_option("URGENCY", urgency, "How short space is: 1, 2 or 3")->required()->check(CLI::Range(1, 1000));
+
     try {
         app.parse(argc, argv);
     } catch (const CLI::ParseError& error) {
@@ -74,6 +92,14 @@ int main(int argc, char** argv) {
     int result = kGood;
     if (status->parsed()) {
         result = showStatus(LinuxEnvironment::ofThisProcess().runtimeDirectory, stdout, stderr);
+    } else if (storage->parsed()) {
+        const std::string directory = LinuxEnvironment::ofThisProcess().runtimeDirectory;
+        const Form form = json ? Form::Json : Form::Text;
+        const StoragePart part = list->parsed()        ? StoragePart::List
+                                 : purgeable->parsed() ? StoragePart::Purgeable
+                                                       : StoragePart::All;
+        result = purge->parsed() ? purgeStorage(directory, urgency, form, stdout, stderr)
+                                 : showStorage(directory, part, form, stdout, stderr);
     } else {
         IdentityQuestion question;
         if (byProgram->count() > 0) question.executable = executable;

@@ -13,6 +13,8 @@
 #include <cerrno>
 #include <list>
 #include <mutex>
+#include <set>
+#include <sstream>
 #include <system_error>
 #include <vector>
 
@@ -28,13 +30,17 @@ using Moment = std::chrono::steady_clock::time_point;
 constexpr std::size_t kMaximumPeers = 8;
 constexpr std::size_t kMaximumRequest = 128;
 
-/// Where the main queue leaves its newest snapshot. Outlives the server as long as a question is under way.
+using Commands = std::map<std::string, AdminCommand, std::less<>>;
+
+/// Where the main queue leaves its newest snapshot, and commands their answers. Outlives the server as long as a question is under way.
 struct Mailbox {
     std::mutex mutex;
     std::optional<Dictionary> snapshot;
     std::uint64_t question = 0;  ///< the one it answers, and so all before it
     bool closed = false;
     std::size_t asked = 0;  ///< questions the main queue has not answered
+    std::map<std::uint64_t, Dictionary> answers;   ///< of commands, by their question
+    std::set<std::uint64_t> commandsUnderWay;     ///< whose answer has not come
     FileDescriptor arrived{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};
 };
 
@@ -44,7 +50,8 @@ struct Peer {
     State state = State::Asking;
     Moment deadline;
     std::string request;
-    std::uint64_t question = 0;  ///< the snapshot that is new enough for this peer
+    std::uint64_t question = 0;  ///< the snapshot that is new enough for this peer, or its command
+    bool waitsForCommand = false;
     std::string reply;
 };
 
@@ -54,6 +61,13 @@ std::string replyTo(const std::string& request, const Dictionary& snapshot) {
     if (request == "status") return jsonText(snapshot) + "\n";
     const Value* entry = snapshot.find(request);
     return entry ? jsonText(*entry) + "\n" : errorReply("unknown request");
+}
+
+std::vector<std::string> wordsOf(const std::string& request) {
+    std::istringstream text(request);
+    std::vector<std::string> words;
+    for (std::string word; text >> word;) words.push_back(word);
+    return words;
 }
 
 void raise(const FileDescriptor& event) {
@@ -70,8 +84,13 @@ void lower(const FileDescriptor& event) {
 
 class LinuxAdminService::Server {
 public:
-    Server(Scheduler& scheduler, const Limits& limits, std::function<Dictionary()> snapshot, FileDescriptor listener)
-        : scheduler_(scheduler), limits_(limits), snapshot_(std::move(snapshot)), listener_(std::move(listener)) {}
+    Server(Scheduler& scheduler, const Limits& limits, Commands commands, std::function<Dictionary()> snapshot,
+           FileDescriptor listener)
+        : scheduler_(scheduler),
+          limits_(limits),
+          commands_(std::move(commands)),
+          snapshot_(std::move(snapshot)),
+          listener_(std::move(listener)) {}
 
     bool isComplete() const { return listener_ && end_ && mailbox_->arrived; }
     void requestEnd() { raise(end_); }
@@ -90,7 +109,7 @@ public:
             }
             if (::poll(waited.data(), waited.size(), timeout()) < 0 && errno != EINTR) break;
             if (waited[0].revents != 0) break;
-            if (waited[1].revents != 0) takeSnapshot();
+            if (waited[1].revents != 0) takeAnswers();
             std::size_t index = 3;
             for (auto peer = peers_.begin(); peer != peers_.end(); ++index)
                 peer = serve(*peer, waited[index].revents) ? std::next(peer) : peers_.erase(peer);
@@ -117,7 +136,10 @@ private:
         if (!socket) return;
         const auto user = peerUser(socket.get());
         if (!user || (*user != ::geteuid() && *user != 0)) return;
-        peers_.push_back({std::move(socket), Peer::State::Asking, in(limits_.request), {}, 0, {}});
+        Peer peer;
+        peer.socket = std::move(socket);
+        peer.deadline = in(limits_.request);
+        peers_.push_back(std::move(peer));
     }
 
     /// False when the peer is done with.
@@ -152,8 +174,43 @@ private:
 
     void ask(Peer& peer) {
         peer.state = Peer::State::Waiting;
-        peer.deadline = in(limits_.snapshot);
         peer.question = ++questions_;
+        std::vector<std::string> words = wordsOf(peer.request);
+        const auto command = words.empty() ? commands_.end() : commands_.find(words.front());
+        peer.waitsForCommand = command != commands_.end();
+        peer.deadline = in(peer.waitsForCommand ? limits_.command : limits_.snapshot);
+        if (peer.waitsForCommand) {
+            words.erase(words.begin());
+            submit(peer, command->second, std::move(words));
+        } else {
+            submitQuestion(peer);
+        }
+    }
+
+    void submit(Peer& peer, const AdminCommand& command, std::vector<std::string> arguments) {
+        {
+            const std::lock_guard lock(mailbox_->mutex);
+            if (mailbox_->commandsUnderWay.size() == kMaximumPeers)
+                return reply(peer, errorReply("the daemon is busy with other commands"));
+            mailbox_->commandsUnderWay.insert(peer.question);
+        }
+        AdminAnswer answer = [mailbox = mailbox_, question = peer.question](Dictionary result) {
+            const std::lock_guard lock(mailbox->mutex);
+            if (mailbox->commandsUnderWay.erase(question) == 0 || mailbox->closed) return;
+            mailbox->answers.emplace(question, std::move(result));
+            raise(mailbox->arrived);
+        };
+        scheduler_.mainQueue().async([mailbox = mailbox_, command, arguments = std::move(arguments),
+                                      answer = std::move(answer)] {
+            {
+                const std::lock_guard lock(mailbox->mutex);
+                if (mailbox->closed) return;
+            }
+            command(arguments, answer);
+        });
+    }
+
+    void submitQuestion(const Peer& peer) {
         {
             // A main queue that does not answer must not be heaped with questions; this peer will be told that it is
             // busy.
@@ -175,20 +232,25 @@ private:
         });
     }
 
-    /// A snapshot answers all who asked no later than it was asked for.
-    void takeSnapshot() {
+    /// A snapshot answers all who asked no later than it was asked for, a command the one who gave it.
+    void takeAnswers() {
         lower(mailbox_->arrived);
         std::optional<Dictionary> snapshot;
         std::uint64_t question = 0;
+        std::map<std::uint64_t, Dictionary> answers;
         {
             const std::lock_guard lock(mailbox_->mutex);
             snapshot = std::exchange(mailbox_->snapshot, std::nullopt);
             question = mailbox_->question;
+            answers.swap(mailbox_->answers);
         }
-        if (!snapshot) return;
-        for (Peer& peer : peers_)
-            if (peer.state == Peer::State::Waiting && peer.question <= question)
+        for (Peer& peer : peers_) {
+            if (peer.state != Peer::State::Waiting) continue;
+            if (const auto answer = answers.find(peer.question); answer != answers.end())
+                reply(peer, jsonText(answer->second) + "\n");
+            else if (snapshot && !peer.waitsForCommand && peer.question <= question)
                 reply(peer, replyTo(peer.request, *snapshot));
+        }
     }
 
     void reply(Peer& peer, std::string text) const {
@@ -207,6 +269,7 @@ private:
 
     Scheduler& scheduler_;
     const Limits limits_;
+    const Commands commands_;
     const std::function<Dictionary()> snapshot_;
     const FileDescriptor listener_;
     const FileDescriptor end_{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};
@@ -225,9 +288,13 @@ LinuxAdminService::~LinuxAdminService() {
     ::unlink(socketPath_.c_str());
 }
 
+void LinuxAdminService::addCommand(std::string name, AdminCommand command) {
+    commands_[std::move(name)] = std::move(command);
+}
+
 void LinuxAdminService::resume(std::function<Dictionary()> snapshot) {
     if (thread_.joinable()) return;
-    server_ = std::make_unique<Server>(scheduler_, limits_, std::move(snapshot), listenAt(socketPath_));
+    server_ = std::make_unique<Server>(scheduler_, limits_, commands_, std::move(snapshot), listenAt(socketPath_));
     if (!server_->isComplete()) return;
     sigset_t all;
     sigset_t before;

@@ -2,6 +2,8 @@
 #include <sys/types.h>
 
 #include <chrono>
+#include <functional>
+#include <map>
 #include <memory>
 #include <string>
 #include <thread>
@@ -13,9 +15,8 @@
 namespace lumacast {
 
 /// The administrator's questions on a Unix socket: a peer sends one line and gets one line of JSON, then the connection
-/// is closed. `status` answers the whole snapshot, any other word the snapshot's entry of that name; what can't be
-/// answered is
-/// {"error": "..."}. Only the daemon's own user and root are heard (by the kernel's word). At most 8 peers at a time, a
+/// is closed. A command's name, with its arguments behind it, is answered by the command, `status` by the whole
+/// snapshot, any other word by the snapshot's entry of that name; what can't be answered is {"error": "..."}. Only the daemon's own user and root are heard (by the kernel's word). At most 8 peers at a time, a
 /// line of at most 128 bytes, and a limit for every wait; one thread serves them all and never holds the daemon up.
 class LinuxAdminService final : public AdminService {
 public:
@@ -23,6 +24,7 @@ public:
         std::chrono::milliseconds request{2000};   ///< from connecting to the end of the line
         std::chrono::milliseconds snapshot{2000};  ///< for the main queue to answer
         std::chrono::milliseconds reply{5000};     ///< for the peer to read
+        std::chrono::milliseconds command{60000};  ///< for a command to answer
     };
     /// `socketPath` is where the socket will be, in a directory of this user's own.
     LinuxAdminService(Scheduler& scheduler, std::string socketPath)
@@ -31,6 +33,7 @@ public:
     /// Closes every connection and removes the socket. A snapshot that was asked for is not waited for.
     ~LinuxAdminService() override;
 
+    void addCommand(std::string name, AdminCommand command) override;
     void resume(std::function<Dictionary()> snapshot) override;
 
     /// Whether the socket is open; false before resume, and when another daemon answers there or it could not be made.
@@ -42,6 +45,7 @@ private:
     Scheduler& scheduler_;
     const std::string socketPath_;
     const Limits limits_;
+    std::map<std::string, AdminCommand, std::less<>> commands_;
     std::unique_ptr<Server> server_;
     std::thread thread_;
 };

@@ -42,6 +42,20 @@ inline constexpr std::array kLimits{
     LimitRow{Limit::HeldBytesPerUser, 64 << 20, "bytes of unfinished and of unread messages of one user's connections"},
 };
 
+/// How little space may be free where movies are written before temporary ones are asked for.
+struct PurgeLevel {
+    std::int32_t urgency;
+    std::uint64_t freeBytesBelow;
+    std::string_view meaning;
+};
+
+/// The most urgent last.
+inline constexpr std::array kPurgeLevels{
+    PurgeLevel{1, 1'000'000'000, "space gets short: old movies may go"},
+    PurgeLevel{2, 500'000'000, "space is short"},
+    PurgeLevel{3, 100'000'000, "less than a recording may begin with: a running one is stopped, every movie goes"},
+};
+
 constexpr std::uint64_t limitOf(Limit limit) { return kLimits[static_cast<std::size_t>(limit)].value; }
 
 }  // namespace lumacast

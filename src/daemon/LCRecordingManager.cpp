@@ -24,6 +24,7 @@ std::shared_ptr<LCRecordingManager> LCRecordingManager::init(const SessionServic
     services.tempStore._srSetupTempDirectory();
     manager->publicListener_ = services.platform.ipc.listenerForService(kServiceName);
     manager->publicListener_->setDelegate(manager);
+    manager->registerPurgeCallbacks();  // last
     return manager;
 }
 

@@ -80,6 +80,9 @@ public:
 
     /// Sessions and their recordings, for the administrator.
     Dictionary snapshot() const;
+    /// Serves the administrator's commands about the temporary movies, "storage" and "purge". Before the service is
+    /// resumed.
+    void serveStorageCommands();
 
     // LCRecordingSessionDelegate; from any lane.
     void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
@@ -116,6 +119,15 @@ private:
     void clientDidBecomeActive();
     void clientDidResignActive();
     std::optional<Dictionary> synchronousGetCurrentState();
+
+    // Storage that runs short. Called on the purge service's lane; each touch of the sessions is a task on the request
+    // lane that is waited for, deleting is done on that lane itself.
+    void registerPurgeCallbacks();
+    PurgeRecord cacheDeletePurgeableSpace();
+    std::optional<PurgeRecord> cacheDeletePurge(std::int32_t urgency);
+    PurgeRecord cacheDeletePeriodic();
+    /// The movies being recorded now. Request lane.
+    std::vector<std::string> pathsBeingRecorded() const;
 
     // Starting.
     bool checkContextIDsMatch(const std::vector<ContextID>& contextIDs);

@@ -20,6 +20,7 @@ const std::shared_ptr<LCClientProxy>& Process::clientProxy() {
 
 void Process::start() {
     manager_->finishStartup();
+    manager_->serveStorageCommands();
     platform_.admin.resume([weak = std::weak_ptr(manager_)] {
         const auto manager = weak.lock();
         return manager ? manager->snapshot() : Dictionary();

@@ -19,6 +19,7 @@
 #include "platform/Preferences.h"
 #include "platform/RenderServer.h"
 #include "platform/Scheduler.h"
+#include "platform/StoragePurgeService.h"
 #include "platform/TelemetryReporter.h"
 
 namespace lumacast {
@@ -42,6 +43,7 @@ struct Platform {
     TelemetryReporter& telemetry;
     KeepAlive& keepAlive;
     AdminService& admin;
+    StoragePurgeService& storagePurge;
 };
 
 /// What owns the platform's objects.

@@ -4,6 +4,7 @@
 #include <functional>
 #include <future>
 #include <thread>
+#include <vector>
 
 #include "linux/admin/LinuxAdminService.h"
 #include "linux/system/Json.h"
@@ -24,6 +25,8 @@ public:
     virtual AdminService& admin() = 0;
     /// The administrator asks how the daemon is, from a lane of its own. None when nobody answers.
     virtual std::optional<Dictionary> ask() = 0;
+    /// The administrator gives a command, a line of words; none when nobody answers in time.
+    virtual std::optional<Dictionary> command(const std::string& line) = 0;
 
     SerialQueue& mainQueue() { return scheduler_.mainQueue(); }
 
@@ -43,6 +46,14 @@ public:
         if (future.wait_for(kPatience) != std::future_status::ready) return std::nullopt;
         return future.get();
     }
+    std::optional<Dictionary> command(const std::string& line) override {
+        const auto answer = std::make_shared<std::promise<Dictionary>>();
+        auto future = answer->get_future();
+        if (!admin_.command(line, [answer](Dictionary result) { answer->set_value(std::move(result)); }))
+            return std::nullopt;
+        if (future.wait_for(kPatience) != std::future_status::ready) return std::nullopt;
+        return future.get();
+    }
 
 private:
     FakeAdminService admin_{scheduler_};
@@ -51,8 +62,9 @@ private:
 class PortAdminWorld final : public AdminWorld {
 public:
     AdminService& admin() override { return admin_; }
-    std::optional<Dictionary> ask() override {
-        const auto line = askAdminService(scratch_.path("admin.sock"), "status", kPatience);
+    std::optional<Dictionary> ask() override { return command("status"); }
+    std::optional<Dictionary> command(const std::string& words) override {
+        const auto line = askAdminService(scratch_.path("admin.sock"), words, kPatience);
         const auto value = line ? valueFromJson(*line) : std::nullopt;
         return value && value->as<Dictionary>() ? std::optional(*value->as<Dictionary>()) : std::nullopt;
     }
@@ -110,6 +122,67 @@ TEST_P(AdminServiceContract, SeveralMayAskAtOnce) {
         });
     for (std::thread& administrator : administrators) administrator.join();
     EXPECT_EQ(answered, 20);
+}
+
+TEST_P(AdminServiceContract, ACommandIsGivenItsWordsOnTheMainQueueAndAnswersFromAnyLane) {
+    std::atomic<bool> elsewhere{false};
+    std::vector<std::string> given;
+    world_->admin().addCommand("brew", [&](const std::vector<std::string>& arguments, AdminAnswer answer) {
+        if (!world_->mainQueue().isCurrent()) elsewhere = true;
+        given = arguments;
+        std::thread([answer] { answer({{"brewed", true}}); }).detach();
+    });
+    world_->admin().resume([] { return Dictionary(); });
+    const auto answer = world_->command("brew  tea 3");
+    ASSERT_TRUE(answer);
+    EXPECT_EQ(Value(*answer), Value(Dictionary{{"brewed", true}}));
+    EXPECT_EQ(given, (std::vector<std::string>{"tea", "3"}));
+    EXPECT_FALSE(elsewhere);
+    world_.reset();
+}
+
+TEST_P(AdminServiceContract, OnlyACommandsFirstAnswerCounts) {
+    world_->admin().addCommand("twice", [](const std::vector<std::string>&, AdminAnswer answer) {
+        answer({{"answer", 1}});
+        answer({{"answer", 2}});
+    });
+    world_->admin().resume([] { return Dictionary(); });
+    for (int i = 0; i < 3; ++i) EXPECT_EQ(Value(*world_->command("twice")), Value(Dictionary{{"answer", 1}}));
+}
+
+TEST_P(AdminServiceContract, ACommandThatTakesItsTimeHoldsNoQuestionUp) {
+    AdminAnswer pending;
+    std::promise<void> begun;
+    world_->admin().addCommand("slow", [&](const std::vector<std::string>&, AdminAnswer answer) {
+        pending = std::move(answer);
+        begun.set_value();
+    });
+    world_->admin().resume([] { return Dictionary{{"well", true}}; });
+    std::optional<Dictionary> answer;
+    std::thread administrator([&] { answer = world_->command("slow"); });
+    begun.get_future().wait();
+    EXPECT_TRUE(world_->ask());
+    pending({{"done", true}});
+    administrator.join();
+    ASSERT_TRUE(answer);
+    EXPECT_EQ(Value(*answer), Value(Dictionary{{"done", true}}));
+    pending = {};
+}
+
+TEST_P(AdminServiceContract, AnAnswerAfterTheServicesEndIsDropped) {
+    AdminAnswer pending;
+    std::promise<void> begun;
+    world_->admin().addCommand("slow", [&](const std::vector<std::string>&, AdminAnswer answer) {
+        pending = std::move(answer);
+        begun.set_value();
+    });
+    world_->admin().resume([] { return Dictionary(); });
+    std::thread administrator([&] { (void)world_->command("slow"); });
+    begun.get_future().wait();
+    pending({});
+    administrator.join();
+    world_.reset();
+    pending({});
 }
 
 INSTANTIATE_TEST_SUITE_P(Fake, AdminServiceContract,

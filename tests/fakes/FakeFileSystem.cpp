@@ -102,6 +102,7 @@ Result<FileAttributes> FakeFileSystem::attributes(const std::string& path) {
 }
 
 Result<std::vector<std::string>> FakeFileSystem::list(const std::string& directory) {
+    if (disk_) disk_(directory);
     if (faults_.fails("FileSystem.list")) return fakeSystemError(EIO);
     const std::lock_guard lock(mutex_);
     const auto found = find(directory);
@@ -118,6 +119,7 @@ Result<std::vector<std::string>> FakeFileSystem::list(const std::string& directo
 }
 
 std::optional<Error> FakeFileSystem::remove(const std::string& path) {
+    if (disk_) disk_(path);
     if (faults_.fails("FileSystem.remove")) return fakeSystemError(EIO);
     const std::lock_guard lock(mutex_);
     const auto found = find(path);
@@ -128,6 +130,7 @@ std::optional<Error> FakeFileSystem::remove(const std::string& path) {
 }
 
 std::optional<Error> FakeFileSystem::move(const std::string& from, const std::string& to) {
+    if (disk_) disk_(from);
     if (faults_.fails("FileSystem.move")) return fakeSystemError(EIO);
     const std::lock_guard lock(mutex_);
     const auto source = find(from);

@@ -1,4 +1,5 @@
 #pragma once
+#include <functional>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -47,6 +48,9 @@ public:
     void addFile(const std::string& path, std::uint64_t size, std::optional<Date> modified = {});
     /// Makes a link. Nothing is ever found through it.
     void addLink(const std::string& path);
+    /// `before` is called by what waits for the disk (listing, removing, moving), on the lane that waits, before
+    /// anything is done: a disk that stands still for as long as it takes. Set before the lanes run.
+    void setDisk(std::function<void(const std::string& path)> before) { disk_ = std::move(before); }
     /// The paths of all files, sorted.
     std::vector<std::string> files() const;
 
@@ -71,6 +75,7 @@ private:
     FaultPlan& faults_;
     const std::string root_;
     const std::string base_;
+    std::function<void(const std::string& path)> disk_;
     mutable std::mutex mutex_;
     std::map<std::string, std::shared_ptr<FakeFile>> nodes_;
     std::uint64_t capacity_ = 1'000'000'000;

@@ -20,6 +20,7 @@ FakePlatform::FakePlatform(Scheduler& itsScheduler, std::function<HostTime()> ho
       movieExporters(scheduler, fileSystem, faults),
       telemetry(faults),
       admin(scheduler),
+      storagePurge(scheduler),
       platform_{log,
                 scheduler,
                 clock,
@@ -36,7 +37,8 @@ FakePlatform::FakePlatform(Scheduler& itsScheduler, std::function<HostTime()> ho
                 deviceInfo,
                 telemetry,
                 keepAlive,
-                admin} {
+                admin,
+                storagePurge} {
     containerWriters.setWhenMade([this] { displayCapture.deliverFrames(); });
 }
 

@@ -21,6 +21,7 @@
 #include "tests/fakes/FakeMovieExporter.h"
 #include "tests/fakes/FakePreferences.h"
 #include "tests/fakes/FakeRenderServer.h"
+#include "tests/fakes/FakeStoragePurgeService.h"
 #include "tests/fakes/FakeTelemetry.h"
 #include "tests/fakes/FaultPlan.h"
 #include "tests/fakes/SimScheduler.h"
@@ -64,6 +65,7 @@ public:
     FakeTelemetry telemetry;
     FakeKeepAlive keepAlive;
     FakeAdminService admin;
+    FakeStoragePurgeService storagePurge;  ///< last: it holds who has registered
 
 private:
     Platform platform_;

@@ -2,6 +2,7 @@
 // The daemon's two sockets, with a snapshot of the test's own behind them.
 
 #include <functional>
+#include <map>
 #include <memory>
 #include <string>
 #include <thread>
@@ -20,11 +21,12 @@ public:
 
     /// Both sockets in `runtimeDirectory`. On a lane that hangs the admin service soon says that the daemon is busy.
     explicit StandInDaemon(const std::string& runtimeDirectory, std::function<Dictionary()> snapshot,
-                           Lane lane = Lane::Runs)
+                           Lane lane = Lane::Runs, const std::map<std::string, AdminCommand>& commands = {})
         : ipc_(*reactor_, log_, {.runtimeDirectory = runtimeDirectory}),
           listener_(ipc_.listenerForService("com.orvane.lumacastd")),
           admin_(scheduler_, runtimeDirectory + "/admin.sock", {.snapshot = std::chrono::milliseconds(50)}) {
         listener_->resume();
+        for (const auto& [name, command] : commands) admin_.addCommand(name, command);
         admin_.resume(std::move(snapshot));
         if (lane == Lane::Runs) thread_ = std::thread([this] { reactor_->run(); });
     }

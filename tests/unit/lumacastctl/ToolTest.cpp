@@ -5,6 +5,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
+
 #include "linux/admin/UnixSocket.h"
 #include "tests/contract/PrivateDisplay.h"
 #include "tests/contract/ScratchDirectory.h"
@@ -115,6 +117,14 @@ TEST_F(Tool, TellsWrongUsageFromEverythingElse) {
                                                       {"status", "more"},
                                                       {"status", "--json"},
                                                       {"status", "doctor"},
+                                                      {"storage", "nonsense"},
+                                                      {"storage", "list", "purgeable"},
+                                                      {"storage", "list", "more"},
+                                                      {"storage", "purge"},
+                                                      {"storage", "purge", "0"},
+                                                      {"storage", "purge", "-3"},
+                                                      {"storage", "purge", "much"},
+                                                      {"storage", "purge", "3", "4"},
                                                       {"doctor", "--pid", "0"},
                                                       {"doctor", "--pid", "-4"},
                                                       {"doctor", "--pid", "many"},
@@ -130,11 +140,41 @@ TEST_F(Tool, TellsWrongUsageFromEverythingElse) {
 
 TEST_F(Tool, DocumentsItsExitStatuses) {
     for (const std::vector<std::string>& arguments :
-         {std::vector<std::string>{"--help"}, {"status", "--help"}, {"doctor", "--help"}}) {
+         {std::vector<std::string>{"--help"}, {"status", "--help"}, {"doctor", "--help"}, {"storage", "--help"},
+          {"storage", "list", "--help"}, {"storage", "purgeable", "--help"}, {"storage", "purge", "--help"}}) {
         const Outcome result = run(arguments);
         EXPECT_EQ(result.status, 0);
         EXPECT_THAT(result.out, HasSubstr("Exit status:\n  0  all is well\n  1  the daemon isn't running"));
     }
+}
+
+TEST_F(Tool, ShowsAndPurgesTheStorage) {
+    const Dictionary storage{{"filesBytes", std::uint64_t{5}},
+                             {"files", Array{Dictionary{{"name", "a.mp4"}, {"bytes", std::uint64_t{5}}}}}};
+    std::atomic<int> purged{0};
+    const StandInDaemon daemon(
+        runtimeDirectory(), emptySnapshot, StandInDaemon::Lane::Runs,
+        {{"storage", [&](const auto&, const AdminAnswer& answer) { answer(storage); }},
+         {"purge", [&](const std::vector<std::string>& arguments, const AdminAnswer& answer) {
+              purged = std::stoi(arguments.at(0));
+              answer({{"urgency", 3}, {"freedBytes", std::uint64_t{1234}}});
+          }}});
+    EXPECT_EQ(run({"storage", "list"}).out, "a.mp4  5 bytes  unknown\n");
+    EXPECT_THAT(run({"storage", "purgeable"}).out, HasSubstr("Movies:     5 bytes in 1 file\n"));
+    EXPECT_THAT(run({"storage"}).out, HasSubstr("a.mp4  5 bytes  unknown\n\nPurgeable:  unknown\n"));
+    for (const auto& arguments : {std::vector<std::string>{"storage", "--json"}, {"storage", "list", "--json"},
+                                  {"storage", "--json", "list"}}) {
+        const Outcome result = run(arguments);
+        EXPECT_EQ(result.status, 0);
+        EXPECT_EQ(result.out, jsonText(storage) + "\n");
+    }
+    EXPECT_EQ(purged, 0);
+    const Outcome result = run({"storage", "purge", "3"});
+    EXPECT_EQ(result.status, 0);
+    EXPECT_EQ(result.out, "Purge at urgency 3: 1.2 kB given back.\n");
+    EXPECT_EQ(purged, 3);
+    EXPECT_EQ(run({"storage", "purge", "2", "--json"}).out, "{\"urgency\":3,\"freedBytes\":1234}\n");
+    EXPECT_EQ(purged, 2);
 }
 
 TEST_F(Tool, FailsWhenItsOutputCannotBeWritten) {

@@ -2,8 +2,10 @@
 
 #include <gtest/gtest.h>
 
+#include <cerrno>
 #include <vector>
 
+#include "tests/fakes/FakeError.h"
 #include "tests/fakes/FakePlatform.h"
 
 namespace lumacast {
@@ -87,6 +89,26 @@ TEST_F(TempStoreTest, RemovingAFileThatDoesNotExistIsNoError) {
     EXPECT_TRUE(fakes_.logSink.lines().empty());
 }
 
+TEST_F(TempStoreTest, AFileThatTheDiskDoesNotAnswerForIsRemovedAllTheSame) {
+    const std::string path = (ready(), addFile("a.mp4"));
+    fakes_.faults.failNext("FileSystem.exists");
+    fakes_.faults.failNext("FileSystem.attributes");
+    store_._srRemoveFile(URL::file(path), {});
+    settle();
+    fakes_.faults.clear();
+    EXPECT_FALSE(exists(path)) << "no answer is not the answer that nothing is there";
+}
+
+TEST_F(TempStoreTest, WhatLeavesTheDirectoryIsAnErrorAndNotNothing) {
+    std::vector<std::optional<Error>> answers;
+    ready()._srRemoveFile(URL::file(store_.pathFor("../a.mp4")),
+                          [&](std::optional<Error> error) { answers.push_back(error); });
+    store_._srRemoveFile(URL::file((addFile("b.mp4"), store_.pathFor("b.mp4/a.mp4"))),
+                         [&](std::optional<Error> error) { answers.push_back(error); });
+    settle();
+    EXPECT_EQ(answers, (std::vector<std::optional<Error>>{fakeSystemError(EACCES), std::nullopt}));
+}
+
 TEST_F(TempStoreTest, AFailedRemovalIsLoggedAndHandedOver) {
     const std::string path = (ready(), addFile("a.mp4"));
     fakes_.faults.failNext("FileSystem.remove");
@@ -95,7 +117,8 @@ TEST_F(TempStoreTest, AFailedRemovalIsLoggedAndHandedOver) {
     settle();
     ASSERT_EQ(answers.size(), 1u);
     EXPECT_EQ(answers[0], fakeSystemError(EIO));
-    EXPECT_EQ(fakes_.logSink.logged(), std::vector<std::string>{"_lxRemoveFile error: 5"});
+    EXPECT_EQ(fakes_.logSink.lines(),
+              (std::vector<FakeLogSink::Line>{{LogLevel::Default, "_lxRemoveFile error: 5"}}));
     EXPECT_TRUE(exists(path));
 }
 
@@ -185,6 +208,38 @@ TEST_F(TempStoreTest, AnOrdinaryRemovalKnowsNoClaims) {
     store_._srRemoveFile(URL::file(path), {});
     settle();
     EXPECT_FALSE(exists(path));
+}
+
+TEST_F(TempStoreTest, AClaimGoesWithItsHolder) {
+    const std::string path = (ready(), addFile("a.mp4"));
+    const std::uint64_t older = store_.claimPath(path), later = store_.claimPath(path);
+    auto holdOlder = store_.holdClaim(path, older), holdLater = store_.holdClaim(path, later);
+    holdLater.reset();
+    EXPECT_EQ(store_.claimedPathCount(), 1u);
+    store_.removeFileOfClaim(URL::file(path), older, {});
+    settle();
+    EXPECT_TRUE(exists(path)) << "somebody is left who could take the later one's file for its own";
+    holdOlder.reset();
+    EXPECT_EQ(store_.claimedPathCount(), 0u);
+    EXPECT_EQ(store_.lastClaim(), later);
+    EXPECT_GT(store_.claimPath(path), later) << "numbers are never given out again";
+}
+
+TEST_F(TempStoreTest, OneHoldersEndLeavesTheOtherPathsAndClaimsAlone) {
+    const std::string a = store_.pathFor("a.mp4"), b = store_.pathFor("b.mp4");
+    const std::uint64_t claimA = store_.claimPath(a), claimB = store_.claimPath(b), laterA = store_.claimPath(a);
+    store_.holdClaim(a, claimA).reset();
+    store_.holdClaim(b, claimB).reset();
+    EXPECT_EQ(store_.claimedPathCount(), 1u);
+    store_.holdClaim(a, laterA).reset();
+    EXPECT_EQ(store_.claimedPathCount(), 0u);
+}
+
+TEST_F(TempStoreTest, AHoldOutlivesItsStore) {
+    SimWorld world(1);
+    auto store = std::make_unique<TempStore>(world.fakes.platform());
+    const auto hold = store->holdClaim("a", store->claimPath("a"));
+    store.reset();
 }
 
 TEST_F(TempStoreTest, ExactlyOneHundredMillionBytesAreNotEnough) {

@@ -44,7 +44,8 @@ protected:
                 p.bundles,       p.renderServer,   p.appStateMonitor, p.displayCapture,
                 p.displayCloneControl, writers,    exporters,         p.fileSystem,
                 p.preferences,   p.deviceInfo,     p.telemetry,       p.keepAlive,
-                p.admin};
+                p.admin,
+                p.storagePurge};
     }
     void settle() { world_.scheduler.runUntilIdle(); }
 

@@ -1,0 +1,17 @@
+#pragma once
+#include <chrono>
+#include <cstdio>
+#include <optional>
+#include <string>
+
+namespace lumacast::ctl {
+
+/// Asks the daemon whose runtime directory this is and answers the line that comes back; none after writing to
+/// `complaints` why there is none and what to do. Blocks for at most `limit`.
+std::optional<std::string> askDaemon(const std::string& runtimeDirectory, const std::string& request,
+                                     std::FILE* complaints, std::chrono::milliseconds limit);
+
+/// Writes a complaint and answers the exit status for a daemon that gave no answer.
+int complain(std::FILE* complaints, const std::string& text);
+
+}  // namespace lumacast::ctl
