@@ -139,6 +139,40 @@ TEST(LinuxAdminService, ADaemonThatDoesNotAnswerIsBusy) {
     EXPECT_LE(daemon.snapshots, 20) << "questions don't pile up behind a busy main queue";
 }
 
+TEST(LinuxAdminService, ACommandGoesBeforeAnEntryOfItsName) {
+    Daemon daemon;
+    daemon.admin.addCommand("storage", [](const std::vector<std::string>& arguments, const AdminAnswer& answer) {
+        answer({{"words", static_cast<std::int64_t>(arguments.size())}});
+    });
+    daemon.resume();
+    const RunningThreadLoop running(*daemon.loop);
+    EXPECT_EQ(daemon.ask("storage"), R"({"words":0})");
+    EXPECT_EQ(daemon.ask(" storage\tof  mine "), R"({"words":2})");
+    EXPECT_EQ(daemon.ask("status"), kStatus);
+    EXPECT_EQ(daemon.ask("sessions"), "[]");
+    EXPECT_EQ(daemon.ask("status of mine"), R"({"error":"unknown request"})") << "only commands take arguments";
+}
+
+TEST(LinuxAdminService, ACommandThatDoesNotAnswerInTimeIsBusyAndTooManyOfThemAreRefused) {
+    Daemon daemon({30s, 30s, 30s, 30ms});
+    std::vector<AdminAnswer> pending;
+    daemon.admin.addCommand("slow", [&](const std::vector<std::string>&, AdminAnswer answer) {
+        pending.push_back(std::move(answer));
+    });
+    daemon.resume();
+    {
+        const RunningThreadLoop running(*daemon.loop);
+        for (int i = 0; i < 8; ++i) EXPECT_EQ(daemon.ask("slow"), R"({"error":"the daemon is busy"})");
+        EXPECT_EQ(daemon.ask("slow"), R"({"error":"the daemon is busy with other commands"})");
+        EXPECT_EQ(daemon.ask("status"), kStatus) << "questions are none";
+    }
+    ASSERT_EQ(pending.size(), 8u);
+    pending[0]({{"late", true}});
+    const RunningThreadLoop running(*daemon.loop);
+    EXPECT_EQ(daemon.ask("slow"), R"({"error":"the daemon is busy"})") << "one has ended: there is room again";
+    EXPECT_EQ(daemon.ask("status"), kStatus) << "nobody is given a late answer";
+}
+
 TEST(LinuxAdminService, ASnapshotUnderWayOutlivesTheService) {
     const auto loop = std::make_shared<ThreadLoop>();
     ThreadScheduler scheduler(loop);
