@@ -26,6 +26,10 @@ public:
         handler_.swap(handler);
     }
 
+    bool hasHandler() const {
+        const std::lock_guard lock(mutex_);
+        return handler_ != nullptr;
+    }
     void setState(const BundleIdentifier& identifier, std::uint32_t state) {
         const std::lock_guard lock(mutex_);
         states_.insert_or_assign(identifier, state);

@@ -37,7 +37,8 @@ nlohmann::json answer(const World& world, std::vector<std::string> arguments) {
 
 /// The entry of a file in the daemon's list; null when it is not in it.
 nlohmann::json entryOf(const World& world, const std::string& name) {
-    for (const auto& file : answer(world, {"storage", "list"})["files"])
+    const auto list = answer(world, {"storage", "list"});
+    for (const auto& file : list["files"])
         if (file["name"] == name) return file;
     return {};
 }

@@ -149,6 +149,49 @@ TEST_F(Stop, AClientThatLeavesBeforeItsMovieIsFinishedKeepsTheDaemonUpUntilItIs)
     EXPECT_EQ(logged("LCRecordingManager:resetStatesForSession:"), 1u);
 }
 
+TEST_F(Stop, AStopOfASystemRecordingEndsTheWatchOnTheForeground) {
+    const auto client = makeRecording();
+    const auto watched = [&] { return fakes_.appStateMonitor.hasHandler(); };
+    const auto watch = [&] {
+        world_.scheduler.mainQueue().sync([&] { fakes_.appStateMonitor.setHandler([](auto, auto, auto) {}); });
+    };
+    watch();
+    session(*client)->setSystemRecording(true);
+    stopped(*client);
+    EXPECT_EQ(logged("stop monitoring foreground apps"), 1u);
+    EXPECT_FALSE(watched());
+    // An idle session that recorded the system before is no exception.
+    watch();
+    tell(*client, DaemonMessage::StopRecording);
+    EXPECT_EQ(fakes_.logSink.logged(),
+              (Lines{"LCRecordingManager: stopRecordingWithHandler:",
+                     "LCRecordingManager: stopRecordingWithStartTimeOffset:endTimeOffset:handler:",
+                     "LCRecordingManager: stopRecordingSession:handler:", "stop monitoring foreground apps"}));
+    EXPECT_FALSE(watched());
+    // Any other session leaves the watch alone.
+    watch();
+    session(*client)->setSystemRecording(false);
+    tell(*client, DaemonMessage::StopRecording);
+    EXPECT_TRUE(watched());
+}
+
+TEST_F(Stop, WhatIsToldAClientThatHasGoneEndsInItsErrorLine) {
+    const auto client = makeRecording();
+    const auto gone = session(*client);
+    client->connection.reset();
+    client->die();
+    settle();
+    fakes_.logSink.clear();
+    ASSERT_FALSE(session(*client));
+    // What is still under way for it tells it.
+    gone->clientProxy()->stopRecordingWithError(std::nullopt, std::nullopt);
+    settle();
+    const auto lines = fakes_.logSink.logged();
+    ASSERT_EQ(lines.size(), 2u);
+    EXPECT_EQ(lines[0], "LCClientProxy:stopRecordingWithError:movieURL:");
+    EXPECT_TRUE(lines[1].starts_with("LCClientProxy:recordingDidStopWithError: error getting remote proxy: "));
+}
+
 TEST_F(Stop, AFailedSourceTellsTheClientOnceAndResets) {
     const auto client = makeRecording();
     fakes_.displayCapture.lastSource()->fail(-1);
