@@ -3,8 +3,7 @@
 
 #include <gtest/gtest.h>
 
-#include <cstdlib>
-
+#include "tests/simulation/Seeds.h"
 #include "tests/simulation/SimulatedApplication.h"
 #include "tests/simulation/SimulatedDaemon.h"
 
@@ -13,11 +12,6 @@ namespace {
 
 using std::chrono::milliseconds;
 using std::chrono::seconds;
-
-std::uint64_t numberFromEnvironment(const char* name, std::uint64_t otherwise) {
-    const char* text = std::getenv(name);
-    return text && *text ? std::strtoull(text, nullptr, 10) : otherwise;
-}
 
 /// What one seed did, for comparing a replay.
 struct Outcome {
@@ -205,11 +199,9 @@ private:
 };
 
 TEST(OneApplication, LeavesNothingBehindInAnyOfManySeeds) {
-    const std::uint64_t only = numberFromEnvironment("LC_SEED", 0);
-    const std::uint64_t seeds = numberFromEnvironment("LC_SEEDS", 500);
-    const std::uint64_t first = only ? only : 1, last = only ? only : seeds;
+    const Seeds seeds(500);
     Outcome total;
-    for (std::uint64_t seed = first; seed <= last; ++seed) {
+    for (std::uint64_t seed = seeds.first; seed <= seeds.last; ++seed) {
         SCOPED_TRACE("LC_SEED=" + std::to_string(seed));
         const Outcome outcome = Life(seed).live();
         total.moviesKept += outcome.moviesKept;
@@ -223,7 +215,7 @@ TEST(OneApplication, LeavesNothingBehindInAnyOfManySeeds) {
         }
     }
     // The seeds really went everywhere.
-    if (!only && seeds >= 100) {
+    if (!seeds.isOne() && seeds.last >= 100) {
         EXPECT_GT(total.moviesKept, 50);
         EXPECT_GT(total.clipsKept, 5);
         EXPECT_GT(total.pauses, 100);

@@ -1,0 +1,318 @@
+// Several applications compete for the recording on a platform that may fail: starts, pauses, resumes, stops, clips,
+// discards, changes of the foreground, purges, a full disk and deaths at any step, in every interleaving that a seed
+// gives. LC_SEED=n replays one seed; LC_SEEDS=n runs so many.
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <deque>
+#include <set>
+
+#include "tests/simulation/Seeds.h"
+#include "tests/simulation/SimulatedApplication.h"
+#include "tests/simulation/SimulatedDaemon.h"
+
+namespace lumacast {
+namespace {
+
+using std::chrono::milliseconds;
+using std::chrono::seconds;
+
+/// What the seeds did all together: a run that goes nowhere proves nothing.
+struct Tally {
+    int takenOver = 0, restarts = 0, movies = 0, clips = 0, purges = 0, deaths = 0, refused = 0, failures = 0;
+};
+
+/// One application and what is known of its movie.
+struct Player {
+    Player(FakePlatform& machine, const std::string& name, int pid, std::uint32_t window)
+        : application(machine, BundleIdentifier("org.example." + name), name, ProcessID{pid}, ContextID{window}) {}
+
+    SimulatedApplication application;
+    /// A stop that is the last thing the application asked for: its movie must be there when it was answered.
+    std::shared_ptr<SimulatedApplication::Asked> lastStop;
+    std::size_t toldWhenItDied = 0;
+    std::vector<std::shared_ptr<SimulatedApplication::Asked>> starts, stops;
+};
+
+class Contest {
+public:
+    Contest(std::uint64_t seed, Tally& tally)
+        : daemon_(seed),
+          random_(daemon_.world.scheduler.fork()),
+          tally_(tally) {
+        players_.emplace_back(fakes(), "Alpha", 500, 7);
+        players_.emplace_back(fakes(), "Beta", 600, 8);
+        players_.emplace_back(fakes(), "Gamma", 700, 9);
+        faulty_ = random_.below(3) == 0;
+        if (faulty_) fakes().faults.failAtRandom(random_.next(), 1, 80);
+    }
+
+    void run() {
+        for (Player& player : players_) player.application.connect();
+        const std::uint64_t steps = 8 + random_.below(40);
+        for (std::uint64_t i = 0; i < steps && !::testing::Test::HasFailure(); ++i) {
+            if (random_.below(6) == 0)
+                disturb();
+            else
+                act(players_[random_.below(players_.size())]);
+            goOn();
+            checkAlways();
+        }
+        end();
+    }
+    std::uint64_t traceHash() const { return daemon_.world.scheduler.traceHash(); }
+    std::vector<std::string> log() { return fakes().logSink.logged(); }
+
+private:
+    FakePlatform& fakes() { return daemon_.world.fakes; }
+
+    void act(Player& player) {
+        SimulatedApplication& application = player.application;
+        if (!application.isAlive()) {
+            application.startAgain(ProcessID{static_cast<std::int32_t>(1000 + ++incarnation_)});
+            application.connect();
+            return;
+        }
+        const std::uint64_t what = random_.below(16);
+        const bool asksOfItsMovie = what <= 10 && what != 5 && what != 6;
+        if (asksOfItsMovie) player.lastStop.reset();
+        switch (what) {
+            case 0: case 1: case 2: case 3: player.starts.push_back(application.start()); break;
+            case 4: player.starts.push_back(application.start({ContextID{99}})); break;  // nobody's window
+            case 5: application.tell(DaemonMessage::PauseRecording); break;
+            case 6: application.tell(DaemonMessage::ResumeRecording, {number(application.window)}); break;
+            case 7: case 8:
+                player.lastStop = application.ask(DaemonMessage::StopRecording);
+                player.stops.push_back(player.lastStop);
+                break;
+            case 9:
+                player.stops.push_back(application.ask(DaemonMessage::StopRecordingWithClipDurations, {1.0, 1.0}));
+                break;
+            case 10: application.ask(DaemonMessage::DiscardRecording); break;
+            case 11: application.tell(DaemonMessage::ClientDidResignActive); break;
+            case 12: application.tell(DaemonMessage::ClientDidBecomeActive); break;
+            case 13: application.ask(DaemonMessage::SynchronousGetCurrentState); break;
+            case 14: application.connect(); break;  // again, over the old connection
+            default:
+                application.die();
+                player.lastStop.reset();
+                player.toldWhenItDied = application.told().size();
+                ++tally_.deaths;
+        }
+    }
+
+    /// The device does something.
+    void disturb() {
+        switch (random_.below(5)) {
+            case 0: {
+                const std::int32_t urgency = 1 + static_cast<std::int32_t>(random_.below(3));
+                if (urgency == 3)
+                    for (Player& player : players_) player.lastStop.reset();
+                fakes().storagePurge.requestPurge(urgency, [](const std::optional<PurgeRecord>&) {});
+                ++tally_.purges;
+                break;
+            }
+            case 1:
+                fakes().storagePurge.passDay();
+                break;
+            case 2:
+                fakes().appStateMonitor.setState(players_[random_.below(players_.size())].application.identifier,
+                                                 random_.below(2) == 0 ? 8 : 4);
+                break;
+            case 3: fakes().fileSystem.setFreeSize(random_.below(3) == 0 ? 0 : kPlenty); break;
+            default:
+                if (const auto source = fakes().displayCapture.lastSource(); source && source->isRunning())
+                    source->fail(-3);
+        }
+    }
+
+    /// Lets anything from nothing to seconds happen.
+    void goOn() {
+        for (std::uint64_t i = random_.below(60); i > 0; --i)
+            if (!daemon_.world.scheduler.step()) break;
+        if (random_.below(2) == 0) daemon_.world.scheduler.advance(milliseconds(random_.below(1500)));
+    }
+
+    void checkAlways() {
+        EXPECT_FALSE(fakes().keepAlive.endedWithoutBegin());
+        const auto sources = fakes().displayCapture.sources();
+        EXPECT_LE(std::count_if(sources.begin(), sources.end(), [](const auto& source) { return source->isRunning(); }), 1)
+            << "two applications are captured at a time";
+        for (const Player& player : players_) {
+            for (const auto& asked : player.application.asked()) {
+                EXPECT_LE(asked->answers + asked->failures, 1)
+                    << daemonProtocol().messages[static_cast<std::size_t>(asked->message)].name;
+            }
+            if (!player.application.isAlive()) {
+                EXPECT_EQ(player.application.told().size(), player.toldWhenItDied) << "told after its death";
+            }
+        }
+    }
+
+    /// What must hold when nothing is under way any more.
+    void checkAtRest() {
+        std::set<std::string> connected;
+        bool anUnansweredClip = false;
+        for (const Player& player : players_) {
+            if (player.application.isAlive()) connected.insert(player.application.identifier.text());
+            for (const auto& stop : player.stops)
+                anUnansweredClip |= stop->message == DaemonMessage::StopRecordingWithClipDurations && !stop->answers;
+        }
+        const Dictionary snapshot = daemon_.snapshot();
+        int recording = 0;
+        for (const Value& entry : *snapshot.find("sessions")->as<Array>()) {
+            const Dictionary& session = *entry.as<Dictionary>();
+            EXPECT_TRUE(connected.contains(*session.find("bundleID")->as<std::string>())) << describe(entry);
+            const bool records = *session.find("recording")->as<bool>();
+            recording += records ? 1 : 0;
+            if (!anUnansweredClip) {
+                EXPECT_EQ(*session.find("transactionOpen")->as<bool>(), records) << describe(entry);
+            }
+        }
+        EXPECT_LE(recording, 1);
+        if (!anUnansweredClip) {
+            EXPECT_EQ(fakes().keepAlive.open(), recording);
+        }
+        for (const SimBlockedTask& task : daemon_.world.scheduler.blockedTasks())
+            ADD_FAILURE() << task.lane << " waits for " << task.waitsFor;
+        if (faulty_) return;
+        for (const Player& player : players_) {
+            if (!player.lastStop || player.lastStop->answers != 1) continue;
+            if (const URL* url = player.lastStop->values[0].as<URL>()) {
+                const auto movie = fakes().fileSystem.movie(url->path());
+                ASSERT_TRUE(movie) << url->path() << " was handed out and is not there";
+                EXPECT_TRUE(movie->finished);
+            }
+        }
+    }
+
+    void end() {
+        fakes().faults.clear();
+        fakes().fileSystem.setFreeSize(kPlenty);
+        daemon_.world.scheduler.advance(seconds(5));
+        checkAtRest();
+        for (Player& player : players_)
+            fakes().appStateMonitor.setState(player.application.identifier, 8);
+        if (!faulty_)
+            for (Player& player : players_) recordOnceMore(player);
+        for (Player& player : players_) {
+            for (const auto& start : player.starts) {
+                if (start->answers == 1 && start->values[0].asError()) ++tally_.refused;
+            }
+            for (const auto& stop : player.stops) {
+                if (stop->answers != 1 || !stop->values[0].as<URL>()) continue;
+                ++(stop->message == DaemonMessage::StopRecording ? tally_.movies : tally_.clips);
+            }
+            for (const auto& told : player.application.told()) {
+                const Error* error = told.message == ClientMessage::StopRecordingWithError ? told.arguments[0].asError()
+                                                                                          : nullptr;
+                if (error && error->code() == -5806) ++tally_.takenOver;
+                if (error && error->code() == -5817) ++tally_.failures;
+            }
+            player.application.die();
+        }
+        daemon_.world.scheduler.advance(seconds(5));
+        EXPECT_EQ(fakes().keepAlive.open(), 0);
+        EXPECT_EQ(fakes().renderServer.portsOpen(), 0);
+        EXPECT_EQ(daemon_.sessionCount(), 0u);
+        for (const auto& source : fakes().displayCapture.sources()) EXPECT_FALSE(source->isRunning());
+        for (const SimBlockedTask& task : daemon_.world.scheduler.blockedTasks())
+            ADD_FAILURE() << task.lane << " waits for " << task.waitsFor;
+        checkFiles();
+        if (!faulty_)
+            for (const auto& recording : fakes().containerWriters.recordings()) judgePictures(recording->movie());
+    }
+
+    void checkFiles() {
+        const std::string folder = fakes().fileSystem.temporaryDirectory() + "/";
+        std::set<std::string> allowed;
+        for (const char* name : {"Alpha", "Beta", "Gamma"})
+            for (const char* end : {".mp4", "_trimmed.mp4"}) allowed.insert(folder + name + end);
+        for (const std::string& path : fakes().fileSystem.files()) EXPECT_TRUE(allowed.contains(path)) << path;
+    }
+
+    /// Whatever happened before, the application can record, alone, and that movie is whole.
+    void recordOnceMore(Player& player) {
+        SimulatedApplication& application = player.application;
+        if (!application.isAlive()) return;
+        application.connect();
+        const auto start = application.start();
+        daemon_.world.scheduler.advance(seconds(2));
+        ASSERT_EQ(start->answers, 1);
+        ASSERT_TRUE(start->values[0].isNull()) << describe(start->values[0]);
+        const auto stop = application.ask(DaemonMessage::StopRecording);
+        daemon_.world.scheduler.advance(seconds(1));
+        ASSERT_EQ(stop->answers, 1);
+        const URL* url = stop->values[0].as<URL>();
+        ASSERT_TRUE(url) << describe(stop->values[1]);
+        const auto movie = fakes().fileSystem.movie(url->path());
+        ASSERT_TRUE(movie);
+        EXPECT_TRUE(movie->finished);
+        EXPECT_NEAR(movie->duration().seconds(), 2.0, 0.1);
+    }
+
+    /// In order, none doubled, and no hole: paused time does not exist in a movie.
+    static void judgePictures(const FakeMovie& movie) {
+        constexpr std::int64_t kTwoFrames = 2 * CaptureClock::kTimescale / 60;
+        for (const FakeTrack& track : movie.tracks) {
+            std::optional<std::int64_t> last;
+            for (const SampleRef& sample : track.samples) {
+                const std::int64_t time = sample->presentationTime().value;
+                if (last) {
+                    EXPECT_GT(time, *last);
+                    EXPECT_LE(time - *last, kTwoFrames);
+                }
+                last = time;
+            }
+        }
+    }
+
+    static constexpr std::uint64_t kPlenty = 10'000'000'000;
+
+    SimulatedDaemon daemon_;
+    SimRandom random_;
+    std::deque<Player> players_;
+    Tally& tally_;
+    bool faulty_ = false;
+    int incarnation_ = 0;
+};
+
+TEST(SeveralApplications, LeaveNothingBehindInAnyOfManySeeds) {
+    Tally tally;
+    const Seeds seeds(500);
+    for (std::uint64_t seed = seeds.first; seed <= seeds.last; ++seed) {
+        SCOPED_TRACE("LC_SEED=" + std::to_string(seed));
+        Contest contest(seed, tally);
+        contest.run();
+        if (HasFailure()) {
+            if (!seeds.isOne()) FAIL() << "seed " << seed;
+            for (const std::string& line : contest.log()) ADD_FAILURE() << line;
+            return;
+        }
+    }
+    if (seeds.isOne() || seeds.last < 100) return;
+    // The seeds really went everywhere.
+    EXPECT_GT(tally.takenOver, 50);
+    EXPECT_GT(tally.movies, 50);
+    EXPECT_GT(tally.clips, 5);
+    EXPECT_GT(tally.purges, 50);
+    EXPECT_GT(tally.deaths, 100);
+    EXPECT_GT(tally.refused, 50);
+    EXPECT_GT(tally.failures, 10);
+}
+
+TEST(SeveralApplications, ASeedReplaysExactly) {
+    for (const std::uint64_t seed : {3u, 77u}) {
+        Tally tally;
+        Contest once(seed, tally);
+        once.run();
+        Contest again(seed, tally);
+        again.run();
+        EXPECT_EQ(once.traceHash(), again.traceHash());
+        EXPECT_EQ(once.log(), again.log());
+    }
+}
+
+}  // namespace
+}  // namespace lumacast
