@@ -76,10 +76,12 @@ TEST_F(PurgeTest, TheServiceIsRegisteredUnderItsName) {
 
 TEST_F(PurgeTest, ThePurgeCallbackHoldsTheManager) {
     const auto weak = process_->manager().weak_from_this();
-    process_.reset();
-    EXPECT_FALSE(weak.expired());
+    auto purge = fakes_.storagePurge.callbacks().purge;
     fakes_.storagePurge.registerCallbacks("another", {});
+    process_.reset();
     settle();
+    EXPECT_FALSE(weak.expired());
+    purge = {};
     EXPECT_TRUE(weak.expired());
 }
 
@@ -283,6 +285,12 @@ TEST_F(PurgeTest, TheAdministratorSeesTheMovies) {
     EXPECT_EQ(*files[2].as<Dictionary>()->find("modified"),
               Value(Date{fakes_.clock.now().secondsSince1970 - 3600}));
     EXPECT_EQ(report.find("error"), nullptr);
+    (void)client->ask(DaemonMessage::StopRecording);
+    settle();
+    const Dictionary later = command("storage");
+    ASSERT_EQ(later.find("files")->as<Array>()->size(), 3u);
+    for (const Value& file : *later.find("files")->as<Array>())
+        EXPECT_EQ(*file.as<Dictionary>()->find("recording"), Value(false)) << "nothing is being recorded any more";
 }
 
 TEST_F(PurgeTest, TheAdministratorIsToldWhatCannotBeRead) {
