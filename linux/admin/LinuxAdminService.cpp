@@ -32,7 +32,8 @@ constexpr std::size_t kMaximumRequest = 128;
 
 using Commands = std::map<std::string, AdminCommand, std::less<>>;
 
-/// Where the main queue leaves its newest snapshot, and commands their answers. Outlives the server as long as a question is under way.
+/// Where the main queue leaves its newest snapshot, and commands their answers. Outlives the server as long as a question
+/// is under way.
 struct Mailbox {
     std::mutex mutex;
     std::optional<Dictionary> snapshot;

@@ -58,9 +58,8 @@ LinuxStoragePurgeService::LinuxStoragePurgeService(Scheduler& scheduler, FileSys
       watch_(std::make_shared<Watch>(fileSystem)) {}
 
 void LinuxStoragePurgeService::registerCallbacks(std::string, StoragePurgeCallbacks callbacks) {
-    lane_->async([watch = watch_, callbacks = std::move(callbacks)]() mutable {
-        watch->setCallbacks(std::move(callbacks));
-    });
+    lane_->async(
+        [watch = watch_, callbacks = std::move(callbacks)]() mutable { watch->setCallbacks(std::move(callbacks)); });
     if (!timer_) timer_ = scheduler_.timer(lane_, kPace, [watch = watch_] { watch->look(); });
 }
 

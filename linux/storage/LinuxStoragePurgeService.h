@@ -8,9 +8,9 @@
 
 namespace lumacast {
 
-/// Watches the free space of the temporary directory's file system. Linux tells nobody when a disk fills, so it is asked
-/// for at a slow pace: a question costs one statvfs. Its lane is a serial queue of its own. Destroying the service ends
-/// the watch; a callback that is running is not waited for.
+/// Watches the free space of the temporary directory's file system. Linux tells nobody when a disk fills, so it is
+/// asked for at a slow pace: a question costs one statvfs. Its lane is a serial queue of its own. Destroying the
+/// service ends the watch; a callback that is running is not waited for.
 class LinuxStoragePurgeService final : public StoragePurgeService {
 public:
     /// How long it takes to find out that space is short. At 5 Mbit/s a recording writes 6 MB meanwhile.

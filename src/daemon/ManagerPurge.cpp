@@ -81,16 +81,16 @@ std::vector<std::string> LCRecordingManager::pathsBeingRecorded() const {
 }
 
 void LCRecordingManager::serveStorageCommands() {
-    platform_.admin.addCommand("storage", [weak = weak_from_this()](const std::vector<std::string>&,
-                                                                    const AdminAnswer& answer) {
-        const auto self = weak.lock();
-        if (!self) return;
-        // Listing waits for the disk: on the purge service's lane.
-        self->platform_.storagePurge.requestPurgeableSpace(
-            [self, answer, recorded = self->pathsBeingRecorded()](std::optional<PurgeRecord> purgeable) {
-                answer(storageReport(self->platform_.fileSystem, self->services_.tempStore, purgeable, recorded));
-            });
-    });
+    platform_.admin.addCommand(
+        "storage", [weak = weak_from_this()](const std::vector<std::string>&, const AdminAnswer& answer) {
+            const auto self = weak.lock();
+            if (!self) return;
+            // Listing waits for the disk: on the purge service's lane.
+            self->platform_.storagePurge.requestPurgeableSpace(
+                [self, answer, recorded = self->pathsBeingRecorded()](std::optional<PurgeRecord> purgeable) {
+                    answer(storageReport(self->platform_.fileSystem, self->services_.tempStore, purgeable, recorded));
+                });
+        });
     platform_.admin.addCommand(
         "purge", [weak = weak_from_this()](const std::vector<std::string>& arguments, const AdminAnswer& answer) {
             const auto self = weak.lock();
@@ -99,8 +99,7 @@ void LCRecordingManager::serveStorageCommands() {
             if (!urgency) return answer({{"error", "a purge takes one urgency, a whole number from 1 on"}});
             self->platform_.storagePurge.requestPurge(
                 *urgency, [answer, urgency = *urgency](std::optional<PurgeRecord> record) {
-                    answer({{"urgency", urgency},
-                            {"freedBytes", record ? Value(record->bytes) : Value()}});
+                    answer({{"urgency", urgency}, {"freedBytes", record ? Value(record->bytes) : Value()}});
                 });
         });
 }

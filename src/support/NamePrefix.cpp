@@ -58,9 +58,15 @@ char32_t folded(char32_t c) {
 char32_t decode(std::string_view text, std::size_t& at) {
     const auto byte = [&](std::size_t index) { return static_cast<std::uint8_t>(text[index]); };
     const std::uint8_t first = byte(at);
-    const std::size_t length = first < 0x80 ? 1 : first >= 0xC2 && first < 0xE0 ? 2 : first >= 0xE0 && first < 0xF0 ? 3
-                             : first >= 0xF0 && first < 0xF5 ? 4 : 0;
-    char32_t character = length == 1 ? first : length == 2 ? first & 0x1Fu : length == 3 ? first & 0x0Fu : first & 0x07u;
+    const std::size_t length = first < 0x80                    ? 1
+                               : first >= 0xC2 && first < 0xE0 ? 2
+                               : first >= 0xE0 && first < 0xF0 ? 3
+                               : first >= 0xF0 && first < 0xF5 ? 4
+                                                               : 0;
+    char32_t character = length == 1   ? first
+                         : length == 2 ? first & 0x1Fu
+                         : length == 3 ? first & 0x0Fu
+                                       : first & 0x07u;
     bool isWhole = length > 0 && at + length <= text.size();
     for (std::size_t i = 1; isWhole && i < length; ++i) {
         isWhole = (byte(at + i) & 0xC0) == 0x80;

@@ -48,7 +48,9 @@ TempStore::TempStore(const Platform& platform)
       removals_(std::make_shared<FileRemovals>(platform.log, platform.fileSystem,
                                                platform.scheduler.globalQueue(QueuePriority::Background))) {}
 
-std::string TempStore::_srTempPath() const { return fileSystem_.root() + std::string(kDirectory); }
+std::string TempStore::_srTempPath() const {
+    return fileSystem_.root() + std::string(kDirectory);
+}
 
 void TempStore::_srSetupTempDirectory() {
     log_.line("_srSetupTempDirectory");

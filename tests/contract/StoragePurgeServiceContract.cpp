@@ -83,17 +83,26 @@ public:
             world.scheduler.mainQueue().sync([this] { ++mainQueueTasks; });  // as the daemon does
             --inside;
         };
-        world.service().registerCallbacks(
-            "com.example.cache", {.purgeableSpace = [on] { on("space"); return PurgeRecord{11}; },
-                                  .purge = [this, on](std::int32_t urgency) {
-                                      on("purge " + std::to_string(urgency));
-                                      return purged;
-                                  },
-                                  .cancelPurge = [on](std::int32_t urgency) {
-                                      on("cancel " + std::to_string(urgency));
-                                      return urgency;
-                                  },
-                                  .periodic = [on] { on("periodic"); return PurgeRecord{33}; }});
+        world.service().registerCallbacks("com.example.cache", {.purgeableSpace =
+                                                                    [on] {
+                                                                        on("space");
+                                                                        return PurgeRecord{11};
+                                                                    },
+                                                                .purge =
+                                                                    [this, on](std::int32_t urgency) {
+                                                                        on("purge " + std::to_string(urgency));
+                                                                        return purged;
+                                                                    },
+                                                                .cancelPurge =
+                                                                    [on](std::int32_t urgency) {
+                                                                        on("cancel " + std::to_string(urgency));
+                                                                        return urgency;
+                                                                    },
+                                                                .periodic =
+                                                                    [on] {
+                                                                        on("periodic");
+                                                                        return PurgeRecord{33};
+                                                                    }});
     }
     std::vector<std::string> take() { return std::exchange(calls, {}); }
 
@@ -253,8 +262,11 @@ TEST(LinuxStoragePurge, NothingIsAskedAfterTheServiceHasEnded) {
     int calls = 0;
     {
         LinuxStoragePurgeService service(scheduler, fileSystem);
-        service.registerCallbacks("com.example.cache", {.purgeableSpace = {}, .purge = {}, .cancelPurge = {},
-                                                        .periodic = [&] { ++calls; return PurgeRecord(); }});
+        service.registerCallbacks("com.example.cache",
+                                  {.purgeableSpace = {}, .purge = {}, .cancelPurge = {}, .periodic = [&] {
+                                       ++calls;
+                                       return PurgeRecord();
+                                   }});
     }
     scheduler.advance(48h);
     EXPECT_EQ(calls, 0);

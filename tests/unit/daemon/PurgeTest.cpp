@@ -97,7 +97,8 @@ TEST_F(PurgeTest, ThePurgeableSpaceIsTheDirectoryEntrysOwnSize) {
 
 TEST_F(PurgeTest, ACancelledPurgeAnswersItsArgumentAndLogsNothing) {
     fakes_.logSink.clear();
-    for (const std::int32_t urgency : {0, 3, -7}) EXPECT_EQ(fakes_.storagePurge.callbacks().cancelPurge(urgency), urgency);
+    for (const std::int32_t urgency : {0, 3, -7})
+        EXPECT_EQ(fakes_.storagePurge.callbacks().cancelPurge(urgency), urgency);
     EXPECT_EQ(fakes_.logSink.logged(), Lines{});
 }
 
@@ -124,7 +125,8 @@ TEST_F(PurgeTest, BelowUrgencyThreeNothingGoesWithoutARecordingEither) {
 TEST_F(PurgeTest, BelowUrgencyThreeOldFilesGoOnlyWhenTheRecordingEndsBetweenTheTwoLooks) {
     const auto client = makeRecording();
     const std::string old = addFile("old.mp4", 86401), young = addFile("young.mp4", 86400);
-    const auto purge = beginWithTaskBetweenTheLooks(2, [recorded = session(*client)] { recorded->setRecording(false); });
+    const auto purge =
+        beginWithTaskBetweenTheLooks(2, [recorded = session(*client)] { recorded->setRecording(false); });
     EXPECT_EQ(purge->record, PurgeRecord{10});
     EXPECT_FALSE(exists(old));
     EXPECT_TRUE(exists(young)) << "exactly a day old";
@@ -200,7 +202,8 @@ TEST_F(PurgeTest, OnlyTheLastRecordingOfTheRegistryIsStopped) {
 
 TEST_F(PurgeTest, ARecordingThatEndsBetweenTheLooksIsNotStoppedAgain) {
     const auto client = makeRecording();
-    const auto purge = beginWithTaskBetweenTheLooks(3, [recorded = session(*client)] { recorded->setRecording(false); });
+    const auto purge =
+        beginWithTaskBetweenTheLooks(3, [recorded = session(*client)] { recorded->setRecording(false); });
     EXPECT_EQ(logged(kStopLine), 0u);
     EXPECT_TRUE(client->told.empty());
     EXPECT_TRUE(fakes_.fileSystem.files().empty());
@@ -282,8 +285,7 @@ TEST_F(PurgeTest, TheAdministratorSeesTheMovies) {
     EXPECT_EQ(names, (std::vector<std::string>{"tomorrow.mp4", "Player.mp4", "old.mp4"})) << "the newest first";
     EXPECT_EQ(*report.find("filesBytes"), Value(bytes));
     EXPECT_EQ(*files[2].as<Dictionary>()->find("bytes"), Value(std::uint64_t{5000}));
-    EXPECT_EQ(*files[2].as<Dictionary>()->find("modified"),
-              Value(Date{fakes_.clock.now().secondsSince1970 - 3600}));
+    EXPECT_EQ(*files[2].as<Dictionary>()->find("modified"), Value(Date{fakes_.clock.now().secondsSince1970 - 3600}));
     EXPECT_EQ(report.find("error"), nullptr);
     (void)client->ask(DaemonMessage::StopRecording);
     settle();

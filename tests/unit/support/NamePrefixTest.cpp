@@ -8,11 +8,11 @@ namespace {
 TEST(NamePrefix, IsComparedWithoutCaseAndDiacritics) {
     for (const auto& [name, prefix] : {std::pair{"Player.mp4", "player"},
                                        {"player.mp4", "PLAYER"},
-                                       {"\u00C9t\u00E9 1.mp4", "ete"},           // composed, capital and small
+                                       {"\u00C9t\u00E9 1.mp4", "ete"},  // composed, capital and small
                                        {"ETE 1.mp4", "\u00E9t\u00E9"},
-                                       {"e\u0301te.mp4", "\u00C9TE"},            // a combining mark
+                                       {"e\u0301te.mp4", "\u00C9TE"},  // a combining mark
                                        {"ete.mp4", "e\u0301"},
-                                       {"\u0158eka.mp4", "rEKA"},                // Latin Extended-A
+                                       {"\u0158eka.mp4", "rEKA"},  // Latin Extended-A
                                        {"\u017D\u017E.mp4", "zZ"},
                                        {"\u0141\u00F3d\u017A.mp4", "\u0142ODZ"},  // a stroke is no mark
                                        {"\u00C6ther.mp4", "\u00E6THER"},
@@ -47,7 +47,8 @@ TEST(NamePrefix, EachLetterOfTheTwoBlocksHasOneForm) {
               foldedForComparison("\u00E0\u00E1\u00E2\u00E3\u00E4\u00E5\u00E6\u00E7\u00F0\u00F1\u00F8\u00FD\u00FE"));
     EXPECT_EQ(foldedForComparison("\u0110\u0126\u0132\u013F\u0141\u014A\u0152\u0166\u0178\u017F"),
               foldedForComparison("\u0111\u0127\u0133\u0140\u0142\u014B\u0153\u0167\u00FFs"));
-    EXPECT_EQ(foldedForComparison("\u00D7\u00F7\u0138\u0149\u0131"), U"\u00D7\u00F7\u0138\u0149\u0131") << "these have none";
+    EXPECT_EQ(foldedForComparison("\u00D7\u00F7\u0138\u0149\u0131"), U"\u00D7\u00F7\u0138\u0149\u0131")
+        << "these have none";
 }
 
 }  // namespace

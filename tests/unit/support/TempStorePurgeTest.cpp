@@ -94,10 +94,9 @@ TEST_F(TempStorePurgeTest, AFileWhoseRemovalFailsIsNotCountedAndNothingIsCounted
     EXPECT_TRUE(exists(stays));
     EXPECT_TRUE(exists(young));
     // After the removal of 2; after the attributes and the removal of 3; after the attributes of 4.
-    EXPECT_EQ(fakes_.logSink.lines(),
-              (Lines{deleting("5"), deletingOldFile_, deletingOldFile_, errorLine(EIO), errorPrint(EIO), errorLine(EIO),
-                     errorPrint(EIO), deletingOldFile_, errorLine(EIO), errorPrint(EIO), errorLine(EIO),
-                     errorPrint(EIO)}));
+    EXPECT_EQ(fakes_.logSink.lines(), (Lines{deleting("5"), deletingOldFile_, deletingOldFile_, errorLine(EIO),
+                                             errorPrint(EIO), errorLine(EIO), errorPrint(EIO), deletingOldFile_,
+                                             errorLine(EIO), errorPrint(EIO), errorLine(EIO), errorPrint(EIO)}));
 }
 
 TEST_F(TempStorePurgeTest, TheErrorReportedIsTheLastOne) {
@@ -271,7 +270,9 @@ TEST_F(TempStorePurgeTest, ADirectoryThatCannotBeListedHasNoPrefixes) {
 class CountingScheduler final : public Scheduler {
 public:
     explicit CountingScheduler(Scheduler& inner) : inner_(inner) {}
-    std::shared_ptr<SerialQueue> serialQueue(std::string label) override { return inner_.serialQueue(std::move(label)); }
+    std::shared_ptr<SerialQueue> serialQueue(std::string label) override {
+        return inner_.serialQueue(std::move(label));
+    }
     GlobalQueue& globalQueue(QueuePriority priority) override {
         return priority == QueuePriority::Default ? default_ : background_;
     }
