@@ -107,9 +107,11 @@ private:
         switch (random_.below(5)) {
             case 0: {
                 const std::int32_t urgency = 1 + static_cast<std::int32_t>(random_.below(3));
-                if (urgency == 3)
-                    for (Player& player : players_) player.lastStop.reset();
-                fakes().storagePurge.requestPurge(urgency, [](const std::optional<PurgeRecord>&) {});
+                fakes().storagePurge.requestPurge(urgency, [this, urgency](const std::optional<PurgeRecord>&) {
+                    // Whatever was handed out until now may be gone.
+                    if (urgency == 3)
+                        for (Player& player : players_) player.lastStop.reset();
+                });
                 ++tally_.purges;
                 break;
             }
@@ -120,7 +122,12 @@ private:
                 fakes().appStateMonitor.setState(players_[random_.below(players_.size())].application.identifier,
                                                  random_.below(2) == 0 ? 8 : 4);
                 break;
-            case 3: fakes().fileSystem.setFreeSize(random_.below(3) == 0 ? 0 : kPlenty); break;
+            case 3: {
+                const bool full = random_.below(3) == 0;
+                diskWasFull_ |= full;
+                fakes().fileSystem.setFreeSize(full ? 0 : kPlenty);
+                break;
+            }
             default:
                 if (const auto source = fakes().displayCapture.lastSource(); source && source->isRunning())
                     source->fail(-3);
@@ -176,7 +183,8 @@ private:
         }
         for (const SimBlockedTask& task : daemon_.world.scheduler.blockedTasks())
             ADD_FAILURE() << task.lane << " waits for " << task.waitsFor;
-        if (faulty_) return;
+        // The URL of a movie that could not be written is handed out too.
+        if (faulty_ || diskWasFull_) return;
         for (const Player& player : players_) {
             if (!player.lastStop || player.lastStop->answers != 1) continue;
             if (const URL* url = player.lastStop->values[0].as<URL>()) {
@@ -274,7 +282,7 @@ private:
     SimRandom random_;
     std::deque<Player> players_;
     Tally& tally_;
-    bool faulty_ = false;
+    bool faulty_ = false, diskWasFull_ = false;
     int incarnation_ = 0;
 };
 
