@@ -1,5 +1,7 @@
 // Starting a recording: from the request's first check to the client's reply.
 
+#include <cmath>
+
 #include "daemon/LCRecordingManager.h"
 
 namespace lumacast {
@@ -7,6 +9,11 @@ namespace lumacast {
 namespace {
 
 constexpr std::string_view kSystemRecordingEntitlement = "com.orvane.private.luma-cast";
+
+/// A session's capture source keeps its first size for good, so one that no picture can have must not get there.
+bool isSize(Size size) {
+    return std::isfinite(size.width) && std::isfinite(size.height) && size.width >= 1 && size.height >= 1;
+}
 
 }  // namespace
 
@@ -49,6 +56,8 @@ void LCRecordingManager::startRecording(const StartRequest& request, StartHandle
     if (!checkContextIDsMatch(request.windowLayerContextIDs))
         return refuse(number, RecordingErrorCode::FailedToStart, "a window layer is not the application's own",
                       handler);
+    if (!isSize(request.windowSize))
+        return refuse(number, RecordingErrorCode::FailedToStart, "the window size is none", handler);
     log_.line(
         "LCRecordingManager:startRecordingWindowLayerContextID:windowSize:microphoneEnabled:streaming:withHandler:");
     stopCurrentRecordingSessionWithHandler(

@@ -134,17 +134,19 @@ TEST_P(SchedulerContract, SyncReturnsWhenItsTaskIsDone) {
 
 TEST_P(SchedulerContract, SyncOnTheQueueItselfRunsInlineAtAnyDepth) {
     const auto queue = scheduler_.serialQueue("queue"), other = scheduler_.serialQueue("other");
-    std::atomic<bool> done = false;
+    std::atomic<bool> done = false, ranInside = false;
     queue->async([&] {
         queue->sync([&] {
             other->sync([&] {
                 EXPECT_TRUE(queue->isCurrent());
-                queue->sync([&] { done = true; });
+                queue->sync([&] { ranInside = true; });
             });
             EXPECT_FALSE(other->isCurrent());
         });
+        done = true;  // last: the queues go when it is seen
     });
     EXPECT_TRUE(world_->until([&] { return done.load(); }));
+    EXPECT_TRUE(ranInside);
 }
 
 TEST_P(SchedulerContract, AQueueIsCurrentInItsTasksOnly) {

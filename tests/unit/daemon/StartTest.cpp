@@ -1,5 +1,7 @@
 // The start request: its checks in their order, making room, and what the client is answered.
 
+#include <limits>
+
 #include "tests/unit/daemon/DaemonWorld.h"
 
 namespace lumacast {
@@ -219,6 +221,21 @@ TEST_F(Start, ASecondStartOfTheSameApplicationInterruptsItsOwnRecording) {
     ASSERT_TRUE(movie) << "the older recording's end has not removed the newer one's file";
     EXPECT_NEAR(movie->duration().seconds(), 3, 0.1);
     EXPECT_EQ(fakes_.keepAlive.open(), 0);
+}
+
+TEST_F(Start, ASizeThatNoPictureCanHaveIsRefusedAndSpoilsNothing) {
+    const auto client = makeConnected();
+    constexpr double kNone = std::numeric_limits<double>::quiet_NaN();
+    constexpr double kEndless = std::numeric_limits<double>::infinity();
+    for (const auto& [width, height] : {std::pair{0.0, 0.0}, {kNone, 360.0}, {640.0, kEndless}, {-640.0, 360.0}, {640.0, 0.5}}) {
+        const auto asked = client->ask(
+            DaemonMessage::StartRecording,
+            {Array{number(client->window)}, Array{width, height}, false, false, false, false, false, Value()});
+        settle();
+        expectRefused(*asked, -5803);
+    }
+    EXPECT_EQ(started(*client)->code(), 0);
+    EXPECT_EQ(session(*client)->windowSize(), (Size{640, 360}));
 }
 
 TEST_F(Start, ARestartEndsTheOlderRecordingOnlyWhenItsStopIsAnswered) {

@@ -127,6 +127,28 @@ TEST_F(FramePipeline, ARetimedFrameIsACopyWithItsPictureAndDuration) {
         << "a re-timed frame sets the start to its own time";
 }
 
+TEST_F(FramePipeline, EveryTimingEntryOfARetimedFrameHasTheNewTimeAndNoDecodeTime) {
+    startQuietly();
+    deliver(1000);
+    deliver(1010);
+    interruption();
+    deliver(2000);
+    auto plane = std::make_shared<FakePlane>(640, 360, 1, std::vector<PixelRect>{});
+    const auto plain = SampleBuffer::makeVideo(PixelBuffer(std::move(plane)), MediaTime::make(2010, 600),
+                                               MediaTime::make(10, 600));
+    const SampleTiming first{MediaTime::make(4, 600), MediaTime::make(2010, 600), MediaTime::make(2009, 600)};
+    const SampleTiming second{MediaTime::make(6, 600), MediaTime::make(2014, 600), MediaTime::make(2013, 600)};
+    session_->screenCaptureControllerDidReceiveSampleBuffer(*source(), plain->copyWithTiming({first, second}), 0);
+    const auto& timing = recording().movie().tracks[0].samples.back()->timing();
+    ASSERT_EQ(timing.size(), 2u);
+    for (const SampleTiming& entry : timing) {
+        EXPECT_EQ(compare(entry.presentation, MediaTime::make(1020, 600)), 0);
+        EXPECT_FALSE(entry.decode.isValid());
+    }
+    EXPECT_EQ(compare(timing[0].duration, MediaTime::make(4, 600)), 0);
+    EXPECT_EQ(compare(timing[1].duration, MediaTime::make(6, 600)), 0);
+}
+
 TEST_F(FramePipeline, AFinishForgetsThePauses) {
     startQuietly();
     for (const std::int64_t value : {1000, 1010}) deliver(value);
