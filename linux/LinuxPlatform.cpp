@@ -41,7 +41,6 @@ class LinuxPlatform final : public PlatformOwner {
 public:
     explicit LinuxPlatform(const LinuxEnvironment& environment)
         : environment_(environment),
-          termination_([this] { writers_.closeOpenMovies(); }),
           sink_({.journalStream = environment.journalStream}),
           log_([this](LogLevel level, std::string_view text) { sink_.write(level, text); }),
           reactor_(std::make_shared<Reactor>("com.orvane.lumacastd")),
@@ -65,7 +64,8 @@ public:
           storagePurge_(scheduler_, fileSystem_),
           platform_{log_,         scheduler_,  clock_,     ipc_,       bundles_,   renderServer_,
                     appState_,    capture_,    capture_,   writers_,   exporters_, fileSystem_,
-                    preferences_, deviceInfo_, telemetry_, keepAlive_, admin_,    storagePurge_} {}
+                    preferences_, deviceInfo_, telemetry_, keepAlive_, admin_,    storagePurge_},
+          termination_([this] { writers_.closeOpenMovies(); }) {}
 
     /// What must be there before the daemon can work; the error when it can't be had.
     std::optional<Error> prepare() { return fileSystem_.prepare(); }
@@ -88,7 +88,6 @@ private:
     }
 
     const LinuxEnvironment environment_;
-    Termination termination_;  // first: it blocks the signals for every thread that follows
     LinuxLogSink sink_;
     Log log_;
     LinuxClock clock_;
@@ -110,11 +109,13 @@ private:
     LinuxAdminService admin_;
     LinuxStoragePurgeService storagePurge_;
     Platform platform_;
+    Termination termination_;  // last: it touches what is above
 };
 
 }  // namespace
 
 std::unique_ptr<PlatformOwner> makePlatform() {
+    blockTerminationSignals();
     const LinuxEnvironment environment = LinuxEnvironment::ofThisProcess();
     if (const auto error = environment.prepareDirectories()) {
         std::fprintf(stderr, "lumacastd: the runtime and state directories can't be made: %s\n",

@@ -20,6 +20,14 @@ namespace lumacast {
 
 namespace {
 
+sigset_t terminationSignals() {
+    sigset_t signals;
+    sigemptyset(&signals);
+    sigaddset(&signals, SIGTERM);
+    sigaddset(&signals, SIGINT);
+    return signals;
+}
+
 /// Runs `work` on a thread of its own and waits for it at most `limit`.
 void runLimited(const std::function<void()>& work, std::chrono::milliseconds limit) {
     struct Progress {
@@ -41,12 +49,14 @@ void runLimited(const std::function<void()>& work, std::chrono::milliseconds lim
 
 }  // namespace
 
-Termination::Termination(std::function<void()> onTerminate, std::chrono::milliseconds limit) {
-    sigset_t signals;
-    sigemptyset(&signals);
-    sigaddset(&signals, SIGTERM);
-    sigaddset(&signals, SIGINT);
+void blockTerminationSignals() {
+    const sigset_t signals = terminationSignals();
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+}
+
+Termination::Termination(std::function<void()> onTerminate, std::chrono::milliseconds limit) {
+    blockTerminationSignals();
+    const sigset_t signals = terminationSignals();
     signals_.reset(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
     end_.reset(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
     if (!signals_ || !end_) return;

@@ -7,12 +7,17 @@
 
 namespace lumacast {
 
+/// Blocks SIGTERM and SIGINT in the thread that calls it and so in every thread it starts afterwards: call it before any
+/// other thread is started. A signal that comes before somebody waits for it stays pending. Who starts another program
+/// must give it an empty signal mask.
+void blockTerminationSignals();
+
 /// Ends the process on SIGTERM or SIGINT: calls `onTerminate` on a thread of its own, waits for it at most `limit`, and
 /// leaves with status 0, without running destructors (every other lane may be in the middle of its work). It waits for
 /// no lane itself. `onTerminate` is called at most once; later signals change nothing.
 ///
-/// The signals are blocked in the thread that constructs this and so in every thread it starts afterwards: construct it
-/// before any other thread. Who starts another program must give it an empty signal mask.
+/// Blocks the signals itself too; where other threads run already, blockTerminationSignals must have been called before
+/// them. Construct it when what `onTerminate` touches is there.
 class Termination final {
 public:
     explicit Termination(std::function<void()> onTerminate, std::chrono::milliseconds limit = std::chrono::seconds(8));
