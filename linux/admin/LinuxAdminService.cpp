@@ -53,6 +53,7 @@ struct Peer {
     std::string request;
     std::uint64_t question = 0;  ///< the snapshot that is new enough for this peer, or its command
     bool waitsForCommand = false;
+    bool isStillToBeAsked = false;
     std::string reply;
 };
 
@@ -211,12 +212,13 @@ private:
         });
     }
 
-    void submitQuestion(const Peer& peer) {
+    void submitQuestion(Peer& peer) {
         {
-            // A main queue that does not answer must not be heaped with questions; this peer will be told that it is
-            // busy.
+            // A main queue that does not answer must not be heaped with questions; this one is put when others were
+            // answered (they may be of peers that have left), or the peer is told that the daemon is busy.
             const std::lock_guard lock(mailbox_->mutex);
-            if (mailbox_->asked == kMaximumPeers) return;
+            peer.isStillToBeAsked = mailbox_->asked == kMaximumPeers;
+            if (peer.isStillToBeAsked) return;
             ++mailbox_->asked;
         }
         scheduler_.mainQueue().async([mailbox = mailbox_, snapshot = snapshot_, question = peer.question] {
@@ -251,6 +253,8 @@ private:
                 reply(peer, jsonText(answer->second) + "\n");
             else if (snapshot && !peer.waitsForCommand && peer.question <= question)
                 reply(peer, replyTo(peer.request, *snapshot));
+            else if (peer.isStillToBeAsked)
+                submitQuestion(peer);
         }
     }
 

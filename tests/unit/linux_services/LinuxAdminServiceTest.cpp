@@ -139,6 +139,17 @@ TEST(LinuxAdminService, ADaemonThatDoesNotAnswerIsBusy) {
     EXPECT_LE(daemon.snapshots, 20) << "questions don't pile up behind a busy main queue";
 }
 
+TEST(LinuxAdminService, QuestionsOfPeersThatHaveLeftKeepNobodyFromBeingAnswered) {
+    Daemon daemon({30s, 2s, 30s});  // its main queue does not run yet
+    daemon.resume();
+    for (int i = 0; i < 8; ++i) EXPECT_EQ(daemon.ask("status", 20ms), "(nothing)");
+    const FileDescriptor socket = connectTo(daemon.path);
+    ASSERT_GT(::send(socket.get(), "status\n", 7, MSG_NOSIGNAL), 0);
+    EXPECT_EQ(daemon.ask("status", 20ms), "(nothing)") << "whoever came before has been read by then";
+    const RunningThreadLoop running(*daemon.loop);
+    EXPECT_EQ(Daemon::readAll(socket), kStatus + "\n");
+}
+
 TEST(LinuxAdminService, ACommandGoesBeforeAnEntryOfItsName) {
     Daemon daemon;
     daemon.admin.addCommand("storage", [](const std::vector<std::string>& arguments, const AdminAnswer& answer) {
