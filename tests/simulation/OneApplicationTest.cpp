@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include "tests/simulation/JudgePictures.h"
 #include "tests/simulation/Seeds.h"
 #include "tests/simulation/SimulatedApplication.h"
 #include "tests/simulation/SimulatedDaemon.h"
@@ -171,22 +172,6 @@ private:
         }
         if (!faulty_)
             for (const auto& recording : fakes().containerWriters.recordings()) judgePictures(recording->movie());
-    }
-
-    /// In order, none doubled, and no hole: paused time does not exist in a movie.
-    static void judgePictures(const FakeMovie& movie) {
-        constexpr std::int64_t kTwoFrames = 2 * CaptureClock::kTimescale / 60;
-        for (const FakeTrack& track : movie.tracks) {
-            std::optional<std::int64_t> last;
-            for (const SampleRef& sample : track.samples) {
-                const std::int64_t time = sample->presentationTime().value;
-                if (last) {
-                    EXPECT_GT(time, *last);
-                    EXPECT_LE(time - *last, kTwoFrames);
-                }
-                last = time;
-            }
-        }
     }
 
     SimulatedDaemon daemon_;

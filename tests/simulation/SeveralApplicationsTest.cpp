@@ -8,6 +8,7 @@
 #include <deque>
 #include <set>
 
+#include "tests/simulation/JudgePictures.h"
 #include "tests/simulation/Seeds.h"
 #include "tests/simulation/SimulatedApplication.h"
 #include "tests/simulation/SimulatedDaemon.h"
@@ -31,16 +32,15 @@ struct Player {
     SimulatedApplication application;
     /// A stop that is the last thing the application asked for: its movie must be there when it was answered.
     std::shared_ptr<SimulatedApplication::Asked> lastStop;
+    /// The same for a discard: when it was answered, no movie is left.
+    std::shared_ptr<SimulatedApplication::Asked> lastDiscard;
     std::size_t toldWhenItDied = 0;
     std::vector<std::shared_ptr<SimulatedApplication::Asked>> starts, stops;
 };
 
 class Contest {
 public:
-    Contest(std::uint64_t seed, Tally& tally)
-        : daemon_(seed),
-          random_(daemon_.world.scheduler.fork()),
-          tally_(tally) {
+    Contest(std::uint64_t seed, Tally& tally) : daemon_(seed), random_(daemon_.world.scheduler.fork()), tally_(tally) {
         players_.emplace_back(fakes(), "Alpha", 500, 7);
         players_.emplace_back(fakes(), "Beta", 600, 8);
         players_.emplace_back(fakes(), "Gamma", 700, 9);
@@ -76,20 +76,27 @@ private:
         }
         const std::uint64_t what = random_.below(16);
         const bool asksOfItsMovie = what <= 10 && what != 5 && what != 6;
-        if (asksOfItsMovie) player.lastStop.reset();
+        if (asksOfItsMovie) {
+            player.lastStop.reset();
+            player.lastDiscard.reset();
+        }
         switch (what) {
-            case 0: case 1: case 2: case 3: player.starts.push_back(application.start()); break;
+            case 0:
+            case 1:
+            case 2:
+            case 3: player.starts.push_back(application.start()); break;
             case 4: player.starts.push_back(application.start({ContextID{99}})); break;  // nobody's window
             case 5: application.tell(DaemonMessage::PauseRecording); break;
             case 6: application.tell(DaemonMessage::ResumeRecording, {number(application.window)}); break;
-            case 7: case 8:
+            case 7:
+            case 8:
                 player.lastStop = application.ask(DaemonMessage::StopRecording);
                 player.stops.push_back(player.lastStop);
                 break;
             case 9:
                 player.stops.push_back(application.ask(DaemonMessage::StopRecordingWithClipDurations, {1.0, 1.0}));
                 break;
-            case 10: application.ask(DaemonMessage::DiscardRecording); break;
+            case 10: player.lastDiscard = application.ask(DaemonMessage::DiscardRecording); break;
             case 11: application.tell(DaemonMessage::ClientDidResignActive); break;
             case 12: application.tell(DaemonMessage::ClientDidBecomeActive); break;
             case 13: application.ask(DaemonMessage::SynchronousGetCurrentState); break;
@@ -115,9 +122,7 @@ private:
                 ++tally_.purges;
                 break;
             }
-            case 1:
-                fakes().storagePurge.passDay();
-                break;
+            case 1: fakes().storagePurge.passDay(); break;
             case 2:
                 fakes().appStateMonitor.setState(players_[random_.below(players_.size())].application.identifier,
                                                  random_.below(2) == 0 ? 8 : 4);
@@ -144,12 +149,19 @@ private:
     void checkAlways() {
         EXPECT_FALSE(fakes().keepAlive.endedWithoutBegin());
         const auto sources = fakes().displayCapture.sources();
-        EXPECT_LE(std::count_if(sources.begin(), sources.end(), [](const auto& source) { return source->isRunning(); }), 1)
+        EXPECT_LE(std::count_if(sources.begin(), sources.end(), [](const auto& source) { return source->isRunning(); }),
+                  1)
             << "two applications are captured at a time";
         for (const Player& player : players_) {
             for (const auto& asked : player.application.asked()) {
                 EXPECT_LE(asked->answers + asked->failures, 1)
                     << daemonProtocol().messages[static_cast<std::size_t>(asked->message)].name;
+            }
+            // Who loses its recording to another start hears why, and its movie is not handed out.
+            for (const auto& told : player.application.told()) {
+                ASSERT_EQ(told.message, ClientMessage::StopRecordingWithError);
+                EXPECT_TRUE(told.arguments[0].asError());
+                EXPECT_TRUE(told.arguments[1].isNull());
             }
             if (!player.application.isAlive()) {
                 EXPECT_EQ(player.application.told().size(), player.toldWhenItDied) << "told after its death";
@@ -183,8 +195,15 @@ private:
         }
         for (const SimBlockedTask& task : daemon_.world.scheduler.blockedTasks())
             ADD_FAILURE() << task.lane << " waits for " << task.waitsFor;
+        if (faulty_) return;
+        for (const Player& player : players_) {
+            if (player.lastDiscard && player.lastDiscard->answers == 1 && player.application.isAlive()) {
+                EXPECT_FALSE(fakes().fileSystem.exists(fakes().fileSystem.temporaryDirectory() + "/" +
+                                                       player.application.name + ".mp4"));
+            }
+        }
         // The URL of a movie that could not be written is handed out too.
-        if (faulty_ || diskWasFull_) return;
+        if (diskWasFull_) return;
         for (const Player& player : players_) {
             if (!player.lastStop || player.lastStop->answers != 1) continue;
             if (const URL* url = player.lastStop->values[0].as<URL>()) {
@@ -200,8 +219,7 @@ private:
         fakes().fileSystem.setFreeSize(kPlenty);
         daemon_.world.scheduler.advance(seconds(5));
         checkAtRest();
-        for (Player& player : players_)
-            fakes().appStateMonitor.setState(player.application.identifier, 8);
+        for (Player& player : players_) fakes().appStateMonitor.setState(player.application.identifier, 8);
         if (!faulty_)
             for (Player& player : players_) recordOnceMore(player);
         for (Player& player : players_) {
@@ -213,8 +231,8 @@ private:
                 ++(stop->message == DaemonMessage::StopRecording ? tally_.movies : tally_.clips);
             }
             for (const auto& told : player.application.told()) {
-                const Error* error = told.message == ClientMessage::StopRecordingWithError ? told.arguments[0].asError()
-                                                                                          : nullptr;
+                const Error* error =
+                    told.message == ClientMessage::StopRecordingWithError ? told.arguments[0].asError() : nullptr;
                 if (error && error->code() == -5806) ++tally_.takenOver;
                 if (error && error->code() == -5817) ++tally_.failures;
             }
@@ -258,22 +276,6 @@ private:
         ASSERT_TRUE(movie);
         EXPECT_TRUE(movie->finished);
         EXPECT_NEAR(movie->duration().seconds(), 2.0, 0.1);
-    }
-
-    /// In order, none doubled, and no hole: paused time does not exist in a movie.
-    static void judgePictures(const FakeMovie& movie) {
-        constexpr std::int64_t kTwoFrames = 2 * CaptureClock::kTimescale / 60;
-        for (const FakeTrack& track : movie.tracks) {
-            std::optional<std::int64_t> last;
-            for (const SampleRef& sample : track.samples) {
-                const std::int64_t time = sample->presentationTime().value;
-                if (last) {
-                    EXPECT_GT(time, *last);
-                    EXPECT_LE(time - *last, kTwoFrames);
-                }
-                last = time;
-            }
-        }
     }
 
     static constexpr std::uint64_t kPlenty = 10'000'000'000;

@@ -1,0 +1,28 @@
+#pragma once
+#include <gtest/gtest.h>
+
+#include <cstdint>
+#include <optional>
+
+#include "platform/Clock.h"
+#include "tests/fakes/FakeMovie.h"
+
+namespace lumacast {
+
+/// In order, none doubled, and no hole: paused time does not exist in a movie.
+inline void judgePictures(const FakeMovie& movie) {
+    constexpr std::int64_t kTwoFrames = 2 * CaptureClock::kTimescale / 60;
+    for (const FakeTrack& track : movie.tracks) {
+        std::optional<std::int64_t> last;
+        for (const SampleRef& sample : track.samples) {
+            const std::int64_t time = sample->presentationTime().value;
+            if (last) {
+                EXPECT_GT(time, *last);
+                EXPECT_LE(time - *last, kTwoFrames);
+            }
+            last = time;
+        }
+    }
+}
+
+}  // namespace lumacast
