@@ -10,9 +10,6 @@
 namespace lumacast::x11 {
 namespace {
 
-// Request numbers wrap around.
-bool before(std::uint32_t a, std::uint32_t b) { return static_cast<std::int32_t>(a - b) < 0; }
-
 constexpr std::uint32_t kWindowEvents =
     XCB_EVENT_MASK_STRUCTURE_NOTIFY | XCB_EVENT_MASK_EXPOSURE | XCB_EVENT_MASK_VISIBILITY_CHANGE;
 constexpr std::uint32_t kScreenEvents = XCB_EVENT_MASK_STRUCTURE_NOTIFY;
@@ -23,15 +20,16 @@ std::unique_ptr<CaptureTarget> CaptureTarget::open(X11Connection& connection, xc
     const Owned<xcb_get_geometry_reply_t> geometry(
         xcb_get_geometry_reply(connection.get(), xcb_get_geometry(connection.get(), window), nullptr));
     if (!geometry || (geometry->depth != 24 && geometry->depth != 32)) return nullptr;
-    std::unique_ptr<CaptureTarget> target(new CaptureTarget(connection, window, kind));
+    std::unique_ptr<CaptureTarget> target(new CaptureTarget(connection, window, kind, geometry->depth));
     target->begin();
     return target;
 }
 
-CaptureTarget::CaptureTarget(X11Connection& connection, xcb_window_t window, Kind kind)
+CaptureTarget::CaptureTarget(X11Connection& connection, xcb_window_t window, Kind kind, std::uint8_t depth)
     : connection_(connection),
       window_(window),
       kind_(kind),
+      depth_(depth),
       damage_(xcb_generate_id(connection.get())),
       region_(xcb_generate_id(connection.get())) {}
 
@@ -222,26 +220,10 @@ void CaptureTarget::takeDamage(DamageRegion& into) {
 }
 
 bool CaptureTarget::read(const SharedMemory& memory, std::span<const Strip> strips) {
-    xcb_connection_t* const x = connection_.get();
-    const std::size_t rowBytes = static_cast<std::size_t>(width_) * 4;
-    std::array<xcb_shm_get_image_cookie_t, DamageRegion::kMaximumRects> cookies;
-    const std::size_t count = std::min(strips.size(), cookies.size());
-    for (std::size_t i = 0; i < count; ++i) {
-        const Strip& strip = strips[i];
-        cookies[i] = xcb_shm_get_image(x, drawable_, static_cast<std::int16_t>(border_),
-                                       static_cast<std::int16_t>(border_ + strip.y), static_cast<std::uint16_t>(width_),
-                                       static_cast<std::uint16_t>(strip.height), ~0u, XCB_IMAGE_FORMAT_Z_PIXMAP,
-                                       memory.segment(),
-                                       static_cast<std::uint32_t>(static_cast<std::size_t>(strip.y) * rowBytes));
-        lastRead_ = cookies[i].sequence;
-    }
-    bool complete = count == strips.size();
-    for (std::size_t i = 0; i < count; ++i)
-        complete &= Owned<xcb_shm_get_image_reply_t>(xcb_shm_get_image_reply(x, cookies[i], nullptr)) != nullptr;
-    needsRefresh_ |= !complete;
-    return complete;
+    const RowsRead rows = readRows(connection_, drawable_, {border_, border_, width_, height_}, memory, strips);
+    if (rows.lastRequest != 0) lastRead_ = rows.lastRequest;
+    needsRefresh_ |= !rows.complete;
+    return rows.complete;
 }
-
-bool CaptureTarget::overtaken() const { return damaged_ && before(damagedAfter_, lastRead_); }
 
 }  // namespace lumacast::x11

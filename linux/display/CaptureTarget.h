@@ -9,21 +9,15 @@
 #include <span>
 
 #include "linux/display/DamageRegion.h"
-#include "linux/display/SharedMemory.h"
+#include "linux/display/PictureSource.h"
 #include "linux/display/X11Connection.h"
 
 namespace lumacast::x11 {
 
-/// Rows of a window, over its full width.
-struct Strip {
-    std::int32_t y = 0, height = 0;
-};
-
 /// A window that is captured, whatever covers it: the server keeps its picture in memory of its own (automatic
 /// redirection), reports what changes in it, and copies what is asked for. Or the whole screen, as it is shown, without
-/// the pointer. Belongs to one thread; `refresh`, `takeDamage` and `read` wait for the server. Times are nanoseconds of
-/// the steady clock.
-class CaptureTarget final {
+/// the pointer. There is no picture to read while the window is hidden; its size is without the window's border.
+class CaptureTarget final : public PictureSource {
 public:
     enum class Kind { Window, Screen };
     /// How long an application may take to repaint what the server uncovered before its picture is taken as it is.
@@ -31,7 +25,7 @@ public:
 
     /// Null when there is no such window, or its pixels aren't 32 bits wide. The connection must outlive the target.
     static std::unique_ptr<CaptureTarget> open(X11Connection& connection, xcb_window_t window, Kind kind);
-    ~CaptureTarget();
+    ~CaptureTarget() override;
     CaptureTarget(const CaptureTarget&) = delete;
     CaptureTarget& operator=(const CaptureTarget&) = delete;
 
@@ -39,37 +33,35 @@ public:
     Kind kind() const { return kind_; }
     /// Takes note of what an event says about this target.
     void handle(const xcb_generic_event_t& event, std::int64_t now);
-
     /// The window was destroyed.
     bool gone() const { return gone_; }
-    /// Its picture must be asked for anew: its size changed, or it came back.
-    bool needsRefresh() const { return needsRefresh_; }
-    void refresh();
-    /// Whether there is a picture to read now: not while the window is hidden.
-    bool readable() const { return drawable_ != XCB_NONE; }
-    /// The picture's size, without the window's border; another number in layout() with each refresh.
-    std::int32_t width() const { return width_; }
-    std::int32_t height() const { return height_; }
-    std::uint64_t layout() const { return layout_; }
 
-    /// Something has changed since takeDamage.
-    bool damaged() const { return damaged_; }
-    /// Adds what has changed; from then on only what changes later counts.
-    void takeDamage(DamageRegion& into);
-    /// Until when to wait for the application to paint what the server uncovered; 0 when there is nothing to wait for.
-    std::int64_t repaintDeadline() const { return awaited_.empty() ? 0 : repaintDeadline_; }
-    /// The deadline has passed. What the server uncovered may still show other windows' pixels; once, that is painted
-    /// over and the application asked again, with another deadline. The second time the picture is taken as it is.
-    void repaintIsLate(std::int64_t now);
+    /// For whoever copies from the picture within the server: where it is while it is readable, and the pixels before
+    /// its first column and row there.
+    xcb_drawable_t drawable() const { return drawable_; }
+    std::int32_t border() const { return border_; }
+    std::uint8_t depth() const { return depth_; }
+    /// Damaged already when the server got to this request of ours.
+    bool damagedBefore(std::uint32_t request) const { return damaged_ && before(damagedAfter_, request); }
 
-    /// Copies rows of the picture into `memory`, each where it is in a picture with rows of width() pixels and nothing
-    /// between them. False when the server would not; then the picture needs a refresh.
-    bool read(const SharedMemory& memory, std::span<const Strip> strips);
-    /// The picture changed before the last read was over, so that it may show parts of two.
-    bool overtaken() const;
+    std::uint32_t id() const override { return damage_; }  // the window may be captured a second time
+    bool needsRefresh() const override { return needsRefresh_; }
+    void refresh() override;
+    bool readable() const override { return drawable_ != XCB_NONE; }
+    std::int32_t width() const override { return width_; }
+    std::int32_t height() const override { return height_; }
+    std::uint64_t layout() const override { return layout_; }
+    bool damaged() const override { return damaged_; }
+    void takeDamage(DamageRegion& into) override;
+    std::int64_t repaintDeadline() const override { return awaited_.empty() ? 0 : repaintDeadline_; }
+    /// What the server uncovered may still show other windows' pixels; once, that is painted over and the application
+    /// asked again, with another deadline. The second time the picture is taken as it is.
+    void repaintIsLate(std::int64_t now) override;
+    bool read(const SharedMemory& memory, std::span<const Strip> strips) override;
+    bool overtaken() const override { return damagedBefore(lastRead_); }
 
 private:
-    CaptureTarget(X11Connection& connection, xcb_window_t window, Kind kind);
+    CaptureTarget(X11Connection& connection, xcb_window_t window, Kind kind, std::uint8_t depth);
     void begin();
     void nameWindow();
     void measureScreen();
@@ -83,6 +75,7 @@ private:
     X11Connection& connection_;
     const xcb_window_t window_;
     const Kind kind_;
+    const std::uint8_t depth_;
     bool gone_ = false;
     bool needsRefresh_ = true;
     bool damaged_ = false;

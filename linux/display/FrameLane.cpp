@@ -62,26 +62,28 @@ void FrameLane::run() {
 
 // The last picture stays: a later start in the same recording begins with it.
 void FrameLane::release() {
-    target_.reset();
+    shown_ = nullptr;
+    scene_.reset();
     maker_.reset();
     connection_.reset();
 }
 
 std::int64_t FrameLane::nextDeadline(const Order& order) const {
     if (!order.running) return connection_ ? stoppedSince_ + kReleaseAfter : FramePacer::kNever;
-    if (!target_) return FramePacer::kNever;
-    if (target_->gone()) return 0;
+    if (!shown_) return FramePacer::kNever;
+    if (scene_->anyGone()) return 0;
     std::int64_t deadline = last_.picture ? pacer_.nextRepeat() : FramePacer::kNever;
-    if (target_->repaintDeadline() != 0) deadline = std::min(deadline, target_->repaintDeadline());
+    if (shown_->readable() && shown_->repaintDeadline() != 0) deadline = std::min(deadline, shown_->repaintDeadline());
     return pictureIsDue() ? std::min(deadline, pacer_.nextChange()) : deadline;
 }
 
 bool FrameLane::pictureIsDue() const {
-    if (target_->needsRefresh()) return true;
-    if (!target_->readable()) return false;
-    if (target_->damaged()) return true;
-    const bool news = pictureWanted_ || (maker_->follows(*target_) && maker_->somethingNew());
-    return news && steadyNow() >= target_->repaintDeadline();
+    if (shown_->needsRefresh()) return true;
+    if (!shown_->readable()) return false;
+    if (shown_->damaged()) return true;
+    // When an application is late with its painting, that has to be seen to, news or not.
+    if (shown_->repaintDeadline() != 0) return steadyNow() >= shown_->repaintDeadline();
+    return pictureWanted_ || (maker_->follows(*shown_) && maker_->somethingNew());
 }
 
 void FrameLane::sleep(std::int64_t deadline) {
@@ -111,7 +113,7 @@ bool FrameLane::drainEvents(bool onlyQueued) {
         const Owned<xcb_generic_event_t> event(onlyQueued ? xcb_poll_for_queued_event(x) : xcb_poll_for_event(x));
         if (!event) return any;
         any = true;
-        if (target_) target_->handle(*event, steadyNow());
+        scene_->handle(*event, steadyNow());
     }
 }
 
@@ -122,8 +124,8 @@ void FrameLane::work(const Order& order) {
         return fail(order, X11CaptureStatus::kDisplayLost);
     }
     if (selectionVersion_ != setup_.selection->version() && !followSelection(order)) return;
-    if (target_ && target_->gone() && !followSelection(order)) return;
-    if (!target_) return;
+    if (scene_->anyGone() && !followSelection(order)) return;
+    if (!shown_) return;
     if (pictureIsDue() && steadyNow() >= pacer_.nextChange()) takePicture(order);
     if (last_.picture && steadyNow() >= pacer_.nextRepeat())
         repeatPicture(order, order.clock->now(), CaptureControl::Stamp::Fresh);
@@ -150,83 +152,58 @@ bool FrameLane::connect(const Order& order) {
     if (!connection_) return fail(order, X11CaptureStatus::kNoDisplay), false;
     if (!connection_->canCapture()) return fail(order, X11CaptureStatus::kNotSupported), false;
     maker_ = std::make_unique<PictureMaker>(*connection_, setup_.width, setup_.height);
+    scene_ = std::make_unique<CaptureScene>(*connection_);
     return true;
 }
 
-bool FrameLane::captures(xcb_window_t window, CaptureTarget::Kind kind) const {
-    return target_ && target_->window() == window && target_->kind() == kind;
-}
-
-// One window at a time: of several wanted windows the first that exists is shown, they are not put together. False when
-// none does.
-bool FrameLane::chooseTarget(const CloneSelection::Wanted& wanted) {
-    using Kind = CaptureTarget::Kind;
-    if (wanted.mode == DisplayCloneControl::kMirrorDisplay) {
-        const xcb_window_t root = connection_->screen().root;
-        if (!captures(root, Kind::Screen)) target_ = CaptureTarget::open(*connection_, root, Kind::Screen);
-        return target_ != nullptr;
-    }
-    if (wanted.mode != DisplayCloneControl::kCloneContexts) {
-        target_.reset();  // nothing to show, for now
-        return true;
-    }
-    for (const ContextID context : wanted.contexts) {
-        const xcb_window_t window = number(context);
-        if (window == 0 || connection_->isRoot(window)) continue;
-        if (captures(window, Kind::Window)) return true;
-        if (auto target = CaptureTarget::open(*connection_, window, Kind::Window)) {
-            target_ = std::move(target);
-            return true;
-        }
-    }
-    return false;
-}
-
 bool FrameLane::followSelection(const Order& order) {
-    if (target_ && target_->gone()) {
-        setup_.selection->forget(ContextID{target_->window()});
-        target_.reset();
-    }
+    for (const ContextID context : scene_->gone()) setup_.selection->forget(context);
     const auto wanted = setup_.selection->wanted();
     selectionVersion_ = wanted.version;
-    const CaptureTarget* const before = target_.get();
-    if (!chooseTarget(wanted))
-        return fail(order, connection_->broken() ? X11CaptureStatus::kDisplayLost : X11CaptureStatus::kWindowGone),
-               false;
-    if (target_.get() != before) pictureWanted_ = true;
+    const std::uint32_t before = shown_ ? shown_->id() : 0;
+    const bool any = scene_->follow(wanted);
+    shown_ = scene_->picture();
+    if (connection_->broken()) {
+        setup_.selection->forgetAll();
+        return fail(order, X11CaptureStatus::kDisplayLost), false;
+    }
+    if (wanted.mode == DisplayCloneControl::kCloneContexts)
+        for (const ContextID context : scene_->missing(wanted)) setup_.selection->forget(context);
+    if (!any) return fail(order, X11CaptureStatus::kWindowGone), false;
+    if (shown_ && shown_->id() != before) pictureWanted_ = true;
     drainEvents(true);
     return true;
 }
 
-// Whether the target's picture can be read now; what has changed in it is noted.
-bool FrameLane::lookAtTarget() {
-    if (target_->needsRefresh()) {
-        target_->refresh();
+// Whether the picture can be read now; what has changed in it is noted.
+bool FrameLane::lookAtPicture() {
+    if (shown_->needsRefresh()) {
+        shown_->refresh();
         drainEvents(true);
     }
-    if (!target_->readable()) return false;
-    if (!maker_->follows(*target_)) maker_->follow(*target_);
+    if (!shown_->readable()) return false;
+    if (!maker_->follows(*shown_)) maker_->follow(*shown_);
     DamageRegion damage;
-    if (target_->damaged()) target_->takeDamage(damage);
+    if (shown_->damaged()) shown_->takeDamage(damage);
     maker_->add(damage);
-    if (target_->repaintDeadline() == 0) return true;
+    if (shown_->repaintDeadline() == 0) return true;
     const std::int64_t now = steadyNow();
-    if (now >= target_->repaintDeadline()) target_->repaintIsLate(now);
-    return target_->repaintDeadline() == 0;
+    if (now >= shown_->repaintDeadline()) shown_->repaintIsLate(now);
+    return shown_->repaintDeadline() == 0;
 }
 
 void FrameLane::takePicture(const Order& order) {
     const MediaTime stamp = order.clock->now();
     std::optional<std::size_t> plane;
     for (int reading = 0; reading < kReadings; ++reading) {
-        const bool hadNews = target_->damaged() || target_->needsRefresh();
-        if (!lookAtTarget()) return;
+        const bool hadNews = shown_->damaged() || shown_->needsRefresh();
+        if (!lookAtPicture()) return;
         if (!maker_->somethingNew() && !pictureWanted_) return;
         if (!plane) plane = maker_->acquire();
         if (!plane) return dropPicture(hadNews);
-        if (!maker_->update(*plane, *target_)) return pacer_.taken(steadyNow());
+        if (!maker_->update(*plane, *shown_)) return pacer_.taken(steadyNow());
         drainEvents(true);
-        if (!target_->overtaken() && !target_->needsRefresh()) break;
+        if (!shown_->overtaken() && !shown_->needsRefresh()) break;
     }
     if (!deliver(order, maker_->picture(*plane, ++pictures_), stamp, CaptureControl::Stamp::Fresh)) return;
     maker_->delivered();
@@ -262,7 +239,7 @@ bool FrameLane::deliver(const Order& order, std::shared_ptr<Picture> picture, Me
 
     drainEvents(false);
     const std::int64_t took = steadyNow() - began;
-    if (target_ && target_->damaged() && took > pacer_.interval())
+    if (shown_ && shown_->damaged() && took > pacer_.interval())
         setup_.control->countDropped(static_cast<std::uint64_t>(took / pacer_.interval()));
     return true;
 }

@@ -9,7 +9,7 @@
 #include <string>
 
 #include "linux/display/CaptureControl.h"
-#include "linux/display/CaptureTarget.h"
+#include "linux/display/CaptureScene.h"
 #include "linux/display/CloneSelection.h"
 #include "linux/display/FramePacer.h"
 #include "linux/display/PictureMaker.h"
@@ -56,12 +56,10 @@ private:
     bool beginRun(const Order& order);
     bool connect(const Order& order);
     bool followSelection(const Order& order);
-    bool chooseTarget(const CloneSelection::Wanted& wanted);
-    bool captures(xcb_window_t window, CaptureTarget::Kind kind) const;
     bool pictureIsDue() const;
 
     void takePicture(const Order& order);
-    bool lookAtTarget();
+    bool lookAtPicture();
     void dropPicture(bool hadNews);
     void repeatPicture(const Order& order, MediaTime stamp, CaptureControl::Stamp kind);
     bool deliver(const Order& order, std::shared_ptr<Picture> picture, MediaTime stamp, CaptureControl::Stamp kind);
@@ -80,7 +78,8 @@ private:
     // Of the lane alone.
     std::unique_ptr<X11Connection> connection_;
     std::unique_ptr<PictureMaker> maker_;
-    std::unique_ptr<CaptureTarget> target_;
+    std::unique_ptr<CaptureScene> scene_;
+    PictureSource* shown_ = nullptr;  ///< the scene's
     FramePacer pacer_;
     std::uint64_t run_ = 0;
     std::uint64_t selectionVersion_ = 0;

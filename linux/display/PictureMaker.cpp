@@ -48,8 +48,8 @@ PictureMaker::~PictureMaker() {
     if (image_) image_->detach(connection_);
 }
 
-void PictureMaker::follow(const CaptureTarget& target) {
-    window_ = target.window();
+void PictureMaker::follow(const PictureSource& target) {
+    source_ = target.id();
     layout_ = target.layout();
     if (!target.readable()) return;
     const Fit fitted = fit(target.width(), target.height(), pool_.width(), pool_.height());
@@ -80,7 +80,7 @@ std::optional<std::size_t> PictureMaker::acquire() {
     });
 }
 
-bool PictureMaker::update(std::size_t index, CaptureTarget& target) {
+bool PictureMaker::update(std::size_t index, PictureSource& target) {
     Plane& plane = *pool_.plane(index);
     if (planeFits_[index] != fit_) {
         // Whatever it showed before, at another place perhaps.
@@ -94,18 +94,18 @@ bool PictureMaker::update(std::size_t index, CaptureTarget& target) {
     return done;
 }
 
-bool PictureMaker::updateDirectly(std::size_t index, CaptureTarget& target) {
+bool PictureMaker::updateDirectly(std::size_t index, PictureSource& target) {
     const Strips rows = rowsOf(tracker_.ofPlane(index));
     return target.read(pool_.plane(index)->memory(), rows.span());
 }
 
-bool PictureMaker::updateFromImage(std::size_t index, CaptureTarget& target) {
+bool PictureMaker::updateFromImage(std::size_t index, PictureSource& target) {
     if (!readImage(target)) return false;
     for (const PixelRect& rect : tracker_.ofPlane(index).rects()) show(rect, *pool_.plane(index));
     return true;
 }
 
-bool PictureMaker::readImage(CaptureTarget& target) {
+bool PictureMaker::readImage(PictureSource& target) {
     const auto size = static_cast<std::size_t>(fit_.sourceWidth) * static_cast<std::size_t>(fit_.sourceHeight) * 4;
     if (!image_) {
         image_ = SharedMemory::make(connection_, size);

@@ -6,9 +6,9 @@
 #include <memory>
 #include <optional>
 
-#include "linux/display/CaptureTarget.h"
 #include "linux/display/DamageTracker.h"
 #include "linux/display/Fit.h"
+#include "linux/display/PictureSource.h"
 #include "linux/display/PlanePool.h"
 
 namespace lumacast::x11 {
@@ -25,11 +25,9 @@ public:
     PictureMaker& operator=(const PictureMaker&) = delete;
 
     /// The target to read from now on, or its new layout: everything has changed.
-    void follow(const CaptureTarget& target);
+    void follow(const PictureSource& target);
     /// Whether follow() was last called for this target as it is laid out now.
-    bool follows(const CaptureTarget& target) const {
-        return window_ == target.window() && layout_ == target.layout();
-    }
+    bool follows(const PictureSource& target) const { return source_ == target.id() && layout_ == target.layout(); }
     /// This part of the target's picture has changed.
     void add(const DamageRegion& damage);
     /// The next picture goes to somebody who has seen none.
@@ -39,22 +37,22 @@ public:
     /// A plane nobody holds; none when all are held.
     std::optional<std::size_t> acquire();
     /// Brings a plane up to date. False when the server would not, or there is no memory.
-    bool update(std::size_t plane, CaptureTarget& target);
+    bool update(std::size_t plane, PictureSource& target);
     /// The plane as a picture with this number.
     std::shared_ptr<Picture> picture(std::size_t plane, std::uint64_t number);
     /// A picture was delivered: the next one's damage counts from it.
     void delivered() { tracker_.delivered(); }
 
 private:
-    bool updateDirectly(std::size_t plane, CaptureTarget& target);
-    bool updateFromImage(std::size_t plane, CaptureTarget& target);
-    bool readImage(CaptureTarget& target);
+    bool updateDirectly(std::size_t plane, PictureSource& target);
+    bool updateFromImage(std::size_t plane, PictureSource& target);
+    bool readImage(PictureSource& target);
     void show(const PixelRect& rect, Plane& plane);
 
     X11Connection& connection_;
     PlanePool pool_;
     DamageTracker tracker_;
-    xcb_window_t window_ = XCB_NONE;
+    std::uint32_t source_ = 0;
     std::uint64_t layout_ = 0;
     Fit fit_;
     std::array<Fit, kPlanes> planeFits_{};  ///< what each plane's borders were cleared for

@@ -2,9 +2,22 @@
 
 #include <poll.h>
 
+#include <vector>
+
 namespace lumacast::test {
 
 using x11::Owned;
+
+namespace {
+
+xcb_visualid_t visualOf(const xcb_screen_t& screen, std::uint8_t depth) {
+    for (auto depths = xcb_screen_allowed_depths_iterator(&screen); depths.rem > 0; xcb_depth_next(&depths))
+        if (depths.data->depth == depth && xcb_depth_visuals_length(depths.data) > 0)
+            return xcb_depth_visuals(depths.data)->visual_id;
+    return XCB_NONE;
+}
+
+}  // namespace
 
 TestWindow::TestWindow(const std::string& display, Look look)
     : connection_(xcb_connect(display.c_str(), nullptr)),
@@ -16,16 +29,27 @@ TestWindow::TestWindow(const std::string& display, Look look)
     xcb_connection_t* const x = connection_.get();
     window_ = xcb_generate_id(x);
     const xcb_window_t parent = look.parent != XCB_NONE ? look.parent : screen_->root;
-    std::uint32_t mask = XCB_CW_EVENT_MASK;
-    std::array<std::uint32_t, 2> values{XCB_EVENT_MASK_EXPOSURE | XCB_EVENT_MASK_STRUCTURE_NOTIFY, 0};
-    if (look.background != Look::kNone) {
-        mask |= XCB_CW_BACK_PIXEL;
-        values = {static_cast<std::uint32_t>(look.background), values[0]};
+    // In the order of the mask's bits.
+    std::uint32_t mask = 0;
+    std::vector<std::uint32_t> values;
+    const auto set = [&](std::uint32_t bit, std::uint32_t value) { mask |= bit, values.push_back(value); };
+    if (look.background != Look::kNone) set(XCB_CW_BACK_PIXEL, static_cast<std::uint32_t>(look.background));
+    xcb_visualid_t visual = XCB_COPY_FROM_PARENT;
+    if (look.depth != 0) {
+        // Another depth than the parent's takes a border and colours of its own.
+        visual = visualOf(*screen_, look.depth);
+        const xcb_colormap_t colours = xcb_generate_id(x);
+        xcb_create_colormap(x, XCB_COLORMAP_ALLOC_NONE, colours, screen_->root, visual);
+        set(XCB_CW_BORDER_PIXEL, 0);
+        set(XCB_CW_EVENT_MASK, XCB_EVENT_MASK_EXPOSURE | XCB_EVENT_MASK_STRUCTURE_NOTIFY);
+        set(XCB_CW_COLORMAP, colours);
+    } else {
+        set(XCB_CW_EVENT_MASK, XCB_EVENT_MASK_EXPOSURE | XCB_EVENT_MASK_STRUCTURE_NOTIFY);
     }
-    xcb_create_window(x, XCB_COPY_FROM_PARENT, window_, parent, static_cast<std::int16_t>(look.place.x),
+    xcb_create_window(x, look.depth, window_, parent, static_cast<std::int16_t>(look.place.x),
                       static_cast<std::int16_t>(look.place.y), static_cast<std::uint16_t>(width_),
                       static_cast<std::uint16_t>(height_), look.border, XCB_WINDOW_CLASS_INPUT_OUTPUT,
-                      XCB_COPY_FROM_PARENT, mask, values.data());
+                      visual, mask, values.data());
     context_ = xcb_generate_id(x);
     xcb_create_gc(x, context_, window_, 0, nullptr);
     events_ = std::thread([this] { serveEvents(); });

@@ -1,0 +1,51 @@
+#pragma once
+// What a frame lane reads pictures from.
+
+#include <xcb/xcb.h>
+
+#include <cstdint>
+#include <span>
+
+#include "linux/display/DamageRegion.h"
+#include "linux/display/ReadRows.h"
+#include "linux/display/SharedMemory.h"
+
+namespace lumacast::x11 {
+
+/// A changing picture that the display server keeps: one window's, the screen's, or several windows' put together.
+/// Belongs to one thread; `refresh`, `takeDamage` and `read` wait for the server. Times are nanoseconds of the steady
+/// clock.
+class PictureSource {
+public:
+    virtual ~PictureSource() = default;
+
+    /// Which source it is: no two of a connection have the same.
+    virtual std::uint32_t id() const = 0;
+
+    /// The picture must be asked for anew: it has another size, or what it is made of came, went or moved.
+    virtual bool needsRefresh() const = 0;
+    virtual void refresh() = 0;
+    /// Whether there is a picture to read now.
+    virtual bool readable() const = 0;
+    virtual std::int32_t width() const = 0;
+    virtual std::int32_t height() const = 0;
+    /// Another number whenever the whole picture has to be read anew.
+    virtual std::uint64_t layout() const = 0;
+
+    /// Something has changed since takeDamage.
+    virtual bool damaged() const = 0;
+    /// Adds what has changed; from then on only what changes later counts.
+    virtual void takeDamage(DamageRegion& into) = 0;
+    /// Until when to wait for an application to paint what the server uncovered; 0 when there is nothing to wait for.
+    virtual std::int64_t repaintDeadline() const = 0;
+    /// The deadline has passed.
+    virtual void repaintIsLate(std::int64_t now) = 0;
+
+    /// Copies rows of the picture into `memory`, each where it is in a picture with rows of width() pixels and nothing
+    /// between them. False when the server would not; then the picture needs a refresh.
+    virtual bool read(const SharedMemory& memory, std::span<const Strip> strips) = 0;
+    /// The picture changed before the last read was over, so that it may show parts of two.
+    virtual bool overtaken() const = 0;
+};
+
+}  // namespace lumacast::x11
