@@ -368,13 +368,15 @@ TEST_F(X11CanvasOnASmallScreen, LooksLikeTheScreenWhateverTheWindowsDo) {
                                  .background = 0x102030 * (i + 1)}));
         contexts.insert(windows.back()->context());
     }
-    const auto made = startOn(contexts, 400, 300, 1000);
+    // Slow enough for several changes to come together.
+    const auto made = startOn(contexts, 400, 300, 30);
     X11DisplayCapture mirror(display.name(), clock, scheduler);
     mirror.setMirroringMode(DisplayCloneControl::kMirrorDisplay);
     for (int round = 0; round < 25; ++round) {
         for (int i = 0; i < 12; ++i) {
             TestWindow& window = *windows[random() % windows.size()];
-            switch (random() % 7) {
+            // Often nothing but parts, so that pictures are made of several that changed.
+            switch (round % 2 == 0 ? 6 : random() % 7) {
                 case 0: window.move(below(420) - 40, below(320) - 40); break;
                 case 1: window.raise(); break;
                 case 2: window.resize(20 + below(150), 20 + below(150)); break;

@@ -319,19 +319,6 @@ TEST_F(X11Capture, ShowsTheWindowThatExistsOfSeveral) {
     EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kWindowGone);
 }
 
-// What is shown again is read again: the application may have painted meanwhile.
-TEST_F(X11Capture, ReadsAWindowAnewThatWasNotShownForAWhile) {
-    TestWindow window(display.name(), {.colour = kRed, .background = kRed, .repaints = false});
-    const auto made = startOn(window, 320, 240);
-    ASSERT_TRUE(frames->waitForColour(kRed));
-    window.paint(kGreen);
-    ASSERT_TRUE(frames->waitForColour(kGreen));
-    capture.setMirroringMode(DisplayCloneControl::kOff);
-    window.paint(kBlue);
-    capture.setMirroringMode(DisplayCloneControl::kCloneContexts);
-    ASSERT_TRUE(frames->waitForColour(kBlue));
-}
-
 TEST_F(X11Capture, FollowsTheSelectionWhileItRuns) {
     TestWindow first(display.name(), {.colour = kRed});
     TestWindow second(display.name(), {.place = {500, 500, 320, 240}, .colour = kGreen});
