@@ -137,7 +137,7 @@ World::~World() {
 
 void World::install(const std::string& identifier, const std::string& name, const std::string& executable) {
     std::ofstream(path("data/applications/" + identifier + ".desktop"))
-        << "[Desktop Entry]\nType=Application\nName=" << name << "\nExec=" << executable << "\n";
+        << "[Desktop Entry]\nType=Application\nName=" << name << "\nExec=\"" << executable << "\"\n";
 }
 
 void World::startDaemon() {
