@@ -25,7 +25,9 @@ struct Unload {
 EncoderFacts probeEncoders() {
     EncoderFacts facts;
     facts.library = "libavcodec.so." + std::to_string(LIBAVCODEC_VERSION_MAJOR);
-    const std::unique_ptr<void, Unload> library(::dlopen(facts.library.c_str(), RTLD_LAZY | RTLD_LOCAL));
+    // It stays loaded: what it keeps for itself is not ours to free.
+    const std::unique_ptr<void, Unload> library(
+        ::dlopen(facts.library.c_str(), RTLD_LAZY | RTLD_LOCAL | RTLD_NODELETE));
     void* const symbol = library ? ::dlsym(library.get(), "avcodec_find_encoder_by_name") : nullptr;
     if (!symbol) return facts;
     facts.isLoaded = true;
