@@ -5,8 +5,6 @@
 #include <cstring>
 #include <string>
 
-#include "linux/media/LeakCheckPause.h"
-
 namespace lumacast::media {
 
 namespace {
@@ -66,11 +64,7 @@ void tune(AVCodecContext& context, const std::string& name) {
 /// Frames in the graphics card's memory for `context`; null when there is no such card.
 AvOwned<AVBufferRef> makeUploads(AVCodecContext& context) {
     AVBufferRef* device = nullptr;
-    {
-        // Where no hardware is, the drivers' loader keeps a few kilobytes of its own.
-        [[maybe_unused]] const LeakCheckPause theirs;
-        if (av_hwdevice_ctx_create(&device, AV_HWDEVICE_TYPE_VAAPI, nullptr, nullptr, 0) < 0) return nullptr;
-    }
+    if (av_hwdevice_ctx_create(&device, AV_HWDEVICE_TYPE_VAAPI, nullptr, nullptr, 0) < 0) return nullptr;
     const AvOwned<AVBufferRef> ownedDevice(device);
     AvOwned<AVBufferRef> frames(av_hwframe_ctx_alloc(device));
     if (!frames) return nullptr;
