@@ -285,10 +285,33 @@ public:
     }
 };
 
-TEST(Interruption, WhatAnswersAFinishIsToldOfItAndReset) {
-    SimWorld world(1);
-    world.fakes.preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
-    Process process(world.fakes.platform(), [](const SessionServices& services, const BundleIdentifier& id) {
+/// Two applications, of which the player starts to record.
+struct Interruption {
+    explicit Interruption(LCRecordingManager::SessionMaker makeSession = {})
+        : process(world.fakes.platform(), std::move(makeSession)) {
+        world.fakes.preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
+        world.scheduler.mainQueue().sync([&] { process.start(); });
+        player.connect();
+        editor.connect();
+        world.scheduler.runUntilIdle();
+    }
+    ~Interruption() { world.scheduler.endWorld(); }
+
+    void start() {
+        const auto asked = player.start();
+        world.scheduler.runUntilIdle();
+        EXPECT_EQ(asked->answers, 1);
+        EXPECT_EQ(asked->code(), 0);
+    }
+
+    SimWorld world{1};
+    Process process;
+    TestClient player{world.fakes, "org.example.Player", "Player", ProcessID{500}, ContextID{7}};
+    TestClient editor{world.fakes, "org.example.Editor", "Editor", ProcessID{501}, ContextID{8}};
+};
+
+TEST(InterruptionTest, WhatAnswersAFinishIsToldOfItAndReset) {
+    Interruption of([](const SessionServices& services, const BundleIdentifier& id) {
         std::shared_ptr<LCRecordingSession> session;
         if (id.text() == "org.example.Editor")
             session = std::make_shared<AnsweringSession>(services, id);
@@ -296,43 +319,23 @@ TEST(Interruption, WhatAnswersAFinishIsToldOfItAndReset) {
             session = std::make_shared<LCRecordingSession>(services, id);
         return session;
     });
-    world.scheduler.mainQueue().sync([&] { process.start(); });
-    TestClient player(world.fakes, "org.example.Player", "Player", ProcessID{500}, ContextID{7});
-    TestClient editor(world.fakes, "org.example.Editor", "Editor", ProcessID{501}, ContextID{8});
-    player.connect();
-    editor.connect();
-    world.scheduler.runUntilIdle();
-    const auto other = process.manager().registeredSession(editor.id);
+    const auto other = of.process.manager().registeredSession(of.editor.id);
     other->setPaused(true);
-    const auto asked = player.start();
-    world.scheduler.runUntilIdle();
-    EXPECT_EQ(asked->code(), 0);
-    EXPECT_EQ(world.fakes.logSink.count("interrupted session"), 1u);
-    ASSERT_EQ(editor.told.size(), 1u);
-    EXPECT_TRUE(editor.told[0].arguments[0].isNull()) << "the finish had no error";
-    EXPECT_EQ(editor.told[0].arguments[1], Value(URL("file:///left.mp4")));
+    of.start();
+    EXPECT_EQ(of.world.fakes.logSink.count("interrupted session"), 1u);
+    ASSERT_EQ(of.editor.told.size(), 1u);
+    EXPECT_TRUE(of.editor.told[0].arguments[0].isNull()) << "the finish had no error";
+    EXPECT_EQ(of.editor.told[0].arguments[1], Value(URL("file:///left.mp4")));
     EXPECT_EQ(other->interruptedMovieURL(), URL("file:///left.mp4"));
     EXPECT_FALSE(other->isPaused());
-    EXPECT_EQ(world.fakes.keepAlive.ended(), 0) << "a reset without a beginning ends nothing";
-    world.scheduler.endWorld();
+    EXPECT_EQ(of.world.fakes.keepAlive.ended(), 0) << "a reset without a beginning ends nothing";
 }
 
-TEST(Interruption, AnIdleSessionStaysSilent) {
-    SimWorld world(1);
-    world.fakes.preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
-    Process process(world.fakes.platform());
-    world.scheduler.mainQueue().sync([&] { process.start(); });
-    TestClient player(world.fakes, "org.example.Player", "Player", ProcessID{500}, ContextID{7});
-    TestClient editor(world.fakes, "org.example.Editor", "Editor", ProcessID{501}, ContextID{8});
-    player.connect();
-    editor.connect();
-    world.scheduler.runUntilIdle();
-    const auto asked = player.start();
-    world.scheduler.runUntilIdle();
-    EXPECT_EQ(asked->code(), 0);
-    EXPECT_EQ(world.fakes.logSink.count("interrupted session"), 0u);
-    EXPECT_TRUE(editor.told.empty());
-    world.scheduler.endWorld();
+TEST(InterruptionTest, AnIdleSessionStaysSilent) {
+    Interruption of;
+    of.start();
+    EXPECT_EQ(of.world.fakes.logSink.count("interrupted session"), 0u);
+    EXPECT_TRUE(of.editor.told.empty());
 }
 
 TEST(AlertQueueTest, IsMadeOnceHoweverOftenItIsAskedFor) {

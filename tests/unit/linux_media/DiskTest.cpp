@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 #include <fcntl.h>
+#include <poll.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -284,9 +285,11 @@ TEST_P(Killed, AMoviePlaysUpToItsLastSecond) {
         std::int64_t last = -1;
         std::int64_t stamp = 0;
         ::fcntl(ends[0], F_SETFL, O_NONBLOCK);
-        while (std::chrono::steady_clock::now() < killing) {
-            if (::read(ends[0], &stamp, sizeof stamp) != sizeof stamp)
-                std::this_thread::sleep_for(std::chrono::milliseconds(1));
+        for (auto now = std::chrono::steady_clock::now(); now < killing; now = std::chrono::steady_clock::now()) {
+            pollfd reported{ends[0], POLLIN, 0};
+            const auto left = std::chrono::ceil<std::chrono::milliseconds>(killing - now);
+            if (::poll(&reported, 1, static_cast<int>(left.count())) > 0)
+                (void)!::read(ends[0], &stamp, sizeof stamp);
         }
         ::kill(child, SIGKILL);
         int status = 0;
