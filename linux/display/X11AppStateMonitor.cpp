@@ -48,6 +48,26 @@ std::uint32_t X11AppStateMonitor::applicationState(const BundleIdentifier& ident
     return lane_->ask<std::uint32_t>(question, 0);
 }
 
+std::optional<BundleIdentifier> X11AppStateMonitor::frontmostApplication() {
+    using Answer = std::optional<BundleIdentifier>;
+    const std::function<Answer(X11Connection&)> question = [this](X11Connection& connection) {
+        const auto active = frontProcess(connection);
+        return active ? identifierOf_(*active) : std::nullopt;
+    };
+    return lane_->ask<Answer>(question, std::nullopt);
+}
+
+std::optional<ProcessID> X11AppStateMonitor::applicationProcess(const BundleIdentifier& identifier) {
+    using Answer = std::optional<ProcessID>;
+    const std::function<Answer(X11Connection&)> question = [this, identifier](X11Connection& connection) -> Answer {
+        const auto active = frontProcess(connection);
+        if (active && identifierOf_(*active) == identifier) return active;
+        const auto processes = processesOf_(identifier);
+        return processes.empty() ? std::nullopt : std::optional(processes.front());
+    };
+    return lane_->ask<Answer>(question, std::nullopt);
+}
+
 std::uint32_t X11AppStateMonitor::stateOf(X11Connection& connection, const BundleIdentifier& identifier) {
     // The active window alone answers most questions, and looking at every process may take longer than an answer has.
     const auto active = frontProcess(connection);

@@ -38,6 +38,8 @@ public:
     ~X11AppStateMonitor() override;
 
     std::uint32_t applicationState(const BundleIdentifier& identifier) override;
+    std::optional<BundleIdentifier> frontmostApplication() override;
+    std::optional<ProcessID> applicationProcess(const BundleIdentifier& identifier) override;
     void setHandler(Handler handler) override;
 
 private:

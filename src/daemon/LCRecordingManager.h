@@ -74,6 +74,10 @@ public:
     void updateExemptionListWithSession(const LCRecordingSession& session);
     void expireAcknowledgementExemptionsForBundleID(const std::optional<BundleIdentifier>& bundleID);
 
+    /// `frontmostSession:applicationPID:` — the process whose sound belongs to a recording of this session: of a system
+    /// recording the process in front, -1 when nothing is; else the client's own. The handler is called at once.
+    void frontmostSession(const LCRecordingSession& session, const std::function<void(ProcessID)>& handler);
+
     /// `isMicrophoneRecording` and `isCameraRecording` — what the last start that got that far asked for.
     bool isMicrophoneRecording() const { return microphoneRecording_; }
     bool isCameraRecording() const { return cameraRecording_; }

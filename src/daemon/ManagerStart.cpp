@@ -10,6 +10,8 @@ namespace {
 
 constexpr std::string_view kSystemRecordingEntitlement = "com.orvane.private.luma-cast";
 
+constexpr ProcessID kNoProcess{-1};
+
 /// A session's capture source keeps its first size for good, so one that no picture can have must not get there.
 bool isSize(Size size) {
     return std::isfinite(size.width) && std::isfinite(size.height) && size.width >= 1 && size.height >= 1;
@@ -123,6 +125,19 @@ void LCRecordingManager::startProper(const std::shared_ptr<LCRecordingSession>& 
 
 bool LCRecordingManager::isApplicationInForegroundWithBundleIdentifier(const BundleIdentifier& bundleID) {
     return (platform_.appStateMonitor.applicationState(bundleID) & AppStateMonitor::kRunningForeground) != 0;
+}
+
+void LCRecordingManager::frontmostSession(const LCRecordingSession& session,
+                                          const std::function<void(ProcessID)>& handler) {
+    if (session.isSystemRecording()) {
+        const auto front = platform_.appStateMonitor.frontmostApplication();
+        const auto process = front ? platform_.appStateMonitor.applicationProcess(*front) : std::nullopt;
+        handler(process.value_or(kNoProcess));
+        return;
+    }
+    const auto proxy = session.clientProxy();
+    const auto connection = proxy ? proxy->connection() : nullptr;
+    handler(connection ? connection->processIdentifier() : kNoProcess);
 }
 
 void LCRecordingManager::stopCurrentRecordingSessionWithHandler(Handler handler) {

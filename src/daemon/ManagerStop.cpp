@@ -24,7 +24,7 @@ void LCRecordingManager::stopRecordingSession(const std::shared_ptr<LCRecordingS
     if (!session->isRecording()) return;
     const std::uint64_t generation = session->managerRecord.startGeneration;
     const auto underWay = noteStopUnderWay(session, generation);
-    if (!handler) {
+    if (!handler && !session->broadcastExtensionID()) {
         // A recording that nobody waits for is deliberately thrown away.
         log_.line("recording stopped without handler!");
         session->finishAndCleanupSessionFilesWithHandler([self = shared_from_this(), session, generation, underWay] {
@@ -37,7 +37,7 @@ void LCRecordingManager::stopRecordingSession(const std::shared_ptr<LCRecordingS
         [self = shared_from_this(), session, generation, underWay, handler = std::move(handler)](
             const std::optional<URL>& url, const std::optional<Error>& error) {
             self->onRequestLane([self, session, generation, handler, url, error] {
-                handler(url, error);
+                if (handler) handler(url, error);
                 self->resetAfterStop(session, generation);
             });
         });
@@ -109,7 +109,12 @@ void LCRecordingManager::recordingSessionStoppedWithError(const std::shared_ptr<
                                                           const std::optional<URL>& movieURL) {
     log_.line("LCRecordingManager:recordingSessionStoppedWithError:movieURL:");
     if (session->isSystemRecording())
-        lumaAlertQueue().async([session, error] { showAlertForRecordingSession(*session, error); });
+        lumaAlertQueue().async([session, error] {
+            if (session->broadcastExtension())
+                showAlertForBroadcastSession(*session, error);
+            else
+                showAlertForRecordingSession(*session, error);
+        });
     clearSystemRecordingUI(*session);
     if (const auto proxy = session->clientProxy()) proxy->stopRecordingWithError(error, movieURL);
 }

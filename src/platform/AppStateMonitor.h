@@ -1,6 +1,7 @@
 #pragma once
 #include <cstdint>
 #include <functional>
+#include <optional>
 
 #include "base/Identifiers.h"
 
@@ -18,6 +19,10 @@ public:
     virtual ~AppStateMonitor() = default;
     /// The application's state as a bit set; 0 for an unknown one.
     virtual std::uint32_t applicationState(const BundleIdentifier& identifier) = 0;
+    /// The application that the user has in front; none when nothing is, or nobody knows.
+    virtual std::optional<BundleIdentifier> frontmostApplication() = 0;
+    /// A process of the application, the one in front if it has one there; none when it does not run.
+    virtual std::optional<ProcessID> applicationProcess(const BundleIdentifier& identifier) = 0;
     /// Whom to tell of updates, on the main queue; an empty handler for nobody. One handler at a time.
     virtual void setHandler(Handler handler) = 0;
 };

@@ -1,6 +1,7 @@
 #include "session/FrameGeometry.h"
 
 #include <cmath>
+#include <iterator>
 #include <numbers>
 
 namespace lumacast {
@@ -35,6 +36,11 @@ AffineTransform frameTransformFromFlags(Log& log, std::uint32_t flags) {
         transform = scaled(transform, 1, -1);
     }
     return transform;
+}
+
+std::uint32_t orientationFromFrameTransform(std::uint32_t flags) {
+    constexpr std::uint32_t kOrientations[] = {1, 4, 2, 3, 8, 5, 7, 6};
+    return flags < std::size(kOrientations) ? kOrientations[flags] : 1;
 }
 
 Size fittedWithin(Size size, double limit) {

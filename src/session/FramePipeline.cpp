@@ -16,6 +16,13 @@ void LCRecordingSession::screenCaptureControllerDidReceiveSampleBuffer(DisplayCa
     if (compare(firstSampleTimestamp_.get(), kZeroMediaTime) == 0)
         firstSampleTimestamp_.set(sample->presentationTime());
     updateDuartionWithSample(sample);
+    if (broadcastExtension())
+        _processSampleBufferForStreaming(sample, transformFlags);
+    else
+        _processSampleBuffer(sample, transformFlags);
+}
+
+void LCRecordingSession::_processSampleBufferForStreaming(const SampleRef& sample, std::uint32_t transformFlags) {
     _processSampleBuffer(sample, transformFlags);
 }
 

@@ -7,7 +7,8 @@ namespace lumacast {
 
 namespace {
 
-constexpr int kCaptureRate = 60;  // frames per second
+// Frames per second, without and with a broadcast extension.
+constexpr int kCaptureRate = 60, kBroadcastCaptureRate = 30;
 
 /// "MM-dd-yyyy HH:mm:ss" with every ":" replaced by "-".
 std::string dateInFileName(const CalendarFields& f) {
@@ -34,8 +35,14 @@ void LCRecordingSession::setWindowSize(Size size) {
 }
 
 std::string LCRecordingSession::outputPath() const {
+    const Clock& clock = services_.platform.clock;
+    if (broadcastExtension()) {
+        char rest[96];
+        std::snprintf(rest, sizeof rest, "_%f_%lli.mp4", clock.now().secondsSince1970,
+                      static_cast<long long>(broadcastFragmentIndex_.load()));
+        return services_.tempStore.pathFor("LCMovie_" + bundleID_.text() + rest);
+    }
     if (systemRecording_) {
-        const Clock& clock = services_.platform.clock;
         return services_.tempStore.pathFor("ScreenRecording_" + dateInFileName(clock.localCalendar(clock.now())) +
                                            ".mp4");
     }
@@ -61,24 +68,33 @@ void LCRecordingSession::startSessionWithHandler(Handler handler) {
         if (isNativeScreenOrientationPortrait() ? width > height : width <= height) std::swap(width, height);
         log_.line("After windowSize w:%f h:%f", width, height);
     }
-    const auto writer =
-        std::make_shared<LCMovieWriter>(services_.platform, services_.tempStore, Size{width, height}, outputPath());
+    startIsPending_ = true;
+    startWriter({width, height}, [self = shared_from_this(), start = ++starts_, stops = stops_.load(),
+                                  handler = std::move(handler)] { self->continueStart(start, stops, handler); });
+}
+
+void LCRecordingSession::startWriter(Size size, Handler continuation) {
+    Handler onLane = [lane = services_.requestLane, continuation = std::move(continuation)] {
+        if (lane)
+            lane->async(continuation);
+        else
+            continuation();
+    };
+    if (broadcastProcessMode_ != static_cast<std::int64_t>(BroadcastProcessMode::MovieClips)) {
+        movieWriter_.set(nullptr);
+        _notifyExtensionOfAction(ExtensionAction::Start, std::move(onLane));
+        return;
+    }
+    const auto writer = std::make_shared<LCMovieWriter>(services_.platform, services_.tempStore, size, outputPath());
     writer->setBroadcastConfig(broadcastConfiguration_);
     writer->setSystemRecording(systemRecording_);
     pathClaim_ = services_.tempStore.claimPath(writer->outputPath());
     writer->setPathClaim(pathClaim_);
     movieWriter_.set(writer);
-
-    startIsPending_ = true;
-    auto continuation = [self = shared_from_this(), start = ++starts_, stops = stops_.load(),
-                         handler = std::move(handler)] { self->continueStart(start, stops, handler); };
-    writer->startWritingHandler([lane = services_.requestLane, continuation = std::move(continuation)] {
-        if (lane)
-            lane->async(continuation);
-        else
-            continuation();
-    });
+    writer->startWritingHandler(std::move(onLane));
 }
+
+int LCRecordingSession::captureRate() const { return broadcastExtension() ? kBroadcastCaptureRate : kCaptureRate; }
 
 void LCRecordingSession::continueStart(std::uint64_t start, std::uint64_t stops, const Handler& handler) {
     // The outcome of the writer's start is deliberately not looked at: capture begins all the same.
@@ -102,11 +118,11 @@ void LCRecordingSession::_resumeOrStartSession() {
     if (const auto agent = reportingAgent())
         agent->update([&](UsageMetrics& metrics) {
             metrics.videoCaptureSize = windowSize_;
-            metrics.videoCaptureRate = kCaptureRate;
+            metrics.videoCaptureRate = captureRate();
         });
     auto source = screenCaptureController();
     if (!source) {
-        source = services_.platform.displayCapture.makeSource(windowSize_, MediaTime::make(1, kCaptureRate));
+        source = services_.platform.displayCapture.makeSource(windowSize_, MediaTime::make(1, captureRate()));
         screenCaptureController_.set(source);
     }
     source->setDelegate(weak_from_this());
@@ -122,6 +138,7 @@ void LCRecordingSession::pauseSession() {
     paused_ = true;
     log_.line("LCRecordingSession: pauseSession");
     stopAllCapture();
+    if (broadcastExtension()) _notifyExtensionOfAction(ExtensionAction::Pause, [] {});
 }
 
 void LCRecordingSession::resumeSessionWithContextID(ContextID contextID) {
@@ -130,6 +147,7 @@ void LCRecordingSession::resumeSessionWithContextID(ContextID contextID) {
     contextIDs_ = {contextID};
     sessionWasResumed_ = true;
     paused_ = false;
+    if (broadcastExtension()) _notifyExtensionOfAction(ExtensionAction::Resume, [] {});
     if (!startIsPending_) _resumeOrStartSession();
 }
 
@@ -181,7 +199,18 @@ void LCRecordingSession::finishSessionWithStartClipDuration(double startClipDura
     stopRecordingWithNotification(false, std::nullopt);
     lastSampleTimestamp_.set(kInvalidMediaTime);
     sampleTimeOffset_.set(kZeroMediaTime);
-    finishMovie(startClipDuration, endClipDuration, std::move(handler));
+    if (broadcastProcessMode_ == static_cast<std::int64_t>(BroadcastProcessMode::SampleBuffers)) {
+        _notifyExtensionOfAction(ExtensionAction::Finish, [weak = weak_from_this(), handler = std::move(handler)] {
+            handler(std::nullopt, std::nullopt);
+            const auto self = weak.lock();
+            if (!self) return;
+            if (const auto proxy = self->broadcastUploadExtensionProxy()) proxy->invalidateConnection();
+            self->setBroadcastUploadExtensionProxy(nullptr);
+        });
+    } else if (broadcastProcessMode_ == static_cast<std::int64_t>(BroadcastProcessMode::MovieClips)) {
+        finishMovie(startClipDuration, endClipDuration, std::move(handler));
+    }
+    // In any other mode nothing further happens: the handler is deliberately never called.
 }
 
 void LCRecordingSession::finishMovie(double startClipDuration, double endClipDuration, FinishHandler handler) {
@@ -238,12 +267,6 @@ void LCRecordingSession::notifyRecordingMayBeStopped() {
 
 void LCRecordingSession::notifyRecordingResumed() {
     if (const auto writer = movieWriter()) writer->notifyRecordingResumed();
-}
-
-void LCRecordingSession::disableBroadcast() {
-    log_.line("LCRecordingSession: disableBroadcast");
-    broadcastConfiguration_.reset();
-    broadcastProcessMode_ = 0;
 }
 
 std::string LCRecordingSession::_serviceNameForReporting() const {

@@ -13,7 +13,9 @@
 #include "base/Guarded.h"
 #include "base/Identifiers.h"
 #include "broadcast/LCBroadcastConfiguration.h"
+#include "broadcast/LCBroadcastExtensionProxy.h"
 #include "capture/LCCaptureManager.h"
+#include "platform/AppExtension.h"
 #include "platform/Platform.h"
 #include "session/LCClientProtocol.h"
 #include "session/LCRecordingSessionDelegate.h"
@@ -38,6 +40,9 @@ struct SessionServices {
 
 /// How a session's samples leave it.
 enum class BroadcastProcessMode : std::int64_t { MovieClips = 0, SampleBuffers = 1 };
+
+/// What a broadcast extension is told about the recording.
+enum class ExtensionAction : std::int64_t { Start = 1, Pause = 2, Resume = 3, Finish = 4 };
 
 /// One recording session per client application, kept by the manager under its bundle identifier. Held by shared_ptr:
 /// its own work keeps it alive after the registry has let it go.
@@ -79,6 +84,23 @@ public:
     bool hasUserConsentForMicrophone() const { return hasUserConsentForMicrophone_; }
     void setHasUserConsentForMicrophone(bool consent) { hasUserConsentForMicrophone_ = consent; }
     std::optional<URL> broadcastURL() const { return broadcastURL_; }
+    /// The upload extension of the broadcast; null when there is none.
+    std::shared_ptr<AppExtension> broadcastExtension() const { return broadcastExtension_.get(); }
+    void setBroadcastExtension(std::shared_ptr<AppExtension> extension) { broadcastExtension_.set(std::move(extension)); }
+    /// Of the extension, so none without one.
+    std::optional<BundleIdentifier> broadcastExtensionID() const;
+    std::shared_ptr<LCBroadcastExtensionProxy> broadcastUploadExtensionProxy() const {
+        return broadcastUploadExtensionProxy_.get();
+    }
+    void setBroadcastUploadExtensionProxy(std::shared_ptr<LCBroadcastExtensionProxy> proxy) {
+        broadcastUploadExtensionProxy_.set(std::move(proxy));
+    }
+    /// What the application wants the extension to know. Request lane.
+    const Dictionary& broadcastUserInfo() const { return broadcastUserInfo_; }
+    void setBroadcastUserInfo(Dictionary info) { broadcastUserInfo_ = std::move(info); }
+    /// The number of the clip being written.
+    std::int64_t broadcastFragmentIndex() const { return broadcastFragmentIndex_; }
+    void setBroadcastFragmentIndex(std::int64_t index) { broadcastFragmentIndex_ = index; }
     std::optional<LCBroadcastConfiguration> broadcastConfiguration() const { return broadcastConfiguration_; }
     void setBroadcastConfiguration(std::optional<LCBroadcastConfiguration> configuration) {
         broadcastConfiguration_ = std::move(configuration);
@@ -95,6 +117,7 @@ public:
     Size windowSize() const { return windowSize_; }
     Size originalWindowSize() const { return originalWindowSize_; }
     std::shared_ptr<LCMovieWriter> movieWriter() const { return movieWriter_.get(); }
+    void setMovieWriter(std::shared_ptr<LCMovieWriter> writer) { movieWriter_.set(std::move(writer)); }
     std::shared_ptr<DisplayCaptureSource> screenCaptureController() const { return screenCaptureController_.get(); }
     std::shared_ptr<LCReportingAgent> reportingAgent() const { return reportingAgent_.get(); }
     std::optional<Date> captureStartTime() const { return captureStartTime_.get(); }
@@ -138,8 +161,11 @@ public:
     std::uint64_t getRecordedFileSize();
     void notifyRecordingMayBeStopped();
     void notifyRecordingResumed();
-    /// `disableBroadcast`
+    /// `disableBroadcast` — the link to the extension is left as it is.
     void disableBroadcast();
+    /// `_notifyExtensionOfAction:completion:` — the completion is called at once unless samples go to an extension that
+    /// can be told; then when it has taken note, and never when it can't be reached.
+    void _notifyExtensionOfAction(ExtensionAction action, Handler completion);
 
     // Usage reporting.
     std::string _serviceNameForReporting() const;
@@ -177,10 +203,14 @@ private:
     }  // deliberately fixed; kept so that the rule stays general
     void continueStart(std::uint64_t start, std::uint64_t stops, const Handler& handler);
     void _resumeOrStartSession();
+    /// `startWritingHandler:` or the extension's start, then the continuation on the request lane.
+    void startWriter(Size size, Handler continuation);
+    int captureRate() const;
     void finishMovie(double startClipDuration, double endClipDuration, FinishHandler handler);
 
     void updateDuartionWithSample(const SampleRef& sample);
     void _processSampleBuffer(const SampleRef& sample, std::uint32_t transformFlags);
+    void _processSampleBufferForStreaming(const SampleRef& sample, std::uint32_t transformFlags);
     void _updateSampleBufferWithOffset(const SampleRef& sample, const std::function<void(const SampleRef&)>& handler);
     SampleRef _copySampleBufferFromSourceBuffer(const SampleRef& sample, MediaTime updatedTimeStamp);
     void deliver(const SampleRef& sample, std::uint32_t transformFlags, MediaTime originalTime);
@@ -209,6 +239,10 @@ private:
         sampleTimeOffset_{kZeroMediaTime};
     std::atomic<std::int64_t> broadcastProcessMode_{0};
     std::optional<LCBroadcastConfiguration> broadcastConfiguration_;
+    Guarded<std::shared_ptr<AppExtension>> broadcastExtension_;
+    Guarded<std::shared_ptr<LCBroadcastExtensionProxy>> broadcastUploadExtensionProxy_;
+    Dictionary broadcastUserInfo_;
+    std::atomic<std::int64_t> broadcastFragmentIndex_{0};
     std::int64_t chipId_ = 0;
 
     /// At first that of whatever was written before: an application that comes back can discard what it left.

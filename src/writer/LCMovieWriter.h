@@ -30,6 +30,7 @@ public:
 
     /// `initWithWindowSize:outputPath:` — nothing is written to disk yet.
     LCMovieWriter(const Platform& platform, TempStore& tempStore, Size windowSize, std::string outputPath);
+    virtual ~LCMovieWriter() = default;
 
     void setBroadcastConfig(std::optional<LCBroadcastConfiguration> config) { broadcastConfig_ = std::move(config); }
     /// Stored for the owner; the writer itself does not read it.
@@ -60,7 +61,7 @@ public:
 
     /// `appendVideoSampleBuffer:withWindowTransform:` — always true: a frame the writer can't use is dropped and
     /// logged, and a failure shows when the movie is finished.
-    bool appendVideoSampleBuffer(const SampleRef& sample, const AffineTransform& windowTransform);
+    virtual bool appendVideoSampleBuffer(const SampleRef& sample, const AffineTransform& windowTransform);
     /// `appendAudio1SampleBuffer:` — the application's sound.
     void appendAudio1SampleBuffer(const SampleRef& sample);
     /// `appendAudio2SampleBuffer:` — the microphone.

@@ -77,6 +77,8 @@ public:
     void openTwoApplications() override {
         monitor_.setState(kFirst, AppStateMonitor::kRunningForeground);
         monitor_.setState(kSecond, 2);
+        monitor_.setProcess(kFirst, process(kFirst));
+        monitor_.setProcess(kSecond, process(kSecond));
     }
     void bringSecondToFront() override {
         monitor_.setState(kFirst, 2);
@@ -85,7 +87,10 @@ public:
         monitor_.update(AppStateMonitor::kRunningForeground, true, process(kSecond));
     }
     ProcessID process(const BundleIdentifier& identifier) override { return ProcessID{identifier == kFirst ? 11 : 22}; }
-    void stopAnswering() override { faults_.failNext("AppStateMonitor.applicationState", 1000); }
+    void stopAnswering() override {
+        for (const char* call : {"applicationState", "frontmostApplication", "applicationProcess"})
+            faults_.failNext(std::string("AppStateMonitor.") + call, 1000);
+    }
 
 private:
     FaultPlan faults_;
@@ -193,6 +198,16 @@ TEST_P(AppStateMonitorContract, TellsWhichApplicationIsInFront) {
     EXPECT_TRUE(becomes([&] { return isBehind(monitor_, kFirst); }));
 }
 
+TEST_P(AppStateMonitorContract, NamesTheApplicationInFrontAndTheProcessesOfBoth) {
+    world_->openTwoApplications();
+    EXPECT_TRUE(becomes([&] { return monitor_.frontmostApplication() == kFirst; }));
+    EXPECT_EQ(monitor_.applicationProcess(kFirst), world_->process(kFirst));
+    EXPECT_EQ(monitor_.applicationProcess(kSecond), world_->process(kSecond));
+    EXPECT_EQ(monitor_.applicationProcess(kUnknown), std::nullopt);
+    world_->bringSecondToFront();
+    EXPECT_TRUE(becomes([&] { return monitor_.frontmostApplication() == kSecond; }));
+}
+
 TEST_P(AppStateMonitorContract, TellsTheHandlerOnTheMainQueueWhenAnotherApplicationComesToFront) {
     world_->openTwoApplications();
     const auto updates = listen();
@@ -222,6 +237,8 @@ TEST_P(AppStateMonitorContract, AnswersZeroInTimeWhenTheDesktopHangs) {
     world_->stopAnswering();
     const auto began = std::chrono::steady_clock::now();
     for (int question = 0; question < 5; ++question) EXPECT_EQ(monitor_.applicationState(kFirst), 0u);
+    EXPECT_EQ(monitor_.frontmostApplication(), std::nullopt);
+    EXPECT_EQ(monitor_.applicationProcess(kFirst), std::nullopt);
     EXPECT_LT(std::chrono::steady_clock::now() - began, 2s);
 }
 

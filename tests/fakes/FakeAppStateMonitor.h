@@ -8,8 +8,8 @@
 
 namespace lumacast {
 
-/// Applications in the states that the test sets. A failing call ("AppStateMonitor.applicationState") answers 0, like a
-/// desktop that does not answer in time. Thread-safe; outlives its updates.
+/// Applications in the states that the test sets. A failing call ("AppStateMonitor.applicationState") answers 0, or none, like
+/// a desktop that does not answer in time. Thread-safe; outlives its updates.
 class FakeAppStateMonitor final : public AppStateMonitor {
 public:
     FakeAppStateMonitor(Scheduler& scheduler, FaultPlan& faults) : scheduler_(scheduler), faults_(faults) {}
@@ -19,6 +19,19 @@ public:
         const std::lock_guard lock(mutex_);
         const auto found = states_.find(identifier);
         return found == states_.end() ? 0 : found->second;
+    }
+    std::optional<BundleIdentifier> frontmostApplication() override {
+        if (faults_.fails("AppStateMonitor.frontmostApplication")) return std::nullopt;
+        const std::lock_guard lock(mutex_);
+        for (const auto& [identifier, state] : states_)
+            if (state & kRunningForeground) return identifier;
+        return std::nullopt;
+    }
+    std::optional<ProcessID> applicationProcess(const BundleIdentifier& identifier) override {
+        if (faults_.fails("AppStateMonitor.applicationProcess")) return std::nullopt;
+        const std::lock_guard lock(mutex_);
+        const auto found = processes_.find(identifier);
+        return found == processes_.end() ? std::nullopt : std::optional(found->second);
     }
     void setHandler(Handler handler) override {
         // Swapped, so that the old handler is released outside of the lock.
@@ -33,6 +46,10 @@ public:
     void setState(const BundleIdentifier& identifier, std::uint32_t state) {
         const std::lock_guard lock(mutex_);
         states_.insert_or_assign(identifier, state);
+    }
+    void setProcess(const BundleIdentifier& identifier, ProcessID process) {
+        const std::lock_guard lock(mutex_);
+        processes_.insert_or_assign(identifier, process);
     }
     /// Tells whoever is the handler when the update arrives on the main queue.
     void update(std::int64_t state, bool frontmost, ProcessID pid) {
@@ -51,6 +68,7 @@ private:
     FaultPlan& faults_;
     mutable std::mutex mutex_;
     std::map<BundleIdentifier, std::uint32_t> states_;
+    std::map<BundleIdentifier, ProcessID> processes_;
     Handler handler_;
 };
 

@@ -338,6 +338,39 @@ TEST(InterruptionTest, AnIdleSessionStaysSilent) {
     EXPECT_TRUE(of.editor.told.empty());
 }
 
+/// A session that notes how another one looked when it was asked to finish.
+class WatchingSession final : public LCRecordingSession {
+public:
+    using LCRecordingSession::LCRecordingSession;
+    void finishSessionWithStartClipDuration(double, double, FinishHandler) override {
+        wasRecording = watched->isRecording();
+        wasBroadcasting = watched->isBroadcasting();
+        hadWriter = watched->movieWriter() != nullptr;
+    }
+    const LCRecordingSession* watched = nullptr;
+    std::optional<bool> wasRecording, wasBroadcasting, hadWriter;
+};
+
+TEST(InterruptionTest, TheOthersAreInterruptedWhenTheSessionCountsAsRecordingButHasNotBegun) {
+    Interruption of([](const SessionServices& services, const BundleIdentifier& id) {
+        std::shared_ptr<LCRecordingSession> session;
+        if (id.text() == "org.example.Editor")
+            session = std::make_shared<WatchingSession>(services, id);
+        else
+            session = std::make_shared<LCRecordingSession>(services, id);
+        return session;
+    });
+    const auto other =
+        std::static_pointer_cast<WatchingSession>(of.process.manager().registeredSession(of.editor.id));
+    const auto starting = of.process.manager().registeredSession(of.player.id);
+    other->watched = starting.get();
+    starting->setIsBroadcasting(true);  // of an earlier recording
+    of.start();
+    EXPECT_EQ(other->wasRecording, true);
+    EXPECT_EQ(other->wasBroadcasting, false) << "it has the request's flag by then";
+    EXPECT_EQ(other->hadWriter, false);
+}
+
 TEST(AlertQueueTest, IsMadeOnceHoweverOftenItIsAskedFor) {
     SimWorld world(1);
     Process process(world.fakes.platform());

@@ -37,6 +37,31 @@ TEST_F(Stop, AStopIsAnsweredWithTheMovieAndThenTheStateIsReset) {
     EXPECT_EQ(logged("LCRecordingManager:resetStatesForSession:"), 1u);
 }
 
+/// An extension whose link takes every payload at once.
+class Uploader final : public AppExtension, public LCBroadcastExtensionProxy {
+public:
+    BundleIdentifier identifier() const override { return BundleIdentifier("org.example.Uploader.upload"); }
+    void processPayload(Dictionary, std::function<void()> completion) override { completion(); }
+    void invalidateConnection() override { ++invalidations; }
+    int invalidations = 0;
+};
+
+TEST_F(Stop, ABroadcastThatNobodyWaitsForIsFinishedNotThrownAway) {
+    const auto client = makeRecording();
+    const auto uploader = std::make_shared<Uploader>();
+    const auto kept = session(*client);
+    kept->setBroadcastExtension(uploader);
+    kept->setBroadcastUploadExtensionProxy(uploader);
+    kept->setBroadcastProcessMode(1);
+    client->die();
+    settle();
+    EXPECT_EQ(logged("recording stopped without handler!"), 0u);
+    EXPECT_EQ(logged("LCRecordingSession: finishSessionWithHandler"), 1u);
+    EXPECT_EQ(logged("LCRecordingManager:resetStatesForSession:"), 1u);
+    EXPECT_EQ(uploader->invalidations, 1);
+    EXPECT_EQ(fakes_.keepAlive.open(), 0);
+}
+
 TEST_F(Stop, AStopOfAnIdleSessionIsNeverAnswered) {
     const auto client = makeConnected();
     fakes_.logSink.clear();

@@ -60,6 +60,18 @@ TEST_F(SessionFiles, TheSizeOfABroadcastOrACaptureIsZeroWithoutALook) {
     }
 }
 
+TEST_F(SessionFiles, ACleanUpOfASystemRecordingLooksForTheSecondOfTheCallAndLeavesItsFile) {
+    session_->setSystemRecording(true);
+    start();
+    const std::string written = session_->movieWriter()->outputPath();
+    advance(seconds(5));
+    fakes_.logSink.clear();
+    EXPECT_EQ(cleanUp(), 1);
+    EXPECT_TRUE(fakes_.fileSystem.exists(written));
+    EXPECT_EQ(logged("error getting recordedFileSize :2"), 1u);
+    EXPECT_EQ(metric(events().at(0), "RecordedFileSize"), Value(std::uint64_t{0}));
+}
+
 class SessionReports : public SessionWorld {};
 
 TEST_F(SessionReports, TheServiceIsNamedBySystemThenBroadcastThenCapture) {

@@ -28,6 +28,12 @@ TEST(FrameGeometry, HigherBitsCarryNoMeaning) {
     EXPECT_EQ(frameTransformFromFlags(log, 0xFFFFFFF8 | 5), frameTransformFromFlags(log, 5));
 }
 
+TEST(FrameGeometry, EachOfTheEightFlagsHasItsOrientationAndAnyOtherValueIsUpright) {
+    const std::uint32_t expected[8] = {1, 4, 2, 3, 8, 5, 7, 6};
+    for (std::uint32_t flags = 0; flags < 8; ++flags) EXPECT_EQ(orientationFromFrameTransform(flags), expected[flags]);
+    for (const std::uint32_t flags : {8u, 9u, 13u, 0xFFFFFFFFu}) EXPECT_EQ(orientationFromFrameTransform(flags), 1u);
+}
+
 TEST(FrameGeometry, EveryStepIsLoggedInItsOrder) {
     Log log;
     frameTransformFromFlags(log, 7);

@@ -220,6 +220,64 @@ TEST_F(FramePipeline, ADeadSessionDropsFramesSilentlyAndReleasesTheLock) {
     EXPECT_EQ(ticks(), Ticks{1000});
 }
 
+TEST_F(FramePipeline, ThePauseIsCutInRawTicksOfTheFramesOwnTimescale) {
+    startQuietly();
+    deliver(1000);
+    deliver(1010);
+    interruption();
+    // 3000 / 100 is 30 seconds, not 5: only the ticks count, and the last frame's timescale.
+    const auto inTicks = [&](std::int64_t value) {
+        auto plane = std::make_shared<FakePlane>(640, 360, 1, std::vector<PixelRect>{});
+        const auto sample = SampleBuffer::makeVideo(PixelBuffer(std::move(plane)), MediaTime::make(value, 100),
+                                                    MediaTime::make(10, 100));
+        session_->screenCaptureControllerDidReceiveSampleBuffer(*source(), sample, 0);
+    };
+    inTicks(3000);
+    inTicks(3020);
+    EXPECT_EQ(ticks(), (Ticks{1000, 1010, 1030}));
+    EXPECT_EQ(recording().movie().tracks[0].samples.back()->presentationTime().timescale, 100);
+    EXPECT_DOUBLE_EQ(delegate_->durations.back(), (3020.0 - 1000.0) / 100.0);
+}
+
+TEST_F(FramePipeline, AFrameOfAPauseSetsTheFirstTimeBeforeItIsDropped) {
+    startQuietly();
+    pause();
+    const auto lane = fakes_.scheduler.serialQueue("other frame lane");
+    for (const std::int64_t value : {600, 1200}) lane->async([this, value] { deliver(value); });
+    settle();  // the second frame is counted before it waits for the lock that the first one keeps
+    EXPECT_EQ(logged(kDiscarded), 1u);
+    EXPECT_EQ(delegate_->durations, (std::vector<double>{0, 1}));
+}
+
+TEST_F(FramePipeline, ADiscardedRecordingLeavesItsPausesToTheNext) {
+    startQuietly();
+    for (const std::int64_t value : {1000, 1010}) deliver(value);
+    interruption();
+    for (const std::int64_t value : {2000, 2010}) deliver(value);
+    cleanUp();
+    startQuietly();
+    for (const std::int64_t value : {5000, 5010}) deliver(value);
+    EXPECT_EQ(ticks(), (Ticks{5000 - 990, 5010 - 990})) << "only a finish forgets them";
+}
+
+/// A writer that takes nothing.
+class RefusingWriter final : public LCMovieWriter {
+public:
+    using LCMovieWriter::LCMovieWriter;
+    bool appendVideoSampleBuffer(const SampleRef&, const AffineTransform&) override { return false; }
+};
+
+TEST_F(FramePipeline, AWriterThatRefusesAFrameStopsTheRecordingAsNotSaved) {
+    startQuietly();
+    session_->setMovieWriter(
+        std::make_shared<RefusingWriter>(fakes_.platform(), tempStore_, Size{640, 360}, session_->outputPath()));
+    deliver(1000);
+    EXPECT_EQ(logged("LCRecordingSession: failed to start writer when appending video sample"), 1u);
+    EXPECT_EQ(delegate_->stops, std::vector<std::int64_t>{-5812});
+    EXPECT_FALSE(session_->isRecording());
+    EXPECT_FALSE(source()->isRunning());
+}
+
 TEST_F(FramePipeline, AFailedAppendStopsTheRecordingAsNotSaved) {
     // A session that was never started has no writer to append to.
     session_->setRecording(true);

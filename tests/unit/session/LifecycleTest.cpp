@@ -333,6 +333,23 @@ TEST_F(SessionLifecycle, AfterAResetOfTheMediaServicesNoPictureIsEverDeliveredAg
     EXPECT_EQ(answer.error->code(), -5812);
 }
 
+TEST_F(SessionLifecycle, NeitherItsDelegateNorAFinishUnderWayIsHeld) {
+    const auto delegate = std::make_shared<RecordingDelegate>();
+    session_->setDelegate(delegate);
+    EXPECT_EQ(delegate.use_count(), 1);
+    start();
+    recording().holdFinish(true);
+    onRequestLane([&] { session_->finishSessionWithHandler([](std::optional<URL>, std::optional<Error>) {}); });
+    settle();
+    const std::weak_ptr<LCRecordingSession> session = session_;
+    session_.reset();
+    settle();
+    EXPECT_TRUE(session.expired());
+    recording().holdFinish(false);
+    settle();
+    EXPECT_EQ(logged("LCRecordingSession: finishWritingWithHandler"), 0u);
+}
+
 TEST_F(SessionLifecycle, AStopBeforeTheWriterIsReadyKeepsTheSourceFromStarting) {
     onRequestLane([&] {
         session_->setRecording(true);

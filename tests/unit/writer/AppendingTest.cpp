@@ -53,6 +53,30 @@ TEST_F(MovieWriterAppending, AnInvalidTimeStartsNoSessionAndDoesNotCountAsTheFir
     EXPECT_TRUE(ticks(0).empty());
 }
 
+TEST_F(MovieWriterAppending, AFirstPictureWithoutATimeLeavesTheRecordingEmpty) {
+    writer_->appendVideoSampleBuffer(picture(kInvalidMediaTime), {});
+    EXPECT_EQ(logged(kCannotStart), 0u);
+    append(110);
+    append(120);
+    EXPECT_EQ(logged(kCannotStart), 2u) << "the writer was started by the first picture, and starts only once";
+    EXPECT_TRUE(ticks(0).empty());
+    EXPECT_FALSE(writer_->didProcessFirstSample());
+}
+
+TEST_F(MovieWriterAppending, APictureAfterTheFinishBeganStillReachesTheContainerWriter) {
+    append(100);
+    append(110);
+    recording().holdFinish(true);
+    writer_->finishWritingWithHandler([](std::optional<URL>) {});
+    settle();
+    fakes_.logSink.clear();
+    append(120);
+    EXPECT_EQ(logged("appending video sample") + logged(kCannotStart), 1u) << "the writer itself does not look";
+    recording().holdFinish(false);
+    settle();
+    EXPECT_EQ(ticks(0), (Ticks{100, 110})) << "the container writer refuses it";
+}
+
 TEST_F(MovieWriterAppending, APictureWithTheTimeOfTheOneBeforeIsDiscarded) {
     append(100);
     append(110);
@@ -179,13 +203,14 @@ public:
     struct Input final : TrackInput {
         explicit Input(std::vector<std::int64_t>& theAppended) : appended(theAppended) {}
         void setExpectsMediaInRealTime(bool realTime) override { isRealTime = realTime; }
-        void setTransform(const AffineTransform&) override {}
+        void setTransform(const AffineTransform& transform) override { transforms.push_back(transform); }
         bool isReadyForMoreMediaData() const override { return ready; }
         bool append(const SampleRef& sample) override {
             appended.push_back(sample->presentationTime().value);
             return true;
         }
         std::vector<std::int64_t>& appended;
+        std::vector<AffineTransform> transforms;
         bool ready = false;
         bool isRealTime = false;
     };
@@ -235,6 +260,20 @@ TEST_F(MovieWriterWithUnreadyTracks, EveryTrackExpectsMediaInRealTimeInAnMpeg4Mo
     ASSERT_EQ(writers_.inputs.size(), 3u);
     for (const auto& input : writers_.inputs) EXPECT_TRUE(input->isRealTime);
     EXPECT_TRUE(writers_.isMpeg4);
+}
+
+TEST_F(MovieWriterWithUnreadyTracks, EveryPictureOfTheStartPathSetsTheTransformAndNoLaterOne) {
+    const AffineTransform turned{0, 1, -1, 0, 0, 0}, mirrored{-1, 0, 0, 1, 0, 0};
+    writer_->setupAssetWriter();
+    writer_->appendVideoSampleBuffer(picture(100), turned);
+    writer_->appendVideoSampleBuffer(picture(110), mirrored);
+    EXPECT_EQ(writers_.inputs[0]->transforms, (std::vector<AffineTransform>{turned, mirrored}));
+    const auto other = std::make_shared<LCMovieWriter>(platform_, tempStore_, Size{640, 360}, path_);
+    other->setupAssetWriter();
+    writers_.inputs[3]->ready = true;
+    other->appendVideoSampleBuffer(picture(100), turned);
+    other->appendVideoSampleBuffer(picture(110), mirrored);
+    EXPECT_EQ(writers_.inputs[3]->transforms, std::vector<AffineTransform>{turned});
 }
 
 TEST_F(MovieWriterWithUnreadyTracks, AFirstPictureThatFindsNoRoomLeavesTheRecordingEmpty) {

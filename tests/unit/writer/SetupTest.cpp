@@ -38,6 +38,19 @@ TEST_F(MovieWriterSetup, AStartRemovesAStaleFileSetsUpAndThenAnswers) {
                                                                  "bit rate set to 3000000"}));
 }
 
+TEST_F(MovieWriterSetup, AStartSetsUpOnTheStoresQueueTheSynchronousFormOnTheWritersOwn) {
+    const auto writer = makeWriter();
+    std::vector<bool> onOwnQueue;
+    fakes_.containerWriters.setWhenMade([&] { onOwnQueue.push_back(writer->movieWriterQueue().isCurrent()); });
+    bool handlerOnOwnQueue = true;
+    writer->startWritingHandler([&] { handlerOnOwnQueue = writer->movieWriterQueue().isCurrent(); });
+    settle();
+    EXPECT_FALSE(handlerOnOwnQueue);
+    fakes_.fileSystem.remove(path_);
+    writer->setupAssetWriter();
+    EXPECT_EQ(onOwnQueue, (std::vector<bool>{false, true}));
+}
+
 TEST_F(MovieWriterSetup, AStartThatComesLateLeavesTheFileOfALaterWriterAlone) {
     const auto older = makeWriter(), later = makeWriter();
     older->setPathClaim(tempStore_.claimPath(path_));
