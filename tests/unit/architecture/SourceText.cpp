@@ -1,9 +1,11 @@
 #include "tests/unit/architecture/SourceText.h"
 
+#include <algorithm>
 #include <cctype>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <optional>
 #include <sstream>
 
 namespace lumacast::architecture {
@@ -70,6 +72,34 @@ std::string codeOf(std::string_view text) {
         if (c != '\n' && in != In::Code) code[at] = ' ';
     }
     return code;
+}
+
+std::vector<std::string> textsOf(std::string_view text) {
+    // Blanks stand for a comment and for what a literal holds; its quotes stay, so that both can be told apart.
+    const std::string code = codeOf(text);
+    std::vector<std::string> texts;
+    std::optional<std::string> joined;
+    const auto finish = [&] {
+        if (joined && !joined->empty() && std::find(texts.begin(), texts.end(), *joined) == texts.end())
+            texts.push_back(*joined);
+        joined.reset();
+    };
+    std::size_t lineStart = 0;
+    for (std::size_t at = 0; at < code.size(); ++at) {
+        if (code[at] == '\n') lineStart = at + 1;
+        const bool isDirective = code.find_first_not_of(" \t", lineStart) < at &&
+                                 code[code.find_first_not_of(" \t", lineStart)] == '#';
+        if (code[at] != '"' || isDirective) {
+            if (!std::isspace(static_cast<unsigned char>(code[at]))) finish();
+            continue;
+        }
+        std::size_t end = at + 1;
+        while (end < text.size() && text[end] != '"') end += text[end] == '\\' ? 2 : 1;
+        joined = joined.value_or("") + std::string(text.substr(at + 1, end - at - 1));
+        at = end;
+    }
+    finish();
+    return texts;
 }
 
 bool usesName(std::string_view code, std::string_view word) {

@@ -28,6 +28,10 @@ std::vector<Include> includesOf(std::string_view text);
 /// The text with comments and string literals as blanks, so that a word in them is not taken for code.
 std::string codeOf(std::string_view text);
 
+/// The string literals of the code, as they stand in the source, neighbours joined; no names of #includes, each text
+/// once, in the order of its first use.
+std::vector<std::string> textsOf(std::string_view text);
+
 /// Whether `word` stands in `code` as a name of its own ("std::thread" is not in "std::thread_id").
 bool usesName(std::string_view code, std::string_view word);
 

@@ -179,7 +179,10 @@ TEST_F(ExtensionActions, InAnUnknownModeTheFirstFrameStopsTheRecordingAndAFinish
     EXPECT_EQ(logged("LCRecordingSession: failed to start writer when appending video sample"), 1u);
     fakes_.displayCapture.setPlanes(0);
     start();
+    session_->setMovieWriter(
+        std::make_shared<LCMovieWriter>(fakes_.platform(), tempStore_, Size{640, 360}, session_->outputPath()));
     EXPECT_EQ(finish().count, 0);
+    EXPECT_EQ(logged("LCRecordingSession: finishWritingWithHandler"), 0u);
     EXPECT_TRUE(link_->payloads.empty());
 }
 
