@@ -32,6 +32,7 @@ void SimulatedApplication::startAgain(ProcessID pid) {
 }
 
 void SimulatedApplication::connect() {
+    firstOfConnection_ = asked_.size();
     inbox_ = std::make_shared<Inbox>(told_);
     connection_ = process_->connectToService("com.orvane.lumacastd");
     connection_->setExportedInterface(clientProtocol());
@@ -63,11 +64,13 @@ void SimulatedApplication::tell(DaemonMessage message, Array arguments) {
     connection_->remoteProxy([](const Error&) {})->send(static_cast<std::uint16_t>(message), std::move(arguments));
 }
 
-std::shared_ptr<SimulatedApplication::Asked> SimulatedApplication::start(const std::vector<ContextID>& windows) {
+std::shared_ptr<SimulatedApplication::Asked> SimulatedApplication::start(const std::vector<ContextID>& windows,
+                                                                          const Wishes& wishes) {
     Array ids;
     for (const ContextID id : windows) ids.emplace_back(number(id));
     return ask(DaemonMessage::StartRecording,
-               {std::move(ids), Array{640.0, 360.0}, false, false, false, false, false, Value()});
+               {std::move(ids), Array{wishes.width, 360.0}, wishes.microphone, wishes.camera, wishes.broadcast,
+                wishes.system, wishes.capture, Value()});
 }
 
 }  // namespace lumacast

@@ -46,14 +46,21 @@ public:
     std::shared_ptr<Asked> ask(DaemonMessage message, Array arguments = {});
     void tell(DaemonMessage message, Array arguments = {});
 
-    std::shared_ptr<Asked> start(const std::vector<ContextID>& windows);
-    std::shared_ptr<Asked> start() { return start({window}); }
+    /// What a start asks for beside its windows.
+    struct Wishes {
+        double width = 640;
+        bool microphone = false, camera = false, broadcast = false, system = false, capture = false;
+    };
+    std::shared_ptr<Asked> start(const std::vector<ContextID>& windows, const Wishes& wishes);
+    std::shared_ptr<Asked> start() { return start({window}, {}); }
 
     const BundleIdentifier identifier;
     const std::string name;
     const ContextID window;
 
     const std::vector<std::shared_ptr<Asked>>& asked() const { return asked_; }
+    /// The first of them that was asked over the connection there is now.
+    std::size_t firstOfConnection() const { return firstOfConnection_; }
     const std::vector<Told>& told() const { return *told_; }
     int losses() const { return *losses_; }
 
@@ -66,6 +73,7 @@ private:
     std::shared_ptr<IpcConnection> connection_;
     std::shared_ptr<Inbox> inbox_;
     std::vector<std::shared_ptr<Asked>> asked_;
+    std::size_t firstOfConnection_ = 0;
     std::shared_ptr<std::vector<Told>> told_ = std::make_shared<std::vector<Told>>();
     std::shared_ptr<int> losses_ = std::make_shared<int>(0);
 };
