@@ -61,12 +61,23 @@ std::shared_ptr<const InstalledApplications> BundleLibrary::snapshot() const {
 std::shared_ptr<const InstalledApplications> BundleLibrary::current() {
     const std::lock_guard reading(reading_);
     auto applications = snapshot();
-    if (!applications->isOutdated()) return applications;
+    const auto now = std::chrono::steady_clock::now();
+    if (!applications->isOutdated()) {
+        const std::lock_guard lock(mutex_);
+        lookedAt_ = now;
+        return applications;
+    }
     applications =
         std::make_shared<const InstalledApplications>(InstalledApplications::read(directories_, searchPath_));
     const std::lock_guard lock(mutex_);
     applications_ = applications;
+    lookedAt_ = now;
     return applications;
+}
+
+bool BundleLibrary::isFresh(std::chrono::steady_clock::duration freshness) const {
+    const std::lock_guard lock(mutex_);
+    return freshness.count() > 0 && std::chrono::steady_clock::now() - lookedAt_ <= freshness;
 }
 
 std::optional<std::string> BundleLibrary::pathForProgram(const std::string& program) {
@@ -103,11 +114,15 @@ std::shared_ptr<const Bundle> BundleLibrary::open(const std::string& path) {
         const auto found = bundles_.find(path);
         if (found != bundles_.end()) sources = found->second.sources;
     }
+    const auto now = std::chrono::steady_clock::now();
     std::string stamp = stampOf(sources);
     {
         const std::lock_guard lock(mutex_);
         const auto found = bundles_.find(path);
-        if (found != bundles_.end() && found->second.stamp == stamp) return found->second.bundle;
+        if (found != bundles_.end() && found->second.stamp == stamp) {
+            found->second.lookedAt = now;
+            return found->second.bundle;
+        }
     }
     OpenedBundle opened = path.ends_with(kEntry) ? openDesktopEntry(path, identifierOfEntry(path), locales_)
                                                  : openFolder(path, locales_);
@@ -119,7 +134,7 @@ std::shared_ptr<const Bundle> BundleLibrary::open(const std::string& path) {
         bundles_.erase(path);
         return nullptr;
     }
-    keep(bundles_, path, Kept{std::move(opened.sources), steady ? stamp : "", opened.bundle});
+    keep(bundles_, path, Kept{std::move(opened.sources), steady ? stamp : "", opened.bundle, now});
     if (const auto identifier = opened.bundle->identifier(); identifier && !path.ends_with(kEntry))
         keep(folders_, identifier->text(), path);
     return opened.bundle;
@@ -141,6 +156,14 @@ std::shared_ptr<const Bundle> BundleLibrary::known(const std::string& path) cons
     const std::lock_guard lock(mutex_);
     const auto found = bundles_.find(path);
     return found == bundles_.end() ? nullptr : found->second.bundle;
+}
+
+std::shared_ptr<const Bundle> BundleLibrary::known(const std::string& path,
+                                                   std::chrono::steady_clock::duration freshness) const {
+    const std::lock_guard lock(mutex_);
+    const auto found = bundles_.find(path);
+    if (found == bundles_.end() || freshness.count() <= 0) return nullptr;
+    return std::chrono::steady_clock::now() - found->second.lookedAt <= freshness ? found->second.bundle : nullptr;
 }
 
 std::string BundleLibrary::identifierOfEntry(const std::string& path) const {

@@ -1,4 +1,5 @@
 #pragma once
+#include <chrono>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -28,12 +29,17 @@ public:
     std::optional<std::string> knownPathForProgram(const std::string& program) const;
     std::optional<std::string> knownPathForIdentifier(const std::string& identifier) const;
     std::shared_ptr<const Bundle> known(const std::string& path) const;
+    /// The same only where the disk was looked at no longer ago than that.
+    std::shared_ptr<const Bundle> known(const std::string& path, std::chrono::steady_clock::duration freshness) const;
+    /// Whether the directories were looked at no longer ago than that.
+    bool isFresh(std::chrono::steady_clock::duration freshness) const;
 
 private:
     struct Kept {
         std::vector<std::string> sources;  ///< what the bundle was made from
         std::string stamp;                 ///< theirs when it was; empty when they changed meanwhile
         std::shared_ptr<const Bundle> bundle;
+        std::chrono::steady_clock::time_point lookedAt;
     };
     std::shared_ptr<const InstalledApplications> current();
     std::shared_ptr<const InstalledApplications> snapshot() const;
@@ -46,6 +52,7 @@ private:
     std::mutex reading_;  ///< one look at the directories at a time; held while the disk is asked, by its threads only
     mutable std::mutex mutex_;
     std::shared_ptr<const InstalledApplications> applications_;
+    std::chrono::steady_clock::time_point lookedAt_;  ///< when they were last found to be up to date
     std::map<std::string, std::string> folders_;  ///< application folders met by their program: identifier, path
     std::map<std::string, std::string> programs_;  ///< programs met in them: program, path
     std::map<std::string, Kept> bundles_;

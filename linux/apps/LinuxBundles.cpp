@@ -1,6 +1,7 @@
 #include "linux/apps/LinuxBundles.h"
 
 #include "linux/apps/BundleLibrary.h"
+#include "linux/apps/KnownProcesses.h"
 #include "linux/apps/ProcessImage.h"
 
 namespace lumacast {
@@ -20,13 +21,15 @@ LinuxBundles::Options LinuxBundles::optionsFrom(const LinuxEnvironment& environm
     options.searchPath = environment.searchPath;
     options.frameworkBundlePath = environment.resourceBundle;
     options.locales = userLocales(environment.languageList, environment.messageLocale);
+    options.freshness = std::chrono::seconds(1);
     return options;
 }
 
 LinuxBundles::LinuxBundles(Options options)
     : options_(std::move(options)),
       library_(
-          std::make_shared<BundleLibrary>(options_.applicationDirectories, options_.searchPath, options_.locales)) {
+          std::make_shared<BundleLibrary>(options_.applicationDirectories, options_.searchPath, options_.locales)),
+      processes_(std::make_shared<KnownProcesses>()) {
     for (const Locale& locale : options_.locales) languages_.push_back(languageTag(locale));
     if (languages_.empty()) languages_.push_back("en");
     const auto framework = library_->open(options_.frameworkBundlePath);
@@ -45,11 +48,21 @@ std::optional<T> LinuxBundles::ask(std::function<T(BundleLibrary&)> question) {
 }
 
 std::optional<std::string> LinuxBundles::executablePath(ProcessID pid) {
-    const auto image = ask<std::optional<ProcessImage>>([pid](BundleLibrary&) { return processImage(pid); });
-    return image && *image ? std::optional((*image)->path) : std::nullopt;
+    if (auto path = processes_->path(pid, options_.freshness)) return path;
+    const auto answer = ask<std::optional<std::string>>(
+        [pid, processes = processes_](BundleLibrary&) -> std::optional<std::string> {
+            FileDescriptor process = openProcess(pid);
+            const auto image = processImage(process);
+            if (!image) return std::nullopt;
+            processes->keep(pid, std::move(process), *image);
+            return image->path;
+        });
+    return answer ? *answer : std::nullopt;
 }
 
 std::optional<std::string> LinuxBundles::bundlePathForExecutable(const std::string& path) {
+    if (library_->isFresh(options_.freshness))
+        if (auto known = library_->knownPathForProgram(path)) return known;
     const auto answer =
         ask<std::optional<std::string>>([path](BundleLibrary& library) { return library.pathForProgram(path); });
     return answer ? *answer : library_->knownPathForProgram(path);
@@ -58,6 +71,7 @@ std::optional<std::string> LinuxBundles::bundlePathForExecutable(const std::stri
 std::shared_ptr<const Bundle> LinuxBundles::open(const std::string& path) {
     const std::string place = withoutTrailingSlashes(path);
     if (!place.starts_with('/')) return nullptr;
+    if (auto known = library_->known(place, options_.freshness)) return known;
     const auto answer =
         ask<std::shared_ptr<const Bundle>>([place](BundleLibrary& library) { return library.open(place); });
     return answer ? *answer : library_->known(place);

@@ -12,11 +12,13 @@
 namespace lumacast {
 
 class BundleLibrary;
+class KnownProcesses;
 
 /// Applications by their desktop entries (the id is the bundle identifier; the bundle's path is the entry's) and by
 /// application folders with a manifest (the bundle's path is the folder's), and the client framework's resources. What
 /// was read is kept until a directory changes; a disk that does not answer within the patience leaves what was known
-/// before. Callable from any lane.
+/// before. Within the freshness what was found is answered from memory, as long as the process runs the same program.
+/// Callable from any lane.
 ///
 /// A script has no identity of its own: its process runs an interpreter, and who only names a script proves nothing.
 class LinuxBundles final : public Bundles {
@@ -27,6 +29,7 @@ public:
         std::string frameworkBundlePath;
         std::vector<Locale> locales;  ///< the user's, see userLocales
         std::chrono::milliseconds patience{100};
+        std::chrono::milliseconds freshness{0};  ///< how long a look at the disk counts; what was not found never does
         std::function<void()> beforeEachQuestion;  ///< tests put a slow disk here; runs on the disk's thread
     };
     static Options optionsFrom(const LinuxEnvironment& environment);
@@ -49,6 +52,7 @@ private:
     const Options options_;
     std::vector<std::string> languages_;
     const std::shared_ptr<BundleLibrary> library_;  ///< shared with questions the disk has not answered yet
+    const std::shared_ptr<KnownProcesses> processes_;
     DiskLane disk_;
 };
 

@@ -5,6 +5,7 @@
 #include <string>
 
 #include "base/Identifiers.h"
+#include "linux/system/FileDescriptor.h"
 
 namespace lumacast {
 
@@ -20,5 +21,9 @@ struct ProcessImage {
 /// 4096 bytes or not UTF-8, whose image never had a path, or that lives in a mount namespace where the path names
 /// another file than it does here. Callable from any lane; waits for the disk that holds the program.
 std::optional<ProcessImage> processImage(ProcessID pid);
+
+/// The same in two steps: a handle on the process's folder in /proc, good for that process alone; and its image.
+FileDescriptor openProcess(ProcessID pid);
+std::optional<ProcessImage> processImage(const FileDescriptor& process);
 
 }  // namespace lumacast

@@ -175,6 +175,77 @@ TEST(LinuxBundles, AHungDiskLeavesWhatWasKnown) {
     *hung = false;
 }
 
+TEST(LinuxBundles, WhatWasLookedUpLatelyIsAnsweredWithoutTheDisk) {
+    Disk disk;
+    const std::string program = disk.installProgram("bin/player");
+    disk.installEntry("system/applications/org.example.Player.desktop", "Name=Player\nExec=player\n");
+    const auto questions = std::make_shared<std::atomic<int>>(0);
+    disk.options.beforeEachQuestion = [questions] { ++*questions; };
+    disk.options.freshness = std::chrono::hours(1);
+    const RunningProgram running(program);
+    EXPECT_EQ(disk.bundles().executablePath(running.pid()), program);
+    EXPECT_EQ(disk.identifierOf(program), kPlayer);
+    const int asked = *questions;
+    EXPECT_GE(asked, 3);
+    for (int i = 0; i < 10; ++i) {
+        EXPECT_EQ(disk.bundles().executablePath(running.pid()), program);
+        EXPECT_EQ(disk.identifierOf(program), kPlayer);
+    }
+    EXPECT_EQ(*questions, asked);
+    EXPECT_EQ(disk.identifierOf(disk.installProgram("bin/other")), std::nullopt);
+    EXPECT_GT(*questions, asked) << "what is not known is looked up";
+}
+
+TEST(LinuxBundles, AProcessThatHasEndedIsForgottenAtOnce) {
+    Disk disk;
+    const std::string program = disk.installProgram("bin/player");
+    disk.options.freshness = std::chrono::hours(1);
+    std::optional<RunningProgram> running(program);
+    const ProcessID pid = running->pid();
+    EXPECT_EQ(disk.bundles().executablePath(pid), program);
+    running.reset();
+    EXPECT_EQ(disk.bundles().executablePath(pid), std::nullopt);
+}
+
+TEST(LinuxBundles, AProcessThatRunsAnotherProgramIsLookedUpAnew) {
+    Disk disk;
+    const std::string first = disk.installProgram("bin/first"), second = disk.installProgram("bin/second");
+    disk.options.freshness = std::chrono::hours(1);
+    int go[2];
+    ASSERT_EQ(::pipe(go), 0);
+    // The same program in two files would be one by its contents, not by its file.
+    const pid_t pid = ::fork();
+    if (pid == 0) {
+        char byte = 0;
+        if (::read(go[0], &byte, 1) != 1) ::_exit(1);
+        ::execl(second.c_str(), second.c_str(), "1000", nullptr);
+        ::_exit(1);
+    }
+    const auto before = disk.bundles().executablePath(ProcessID(pid));
+    EXPECT_EQ(before, fs::read_symlink("/proc/self/exe").string());
+    ASSERT_EQ(::write(go[1], "x", 1), 1);
+    const auto limit = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+    while (disk.bundles().executablePath(ProcessID(pid)) != second && std::chrono::steady_clock::now() < limit)
+        std::this_thread::yield();
+    EXPECT_EQ(disk.bundles().executablePath(ProcessID(pid)), second);
+    ::kill(pid, SIGKILL);
+    ::waitpid(pid, nullptr, 0);
+    ::close(go[0]);
+    ::close(go[1]);
+}
+
+TEST(LinuxBundles, WithoutFreshnessEveryLookIsAtTheDisk) {
+    Disk disk;
+    const std::string program = disk.installProgram("bin/player");
+    const auto questions = std::make_shared<std::atomic<int>>(0);
+    disk.options.beforeEachQuestion = [questions] { ++*questions; };
+    disk.installEntry("system/applications/org.example.Player.desktop", "Exec=player\n");
+    EXPECT_EQ(disk.identifierOf(program), kPlayer);
+    const int asked = *questions;
+    EXPECT_EQ(disk.identifierOf(program), kPlayer);
+    EXPECT_EQ(*questions, 2 * asked);
+}
+
 TEST(ProcessImage, ARunningProgramHasItsPath) {
     const auto self = processImage(ProcessID(::getpid()));
     ASSERT_TRUE(self);
