@@ -46,9 +46,13 @@ void LCRecordingManager::stopRecordingSession(const std::shared_ptr<LCRecordingS
 std::shared_ptr<void> LCRecordingManager::noteStopUnderWay(const std::shared_ptr<LCRecordingSession>& session,
                                                            std::uint64_t generation) {
     session->managerRecord.stopsUnderWay.push_back(generation);
-    // Answered or dropped, the completion lets this go.
+    // Answered or dropped, the completion lets this go. Once the application has left, nobody else resets what was
+    // dropped.
     return {nullptr, [self = shared_from_this(), session, generation](std::nullptr_t) {
-                self->onRequestLane([session, generation] { std::erase(session->managerRecord.stopsUnderWay, generation); });
+                self->onRequestLane([self, session, generation] {
+                    std::erase(session->managerRecord.stopsUnderWay, generation);
+                    if (self->registeredSession(session->bundleID()) != session) self->resetUnansweredStops(session);
+                });
             }};
 }
 

@@ -37,6 +37,22 @@ TEST_F(Stop, AStopIsAnsweredWithTheMovieAndThenTheStateIsReset) {
     EXPECT_EQ(logged("LCRecordingManager:resetStatesForSession:"), 1u);
 }
 
+TEST_F(Stop, AClipThatFailsAfterItsApplicationHasLeftIsReset) {
+    const auto client = makeRecording();
+    advance(seconds(10));
+    fakes_.containerWriters.lastRecording()->holdFinish(true);
+    client->ask(DaemonMessage::StopRecordingWithClipDurations, {1.0, 1.0});
+    settle();
+    client->die();
+    settle();
+    EXPECT_EQ(fakes_.keepAlive.open(), 1) << "the movie is still being finished";
+    fakes_.faults.failNext("MovieExporter.export");
+    fakes_.containerWriters.lastRecording()->holdFinish(false);
+    settle();
+    EXPECT_EQ(logged("LCMovieWriter: Export Trim succeeded"), 0u);
+    EXPECT_EQ(fakes_.keepAlive.open(), 0);
+}
+
 /// An extension whose link takes every payload at once.
 class Uploader final : public AppExtension, public LCBroadcastExtensionProxy {
 public:
