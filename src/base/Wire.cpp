@@ -235,9 +235,15 @@ private:
 
 }  // namespace
 
-bool encode(const Value& value, WireBody& body) { return Encoder(body).value(value, 0); }
+// The last value may be one that goes over the limit without having been looked at.
 
-bool encodeArray(const Array& items, WireBody& body) { return Encoder(body).array(items); }
+bool encode(const Value& value, WireBody& body) {
+    return Encoder(body).value(value, 0) && body.bytes.size() <= limitOf(Limit::MessageBytes);
+}
+
+bool encodeArray(const Array& items, WireBody& body) {
+    return Encoder(body).array(items) && body.bytes.size() <= limitOf(Limit::MessageBytes);
+}
 
 std::optional<Value> decode(std::span<const std::uint8_t> bytes, std::span<const Value> handles) {
     Decoder decoder(bytes, handles);

@@ -141,6 +141,22 @@ TEST(Wire, BytesEndAtTheLimit) {
     EXPECT_FALSE(encode(Value(Array(limit, Value())), many));
 }
 
+TEST(Wire, TheLastValueDoesNotGoOverTheLimitEither) {
+    const std::uint64_t limit = limitOf(Limit::MessageBytes);
+    const auto ending = [&](std::uint64_t size, const Value& last) { return Array{Data(size - 10), last}; };
+    for (const Value& last : {Value(1), Value(true), Value(Array{}), Value(Dictionary{})}) {
+        WireBody alone;
+        ASSERT_TRUE(encode(last, alone));
+        const std::uint64_t room = limit - alone.bytes.size();
+        WireBody fits, fitsAsArray, tooLong, tooLongAsArray;
+        EXPECT_TRUE(encode(Value(ending(room, last)), fits));
+        EXPECT_EQ(fits.bytes.size(), limit);
+        EXPECT_TRUE(encodeArray(ending(room, last), fitsAsArray));
+        EXPECT_FALSE(encode(Value(ending(room + 1, last)), tooLong));
+        EXPECT_FALSE(encodeArray(ending(room + 1, last), tooLongAsArray));
+    }
+}
+
 TEST(Wire, HandlesEndAtTheLimit) {
     const auto handles = [](std::uint64_t count) {
         return Value(Array(count, Value(Value::EndpointRef(std::make_shared<Endpoint>()))));
