@@ -11,6 +11,11 @@ namespace {
 constexpr std::chrono::milliseconds kCloseWait{100};
 constexpr std::int64_t kLongestPause = 1'000'000'000;
 constexpr std::int64_t kFallbackInterval = 16'666'667;
+constexpr double kLargestSide = 16'384;
+
+bool canBeCaptured(const Size& size) {
+    return size.width >= 1 && size.height >= 1 && size.width <= kLargestSide && size.height <= kLargestSide;
+}
 
 std::int64_t nanosecondsOf(const MediaTime& interval) {
     const double seconds = interval.seconds();
@@ -72,7 +77,7 @@ void FakeDisplayCaptureSource::start() {
         running_ = true;
         run = ++run_;
     }
-    if (settings_->faults.fails("DisplayCapture.start")) return fail(FakeDisplayCapture::kStartFailed);
+    if (!canBeCaptured(size_) || settings_->faults.fails("DisplayCapture.start")) return fail(FakeDisplayCapture::kStartFailed);
     const std::weak_ptr<FakeDisplayCaptureSource> weak = weak_from_this();
     lane_->async([weak, run] {
         if (const auto self = weak.lock()) self->beginRun(run);

@@ -94,7 +94,8 @@ private:
     Counters counters_;
 };
 
-/// A failing call ("DisplayCapture.start") is a source that fails with kStartFailed after its start.
+/// A failing call ("DisplayCapture.start") is a source that fails with kStartFailed after its start. So does one of a
+/// size that no picture has.
 class FakeDisplayCapture final : public DisplayCapture {
 public:
     static constexpr std::int32_t kStartFailed = -1;

@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <limits>
+
 #include "tests/fakes/FakePlatform.h"
 
 namespace lumacast {
@@ -211,6 +213,21 @@ TEST_F(FakeDisplayCaptureTest, AFailureEndsDeliveryAndIsToldOnTheMainQueueOnce) 
     source->mediaServicesWereReset();
     world.scheduler.runUntilIdle();
     EXPECT_EQ(frames->failures, (std::vector<std::int32_t>{-42, 1000, 2000}));
+}
+
+TEST_F(FakeDisplayCaptureTest, ASizeThatNoPictureHasFailsAfterTheStart) {
+    constexpr double kHuge = std::numeric_limits<double>::max(), kNone = std::numeric_limits<double>::quiet_NaN();
+    for (const Size size : {Size{0.5, 360}, Size{640, kNone}, Size{-1, -1}, Size{kHuge, 360}, Size{640, 16'385}}) {
+        frames->failures.clear();
+        const auto bad = world.fakes.displayCapture.makeSource(size, MediaTime::make(1, 100));
+        bad->setDelegate(frames);
+        world.fakes.clock.startCaptureClock();
+        bad->openGate();
+        bad->start();
+        world.scheduler.advance(1s);
+        EXPECT_EQ(frames->failures, std::vector<std::int32_t>{FakeDisplayCapture::kStartFailed}) << size.width;
+        EXPECT_TRUE(frames->stamps.empty());
+    }
 }
 
 TEST_F(FakeDisplayCaptureTest, TheLastReferenceMayGoWithinADelivery) {
