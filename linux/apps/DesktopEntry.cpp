@@ -68,12 +68,13 @@ std::optional<std::vector<std::string>> arguments(std::string_view exec) {
 }
 
 bool isInterpreter(std::string_view program) {
-    static constexpr std::array<std::string_view, 20> kNames{"sh",
+    static constexpr std::array<std::string_view, 21> kNames{"sh",
                                                              "bash",
                                                              "dash",
                                                              "zsh",
                                                              "ksh",
                                                              "busybox",
+                                                             "env",
                                                              "node",
                                                              "nodejs",
                                                              "java",

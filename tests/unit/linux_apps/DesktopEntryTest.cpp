@@ -83,6 +83,8 @@ TEST(DesktopEntry, EnvAndItsVariablesArePassedOver) {
     EXPECT_EQ(program("env A=1 B=2 player --x"), "player");
     EXPECT_EQ(program("env -i player"), "(none)");
     EXPECT_EQ(program("env"), "(none)");
+    EXPECT_EQ(program("env A=1 env player"), "(none)");
+    EXPECT_EQ(program("/bin/env player"), "(none)");
 }
 
 TEST(DesktopEntry, AnInterpreterIsNobodysProgram) {
