@@ -58,7 +58,7 @@ void LCRecordingManager::startRecording(const StartRequest& request, StartHandle
     if (!checkContextIDsMatch(request.windowLayerContextIDs))
         return refuse(number, RecordingErrorCode::FailedToStart, "a window layer is not the application's own",
                       handler);
-    if (!isSize(request.windowSize))
+    if (!isSize(request.windowSize) || (session && !session->canCaptureSize(request.windowSize)))
         return refuse(number, RecordingErrorCode::FailedToStart, "the window size is none", handler);
     log_.line(
         "LCRecordingManager:startRecordingWindowLayerContextID:windowSize:microphoneEnabled:streaming:withHandler:");

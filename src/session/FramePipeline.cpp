@@ -1,5 +1,6 @@
 // The road of one screen frame through the session: dropped, re-timed or not, and delivered. Runs on the frame lane.
 
+#include <cmath>
 #include <limits>
 
 #include "session/FrameGeometry.h"
@@ -109,13 +110,29 @@ void LCRecordingSession::deliver(const SampleRef& sample, std::uint32_t transfor
 }
 
 Size LCRecordingSession::_maximumSizeWithSize(Size size) {
-    constexpr std::int64_t kTabletIdiom = 1;
-    constexpr double kLimit = 1920, kReducedLimit = 1600;
-    const auto fullResolution = services_.platform.preferences.value(kPreferenceDomain, "LCFullResCapture");
-    if (const bool* on = fullResolution ? fullResolution->as<bool>() : nullptr; on && *on) {
+    if (hasFullResolution()) {
         log_.line("full res capture enabled");
         return size;
     }
+    return cappedSize(size);
+}
+
+bool LCRecordingSession::canCaptureSize(Size size) {
+    const auto isSide = [](double length) { return std::isfinite(length) && length >= 1; };
+    if (!isSide(size.width) || !isSide(size.height)) return false;
+    const Size captured = hasFullResolution() ? size : cappedSize(size);
+    return isSide(captured.width) && isSide(captured.height);
+}
+
+bool LCRecordingSession::hasFullResolution() const {
+    const auto fullResolution = services_.platform.preferences.value(kPreferenceDomain, "LCFullResCapture");
+    const bool* on = fullResolution ? fullResolution->as<bool>() : nullptr;
+    return on && *on;
+}
+
+Size LCRecordingSession::cappedSize(Size size) {
+    constexpr std::int64_t kTabletIdiom = 1;
+    constexpr double kLimit = 1920, kReducedLimit = 1600;
     const DeviceInfo& device = services_.platform.deviceInfo;
     const bool reduced = device.userInterfaceIdiom() == kTabletIdiom && chipId() == device.reducedCaptureChipID();
     return fittedWithin(size, reduced ? kReducedLimit : kLimit);

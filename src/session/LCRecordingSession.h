@@ -182,6 +182,9 @@ public:
 
     /// `_maximumSizeWithSize:` — the capture-size cap.
     Size _maximumSizeWithSize(Size size);
+    /// Whether a picture can have what the cap leaves of this size: a very long and narrow one loses its short side. A
+    /// session's capture source keeps its first size for good, so another must not get there.
+    bool canCaptureSize(Size size);
 
     /// The manager's bookkeeping of this session, touched on the request lane only.
     struct ManagerRecord {
@@ -214,6 +217,8 @@ private:
     void _updateSampleBufferWithOffset(const SampleRef& sample, const std::function<void(const SampleRef&)>& handler);
     SampleRef _copySampleBufferFromSourceBuffer(const SampleRef& sample, MediaTime updatedTimeStamp);
     void deliver(const SampleRef& sample, std::uint32_t transformFlags, MediaTime originalTime);
+    bool hasFullResolution() const;
+    Size cappedSize(Size size);
     std::int64_t chipId();
 
     const SessionServices services_;

@@ -227,7 +227,9 @@ TEST_F(Start, ASizeThatNoPictureCanHaveIsRefusedAndSpoilsNothing) {
     const auto client = makeConnected();
     constexpr double kNone = std::numeric_limits<double>::quiet_NaN();
     constexpr double kEndless = std::numeric_limits<double>::infinity();
-    for (const auto& [width, height] : {std::pair{0.0, 0.0}, {kNone, 360.0}, {640.0, kEndless}, {-640.0, 360.0}, {640.0, 0.5}}) {
+    // The last two lose their short side to the cap.
+    for (const auto& [width, height] : {std::pair{0.0, 0.0}, {kNone, 360.0}, {640.0, kEndless}, {-640.0, 360.0},
+                                        {640.0, 0.5}, {5000.0, 1.0}, {640.0, 2e9}}) {
         const auto asked = client->ask(
             DaemonMessage::StartRecording,
             {Array{number(client->window)}, Array{width, height}, false, false, false, false, false, Value()});
@@ -236,6 +238,19 @@ TEST_F(Start, ASizeThatNoPictureCanHaveIsRefusedAndSpoilsNothing) {
     }
     EXPECT_EQ(started(*client)->code(), 0);
     EXPECT_EQ(session(*client)->windowSize(), (Size{640, 360}));
+}
+
+TEST_F(Start, ANarrowSizeIsFineWhereNothingIsCapped) {
+    fakes_.preferences.set(kPreferenceDomain, "LCFullResCapture", true);
+    const auto client = makeConnected();
+    const auto asked =
+        client->ask(DaemonMessage::StartRecording,
+                    {Array{number(client->window)}, Array{5000.0, 1.0}, false, false, false, false, false, Value()});
+    settle();
+    EXPECT_EQ(asked->answers, 1);
+    EXPECT_EQ(asked->code(), 0);
+    EXPECT_EQ(session(*client)->windowSize(), (Size{5000, 1}));
+    EXPECT_EQ(logged("full res capture enabled"), 1u) << "asking whether the size is fine says nothing";
 }
 
 TEST_F(Start, ARestartEndsTheOlderRecordingOnlyWhenItsStopIsAnswered) {
