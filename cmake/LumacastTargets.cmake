@@ -15,6 +15,11 @@ if(LC_SANITIZE)
   target_link_options(lc_options INTERFACE -fsanitize=${LC_SANITIZE})
   target_compile_definitions(lc_options INTERFACE LC_SANITIZED=1)
 endif()
+if(LC_FUZZ)
+  # The fuzzer follows everything that is compiled; only its targets are linked with its main function.
+  target_compile_options(lc_options INTERFACE -fsanitize=fuzzer-no-link)
+  target_link_options(lc_options INTERFACE -fsanitize=fuzzer-no-link)
+endif()
 
 # lc_library(NAME DIR DEPS...): a static library of all .cpp files of one folder (not of the folders below it).
 function(lc_library name dir)

@@ -37,6 +37,8 @@ public:
 
     void connect();
     bool isConnected() const { return connection_ != nullptr; }
+    /// Its end of the connection, for whoever wants to misuse it; null when there is none.
+    const std::shared_ptr<IpcConnection>& connection() const { return connection_; }
     /// The process dies: connection, window and process are gone.
     void die();
     bool isAlive() const { return process_ != nullptr; }

@@ -1,0 +1,37 @@
+#include "fuzz/Targets.h"
+
+#include <algorithm>
+#include <array>
+#include <stdexcept>
+#include <string>
+
+namespace lumacast::fuzz {
+
+namespace {
+
+constexpr std::array kTargets{
+    Target{"authority_file", authorityFile},
+    Target{"desktop_entry", desktopEntry},
+    Target{"device_info", deviceInfo},
+    Target{"frames", frames},
+    Target{"manifest", manifest},
+    Target{"messages", messages},
+    Target{"preferences", preferences},
+    Target{"strings_table", stringsTable},
+    Target{"values", values},
+};
+
+}  // namespace
+
+std::span<const Target> targets() {
+    return kTargets;
+}
+
+const Target& targetNamed(std::string_view name) {
+    const auto found =
+        std::find_if(kTargets.begin(), kTargets.end(), [&](const Target& target) { return target.name == name; });
+    if (found == kTargets.end()) throw std::out_of_range("no target is named " + std::string(name));
+    return *found;
+}
+
+}  // namespace lumacast::fuzz

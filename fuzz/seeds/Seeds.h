@@ -1,0 +1,17 @@
+#pragma once
+#include <filesystem>
+#include <string>
+
+#include "base/Value.h"
+
+namespace lumacast::fuzz {
+
+/// Writes `bytes` as `corpora/<target>/seed-<name>`. Throws when the disk refuses.
+void writeSeed(const std::filesystem::path& corpora, const std::string& target, const std::string& name,
+               const Data& bytes);
+
+void writeFrameSeeds(const std::filesystem::path& corpora);
+void writeMessageSeeds(const std::filesystem::path& corpora);
+void writeValueSeeds(const std::filesystem::path& corpora);
+
+}  // namespace lumacast::fuzz
