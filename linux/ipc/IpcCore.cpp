@@ -17,14 +17,24 @@ UserTable::Seat::~Seat() {
     if (!table_) return;
     const std::lock_guard lock(table_->mutex_);
     const auto found = table_->users_.find(user_);
-    if (--found->second.connections == 0) table_->users_.erase(found);
+    if (isConfirmed_) --found->second.connections;
+    if (--found->second.seats == 0) table_->users_.erase(found);
+}
+
+bool UserTable::Seat::confirm() {
+    const std::lock_guard lock(table_->mutex_);
+    User& entry = table_->users_.at(user_);
+    if (entry.connections >= limitOf(Limit::ConnectionsPerUser)) return false;
+    ++entry.connections;
+    isConfirmed_ = true;
+    return true;
 }
 
 std::optional<UserTable::Seat> UserTable::take(uid_t user) {
     const std::lock_guard lock(mutex_);
     User& entry = users_[user];
     if (entry.connections >= limitOf(Limit::ConnectionsPerUser)) return std::nullopt;
-    ++entry.connections;
+    ++entry.seats;
     return Seat(shared_from_this(), user, entry.budget);
 }
 

@@ -20,6 +20,7 @@
 #include "base/Value.h"
 #include "linux/ipc/Fd.h"
 #include "linux/ipc/Reactor.h"
+#include "linux/ipc/WaitingRoom.h"
 
 namespace lumacast {
 
@@ -44,7 +45,7 @@ private:
 /// Counts the open connections of each user, and what is kept for them. Thread-safe (a leaf lock).
 class UserTable : public std::enable_shared_from_this<UserTable> {
 public:
-    /// One connection's place in the count, given back when it goes.
+    /// One connection's place, given back when it goes. It counts as an open connection once it is confirmed.
     class Seat {
     public:
         Seat(std::shared_ptr<UserTable> table, uid_t user, std::shared_ptr<ByteBudget> budget)
@@ -55,20 +56,25 @@ public:
         Seat& operator=(Seat&&) = delete;
         ~Seat();
 
+        uid_t user() const { return user_; }
         const std::shared_ptr<ByteBudget>& budget() const { return budget_; }
+        /// The connection has said hello. False when the user has as many open ones as the limits table allows.
+        [[nodiscard]] bool confirm();
 
     private:
         std::shared_ptr<UserTable> table_;
         uid_t user_;
         std::shared_ptr<ByteBudget> budget_;
+        bool isConfirmed_ = false;
     };
 
-    /// None when the user has as many connections as the limits table allows.
+    /// None when the user has as many open connections as the limits table allows.
     std::optional<Seat> take(uid_t user);
 
 private:
     struct User {
-        std::uint64_t connections = 0;
+        std::uint64_t seats = 0;        ///< all that were taken and not given back
+        std::uint64_t connections = 0;  ///< those of them that are confirmed
         std::shared_ptr<ByteBudget> budget = std::make_shared<ByteBudget>();
     };
     std::mutex mutex_;
@@ -89,6 +95,10 @@ public:
     std::array<std::uint8_t, 65'536> scratch;
     /// Closed for a moment when the process has no descriptor left, to take and refuse a connection. The reactor's own.
     Fd spare;
+    /// Who has come in and not said hello. The reactor's own.
+    WaitingRoom waitingRoom;
+    /// One line for many connections turned away in a row. The reactor's own.
+    BurstGate silentDropped, userFull, noDescriptorLeft;
 
     /// Accepted connections, owned from their acceptance until their loss has been delivered.
     void own(std::shared_ptr<LinuxIpcConnection> connection);

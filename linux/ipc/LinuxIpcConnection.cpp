@@ -152,6 +152,7 @@ void LinuxIpcConnection::deliverLoss() {
     incoming_ = IncomingFrames();
     [[maybe_unused]] const bool given = hold(0);
     helloTimer_.reset();
+    core_->waitingRoom.leave(this);
     greeted_ = nullptr;
     const Error error(std::string(kSystemErrorDomain), EPIPE);
     for (auto& [sequence, waiting] : pending)

@@ -50,6 +50,10 @@ public:
     /// An accepted connection waits for its peer's hello, for a limited time, and only then is shown to anybody:
     /// `greeted` is called on the reactor. A peer that says something else, or nothing, is dropped. On the reactor.
     void awaitHello(Greeted greeted);
+    /// Reads the hello if it has come, as the reactor would in its next turn. On the reactor.
+    void lookForHello();
+    /// Counts as one of its user's open connections from now on. False when the user has too many.
+    [[nodiscard]] bool takeItsPlace();
 
     using ReplyHandler = std::function<void(Array values)>;
     /// See IpcRemoteProxy::send.

@@ -51,6 +51,15 @@ void LinuxIpcConnection::awaitHello(Greeted greeted) {
     if (!works) lose();
 }
 
+void LinuxIpcConnection::lookForHello() {
+    if (!isGreeted_) turn(EPOLLIN);
+}
+
+bool LinuxIpcConnection::takeItsPlace() {
+    const std::lock_guard lock(mutex_);
+    return !seat_ || seat_->confirm();
+}
+
 Reactor::Again LinuxIpcConnection::turn(std::uint32_t events) {
     if (isLost()) return Reactor::Again::No;
     if (events & EPOLLOUT) flush();
@@ -58,6 +67,7 @@ Reactor::Again LinuxIpcConnection::turn(std::uint32_t events) {
     if (!isGreeted_) {
         if (!isReadable || !readHello()) return Reactor::Again::No;
         helloTimer_.reset();
+        core_->waitingRoom.leave(this);
         if (!greeted_) return Reactor::Again::No;
         {
             // From here on it waits for its resume.

@@ -6,10 +6,12 @@
 
 #include <array>
 #include <cerrno>
+#include <chrono>
 #include <cstring>
 #include <optional>
 #include <utility>
 
+#include "base/Limits.h"
 #include "linux/ipc/LinuxIpcEndpoint.h"
 
 namespace lumacast {
@@ -17,6 +19,8 @@ namespace lumacast {
 namespace {
 
 constexpr int kAcceptsPerTurn = 16;
+/// Connections that are turned away one after another get one log line, until none was for so long.
+constexpr std::chrono::seconds kBurstEndsAfter{10};
 
 int optionOf(int socket, int name) {
     int value = -1;
@@ -148,7 +152,8 @@ Reactor::Again LinuxIpcListener::acceptFromService() {
 void LinuxIpcListener::refuseForLackOfDescriptors() {
     core_->spare.reset();
     Fd refused(accept4(service_.descriptor(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
-    if (refused) core_->log.error("IPC: a connection was refused: no descriptor is left");
+    if (refused && core_->noDescriptorLeft.begins(std::chrono::steady_clock::now(), kBurstEndsAfter))
+        core_->log.error("IPC: a connection was refused: no descriptor is left");
     refused.reset();
     core_->spare.reset(open("/dev/null", O_RDONLY | O_CLOEXEC));
 }
@@ -178,19 +183,43 @@ Reactor::Again LinuxIpcListener::acceptFromDoorbell(int descriptor) {
 void LinuxIpcListener::admit(Fd socket) {
     Peer peer = Peer::of(socket.get());
     std::optional<UserTable::Seat> seat = core_->users->take(peer.uid);
-    if (!seat) {
-        core_->log.error("IPC: connection of process %d refused: user %u has too many", number(peer.pid), peer.uid);
-        return;
-    }
+    if (!seat) return sayUserIsFull(peer.pid, peer.uid);
+    const uid_t user = peer.uid;
+    const ProcessID process = peer.pid;
     auto connection =
         std::make_shared<LinuxIpcConnection>(core_, std::move(socket), std::move(peer), std::move(seat));
     core_->own(connection);
+    core_->waitingRoom.enter(connection, user, process);
     connection->sendHello();
-    connection->awaitHello([weak = weak_from_this()](const std::shared_ptr<LinuxIpcConnection>& greeted) {
+    connection->awaitHello([weak = weak_from_this(), user](const std::shared_ptr<LinuxIpcConnection>& greeted) {
         const auto self = weak.lock();
-        if (self) return self->ask(greeted);
+        if (!self) return greeted->invalidate();
+        if (greeted->takeItsPlace()) return self->ask(greeted);
+        self->sayUserIsFull(greeted->processIdentifier(), user);
         greeted->invalidate();
     });
+    makeRoomForTheSilent(user);
+}
+
+void LinuxIpcListener::sayUserIsFull(ProcessID process, uid_t user) {
+    if (!core_->userFull.begins(std::chrono::steady_clock::now(), kBurstEndsAfter)) return;
+    core_->log.error("IPC: connection of process %d refused: user %u has too many", number(process), user);
+}
+
+/// So that connections that say nothing never keep others out.
+void LinuxIpcListener::makeRoomForTheSilent(uid_t user) {
+    WaitingRoom& room = core_->waitingRoom;
+    while (room.countOf(user) > limitOf(Limit::ConnectionsBeforeHello)) {
+        const auto first = room.firstToGo(user);
+        if (!first) return;
+        first->lookForHello();  // it may be there, and only not have been read
+        if (!room.holds(first.get())) continue;
+        room.leave(first.get());
+        if (core_->silentDropped.begins(std::chrono::steady_clock::now(), kBurstEndsAfter))
+            core_->log.error("IPC: connection of process %d dropped: user %u has too many without a hello",
+                             number(first->processIdentifier()), user);
+        first->invalidate();
+    }
 }
 
 void LinuxIpcListener::ask(const std::shared_ptr<LinuxIpcConnection>& connection) {

@@ -35,6 +35,8 @@ private:
     Reactor::Again acceptFromDoorbell(int descriptor);
     void refuseForLackOfDescriptors();
     void admit(Fd socket);
+    void sayUserIsFull(ProcessID process, uid_t user);
+    void makeRoomForTheSilent(uid_t user);
     void ask(const std::shared_ptr<LinuxIpcConnection>& connection);
     void watchDoorbellLocked(Doorbell& doorbell);
 

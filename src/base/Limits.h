@@ -19,6 +19,7 @@ enum class Limit : std::uint8_t {
     PlanesLeased,
     MessageValues,
     HeldBytesPerUser,
+    ConnectionsBeforeHello,
 };
 
 struct LimitRow {
@@ -40,6 +41,7 @@ inline constexpr std::array kLimits{
     LimitRow{Limit::PlanesLeased, 4, "planes lent to one peer at a time"},
     LimitRow{Limit::MessageValues, 16'384, "values in one message, at all depths"},
     LimitRow{Limit::HeldBytesPerUser, 64 << 20, "bytes of unfinished and of unread messages of one user's connections"},
+    LimitRow{Limit::ConnectionsBeforeHello, 64, "connections of one user that have not said hello"},
 };
 
 /// How little space may be free where movies are written before temporary ones are asked for.

@@ -55,6 +55,7 @@ protected:
                 peer.send(rawFrame(setMicrophone(1), nulls(limitOf(limit))));
                 return expectDropped(peer, "malformed message", 1);
             case Limit::HeldBytesPerUser: return overflowUnfinished();
+            case Limit::ConnectionsBeforeHello: return overflowSilent(peer);
         }
         FAIL() << "no overflow for this limit";
     }
@@ -95,19 +96,33 @@ protected:
 
     void overflowConnections() {
         std::vector<RawPeer> peers;
-        // The friendly client and the one that the caller made have a place each.
-        for (std::uint64_t i = 2; i < limitOf(Limit::ConnectionsPerUser); ++i) {
+        // The friendly client has a place; the one that the caller made has said nothing and has none.
+        for (std::uint64_t i = 1; i < limitOf(Limit::ConnectionsPerUser); ++i) {
             ASSERT_TRUE(peers.emplace_back(path()).hello());
             if (i % 100 == 0) { ASSERT_TRUE(isServed()); }
         }
         expectHello(peers.back());
         RawPeer excess(path());
+        excess.hello();
         expectDropped(excess, "has too many");
         peers.pop_back();
         ASSERT_TRUE(until([&] {
             RawPeer next(path());
             return next.hello() && next.read(kHelloBytes) == makeHello();
         })) << "a closed connection makes room";
+    }
+
+    /// `oldest` is one that has said nothing.
+    void overflowSilent(RawPeer& oldest) {
+        std::vector<RawPeer> others;
+        while (others.size() + 1 < limitOf(Limit::ConnectionsBeforeHello)) others.emplace_back(path());
+        for (RawPeer& other : others) expectHello(other);
+        EXPECT_TRUE(lines().empty()) << "the limit itself is fine";
+        others.emplace_back(path());
+        expectDropped(oldest, "too many without a hello");
+        EXPECT_TRUE(others.front().hello());
+        others.front().send(message(DaemonMessage::PauseRecording, {}, 1));
+        EXPECT_TRUE(until([&] { return object->count() > 2; })) << "only the oldest goes";
     }
 
     void overflowRequests(RawPeer& peer) {
@@ -195,7 +210,8 @@ std::string limitName(const ::testing::TestParamInfo<LimitRow>& info) {
                                 "HelloBytes",
                                 "PlanesLeased",
                                 "MessageValues",
-                                "HeldBytesPerUser"};
+                                "HeldBytesPerUser",
+                                "ConnectionsBeforeHello"};
     static_assert(kNames.size() == kLimits.size());
     return kNames.at(static_cast<std::size_t>(info.param.limit));
 }
