@@ -1,5 +1,8 @@
 // The Linux port's platform: every role made of real services, in the order in which they need each other.
 
+#include <sysexits.h>
+#include <unistd.h>
+
 #include <cstdio>
 #include <cstdlib>
 #include <memory>
@@ -31,6 +34,10 @@ namespace lumacast {
 
 namespace {
 
+/// A daemon that nobody can reach must not run on: whoever started it hears of it by its exit status. At once, like every
+/// end of this process: other lanes may be in the middle of their work.
+[[noreturn]] void endUnreachable() { ::_exit(EX_UNAVAILABLE); }
+
 std::string environmentVariable(const char* name) {
     const char* value = std::getenv(name);
     return value ? value : "";
@@ -50,7 +57,8 @@ public:
           ipc_(*reactor_, log_,
                {.runtimeDirectory = environment.runtimeDirectory,
                 .entitlements = [this](ProcessID pid, std::string_view name) { return entitlements_.value(pid, name); },
-                .activated = ActivatedSockets::fromEnvironment()}),
+                .activated = ActivatedSockets::fromEnvironment(),
+                .serviceUnavailable = endUnreachable}),
           writers_(clock_),
           fileSystem_(fileSystemOptions(environment)),
           preferences_(environment.configDirectories),
@@ -60,7 +68,11 @@ public:
           capture_(environmentVariable("DISPLAY"), clock_, scheduler_),
           renderServer_(environmentVariable("DISPLAY")),
           appState_(environmentVariable("DISPLAY"), scheduler_, [this](ProcessID pid) { return applicationOf(pid); }),
-          admin_(scheduler_, environment.runtimeDirectory + "/admin.sock"),
+          admin_(scheduler_, environment.runtimeDirectory + "/admin.sock", {},
+                 [this](std::string_view reason) {
+                     log_.error("the administrator's socket admin.sock is not available: %s", reason);
+                     endUnreachable();
+                 }),
           storagePurge_(scheduler_, fileSystem_),
           platform_{log_,         scheduler_,  clock_,     ipc_,       bundles_,   renderServer_,
                     appState_,    capture_,    capture_,   writers_,   exporters_, fileSystem_,

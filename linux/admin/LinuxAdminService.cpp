@@ -283,8 +283,12 @@ private:
     std::uint64_t questions_ = 0;
 };
 
-LinuxAdminService::LinuxAdminService(Scheduler& scheduler, std::string socketPath, Limits limits)
-    : scheduler_(scheduler), socketPath_(std::move(socketPath)), limits_(limits) {}
+LinuxAdminService::LinuxAdminService(Scheduler& scheduler, std::string socketPath, Limits limits,
+                                     Unavailable unavailable)
+    : scheduler_(scheduler),
+      socketPath_(std::move(socketPath)),
+      limits_(limits),
+      unavailable_(std::move(unavailable)) {}
 
 LinuxAdminService::~LinuxAdminService() {
     if (!thread_.joinable()) return;
@@ -299,8 +303,17 @@ void LinuxAdminService::addCommand(std::string name, AdminCommand command) {
 
 void LinuxAdminService::resume(std::function<Dictionary()> snapshot) {
     if (thread_.joinable()) return;
-    server_ = std::make_unique<Server>(scheduler_, limits_, commands_, std::move(snapshot), listenAt(socketPath_));
-    if (!server_->isComplete()) return;
+    std::string reason;
+    FileDescriptor listener = listenAt(socketPath_, reason);
+    if (listener) {
+        server_ = std::make_unique<Server>(scheduler_, limits_, commands_, std::move(snapshot), std::move(listener));
+        if (server_->isComplete()) startThread();
+        if (!thread_.joinable()) reason = "no thread or no descriptor is left";
+    }
+    if (!thread_.joinable() && unavailable_) unavailable_(reason);
+}
+
+void LinuxAdminService::startThread() {
     sigset_t all;
     sigset_t before;
     sigfillset(&all);

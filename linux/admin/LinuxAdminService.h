@@ -6,6 +6,7 @@
 #include <map>
 #include <memory>
 #include <string>
+#include <string_view>
 #include <thread>
 
 #include "linux/system/FileDescriptor.h"
@@ -27,10 +28,12 @@ public:
         std::chrono::milliseconds reply{5000};     ///< for the peer to read
         std::chrono::milliseconds command{60000};  ///< for a command to answer
     };
+    /// Told why the service can't be offered, on the lane that resumed it. It is not offered then.
+    using Unavailable = std::function<void(std::string_view reason)>;
     /// `socketPath` is where the socket will be, in a directory of this user's own.
     LinuxAdminService(Scheduler& scheduler, std::string socketPath)
         : LinuxAdminService(scheduler, std::move(socketPath), Limits()) {}
-    LinuxAdminService(Scheduler& scheduler, std::string socketPath, Limits limits);
+    LinuxAdminService(Scheduler& scheduler, std::string socketPath, Limits limits, Unavailable unavailable = {});
     /// Closes every connection and removes the socket. A snapshot that was asked for is not waited for.
     ~LinuxAdminService() override;
 
@@ -43,9 +46,12 @@ public:
 private:
     class Server;
 
+    void startThread();
+
     Scheduler& scheduler_;
     const std::string socketPath_;
     const Limits limits_;
+    const Unavailable unavailable_;
     std::map<std::string, AdminCommand, std::less<>> commands_;
     std::unique_ptr<Server> server_;
     std::thread thread_;

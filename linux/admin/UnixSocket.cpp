@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <utility>
 
 namespace lumacast {
 
@@ -29,17 +30,29 @@ FileDescriptor streamSocket() {
 }  // namespace
 
 FileDescriptor listenAt(const std::string& path) {
+    std::string reason;
+    return listenAt(path, reason);
+}
+
+FileDescriptor listenAt(const std::string& path, std::string& reason) {
+    const auto refuse = [&](std::string why) {
+        reason = std::move(why);
+        return FileDescriptor();
+    };
     const auto address = addressOf(path);
+    if (!address) return refuse("its path is too long");
     FileDescriptor socket = streamSocket();
-    if (!address || !socket) return {};
+    if (!socket) return refuse("no socket can be made");
     struct stat status = {};
     if (::lstat(path.c_str(), &status) == 0) {
-        if (!S_ISSOCK(status.st_mode) || connectTo(path)) return {};
+        if (!S_ISSOCK(status.st_mode)) return refuse("something else lies at its path");
+        if (connectTo(path) || errno == EAGAIN) return refuse("another process serves it");
         ::unlink(path.c_str());
     }
     ::fchmod(socket.get(), 0600);  // before bind: the socket's file is made with these permissions
-    if (::bind(socket.get(), reinterpret_cast<const sockaddr*>(&*address), sizeof *address) != 0) return {};
-    if (::listen(socket.get(), kBacklog) != 0) return {};
+    if (::bind(socket.get(), reinterpret_cast<const sockaddr*>(&*address), sizeof *address) != 0)
+        return refuse("its socket can't be bound: error " + std::to_string(errno));
+    if (::listen(socket.get(), kBacklog) != 0) return refuse("its socket can't listen: error " + std::to_string(errno));
     return socket;
 }
 

@@ -11,6 +11,8 @@ namespace lumacast {
 /// A listening stream socket at `path`, for this user alone, non-blocking. A socket that nobody listens at any more is
 /// replaced; one that somebody does, and anything that is not a socket, is left alone: then, and on any failure, empty.
 FileDescriptor listenAt(const std::string& path);
+/// The same; an empty answer says why in `reason`.
+FileDescriptor listenAt(const std::string& path, std::string& reason);
 
 /// A connection to the socket at `path`, non-blocking; empty, with errno, when nobody listens there
 /// (EAGAIN: somebody does, but too many wait already).

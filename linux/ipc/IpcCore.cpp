@@ -38,11 +38,13 @@ std::optional<UserTable::Seat> UserTable::take(uid_t user) {
     return Seat(shared_from_this(), user, entry.budget);
 }
 
-IpcCore::IpcCore(Reactor& theReactor, Log& theLog, EntitlementLookup lookup, std::chrono::nanoseconds deadline)
+IpcCore::IpcCore(Reactor& theReactor, Log& theLog, EntitlementLookup lookup, std::chrono::nanoseconds deadline,
+                 std::function<void()> unavailable)
     : reactor(theReactor),
       log(theLog),
       entitlements(std::move(lookup)),
       helloDeadline(deadline),
+      serviceUnavailable(std::move(unavailable)),
       spare(open("/dev/null", O_RDONLY | O_CLOEXEC)) {}
 
 void IpcCore::own(std::shared_ptr<LinuxIpcConnection> connection) {

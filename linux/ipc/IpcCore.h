@@ -83,12 +83,14 @@ private:
 
 class IpcCore {
 public:
-    IpcCore(Reactor& theReactor, Log& theLog, EntitlementLookup lookup, std::chrono::nanoseconds deadline);
+    IpcCore(Reactor& theReactor, Log& theLog, EntitlementLookup lookup, std::chrono::nanoseconds deadline,
+            std::function<void()> unavailable);
 
     Reactor& reactor;
     Log& log;
     const EntitlementLookup entitlements;
     const std::chrono::nanoseconds helloDeadline;
+    const std::function<void()> serviceUnavailable;
     const std::shared_ptr<UserTable> users = std::make_shared<UserTable>();
 
     /// What a connection's turn reads into. The reactor's own.

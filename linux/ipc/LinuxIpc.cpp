@@ -9,7 +9,8 @@
 namespace lumacast {
 
 LinuxIpc::LinuxIpc(Reactor& reactor, Log& log, LinuxIpcOptions options)
-    : core_(std::make_shared<IpcCore>(reactor, log, std::move(options.entitlements), options.helloDeadline)),
+    : core_(std::make_shared<IpcCore>(reactor, log, std::move(options.entitlements), options.helloDeadline,
+                                      std::move(options.serviceUnavailable))),
       runtimeDirectory_(std::move(options.runtimeDirectory)),
       activated_(std::move(options.activated)) {}
 
@@ -17,8 +18,9 @@ LinuxIpc::~LinuxIpc() { core_->releaseAll(); }
 
 std::shared_ptr<IpcListener> LinuxIpc::listenerForService(const std::string& name) {
     const std::lock_guard lock(mutex_);
-    return std::make_shared<LinuxIpcListener>(core_,
-                                              ServiceSocket::open(runtimeDirectory_, name, activated_, core_->log));
+    ServiceSocket socket = ServiceSocket::open(runtimeDirectory_, name, activated_, core_->log);
+    if (socket.descriptor() < 0 && core_->serviceUnavailable) core_->serviceUnavailable();
+    return std::make_shared<LinuxIpcListener>(core_, std::move(socket));
 }
 
 std::shared_ptr<IpcListener> LinuxIpc::anonymousListener() {

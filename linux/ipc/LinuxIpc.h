@@ -1,5 +1,6 @@
 #pragma once
 #include <chrono>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -22,6 +23,9 @@ struct LinuxIpcOptions {
     ActivatedSockets activated = {};
     /// How long an accepted connection may keep its hello to itself.
     std::chrono::nanoseconds helloDeadline = std::chrono::seconds(10);
+    /// Called when a named service can't be served (after the line that says why), on the lane that asked for it. For a
+    /// process that has no other reason to be. Empty: its listener just accepts nobody.
+    std::function<void()> serviceUnavailable = {};
 };
 
 /// The transport: Unix sockets served by one reactor, which is the lane of everything that is delivered. Operations are

@@ -105,7 +105,10 @@ void LinuxIpcListener::resume() {
             const auto self = weak.lock();
             return self ? self->acceptFromService() : Reactor::Again::No;
         });
-        if (!watch_) core_->log.error("IPC: a service's socket can't be waited for: error %d", errno);
+        if (!watch_) {
+            core_->log.error("IPC: a service's socket can't be waited for: error %d", errno);
+            if (core_->serviceUnavailable) core_->serviceUnavailable();
+        }
     }
     for (auto& [descriptor, doorbell] : doorbells_) watchDoorbellLocked(doorbell);
 }

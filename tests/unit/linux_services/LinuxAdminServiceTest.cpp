@@ -209,9 +209,11 @@ TEST(LinuxAdminService, ASocketLeftBehindIsReplacedAndALivingOneIsNot) {
     { const FileDescriptor dead = listenAt(first.path); }
     ASSERT_TRUE(std::filesystem::exists(first.path));
     first.resume();
-    LinuxAdminService second(first.scheduler, first.path);
+    std::string why;
+    LinuxAdminService second(first.scheduler, first.path, {}, [&](std::string_view reason) { why = reason; });
     second.resume([] { return Dictionary(); });
     EXPECT_FALSE(second.isAnswering());
+    EXPECT_EQ(why, "another process serves it");
     const RunningThreadLoop running(*first.loop);
     EXPECT_EQ(first.ask("status"), kStatus);
 }

@@ -1,0 +1,85 @@
+// A daemon that can't be reached says so and ends; it never runs on for nobody.
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/wait.h>
+
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+#include "tests/system/World.h"
+
+namespace lumacast::test {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+
+constexpr int kUnavailable = 69;  // EX_UNAVAILABLE
+
+struct End {
+    int status = -1;
+    std::vector<std::string> errors;
+};
+
+/// Runs a daemon of its own in this world to its end.
+End runDaemon(const World& world) {
+    End end;
+    {
+        checkers::Child daemon({LC_DAEMON}, world.environment(), world.path("second.log"));
+        const auto hasEnded = [&] {
+            siginfo_t info{};
+            return ::waitid(P_PID, static_cast<id_t>(daemon.pid()), &info, WEXITED | WNOHANG | WNOWAIT) == 0 &&
+                   info.si_pid == daemon.pid();
+        };
+        EXPECT_TRUE(waitUntil(hasEnded, std::chrono::seconds(15))) << "it runs on";
+        ::kill(daemon.pid(), SIGKILL);
+        end.status = daemon.wait();
+    }
+    std::ifstream log(world.path("second.log"));
+    for (std::string line; std::getline(log, line);)
+        if (line.starts_with("error ")) end.errors.push_back(line);
+    return end;
+}
+
+TEST(Start, ASecondDaemonEndsAndTheFirstGoesOn) {
+    World world;
+    world.startDaemon();
+    const auto application = world.application({"--size", "320x180", "--fps", "30"});
+    ASSERT_TRUE(application->waitForFrame(1));
+    (void)application->askForFrame("start");
+    const End second = runDaemon(world);
+    EXPECT_EQ(second.status, kUnavailable);
+    EXPECT_THAT(second.errors, ElementsAre(HasSubstr("com.orvane.lumacastd is not available: another process serves")));
+    ASSERT_TRUE(world.waitForElapsed(0.5));
+    EXPECT_FALSE(picturesOf(application->stop()).empty());
+}
+
+TEST(Start, WithSomethingElseInTheServicesPlaceItEnds) {
+    World world;
+    std::filesystem::create_directories(world.path("run/lumacast"));
+    std::filesystem::permissions(world.path("run/lumacast"), std::filesystem::perms::owner_all);
+    std::ofstream(world.path("run/lumacast/com.orvane.lumacastd.sock")) << "precious";
+    const End end = runDaemon(world);
+    EXPECT_EQ(end.status, kUnavailable);
+    EXPECT_THAT(end.errors, ElementsAre(HasSubstr("something else lies at its path")));
+    EXPECT_EQ(std::filesystem::file_size(world.path("run/lumacast/com.orvane.lumacastd.sock")), 8u);
+}
+
+TEST(Start, WithADirectoryInTheAdministratorsPlaceItEnds) {
+    World world;
+    std::filesystem::create_directories(world.path("run/lumacast/admin.sock"));
+    std::filesystem::permissions(world.path("run/lumacast"), std::filesystem::perms::owner_all);
+    const End end = runDaemon(world);
+    EXPECT_EQ(end.status, kUnavailable);
+    EXPECT_THAT(end.errors, ElementsAre(HasSubstr("admin.sock is not available: something else lies at its path")));
+    // What it leaves keeps the next one from nothing.
+    std::filesystem::remove(world.path("run/lumacast/admin.sock"));
+    world.startDaemon();
+    EXPECT_EQ(world.endDaemon(SIGTERM), 0);
+}
+
+}  // namespace
+}  // namespace lumacast::test
