@@ -59,7 +59,9 @@ public:
                 .entitlements = [this](ProcessID pid, std::string_view name) { return entitlements_.value(pid, name); },
                 .activated = ActivatedSockets::fromEnvironment(),
                 .serviceUnavailable = endUnreachable}),
-          writers_(clock_),
+          movieFiles_(std::make_shared<media::PosixMovieFiles>(environment.root + std::string(kDeviceTemporaryDirectory))),
+          writers_(clock_, movieFiles_),
+          exporters_(movieFiles_),
           fileSystem_(fileSystemOptions(environment)),
           preferences_(environment.configDirectories),
           deviceInfo_(environment.systemDirectories),
@@ -108,6 +110,7 @@ private:
     LinuxBundles bundles_;
     Entitlements entitlements_;
     LinuxIpc ipc_;
+    const std::shared_ptr<media::MovieFiles> movieFiles_;
     LinuxContainerWriters writers_;
     LinuxMovieExporters exporters_;
     LinuxFileSystem fileSystem_;
@@ -136,8 +139,8 @@ std::unique_ptr<PlatformOwner> makePlatform() {
     }
     auto platform = std::make_unique<LinuxPlatform>(environment);
     if (const auto error = platform->prepare()) {
-        std::fprintf(stderr, "lumacastd: the parents of the temporary directory can't be made: %s\n",
-                     describe(*error).c_str());
+        std::fprintf(stderr, "lumacastd: the temporary directory %s%s can't be used: %s\n",
+                     environment.root.c_str(), std::string(kDeviceTemporaryDirectory).c_str(), describe(*error).c_str());
         return nullptr;
     }
     return platform;

@@ -6,6 +6,8 @@
 
 #include <cerrno>
 
+#include "linux/storage/BeneathDirectory.h"
+
 namespace lumacast::media {
 
 namespace {
@@ -47,18 +49,29 @@ private:
     const int descriptor_;
 };
 
+/// `folder` may be AT_FDCWD.
+std::variant<std::unique_ptr<MovieFile>, int> createIn(int folder, const std::string& name) {
+    for (;;) {
+        // The mode is what umask 077 would leave, whatever the process's umask is.
+        const int descriptor = ::openat(folder, name.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
+        if (descriptor >= 0) return std::make_unique<PosixMovieFile>(descriptor);
+        if (errno != EINTR) return errno;
+    }
+}
+
 bool climbs(const std::string& path) { return ("/" + path + "/").find("/../") != std::string::npos; }
 
 }  // namespace
 
 std::variant<std::unique_ptr<MovieFile>, int> PosixMovieFiles::create(const std::string& path) {
     if (path.empty() || climbs(path)) return EINVAL;
-    for (;;) {
-        // The mode is what umask 077 would leave, whatever the process's umask is.
-        const int descriptor = ::open(path.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
-        if (descriptor >= 0) return std::make_unique<PosixMovieFile>(descriptor);
-        if (errno != EINTR) return errno;
-    }
+    if (!directory_) return createIn(AT_FDCWD, path);
+    const std::string inside = withSingleSlashes(*directory_) + "/";
+    const std::string whole = withSingleSlashes(path);
+    if (!whole.starts_with(inside) || whole.find('/', inside.size()) != std::string::npos) return EACCES;
+    const auto folder = openTrusted(inside);
+    if (const int* error = std::get_if<int>(&folder)) return *error;
+    return createIn(std::get<FileDescriptor>(folder).get(), whole.substr(inside.size()));
 }
 
 }  // namespace lumacast::media

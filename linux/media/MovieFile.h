@@ -1,8 +1,10 @@
 #pragma once
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <span>
 #include <string>
+#include <utility>
 #include <variant>
 
 namespace lumacast::media {
@@ -31,7 +33,16 @@ public:
 /// Files of the system.
 class PosixMovieFiles final : public MovieFiles {
 public:
+    /// Anywhere: for tools and tests.
+    PosixMovieFiles() = default;
+    /// Only directly in `directory`, which is reached as the file system role reaches it: a path to anywhere else, such
+    /// as by a name with a slash, is EACCES, and so is a directory that somebody else has put there.
+    explicit PosixMovieFiles(std::string directory) : directory_(std::move(directory)) {}
+
     std::variant<std::unique_ptr<MovieFile>, int> create(const std::string& path) override;
+
+private:
+    const std::optional<std::string> directory_;
 };
 
 }  // namespace lumacast::media

@@ -7,6 +7,7 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <array>
 #include <cerrno>
 #include <memory>
 #include <vector>
@@ -17,6 +18,7 @@ namespace {
 
 constexpr int kDirectoryFlags = O_PATH | O_DIRECTORY | O_CLOEXEC;
 constexpr int kMaximumDepth = 64;
+constexpr int kMaximumLinks = 40;  // as the kernel follows
 
 FileDescriptor openBeneath(int base, const std::string& path) {
     open_how how{};
@@ -42,6 +44,14 @@ std::vector<std::string> componentsOf(std::string_view path) {
         path.remove_prefix(slash == std::string_view::npos ? path.size() : slash + 1);
     }
     return result;
+}
+
+bool isTrusted(const struct stat& status) { return status.st_uid == 0 || status.st_uid == ::geteuid(); }
+
+/// Puts the components of `path` before those that are still to be walked.
+void walkFirst(std::vector<std::string>& rest, std::string_view path) {
+    std::vector<std::string> components = componentsOf(path);
+    rest.insert(rest.end(), components.rbegin(), components.rend());
 }
 
 int removeTree(int directory, const std::string& name, int depth) {
@@ -81,6 +91,35 @@ std::string withSingleSlashes(std::string_view path) {
     return result;
 }
 
+std::variant<FileDescriptor, int> openTrusted(const std::string& directory) {
+    FileDescriptor at(::open("/", kDirectoryFlags));
+    std::vector<std::string> rest;  // the next one last
+    walkFirst(rest, directory);
+    for (int links = 0; at && !rest.empty();) {
+        const std::string name = std::move(rest.back());
+        rest.pop_back();
+        FileDescriptor next(::openat(at.get(), name.c_str(), O_PATH | O_CLOEXEC | O_NOFOLLOW));
+        struct stat status = {};
+        if (!next || ::fstat(next.get(), &status) != 0) return errno;
+        if (!S_ISLNK(status.st_mode)) {
+            if (!S_ISDIR(status.st_mode)) return ENOTDIR;
+            at = std::move(next);
+            continue;
+        }
+        if (!isTrusted(status)) return EACCES;
+        if (++links > kMaximumLinks) return ELOOP;
+        std::array<char, 4096> target{};
+        const ssize_t length = ::readlinkat(next.get(), "", target.data(), target.size());
+        if (length <= 0) return length < 0 ? errno : ENOENT;
+        if (target[0] == '/') at.reset(::open("/", kDirectoryFlags));
+        walkFirst(rest, std::string_view(target.data(), static_cast<std::size_t>(length)));
+    }
+    struct stat status = {};
+    if (!at || ::fstat(at.get(), &status) != 0) return errno;
+    if (!isTrusted(status)) return EACCES;
+    return at;
+}
+
 std::variant<ResolvedName, int> resolveBeneath(const std::string& base, const std::string& path,
                                                Resolution resolution) {
     if (path.find('\0') != std::string::npos) return EINVAL;
@@ -88,9 +127,9 @@ std::variant<ResolvedName, int> resolveBeneath(const std::string& base, const st
     const std::string whole = withSingleSlashes(path);
     if (whole == top) {
         const std::size_t slash = top.rfind('/');
-        FileDescriptor parent(::open(top.substr(0, slash + 1).c_str(), kDirectoryFlags));
-        if (!parent) return errno;
-        return ResolvedName{std::move(parent), top.substr(slash + 1)};
+        auto parent = openTrusted(top.substr(0, slash + 1));
+        if (const int* error = std::get_if<int>(&parent)) return *error;
+        return ResolvedName{std::move(std::get<FileDescriptor>(parent)), top.substr(slash + 1)};
     }
     if (!whole.starts_with(top + "/")) return EACCES;
     std::vector<std::string> components = componentsOf(std::string_view(whole).substr(top.size() + 1));
@@ -100,8 +139,9 @@ std::variant<ResolvedName, int> resolveBeneath(const std::string& base, const st
     ResolvedName result;
     result.name = std::move(components.back());
     components.pop_back();
-    result.directory.reset(::open(top.c_str(), kDirectoryFlags));
-    if (!result.directory) return errno;
+    auto opened = openTrusted(top);
+    if (const int* error = std::get_if<int>(&opened)) return *error;
+    result.directory = std::move(std::get<FileDescriptor>(opened));
     if (components.empty()) return result;
     if (resolution == Resolution::Walk) {
         result.directory = walkBeneath(std::move(result.directory), components);

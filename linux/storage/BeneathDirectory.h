@@ -25,12 +25,17 @@ struct ResolvedName {
 
 /// Finds the place of `path` beneath `base` without ever leaving it: "." and ".." are refused, and so is every link on
 /// the way. The last component is not looked at; what is done with it must not follow links either. Both paths are
-/// absolute, doubled slashes count as one. `base` itself is reached the ordinary way (an administrator may have linked
+/// absolute, doubled slashes count as one. `base` itself is reached as openTrusted does (an administrator may have linked
 /// it elsewhere), and answers as its name in the folder that holds it.
 ///
 /// Answers the error number instead: EACCES for a path outside `base` or with "." or "..", ELOOP or ENOTDIR for a link
 /// on the way, else what the system says. Blocks as long as the disk does.
 std::variant<ResolvedName, int> resolveBeneath(const std::string& base, const std::string& path, Resolution resolution);
+
+/// Opens a directory (O_PATH) by its absolute path. Links on the way and at its end are followed if this user or the
+/// administrator made them; one that somebody else planted, and a directory of somebody else's at the end, are EACCES.
+/// Blocks as long as the disk does.
+std::variant<FileDescriptor, int> openTrusted(const std::string& directory);
 
 /// `path` with every run of slashes as one and none at its end.
 std::string withSingleSlashes(std::string_view path);

@@ -7,6 +7,7 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
 #include <cstdio>
 
@@ -47,10 +48,17 @@ Date wallTime() {
 
 /// What a question needs of the object; owned by the question too, which may outlive the object.
 struct LinuxFileSystem::Place {
+    Place(std::string theRoot, std::string theDirectory, Resolution theResolution, std::function<void()> before)
+        : root(std::move(theRoot)),
+          directory(std::move(theDirectory)),
+          resolution(theResolution),
+          beforeEachQuestion(std::move(before)) {}
+
     std::string root;
     std::string directory;
     Resolution resolution = Resolution::Walk;
     std::function<void()> beforeEachQuestion;
+    mutable std::atomic<bool> directoryWasThere{false};
 
     std::variant<ResolvedName, int> resolve(const std::string& path) const {
         if (beforeEachQuestion) beforeEachQuestion();
@@ -67,13 +75,34 @@ struct LinuxFileSystem::Place {
         return Done{};
     }
 
+    bool isDirectory(const std::string& path) const { return withSingleSlashes(path) == directory; }
+
     /// Opens a directory, following a link only for the temporary directory itself.
     std::variant<FileDescriptor, int> open(const std::string& path, int flags) const {
         const auto place = resolve(path);
         if (const int* error = std::get_if<int>(&place)) return *error;
         const auto& [folder, name] = std::get<ResolvedName>(place);
-        const int noFollow = withSingleSlashes(path) == directory ? 0 : O_NOFOLLOW;
-        FileDescriptor file(::openat(folder.get(), name.c_str(), flags | noFollow | O_CLOEXEC));
+        if (!isDirectory(path)) return reopened(folder.get(), name.c_str(), flags | O_NOFOLLOW);
+        auto opened = openTrusted(directory);
+        if (std::holds_alternative<int>(opened)) return opened;
+        directoryWasThere = true;
+        if ((flags & O_PATH) != 0) return opened;
+        return reopened(std::get<FileDescriptor>(opened).get(), ".", flags);
+    }
+
+    /// As `open`, for the temporary directory: one that was there and is gone is made again, with its parents, so that
+    /// whoever cleans up under a running daemon does not end its service.
+    std::variant<FileDescriptor, int> openDirectoryAgain() const {
+        auto opened = open(directory, O_PATH);
+        const int* error = std::get_if<int>(&opened);
+        if (!error || *error != ENOENT || !directoryWasThere) return opened;
+        if (makeDirectories(directory)) return opened;
+        return open(directory, O_PATH);
+    }
+
+private:
+    static std::variant<FileDescriptor, int> reopened(int folder, const char* name, int flags) {
+        FileDescriptor file(::openat(folder, name, flags | O_CLOEXEC));
         if (!file) return errno;
         return file;
     }
@@ -81,13 +110,18 @@ struct LinuxFileSystem::Place {
 
 LinuxFileSystem::LinuxFileSystem(Options options)
     : place_(std::make_shared<const Place>(
-          Place{options.root, withSingleSlashes(options.root + std::string(kDeviceTemporaryDirectory)),
-                options.resolution ? *options.resolution : availableResolution(), options.beforeEachQuestion})),
+          options.root, withSingleSlashes(options.root + std::string(kDeviceTemporaryDirectory)),
+          options.resolution ? *options.resolution : availableResolution(), options.beforeEachQuestion)),
       bytesBeingWritten_(options.bytesBeingWritten),
       patience_(options.patience) {}
 
 std::optional<Error> LinuxFileSystem::prepare() {
-    return makeDirectories(place_->directory.substr(0, place_->directory.rfind('/')));
+    const std::string parent = place_->directory.substr(0, place_->directory.rfind('/'));
+    if (auto error = makeDirectories(parent)) return error;
+    // What somebody else put in its place, or on the way to it, is found now and not by the first recording.
+    const auto opened = place_->open(place_->directory, O_PATH);
+    const int* error = std::get_if<int>(&opened);
+    return error && *error != ENOENT ? std::optional(systemError(*error)) : std::nullopt;
 }
 
 template <class T>
@@ -112,9 +146,11 @@ bool LinuxFileSystem::exists(const std::string& path) {
 
 std::optional<Error> LinuxFileSystem::createDirectory(const std::string& path) {
     return errorOf(ask<Done>([path](const Place& place) {
-        return place.perform(path, [](int folder, const std::string& name) {
+        auto answer = place.perform(path, [](int folder, const std::string& name) {
             return ::mkdirat(folder, name.c_str(), 0700);
         });
+        if (std::holds_alternative<Done>(answer) && place.isDirectory(path)) place.directoryWasThere = true;
+        return answer;
     }));
 }
 
@@ -124,12 +160,17 @@ Result<FileAttributes> LinuxFileSystem::attributes(const std::string& path) {
         bytesBeingWritten_ ? bytesBeingWritten_(withSingleSlashes(path)) : std::nullopt;
     auto answer = ask<FileAttributes>([path](const Place& place) -> std::variant<FileAttributes, int> {
         struct statx status = {};
-        const auto outcome = place.perform(path, [&](int folder, const std::string& name) {
-            const bool top = withSingleSlashes(path) == place.directory;
-            return ::statx(folder, name.c_str(), top ? 0 : AT_SYMLINK_NOFOLLOW, STATX_BASIC_STATS | STATX_BTIME,
-                           &status);
-        });
-        if (const int* error = std::get_if<int>(&outcome)) return *error;
+        constexpr unsigned kWanted = STATX_BASIC_STATS | STATX_BTIME;
+        if (place.isDirectory(path)) {
+            const auto opened = place.open(path, O_PATH);
+            if (const int* error = std::get_if<int>(&opened)) return *error;
+            if (::statx(std::get<FileDescriptor>(opened).get(), "", AT_EMPTY_PATH, kWanted, &status) != 0) return errno;
+        } else {
+            const auto outcome = place.perform(path, [&](int folder, const std::string& name) {
+                return ::statx(folder, name.c_str(), AT_SYMLINK_NOFOLLOW, kWanted, &status);
+            });
+            if (const int* error = std::get_if<int>(&outcome)) return *error;
+        }
         FileAttributes result;
         result.size = status.stx_size;
         result.modified = dateOf(status.stx_mtime);
@@ -147,7 +188,7 @@ Result<FileAttributes> LinuxFileSystem::attributes(const std::string& path) {
 
 Result<std::uint64_t> LinuxFileSystem::freeSize(const std::string& path) {
     return resultOf(ask<std::uint64_t>([path](const Place& place) -> std::variant<std::uint64_t, int> {
-        const auto opened = place.open(path, O_PATH);
+        const auto opened = place.isDirectory(path) ? place.openDirectoryAgain() : place.open(path, O_PATH);
         if (const int* error = std::get_if<int>(&opened)) return *error;
         struct statvfs status = {};
         if (::fstatvfs(std::get<FileDescriptor>(opened).get(), &status) != 0) return errno;

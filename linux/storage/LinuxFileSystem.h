@@ -20,7 +20,8 @@ using BytesBeingWritten = std::function<std::optional<std::uint64_t>(const std::
 /// The file system role on the disk of this machine. Only the temporary directory and what is beneath it can be
 /// reached; links in it are never followed: they answer with their own attributes, and removing one removes the link.
 /// What the disk has not answered in time is ETIMEDOUT. Everything is made for this user alone, whatever the process's
-/// umask.
+/// umask. The temporary directory that was there and is gone is made again when its free size is asked for, which every
+/// recording begins with.
 class LinuxFileSystem final : public FileSystem {
 public:
     struct Options {
@@ -33,7 +34,8 @@ public:
     explicit LinuxFileSystem(Options options);
 
     /// Makes the folders that hold the temporary directory (not the directory itself), each for this user alone. Once,
-    /// at the start; blocks as long as the disk does. The error when one could not be made.
+    /// at the start; blocks as long as the disk does. The error when one could not be made, or when the directory or a
+    /// link on the way to it is somebody else's (EACCES).
     [[nodiscard]] std::optional<Error> prepare();
 
     std::string root() const override;

@@ -9,6 +9,7 @@
 
 #include <cerrno>
 #include <csignal>
+#include <filesystem>
 #include <fstream>
 #include <random>
 
@@ -41,6 +42,34 @@ TEST(Disk, PathsThatClimbAreRefused) {
     const auto made = writers.make(URL::file(directory.file("../climbed.mp4")), ContainerType::Mpeg4);
     ASSERT_TRUE(std::holds_alternative<Error>(made));
     EXPECT_FALSE(std::filesystem::exists(directory.file("../climbed.mp4")));
+}
+
+TEST(Disk, NothingIsMadeButInTheDirectoryItself) {
+    namespace fs = std::filesystem;
+    OwnDirectory own;
+    const fs::path directory = own.file("movies"), outside = own.file("outside");
+    fs::create_directory(directory);
+    fs::create_directory(outside);
+    fs::create_directory_symlink(outside, directory / "App");
+    media::PosixMovieFiles files(directory.string());
+    const auto error = [&](const std::string& path) {
+        const auto made = files.create(path);
+        return std::holds_alternative<int>(made) ? std::get<int>(made) : 0;
+    };
+    EXPECT_EQ(error(directory.string() + "//App/Two.mp4"), EACCES) << "a name with a slash";
+    EXPECT_EQ(error(outside.string() + "/App.mp4"), EACCES);
+    EXPECT_EQ(error(directory.string() + "/../outside/App.mp4"), EINVAL);
+    EXPECT_EQ(error(directory.string() + "/" + std::string(252, 'n') + ".mp4"), ENAMETOOLONG);
+    EXPECT_EQ(error(directory.string() + "/" + std::string(251, 'n') + ".mp4"), 0);
+    EXPECT_TRUE(fs::is_empty(outside));
+    if (::geteuid() != 0) return;  // only the administrator can plant something in somebody else's name
+    fs::remove_all(directory);
+    fs::create_directory_symlink(outside, directory);
+    EXPECT_EQ(error(directory.string() + "/App.mp4"), 0) << "a link of its own";
+    fs::remove(outside / "App.mp4");
+    ASSERT_EQ(::lchown(directory.c_str(), 65534, 65534), 0);
+    EXPECT_EQ(error(directory.string() + "/App.mp4"), EACCES);
+    EXPECT_TRUE(fs::is_empty(outside));
 }
 
 TEST(Disk, ThatIsFullFailsTheMovieWithItsError) {

@@ -68,6 +68,53 @@ TEST(LinuxFileSystem, WhatIsMadeIsThisUsersAlone) {
     EXPECT_EQ(modeOf(disk.directory + "/sub"), 0700u);
 }
 
+TEST(LinuxFileSystem, TheDirectoryThatWasRemovedIsMadeAgainWhenItsFreeSizeIsAskedFor) {
+    Disk disk;
+    EXPECT_EQ(code(disk.fileSystem->freeSize(disk.directory)), ENOENT) << "making it at first is not this one's business";
+    EXPECT_FALSE(disk.fileSystem->createDirectory(disk.directory));
+    for (const char* removed : {"root/private/var/mobile/Library/Lumacast", "root"}) {
+        std::filesystem::remove_all(disk.scratch.path(removed));
+        EXPECT_EQ(code(disk.fileSystem->attributes(disk.directory)), ENOENT);
+        EXPECT_EQ(code(disk.fileSystem->freeSize(disk.directory + "/")), 0);
+        EXPECT_EQ(modeOf(disk.directory), 0700u);
+        EXPECT_EQ(modeOf(disk.scratch.path("root/private")), 0700u);
+    }
+}
+
+TEST(LinuxFileSystem, WhatSomebodyElsePlantedInItsPlaceIsRefused) {
+    Disk disk;
+    const std::string elsewhere = disk.scratch.makeDirectory("elsewhere");
+    disk.scratch.write("elsewhere/precious.mp4", "precious");
+    std::filesystem::create_directory_symlink(elsewhere, disk.directory);
+    EXPECT_EQ(code(disk.fileSystem->freeSize(disk.directory)), 0) << "one's own link";
+    EXPECT_FALSE(disk.fileSystem->prepare());
+    if (::geteuid() != 0) return;  // only the administrator can plant something in somebody else's name
+    constexpr uid_t kSomebody = 65534;
+    const auto expectRefused = [&] {
+        EXPECT_EQ(code(disk.fileSystem->freeSize(disk.directory)), EACCES);
+        EXPECT_EQ(code(disk.fileSystem->attributes(disk.directory)), EACCES);
+        EXPECT_EQ(code(disk.fileSystem->list(disk.directory)), EACCES);
+        EXPECT_EQ(disk.fileSystem->remove(disk.directory + "/precious.mp4")->code(), EACCES);
+        EXPECT_EQ(disk.fileSystem->createDirectory(disk.directory + "/new")->code(), EACCES);
+        EXPECT_EQ(disk.fileSystem->prepare()->code(), EACCES) << "at the start";
+        EXPECT_EQ(ScratchDirectory::read(elsewhere + "/precious.mp4"), "precious");
+    };
+    ASSERT_EQ(::lchown(disk.directory.c_str(), kSomebody, kSomebody), 0);
+    expectRefused();
+    std::filesystem::remove(disk.directory);
+    std::filesystem::create_directory(disk.directory);
+    ASSERT_EQ(::lchown(disk.directory.c_str(), kSomebody, kSomebody), 0);
+    expectRefused();
+    // A link on the way.
+    std::filesystem::remove(disk.directory);
+    const std::string library = std::filesystem::path(disk.directory).parent_path().string();
+    std::filesystem::remove(library);
+    std::filesystem::create_directory_symlink(elsewhere, library);
+    ASSERT_EQ(::lchown(library.c_str(), kSomebody, kSomebody), 0);
+    EXPECT_EQ(disk.fileSystem->createDirectory(disk.directory)->code(), EACCES);
+    EXPECT_FALSE(std::filesystem::exists(elsewhere + "/Lumacast"));
+}
+
 TEST(LinuxFileSystem, AHungDiskIsUnreadableAfter40Milliseconds) {
     Disk disk(40ms);
     ASSERT_TRUE(until(
