@@ -140,8 +140,10 @@ void World::install(const std::string& identifier, const std::string& name, cons
         << "[Desktop Entry]\nType=Application\nName=" << name << "\nExec=\"" << executable << "\"\n";
 }
 
-void World::startDaemon() {
-    daemon_ = std::make_unique<checkers::Child>(std::vector<std::string>{LC_DAEMON}, environment_, path("daemon.log"));
+void World::startDaemon(const std::vector<std::string>& variables) {
+    std::vector<std::string> environment = environment_;
+    environment.insert(environment.end(), variables.begin(), variables.end());
+    daemon_ = std::make_unique<checkers::Child>(std::vector<std::string>{LC_DAEMON}, environment, path("daemon.log"));
     EXPECT_TRUE(waitUntil([this] { return !status().is_null(); })) << daemonLog();
 }
 
@@ -183,6 +185,26 @@ bool World::waitForElapsed(double seconds) {
 std::size_t World::daemonDescriptors() {
     const fs::directory_iterator open("/proc/" + std::to_string(daemon_->pid()) + "/fd");
     return static_cast<std::size_t>(std::distance(fs::begin(open), fs::end(open)));
+}
+
+std::size_t World::daemonNumber(const std::string& name) {
+    std::ifstream file("/proc/" + std::to_string(daemon_->pid()) + "/status");
+    for (std::string line; std::getline(file, line);)
+        if (line.starts_with(name + ":")) return std::stoul(line.substr(name.size() + 1));
+    ADD_FAILURE() << "no " << name;
+    return 0;
+}
+
+std::vector<std::string> World::troubledDisk() const {
+    return {std::string("LD_PRELOAD=") + LC_SLOW_DISK, "LC_DISK=" + fs::path(moviePath()).parent_path().string(),
+            "LC_DISK_STALLED=" + path("disk stalled"), "LC_DISK_FULL=" + path("disk full")};
+}
+
+void World::setFlag(const std::string& name, bool on) const {
+    if (on)
+        std::ofstream file(path(name));
+    else
+        fs::remove(path(name));
 }
 
 std::string World::moviePath(const std::string& name) const {

@@ -67,8 +67,8 @@ public:
     World(const World&) = delete;
     World& operator=(const World&) = delete;
 
-    /// Starts the daemon and waits for its sockets.
-    void startDaemon();
+    /// Starts the daemon and waits for its sockets. `variables` are its alone.
+    void startDaemon(const std::vector<std::string>& variables = {});
     checkers::Child& daemon() { return *daemon_; }
     /// Ends it with a signal and waits; its exit status, -1 when the signal ended it.
     int endDaemon(int signal);
@@ -84,17 +84,25 @@ public:
     /// Waits until the running recording is at least so old.
     bool waitForElapsed(double seconds);
     std::size_t daemonDescriptors();
+    /// A number of /proc/<pid>/status, such as "Threads" or "VmRSS" (kB).
+    std::size_t daemonNumber(const std::string& name);
     /// The movie that the recordings of an application are written to.
     std::string moviePath(const std::string& name = "Self Recorder") const;
     std::string daemonLog() const;
 
     std::string path(const std::string& name) const { return folder_ + "/" + name; }
     const std::vector<std::string>& environment() const { return environment_; }
+    /// The variables that make a daemon's disk one that can stop answering or be full (tests/system/slow_disk).
+    std::vector<std::string> troubledDisk() const;
+    void setDiskStalled(bool stalled) const { setFlag("disk stalled", stalled); }
+    void setDiskFull(bool full) const { setFlag("disk full", full); }
     const PrivateDisplay& display() const { return display_; }
     /// Installs a program as an application.
     void install(const std::string& identifier, const std::string& name, const std::string& executable);
 
 private:
+    void setFlag(const std::string& name, bool on) const;
+
     std::string folder_;
     PrivateDisplay display_;
     std::vector<std::string> environment_;

@@ -1,0 +1,140 @@
+// A disk that stops answering for ten seconds, and one that is full, under a recording.
+
+#include <gtest/gtest.h>
+#include <poll.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <map>
+#include <sstream>
+
+#include "tests/system/RawClient.h"
+#include "tests/system/World.h"
+
+namespace lumacast::test {
+namespace {
+
+using std::chrono::milliseconds;
+
+#ifdef LC_SANITIZED
+const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "6"};
+#else
+const std::vector<std::string> kMoving{"--size", "640x360", "--fps", "30"};
+/// How long a request of another client may take, whatever the disk does.
+constexpr milliseconds kAnswerWithin{50};
+#endif
+constexpr std::chrono::seconds kStall{10};
+
+double inMilliseconds(std::chrono::nanoseconds time) {
+    return std::chrono::duration<double, std::milli>(time).count();
+}
+
+/// Asks for the state again and again; the longest wait.
+std::chrono::nanoseconds longestAnswer(RawClient& client, std::chrono::nanoseconds duration, std::size_t& answers) {
+    std::chrono::nanoseconds longest{0};
+    const auto end = std::chrono::steady_clock::now() + duration;
+    while (std::chrono::steady_clock::now() < end) {
+        const auto took = client.askForState();
+        if (!took) {
+            ADD_FAILURE() << "not served";
+            break;
+        }
+        longest = std::max(longest, *took);
+        ++answers;
+        ::poll(nullptr, 0, 2);  // a pace, not a wait: hundreds of requests a second are enough
+    }
+    return longest;
+}
+
+TEST(DiskTrouble, AStallOfTenSecondsHoldsNobodyUpAndTheRecordingGoesOn) {
+    World world;
+    installThisProcess(world);
+    world.startDaemon(world.troubledDisk());
+    const auto application = world.application(kMoving);
+    ASSERT_TRUE(application->waitForFrame(3));
+    const std::uint32_t first = application->askForFrame("start");
+    ASSERT_TRUE(world.waitForElapsed(1));
+    RawClient other(world);
+    ASSERT_TRUE(other.isConnected());
+    std::size_t answers = 0;
+    const auto before = longestAnswer(other, std::chrono::seconds(1), answers);
+
+    const auto sizeOnDisk = [&] { return std::filesystem::file_size(world.moviePath()); };
+    world.setDiskStalled(true);
+    const std::uint32_t stalledFrom = application->askForFrame("frame");
+    answers = 0;
+    auto during = longestAnswer(other, kStall / 2, answers);
+    const auto sizeAtHalf = sizeOnDisk();
+    during = std::max(during, longestAnswer(other, kStall / 2, answers));
+    EXPECT_EQ(sizeOnDisk(), sizeAtHalf) << "the disk does not stall";
+    EXPECT_FALSE(world.recording().is_null()) << "it goes on";
+    const std::uint32_t stalledTo = application->askForFrame("frame");
+    world.setDiskStalled(false);
+    EXPECT_TRUE(waitUntil([&] { return sizeOnDisk() > sizeAtHalf; }));
+
+    ASSERT_TRUE(application->waitForFrame(stalledTo + 30));
+    const std::uint32_t last = application->askForFrame("frame");
+    const auto drawn = application->framesLog();
+    const std::string movie = application->stop();
+    ASSERT_FALSE(movie.empty()) << world.daemonLog();
+    std::set<std::uint32_t> shown;
+    for (const auto& picture : picturesOf(movie))
+        if (picture.number) shown.insert(*picture.number);
+    std::size_t lost = 0, lostInStall = 0, all = 0;
+    for (const auto& [number, times] : drawn) {
+        if (number <= first || number >= last) continue;
+        ++all;
+        if (shown.contains(number)) continue;
+        ++lost;
+        if (number >= stalledFrom && number <= stalledTo) ++lostInStall;
+    }
+    std::printf("stall of %lld s: %zu answers, the longest after %.1f ms (%.1f ms before it); of %zu frames %zu lost, "
+                "%zu of them during the stall\n",
+                static_cast<long long>(kStall.count()), answers, inMilliseconds(during), inMilliseconds(before), all,
+                lost, lostInStall);
+    RecordProperty("longest_answer_us", static_cast<int>(during.count() / 1000));
+    RecordProperty("frames_lost", static_cast<int>(lost));
+    EXPECT_GT(answers, 100u);
+    EXPECT_GT(all, 50u);
+    EXPECT_TRUE(shown.contains(last - 1)) << "what was drawn after the stall";
+#ifndef LC_SANITIZED
+    EXPECT_LE(during, kAnswerWithin);
+    // What such a recording makes in ten seconds fits into what may wait for the disk.
+    EXPECT_EQ(lost, 0u);
+#endif
+}
+
+TEST(DiskTrouble, AFullDiskLeavesAMovieThatPlaysAndTheNextOneWorks) {
+    World world;
+    world.startDaemon(world.troubledDisk());
+    const auto application = world.application(kMoving);
+    ASSERT_TRUE(application->waitForFrame(3));
+    (void)application->askForFrame("start");
+    ASSERT_TRUE(world.waitForElapsed(1));
+    world.setDiskFull(true);
+    ASSERT_TRUE(waitUntil([&] { return world.daemonLog().find("ERROR starting asset writer") != std::string::npos; }));
+    const std::uint32_t from = application->askForFrame("frame");
+    ASSERT_TRUE(application->waitForFrame(from + 30));
+    // The client hears nothing of it before it stops; what was written until then plays.
+    const std::string movie = application->stop();
+    EXPECT_FALSE(picturesOf(movie, true).empty());
+    // The prescribed line for each frame, and nothing else that repeats or comes from the port.
+    std::map<std::string, std::size_t> lines;
+    std::istringstream log(world.daemonLog());
+    for (std::string line; std::getline(log, line);) ++lines[line];
+    for (const auto& [line, count] : lines) {
+        if (line == "info ERROR starting asset writer") {
+            EXPECT_LE(count, application->framesLog().size()) << "once a frame";
+        } else {
+            EXPECT_EQ(count, 1u) << line;
+            EXPECT_FALSE(line.starts_with("error ")) << line;
+        }
+    }
+    world.setDiskFull(false);
+    (void)application->askForFrame("start");
+    ASSERT_TRUE(world.waitForElapsed(1));
+    EXPECT_FALSE(picturesOf(application->stop()).empty());
+}
+
+}  // namespace
+}  // namespace lumacast::test
