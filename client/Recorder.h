@@ -4,100 +4,110 @@
 #include <chrono>
 #include <cstdint>
 #include <functional>
-#include <future>
 #include <memory>
 #include <optional>
 #include <string>
-#include <vector>
 
 #include "base/Identifiers.h"
 #include "base/Value.h"
+#include "client/Answers.h"
+#include "client/Errors.h"
 
 namespace lumacast::client {
 
-/// The domain of errors that come from the connection, not from the daemon; see ConnectionError.
-inline constexpr char kConnectionErrorDomain[] = "com.orvane.Lumacast.client";
+class Link;
 
-enum class ConnectionError : std::int64_t {
-    NotReached = 1,  ///< the daemon is not there, or the connection ended before the answer came
-};
+/// For calls that wait: without a limit, until the daemon answers or the connection ends.
+inline constexpr std::chrono::milliseconds kNoLimit = std::chrono::milliseconds::max();
+/// For what the daemon may leave without an answer.
+inline constexpr std::chrono::milliseconds kPatience = std::chrono::seconds(60);
 
-struct StartOptions {
-    /// The application's own windows (on X11: window ids). All must belong to the application.
-    std::vector<ContextID> windows;
-    /// Size of the movie in pixels; the daemon caps it.
-    Size size;
-    bool microphone = false;
-    bool camera = false;
-    bool broadcast = false;
-    bool systemRecording = false;
-    bool capture = false;
-};
-
-struct StartAnswer {
-    std::optional<Error> error;
-    bool microphoneRecording = false;
-    bool cameraRecording = false;
-};
-
-struct StopAnswer {
-    /// The finished movie. The file is good until the application records again, discards it, or the device needs the
-    /// space: copy it or open it before.
-    std::optional<URL> movie;
-    std::optional<Error> error;
-};
-
-struct StateAnswer {
-    std::optional<Dictionary> state;
-    std::optional<Error> error;
-};
-
-/// One application's connection to the daemon. Thread-safe. Every answer and every event comes on a thread of the
-/// library's own, one at a time; answers exactly once each, with a connection error when the daemon can't be reached or
-/// goes away (a request that the daemon never answers waits until then). Destroying the recorder ends a running
-/// recording, answers what is pending and joins that thread: never destroy it from a handler.
+/// One application's connection to the daemon.
+///
+/// Threads: callable from any thread, handlers included; nothing blocks but the calls that say so. Every answer and
+/// event comes on one thread of the library's own, one at a time, never from within a call, with all signals blocked.
+/// A handler must not throw, and holds up all others.
+///
+/// Answers: each question is answered exactly once: by the daemon, or with a connection error when it can't be reached,
+/// goes away, or the recorder is destroyed (see ConnectionError for what each means). Questions that the daemon
+/// deliberately leaves without an answer say so below: they wait until the connection ends, and 64 that wait are the
+/// most there can be.
+///
+/// Connection: made at once, and again by itself after it was lost, 50 ms later at first, then less and less often, at
+/// the longest every 5 s. In between, questions are answered with NotReached at once and messages without an answer are
+/// lost; while the daemon is there but too many wait to be accepted, up to 64 of both are held. An application has one
+/// connection: a newer one, of whatever process of it, takes the older one's place, and its recording goes on. The
+/// older recorder is told `disconnected` and stays so until it is asked for something, which makes it the newest.
+///
+/// Movies: the file that a StopAnswer names stays until the application's next start, its discard(), or a day has
+/// passed; or until the device runs out of space (below 100 MB free, or by the administrator's purge). Its name is the
+/// application's, so the next recording takes its place. Move it, copy it or open it before; an opened file stays
+/// readable.
+///
+/// Destroying the recorder ends a running recording and throws it away, answers what is pending with Closed and waits
+/// for the handler that is running. From within a handler it does all that but the waiting. No handler runs after it.
 class Recorder {
 public:
-    struct Events {
-        /// The recording ended by itself, or another one took its place.
-        std::function<void(std::optional<Error> error, std::optional<URL> movie)> stopped;
-        /// The daemon went away. The recorder is of no use any more.
-        std::function<void()> disconnected;
-    };
+    using Events = client::Events;
 
     /// Connects to the daemon whose sockets are in `runtimeDirectory`; by default the user's
-    /// ("$XDG_RUNTIME_DIR/lumacast").
+    /// ("$XDG_RUNTIME_DIR/lumacast"). Does not wait for the connection: ask at once. Throws std::system_error when no
+    /// thread can be had.
     explicit Recorder(Events events, std::string runtimeDirectory = defaultRuntimeDirectory());
     ~Recorder();
     Recorder(const Recorder&) = delete;
     Recorder& operator=(const Recorder&) = delete;
 
+    /// Starts a recording; one that is running, of whatever application, ends.
     void start(const StartOptions& options, std::function<void(StartAnswer)> answered);
     /// Stops and keeps the whole movie. Not answered when nothing is being recorded.
     void stop(std::function<void(StopAnswer)> answered);
     /// Stops and keeps the movie without its first `fromStart` and last `fromEnd` seconds (rounded to whole ones, both
-    /// above 0). Not answered when the clip can't be made.
+    /// above 0). Not answered when nothing is being recorded, or the clip can't be made.
     void stopWithClip(double fromStart, double fromEnd, std::function<void(StopAnswer)> answered);
-    void pause();
-    /// Goes on, recording `window`.
-    void resume(ContextID window);
     /// Deletes the last movie. Not answered while recording.
     void discard(std::function<void(std::optional<Error>)> answered);
-    /// The application's state as the daemon has it: "isRecording" and others.
+    /// The application's state as the daemon has it; see RecordingState. It comes after the effect of all that was
+    /// asked before.
     void state(std::function<void(StateAnswer)> answered);
 
-    // The same, waiting for the answer. Never call them from a handler.
-    StartAnswer startAndWait(const StartOptions& options);
-    StopAnswer stopAndWait();
-    StopAnswer stopWithClipAndWait(double fromStart, double fromEnd);
-    StateAnswer stateAndWait();
+    // Without an answer; ignored where they don't apply.
+
+    /// Pauses a running recording. What happens until the resume is not in the movie.
+    void pause();
+    /// Goes on, recording `window`. With a window that is not the application's own a paused recording is stopped:
+    /// `stopped` tells NoContextIDMatch and the movie.
+    void resume(ContextID window);
+    /// Turns the microphone of a running recording on or off.
+    void setMicrophoneEnabled(bool enabled);
+    /// What the application wants to remember; it comes back with the state.
+    void setMicrophoneEnabledPersistent(bool enabled);
+    void setHasUserConsentForMicrophone(bool consent);
+    void setHasUserConsentForCamera(bool consent);
+    void setBroadcastURL(const std::optional<URL>& url);
+    /// Whose sound a running recording takes.
+    void setProcessForAudioCapture(ProcessID pid);
+    /// The application came to the foreground: an interrupted recording that waits for it is told as `stopped`.
+    void didBecomeActive();
+    /// The application left the foreground. The user may be asked anew when it comes back late.
+    void didResignActive();
+    /// Accepted by the daemon, and ignored.
+    void reportCameraUsage(std::int32_t usage);
+
+    // The questions once more, waiting for the answer, at most `limit` (then NoAnswer; the request is not taken back).
+    // From a handler they answer WouldBlock at once.
+
+    StartAnswer startAndWait(const StartOptions& options, std::chrono::milliseconds limit = kNoLimit);
+    StopAnswer stopAndWait(std::chrono::milliseconds limit = kPatience);
+    StopAnswer stopWithClipAndWait(double fromStart, double fromEnd, std::chrono::milliseconds limit = kPatience);
+    std::optional<Error> discardAndWait(std::chrono::milliseconds limit = kPatience);
+    StateAnswer stateAndWait(std::chrono::milliseconds limit = kNoLimit);
 
     /// "$XDG_RUNTIME_DIR/lumacast", or "/run/user/UID/lumacast" without that variable.
     static std::string defaultRuntimeDirectory();
 
 private:
-    class Connection;
-    std::shared_ptr<Connection> connection_;
+    const std::shared_ptr<Link> link_;
 };
 
 }  // namespace lumacast::client

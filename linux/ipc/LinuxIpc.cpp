@@ -33,6 +33,17 @@ std::shared_ptr<IpcConnection> LinuxIpc::connectToService(const std::string& nam
     return connectionOver(std::move(socket), std::move(peer));
 }
 
+LinuxIpc::Attempt LinuxIpc::tryService(const std::string& name) {
+    Attempt attempt;
+    ServiceCall call = callServiceSocket(runtimeDirectory_, name);
+    attempt.isBusy = call.isBusy;
+    if (!call.socket) return attempt;
+    attempt.peer = Peer::of(call.socket.get());
+    Peer peer = Peer::of(call.socket.get());
+    attempt.connection = connectionOver(std::move(call.socket), std::move(peer));
+    return attempt;
+}
+
 std::shared_ptr<IpcConnection> LinuxIpc::connectToEndpoint(const std::shared_ptr<IpcEndpoint>& endpoint) {
     EndpointCall call;
     if (endpoint) call = ringEndpoint(*endpoint);

@@ -43,6 +43,15 @@ public:
     std::shared_ptr<IpcConnection> connectToService(const std::string& name) override;
     std::shared_ptr<IpcConnection> connectToEndpoint(const std::shared_ptr<IpcEndpoint>& endpoint) override;
 
+    /// What came of one attempt to reach a service.
+    struct Attempt {
+        std::shared_ptr<IpcConnection> connection;  ///< null when the service was not reached
+        bool isBusy = false;  ///< it was not because so many wait to be accepted: try again later
+        Peer peer;            ///< who listens there
+    };
+    /// connectToService for those who try again: answers at once whether the service was reached. Never blocks.
+    Attempt tryService(const std::string& name);
+
     /// An endpoint's descriptor, for a child process to inherit; -1 when it has none. Stays the endpoint's.
     static int descriptorOf(const IpcEndpoint& endpoint);
     /// An endpoint from a descriptor that was inherited. Null when it is none.

@@ -161,12 +161,19 @@ ServiceSocket::~ServiceSocket() {
     if (!path_.empty() && lock_) unlink(path_.c_str());
 }
 
-Fd connectToServiceSocket(const std::string& runtimeDirectory, const std::string& service) {
+ServiceCall callServiceSocket(const std::string& runtimeDirectory, const std::string& service) {
+    ServiceCall call;
     const auto address = addressOf(socketPath(runtimeDirectory, service));
-    if (!isPlainName(service) || !address) return Fd();
+    if (!isPlainName(service) || !address) return call;
     Fd socket = streamSocket();
-    if (!socket || !connectTo(socket, *address)) return Fd();
-    return socket;
+    if (!socket) return call;
+    if (connectTo(socket, *address)) call.socket = std::move(socket);
+    else call.isBusy = errno == EAGAIN;
+    return call;
+}
+
+Fd connectToServiceSocket(const std::string& runtimeDirectory, const std::string& service) {
+    return callServiceSocket(runtimeDirectory, service).socket;
 }
 
 }  // namespace lumacast

@@ -55,7 +55,16 @@ private:
     std::string path_;  ///< removed at the end; empty when it isn't ours
 };
 
-/// A stream socket connected to a named service; none when nobody listens, or nobody can be told at once. Never blocks.
+/// One attempt to reach a named service.
+struct ServiceCall {
+    Fd socket;            ///< connected; none when that was not possible
+    bool isBusy = false;  ///< there is none because so many wait to be accepted: somebody listens, try again later
+};
+
+/// Connects a stream socket to a named service. Never blocks.
+ServiceCall callServiceSocket(const std::string& runtimeDirectory, const std::string& service);
+
+/// The same without the reason: none when nobody listens, or nobody can be told at once.
 Fd connectToServiceSocket(const std::string& runtimeDirectory, const std::string& service);
 
 }  // namespace lumacast
