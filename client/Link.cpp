@@ -40,6 +40,8 @@ constexpr auto kLookDelay = 250ms;
 /// Between two attempts at a full backlog, and for how long they are made before the daemon counts as not there.
 constexpr auto kBusyDelay = 20ms;
 constexpr auto kBusyLimit = 10s;
+/// As many as can be under way together with the connection's own first question.
+constexpr std::size_t kMostHeld = limitOf(Limit::MessagesInFlight) - 1;
 
 }  // namespace
 
@@ -112,7 +114,7 @@ void Link::request(Request request) {
         case LinkState::Reached:
         case LinkState::Open: return transmit(std::move(request));
         case LinkState::Busy:
-            if (held_.size() < limitOf(Limit::MessagesInFlight)) return held_.push_back(std::move(request));
+            if (held_.size() < kMostHeld) return held_.push_back(std::move(request));
             if (request.question) failLater(*request.question, ConnectionError::Busy);
             return;
         case LinkState::Away:

@@ -35,7 +35,7 @@ inline constexpr std::chrono::milliseconds kPatience = std::chrono::seconds(60);
 ///
 /// Connection: made at once, and again by itself after it was lost, 50 ms later at first, then less and less often, at
 /// the longest every 5 s. In between, questions are answered with NotReached at once and messages without an answer are
-/// lost; while the daemon is there but too many wait to be accepted, up to 64 of both are held. An application has one
+/// lost; while the daemon is there but too many wait to be accepted, up to 63 of both are held. An application has one
 /// connection: a newer one, of whatever process of it, takes the older one's place, and its recording goes on. The
 /// older recorder is told `disconnected` and stays so until it is asked for something, which makes it the newest.
 ///
