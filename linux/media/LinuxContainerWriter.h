@@ -24,6 +24,7 @@ public:
     void endSession(MediaTime time) override { recording_->endSession(time); }
     void finishWriting(std::function<void()> completion) override { recording_->finish(std::move(completion)); }
     std::uint64_t bytesWritten() const override { return recording_->bytesWritten(); }
+    std::uint64_t picturesTaken() const override { return recording_->picturesTaken(); }
 
 private:
     std::shared_ptr<TrackInput> addTrack(media::TrackPlan plan);

@@ -71,6 +71,7 @@ bool MovieRecording::append(std::size_t number, const SampleRef& sample) {
     if (isRepeat || isEarly || isLate) return true;
     track.lastNanoseconds = stamp;
     track.waiting += 1;
+    if (isVideo) picturesTaken_.fetch_add(1, std::memory_order_relaxed);
     items_.push_back({number, sample, *stamp - *sessionStart_});
     changed_.notify_all();
     return true;

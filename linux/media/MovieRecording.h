@@ -58,6 +58,7 @@ public:
     ContainerStatus status() const;
     std::optional<Error> error() const;
     std::uint64_t bytesWritten() const { return disk_.bytesWritten(); }
+    std::uint64_t picturesTaken() const { return picturesTaken_.load(std::memory_order_relaxed); }
 
     /// Whether both threads have nothing left to do but end.
     bool hasEnded() const { return ended_.load(std::memory_order_acquire) && disk_.hasEnded(); }
@@ -106,6 +107,7 @@ private:
     bool finishing_ = false;  ///< finish was asked for; no samples are taken
     bool abandoned_ = false;
     std::atomic<bool> ended_ = false;
+    std::atomic<std::uint64_t> picturesTaken_ = 0;
 
     DiskWriter disk_;
     std::thread thread_;

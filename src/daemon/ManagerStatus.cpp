@@ -12,7 +12,10 @@ Dictionary describeRecording(const LCRecordingSession& session) {
         recording.set("path", writer->outputPath());
         recording.set("width", writer->windowSize().width);
         recording.set("height", writer->windowSize().height);
-        if (const auto file = writer->assetWriter()) recording.set("bytes", file->bytesWritten());
+        if (const auto file = writer->assetWriter()) {
+            recording.set("bytes", file->bytesWritten());
+            recording.set("framesRecorded", file->picturesTaken());
+        }
     }
     if (const auto agent = session.reportingAgent()) recording.set("frames", agent->metrics().videoFrameCount);
     if (const auto source = session.screenCaptureController()) {

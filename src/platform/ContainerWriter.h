@@ -89,6 +89,9 @@ public:
 
     /// For status reports, callable from any lane: bytes written so far.
     virtual std::uint64_t bytesWritten() const = 0;
+    /// The same of the pictures: those that the movie was given and keeps, up to now. Not counted are the refused ones
+    /// and those that append drops.
+    virtual std::uint64_t picturesTaken() const = 0;
 };
 
 enum class ContainerType { Mpeg4 };

@@ -167,6 +167,25 @@ TEST_P(ContainerWriterContract, SamplesThatCannotBeTakenAreRefused) {
     EXPECT_EQ(writer->status(), ContainerStatus::Writing);
 }
 
+TEST_P(ContainerWriterContract, CountsThePicturesThatTheMovieKeeps) {
+    const auto writer = make();
+    const auto video = writer->addVideoInput(videoSettings(kWidth, kHeight));
+    const auto audio = writer->addAudioInput(audioSettings());
+    EXPECT_FALSE(video->append(pictureAt(0))) << "refused";
+    EXPECT_EQ(writer->picturesTaken(), 0u);
+    ASSERT_TRUE(writer->startWriting());
+    writer->startSession(atSeconds(1));
+    EXPECT_TRUE(video->append(pictureAt(0))) << "before the session: dropped";
+    EXPECT_EQ(writer->picturesTaken(), 0u);
+    EXPECT_TRUE(video->append(pictureAt(1)));
+    EXPECT_TRUE(video->append(pictureAt(1))) << "repeated: dropped";
+    EXPECT_TRUE(video->append(pictureAt(2)));
+    EXPECT_FALSE(audio->append(pictureAt(3))) << "refused";
+    EXPECT_EQ(writer->picturesTaken(), 2u);
+    finish(*writer);
+    EXPECT_EQ(writer->picturesTaken(), 2u) << "they stay counted";
+}
+
 TEST_P(ContainerWriterContract, FinishingCompletesTheMovieOnceAndNotInline) {
     const auto writer = make();
     const auto input = writer->addVideoInput(videoSettings(kWidth, kHeight));

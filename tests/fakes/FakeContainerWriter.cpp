@@ -68,6 +68,7 @@ public:
     void endSession(MediaTime time) override { recording_->endSession(time); }
     void finishWriting(std::function<void()> completion) override { recording_->finish(std::move(completion)); }
     std::uint64_t bytesWritten() const override { return recording_->bytesWritten(); }
+    std::uint64_t picturesTaken() const override { return recording_->picturesTaken(); }
 
 private:
     std::shared_ptr<TrackInput> add(MediaType type, const Dictionary& settings) {
@@ -123,6 +124,7 @@ bool FakeRecording::append(std::size_t track, const SampleRef& sample) {
         if (isRepeat || isEarly || isLate) return true;
         into.samples.push_back(sample);
         bytes_ += bytes;
+        if (isVideo) ++pictures_;
     }
     if (faults_.fails("ContainerWriter.append") || !files_.append(*file_, bytes)) fail(fakeSystemError(ENOSPC));
     return true;
@@ -216,6 +218,11 @@ ContainerStatus FakeRecording::status() const {
 std::optional<Error> FakeRecording::error() const {
     const std::lock_guard lock(mutex_);
     return error_;
+}
+
+std::uint64_t FakeRecording::picturesTaken() const {
+    const std::lock_guard lock(mutex_);
+    return pictures_;
 }
 
 std::uint64_t FakeRecording::bytesWritten() const {

@@ -33,6 +33,7 @@ public:
     ContainerStatus status() const;
     std::optional<Error> error() const;
     std::uint64_t bytesWritten() const;
+    std::uint64_t picturesTaken() const;
     const URL& outputURL() const { return outputURL_; }
 
     // For tests.
@@ -73,6 +74,7 @@ private:
     std::optional<MediaTime> clockAtFinish_;
     std::vector<std::function<void()>> completions_;
     std::uint64_t bytes_ = 0;
+    std::uint64_t pictures_ = 0;
     bool finishing_ = false;
     bool abandoned_ = false;
     bool held_ = false;

@@ -234,6 +234,7 @@ public:
         void endSession(MediaTime) override {}
         void finishWriting(std::function<void()> completion) override { completion(); }
         std::uint64_t bytesWritten() const override { return 0; }
+        std::uint64_t picturesTaken() const override { return owner.appended.size(); }
         UnreadyWriters& owner;
         const URL url;
         ContainerStatus state = ContainerStatus::Unknown;
