@@ -1,13 +1,37 @@
 #pragma once
+#include <array>
+#include <string>
 
 namespace lumacast::ctl {
 
-/// The tool's exit statuses, for scripts. Also in its --help.
+/// The tool's exit statuses, for scripts.
 enum ExitStatus : int {
     kGood = 0,
-    kNoAnswer = 1,  ///< the daemon isn't running or does not answer, or the answer could not be written
+    kNoAnswer = 1,
     kWrongUsage = 2,
-    kProblemsFound = 3,  ///< by the doctor
+    kProblemsFound = 3,
 };
+
+struct ExitStatusRow {
+    ExitStatus status;
+    const char* meaning;
+};
+
+/// The one table of what they mean; --help prints it, and the README's is compared with it.
+inline constexpr std::array kExitStatuses{
+    ExitStatusRow{kGood, "all is well; or a watch was ended with Ctrl-C (SIGINT) or SIGTERM"},
+    ExitStatusRow{kNoAnswer,
+                  "the daemon isn't running, does not answer, or ended during a watch (status, storage), or the output "
+                  "could not be written"},
+    ExitStatusRow{kWrongUsage, "wrong usage"},
+    ExitStatusRow{kProblemsFound, "the doctor found problems; warnings alone are none"},
+};
+
+/// The table as --help shows it.
+inline std::string exitStatusText() {
+    std::string text = "Exit status:";
+    for (const ExitStatusRow& row : kExitStatuses) text += "\n  " + std::to_string(row.status) + "  " + row.meaning;
+    return text;
+}
 
 }  // namespace lumacast::ctl

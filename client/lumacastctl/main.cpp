@@ -1,13 +1,16 @@
 // lumacastctl: the tool of the daemon's administrator and of those who develop applications for it.
 
+#include <signal.h>
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
+#include <chrono>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <optional>
 #include <string>
+#include <thread>
 
 #include "client/lumacastctl/ExitStatus.h"
 #include "client/lumacastctl/doctor/Doctor.h"
@@ -20,13 +23,6 @@ namespace {
 using namespace lumacast;
 using namespace lumacast::ctl;
 
-constexpr char kExitStatuses[] =
-    "Exit status:\n"
-    "  0  all is well\n"
-    "  1  the daemon isn't running or does not answer (status, storage), or the output could not be written\n"
-    "  2  wrong usage\n"
-    "  3  the doctor found problems (warnings alone are none)";
-
 std::optional<std::string> variable(std::string_view name) {
     const char* value = std::getenv(std::string(name).c_str());
     return value ? std::optional<std::string>(value) : std::nullopt;
@@ -36,6 +32,26 @@ std::optional<std::string> variable(std::string_view name) {
 std::string whyNoPid(const std::string& text) {
     const auto number = wholeNumber(text);
     return number && *number > 0 && *number <= INT32_MAX ? "" : text + " is no process's number";
+}
+
+/// For a watch: each block was written whole before, so there is nothing to end but the process.
+extern "C" void endWatch(int) { ::_exit(kGood); }
+
+int runWatch(const std::string& directory, Form form) {
+    struct sigaction action {};
+    action.sa_handler = endWatch;
+    for (const int signal : {SIGINT, SIGTERM}) ::sigaction(signal, &action, nullptr);
+    // A block, short enough, is one write.
+    std::setvbuf(stdout, nullptr, _IOFBF, 1 << 16);
+    auto next = std::chrono::steady_clock::now();
+    const auto nextRound = [&] {
+        // At whole seconds from the start; those that have passed meanwhile are left out.
+        while (next <= std::chrono::steady_clock::now()) next += std::chrono::seconds(1);
+        std::this_thread::sleep_until(next);
+        return true;
+    };
+    const Screen screen = ::isatty(STDOUT_FILENO) == 1 ? Screen::Terminal : Screen::Plain;
+    return watchStatus(directory, form, screen, stdout, stderr, nextRound);
 }
 
 int runDoctor(const IdentityQuestion& question) {
@@ -49,14 +65,18 @@ int runDoctor(const IdentityQuestion& question) {
 int main(int argc, char** argv) {
     CLI::App app("Asks the screen recording daemon how it is, and looks for what keeps it from recording.",
                  "lumacastctl");
-    app.footer(kExitStatuses);
+    const std::string exitStatuses = exitStatusText();
+    app.footer(exitStatuses);
     app.require_subcommand(1);
     CLI::App* status =
         app.add_subcommand("status", "Show the applications that the daemon knows and the running recording");
-    status->footer(kExitStatuses);
+    status->footer(exitStatuses);
+    bool json = false, watch = false;
+    status->add_flag("--json", json, "Answer one line of JSON");
+    status->add_flag("--watch", watch, "Show the running recordings, anew each second, until Ctrl-C or the daemon's end");
     CLI::App* doctor = app.add_subcommand(
         "doctor", "Look at all that recording takes; a line each: ok, warning or problem, and what to do");
-    doctor->footer(kExitStatuses);
+    doctor->footer(exitStatuses);
     std::int32_t pid = 0;
     std::string executable;
     CLI::Option* byPid = doctor->add_option("--pid", pid, "Tell which application this process counts as")
@@ -67,9 +87,8 @@ int main(int argc, char** argv) {
                                  ->excludes(byPid);
 
     CLI::App* storage = app.add_subcommand("storage", "Show the temporary movies, or have old ones deleted");
-    storage->footer(kExitStatuses);
+    storage->footer(exitStatuses);
     storage->require_subcommand(0, 1);
-    bool json = false;
     storage->add_flag("--json", json, "Answer one line of JSON");
     CLI::App* list = storage->add_subcommand("list", "Show the movies: size, date, and whether one is being recorded");
     CLI::App* purgeable = storage->add_subcommand("purgeable", "Show what a purge could give back");
@@ -77,7 +96,7 @@ int main(int argc, char** argv) {
         "purge", "Delete as if space were so short: from urgency 3 on a running recording is stopped and every movie "
                  "deleted; below 3 nothing goes but where a recording has just ended");
     for (CLI::App* command : {list, purgeable, purge}) {
-        command->footer(kExitStatuses);
+        command->footer(exitStatuses);
         command->add_flag("--json", json, "Answer one line of JSON");
     }
     std::int32_t urgency = 0;
@@ -91,7 +110,9 @@ int main(int argc, char** argv) {
 
     int result = kGood;
     if (status->parsed()) {
-        result = showStatus(LinuxEnvironment::ofThisProcess().runtimeDirectory, stdout, stderr);
+        const std::string directory = LinuxEnvironment::ofThisProcess().runtimeDirectory;
+        const Form form = json ? Form::Json : Form::Text;
+        result = watch ? runWatch(directory, form) : showStatus(directory, form, stdout, stderr);
     } else if (storage->parsed()) {
         const std::string directory = LinuxEnvironment::ofThisProcess().runtimeDirectory;
         const Form form = json ? Form::Json : Form::Text;

@@ -15,6 +15,7 @@ RunningRecording readRecording(const Dictionary& entry) {
     result.height = numberIn(entry, "height");
     result.bytes = countIn(entry, "bytes");
     result.frames = countIn(entry, "frames");
+    result.recorded = countIn(entry, "framesRecorded");
     result.delivered = countIn(entry, "framesDelivered");
     result.dropped = countIn(entry, "framesDropped");
     return result;

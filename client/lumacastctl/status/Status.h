@@ -17,7 +17,8 @@ struct RunningRecording {
     std::optional<std::string> path;
     std::optional<double> width, height;  ///< of the movie, pixels
     std::optional<std::uint64_t> bytes;   ///< written to the file up to now
-    std::optional<std::uint64_t> frames;  ///< given to the movie
+    std::optional<std::uint64_t> frames;    ///< that the recording took from the capture
+    std::optional<std::uint64_t> recorded;  ///< of them, those that are in the movie
     std::optional<std::uint64_t> delivered, dropped;  ///< by the capture
 };
 
@@ -41,5 +42,9 @@ std::variant<DaemonStatus, std::string> readStatus(std::string_view answer);
 
 /// The status for people, several lines with a newline each: the running recording, the applications, the free space.
 std::string statusText(const DaemonStatus& status);
+
+/// The running recordings as a table, a line each: application, state, elapsed time, size of the file, frames recorded
+/// and frames dropped ("-" for what the daemon does not say); or one line that says that there is none.
+std::string recordingsTable(const DaemonStatus& status);
 
 }  // namespace lumacast::ctl

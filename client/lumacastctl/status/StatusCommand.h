@@ -1,14 +1,28 @@
 #pragma once
 #include <chrono>
 #include <cstdio>
+#include <functional>
 #include <string>
+
+#include "client/lumacastctl/Form.h"
 
 namespace lumacast::ctl {
 
+/// Longer than the daemon takes to say that it is busy.
+inline constexpr std::chrono::seconds kStatusLimit{4};
+
 /// `lumacastctl status`: asks the daemon whose runtime directory this is and prints its status to `out`, or to
-/// `complaints` why there is none and what to do. Answers the process's exit status. Blocks for at most `limit`, which
-/// is longer than the daemon takes to say that it is busy.
-int showStatus(const std::string& runtimeDirectory, std::FILE* out, std::FILE* complaints,
-               std::chrono::milliseconds limit = std::chrono::seconds(4));
+/// `complaints` why there is none and what to do. Answers the process's exit status. Blocks for at most `limit`.
+int showStatus(const std::string& runtimeDirectory, Form form, std::FILE* out, std::FILE* complaints,
+               std::chrono::milliseconds limit = kStatusLimit);
+
+/// A terminal shows one block, always the newest; anything else gets block after block, without escape codes.
+enum class Screen { Terminal, Plain };
+
+/// `lumacastctl status --watch`: a block of the running recordings, each in one write, then another whenever
+/// `nextRound` returns true. Answers kGood when that returns false, kNoAnswer once the daemon has gone (`complaints`
+/// gets why) or `out` takes no more. A daemon that is busy is waited for: its block says so.
+int watchStatus(const std::string& runtimeDirectory, Form form, Screen screen, std::FILE* out, std::FILE* complaints,
+                const std::function<bool()>& nextRound, std::chrono::milliseconds limit = kStatusLimit);
 
 }  // namespace lumacast::ctl

@@ -25,7 +25,8 @@ std::string stateText(const ApplicationSession& session) {
 }
 
 std::string framesText(const RunningRecording& recording) {
-    std::string text = recording.frames ? std::to_string(*recording.frames) : "unknown";
+    const auto& frames = recording.recorded ? recording.recorded : recording.frames;
+    std::string text = frames ? std::to_string(*frames) : "unknown";
     if (recording.delivered && recording.dropped)
         text += " (" + std::to_string(*recording.delivered) + " captured, " + std::to_string(*recording.dropped) +
                 " dropped)";

@@ -4,12 +4,12 @@
 #include <cstdio>
 #include <string>
 
+#include "client/lumacastctl/Form.h"
+
 namespace lumacast::ctl {
 
 /// What `lumacastctl storage` shows.
 enum class StoragePart { All, Purgeable, List };
-/// For people, or the daemon's own answer: one line of JSON.
-enum class Form { Text, Json };
 
 /// Longer than the daemon takes to say that its disk does not answer.
 inline constexpr std::chrono::seconds kStorageLimit{65};

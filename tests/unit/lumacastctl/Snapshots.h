@@ -20,7 +20,8 @@ inline Dictionary snapshotOfARecording() {
                              {"width", 1280.0},
                              {"height", 720.0},
                              {"bytes", std::uint64_t{12'345'678}},
-                             {"frames", std::int64_t{1874}},
+                             {"frames", std::int64_t{1876}},
+                             {"framesRecorded", std::uint64_t{1874}},
                              {"framesDelivered", std::uint64_t{1880}},
                              {"framesDropped", std::uint64_t{6}}};
     const Dictionary player{{"bundleID", "org.example.Player"}, {"connected", true}, {"recording", true},

@@ -1,81 +1,21 @@
 // The tool as it is built: what it prints and its exit status.
 
-#include <fcntl.h>
-#include <spawn.h>
-#include <sys/wait.h>
-#include <unistd.h>
-
 #include <atomic>
 
+#include "client/lumacastctl/ExitStatus.h"
 #include "linux/admin/UnixSocket.h"
 #include "tests/contract/PrivateDisplay.h"
-#include "tests/contract/ScratchDirectory.h"
 #include "tests/unit/linux_apps/RunningProgram.h"
 #include "tests/unit/lumacastctl/FindingMatchers.h"
 #include "tests/unit/lumacastctl/Snapshots.h"
 #include "tests/unit/lumacastctl/StandInDaemon.h"
+#include "tests/unit/lumacastctl/ToolFixture.h"
 
 namespace lumacast::ctl {
 namespace {
 
 using ::testing::HasSubstr;
 using ::testing::Not;
-
-constexpr char kTool[] = LC_BINARY_DIR "/bin/lumacastctl";
-
-struct Outcome {
-    int status = -1;  ///< the exit status; -1 when it did not exit by itself
-    std::string out, complaints;
-};
-
-/// A user's directories of the test's own, and the tool run with nothing but them in its environment.
-class Tool : public ::testing::Test {
-protected:
-    Tool() {
-        for (const char* name : {"run", "config", "data", "state"}) scratch_.makeDirectory(name);
-        std::filesystem::permissions(scratch_.path("run"), std::filesystem::perms::owner_all);
-        set("HOME", scratch_.path());
-        set("XDG_RUNTIME_DIR", scratch_.path("run"));
-        set("XDG_CONFIG_HOME", scratch_.path("config"));
-        set("XDG_CONFIG_DIRS", scratch_.path("no-config"));
-        set("XDG_DATA_HOME", scratch_.path("data"));
-        set("XDG_DATA_DIRS", scratch_.path("no-data"));
-        set("XDG_STATE_HOME", scratch_.path("state"));
-        set("PATH", "/usr/bin:/bin");
-    }
-
-    void set(const std::string& name, const std::string& value) { environment_.push_back(name + "=" + value); }
-    std::string runtimeDirectory() const { return scratch_.makeDirectory("run/lumacast"); }
-
-    Outcome run(std::vector<std::string> arguments, const std::string& output = {}) {
-        const std::string out = output.empty() ? scratch_.path("out") : output;
-        const std::string complaints = scratch_.path("complaints");
-        arguments.insert(arguments.begin(), kTool);
-        std::vector<char*> words, variables;
-        for (std::string& word : arguments) words.push_back(word.data());
-        for (std::string& variable : environment_) variables.push_back(variable.data());
-        words.push_back(nullptr);
-        variables.push_back(nullptr);
-        posix_spawn_file_actions_t actions;
-        posix_spawn_file_actions_init(&actions);
-        posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, out.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
-        posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, complaints.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
-                                         0600);
-        pid_t pid = 0;
-        const int error = ::posix_spawn(&pid, kTool, &actions, nullptr, words.data(), variables.data());
-        posix_spawn_file_actions_destroy(&actions);
-        Outcome result;
-        int status = 0;
-        if (error != 0 || ::waitpid(pid, &status, 0) != pid) return result;
-        if (WIFEXITED(status)) result.status = WEXITSTATUS(status);
-        if (output.empty()) result.out = ScratchDirectory::read(out);
-        result.complaints = ScratchDirectory::read(complaints);
-        return result;
-    }
-
-    ScratchDirectory scratch_;
-    std::vector<std::string> environment_;
-};
 
 TEST_F(Tool, ShowsTheStatusOfARunningDaemon) {
     const StandInDaemon daemon(runtimeDirectory(), snapshotOfARecording);
@@ -84,6 +24,13 @@ TEST_F(Tool, ShowsTheStatusOfARunningDaemon) {
     EXPECT_EQ(result.complaints, "");
     EXPECT_THAT(result.out, HasSubstr("org.example.Player (pid 4711): recording\n  elapsed  1:02.5\n"));
     EXPECT_THAT(result.out, HasSubstr("Free space: 81.6 GB in /root/private/var/mobile/Library/Lumacast/\n"));
+}
+
+TEST_F(Tool, AnswersTheStatusAsJson) {
+    const StandInDaemon daemon(runtimeDirectory(), snapshotOfARecording);
+    const Outcome result = run({"status", "--json"});
+    EXPECT_EQ(result.status, 0);
+    EXPECT_EQ(result.out, jsonText(snapshotOfARecording()) + "\n");
 }
 
 TEST_F(Tool, SaysWhatToDoWhenNoDaemonRuns) {
@@ -115,7 +62,9 @@ TEST_F(Tool, TellsWrongUsageFromEverythingElse) {
     const std::vector<std::vector<std::string>> wrong{{},
                                                       {"nonsense"},
                                                       {"status", "more"},
-                                                      {"status", "--json"},
+                                                      {"status", "--jsonx"},
+                                                      {"status", "--watch", "2"},
+                                                      {"doctor", "--watch"},
                                                       {"status", "doctor"},
                                                       {"storage", "nonsense"},
                                                       {"storage", "list", "purgeable"},
@@ -139,12 +88,15 @@ TEST_F(Tool, TellsWrongUsageFromEverythingElse) {
 }
 
 TEST_F(Tool, DocumentsItsExitStatuses) {
+    const std::string readme = ScratchDirectory::read(LC_SOURCE_DIR "/client/lumacastctl/README.md");
+    for (const ExitStatusRow& row : kExitStatuses)
+        EXPECT_THAT(readme, HasSubstr("| " + std::to_string(row.status) + " | " + row.meaning + " |\n"));
     for (const std::vector<std::string>& arguments :
          {std::vector<std::string>{"--help"}, {"status", "--help"}, {"doctor", "--help"}, {"storage", "--help"},
           {"storage", "list", "--help"}, {"storage", "purgeable", "--help"}, {"storage", "purge", "--help"}}) {
         const Outcome result = run(arguments);
         EXPECT_EQ(result.status, 0);
-        EXPECT_THAT(result.out, HasSubstr("Exit status:\n  0  all is well\n  1  the daemon isn't running"));
+        EXPECT_THAT(result.out, HasSubstr(exitStatusText() + "\n"));
     }
 }
 

@@ -1,0 +1,36 @@
+# bash completion for lumacastctl: source it, or put it into ~/.local/share/bash-completion/completions/lumacastctl
+
+_lumacastctl() {
+    local word=${COMP_WORDS[COMP_CWORD]} before=${COMP_WORDS[COMP_CWORD-1]}
+    local command='' part='' given i
+    for ((i = 1; i < COMP_CWORD; ++i)); do
+        given=${COMP_WORDS[i]}
+        case $given in
+            -*) ;;
+            status | doctor | storage) [ -z "$command" ] && command=$given ;;
+            list | purgeable | purge) [ "$command" = storage ] && [ -z "$part" ] && part=$given ;;
+        esac
+    done
+    COMPREPLY=()
+    case $command:$before in
+        doctor:--exe)
+            compopt -o filenames 2>/dev/null
+            COMPREPLY=($(compgen -f -- "$word"))
+            return ;;
+        doctor:--pid)
+            COMPREPLY=($(compgen -W "$(command ps -eo pid= 2>/dev/null)" -- "$word"))
+            return ;;
+    esac
+    local words
+    case $command:$part in
+        :) words='status doctor storage -h --help' ;;
+        status:) words='--json --watch -h --help' ;;
+        doctor:) words='--pid --exe -h --help' ;;
+        storage:) words='list purgeable purge --json -h --help' ;;
+        storage:purge) words='1 2 3 --json -h --help' ;;
+        storage:*) words='--json -h --help' ;;
+    esac
+    COMPREPLY=($(compgen -W "$words" -- "$word"))
+}
+
+complete -F _lumacastctl lumacastctl

@@ -1,0 +1,21 @@
+# fish completion for lumacastctl: put it into ~/.config/fish/completions
+
+complete -c lumacastctl -f
+complete -c lumacastctl -s h -l help -d 'Print help'
+
+complete -c lumacastctl -n __fish_use_subcommand -a status -d 'Show the applications and the running recording'
+complete -c lumacastctl -n __fish_use_subcommand -a doctor -d 'Look at all that recording takes'
+complete -c lumacastctl -n __fish_use_subcommand -a storage -d 'Show the temporary movies, or have old ones deleted'
+
+complete -c lumacastctl -n '__fish_seen_subcommand_from status' -l json -d 'Answer one line of JSON'
+complete -c lumacastctl -n '__fish_seen_subcommand_from status' -l watch -d 'Show the running recordings, anew each second'
+
+complete -c lumacastctl -n '__fish_seen_subcommand_from doctor' -l pid -x -a '(__fish_complete_pids)' -d 'Tell which application a process counts as'
+complete -c lumacastctl -n '__fish_seen_subcommand_from doctor' -l exe -r -F -d 'Tell which application a program counts as'
+
+complete -c lumacastctl -n '__fish_seen_subcommand_from storage' -l json -d 'Answer one line of JSON'
+set -l parts list purgeable purge
+complete -c lumacastctl -n "__fish_seen_subcommand_from storage; and not __fish_seen_subcommand_from $parts" -a list -d 'Show the movies'
+complete -c lumacastctl -n "__fish_seen_subcommand_from storage; and not __fish_seen_subcommand_from $parts" -a purgeable -d 'Show what a purge could give back'
+complete -c lumacastctl -n "__fish_seen_subcommand_from storage; and not __fish_seen_subcommand_from $parts" -a purge -d 'Delete as if space were so short'
+complete -c lumacastctl -n '__fish_seen_subcommand_from storage; and __fish_seen_subcommand_from purge' -a '1 2 3' -d 'Urgency'
