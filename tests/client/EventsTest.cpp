@@ -9,6 +9,7 @@
 #include <random>
 
 #include "tests/client/StandInService.h"
+#include "tests/client/WaitUntil.h"
 #include "tests/contract/RawPeer.h"
 #include "tests/contract/ScratchDirectory.h"
 

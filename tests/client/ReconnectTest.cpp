@@ -9,6 +9,7 @@
 
 #include "tests/checkers/tests/Child.h"
 #include "tests/client/StandInService.h"
+#include "tests/client/WaitUntil.h"
 #include "tests/contract/RawPeer.h"
 #include "tests/contract/ScratchDirectory.h"
 
