@@ -39,10 +39,9 @@ inline constexpr std::chrono::milliseconds kPatience = std::chrono::seconds(60);
 /// connection: a newer one, of whatever process of it, takes the older one's place, and its recording goes on. The
 /// older recorder is told `disconnected` and stays so until it is asked for something, which makes it the newest.
 ///
-/// Movies: the file that a StopAnswer names stays until the application's next start, its discard(), or a day has
-/// passed; or until the device runs out of space (below 100 MB free, or by the administrator's purge). Its name is the
-/// application's, so the next recording takes its place. Move it, copy it or open it before; an opened file stays
-/// readable.
+/// Movies: the file that a StopAnswer names stays until the application's next start (a clip: until its next clip), its
+/// discard() (not a clip), or a day has passed; or until the device runs out of space (below 100 MB free, or by the
+/// administrator's purge). Copy it or open it before; an opened file stays readable.
 ///
 /// Destroying the recorder ends a running recording and throws it away, answers what is pending with Closed and waits
 /// for the handler that is running. From within a handler it does all that but the waiting. No handler runs after it.
@@ -65,7 +64,7 @@ public:
     /// Stops and keeps the movie without its first `fromStart` and last `fromEnd` seconds (rounded to whole ones, both
     /// above 0). Not answered when nothing is being recorded, or the clip can't be made.
     void stopWithClip(double fromStart, double fromEnd, std::function<void(StopAnswer)> answered);
-    /// Deletes the last movie. Not answered while recording.
+    /// Deletes the last movie, but not a clip of it. Not answered while recording.
     void discard(std::function<void(std::optional<Error>)> answered);
     /// The application's state as the daemon has it; see RecordingState. It comes after the effect of all that was
     /// asked before.

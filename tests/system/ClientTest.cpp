@@ -225,6 +225,18 @@ TEST_F(Client, GivesItsPlaceToTheNewestRecorderOfTheApplicationWhichGoesOnRecord
     EXPECT_TRUE(second.stopAndWait().movie);
 }
 
+TEST(MinimalExample, LeavesAMovieOfThreeSeconds) {
+    World world;
+    world.install("org.lumacast.Minimal", "Minimal", LC_MINIMAL);
+    world.startDaemon();
+    checkers::Child example({LC_MINIMAL, world.path("copy.mp4")}, world.environment(), world.path("minimal.log"));
+    EXPECT_EQ(example.wait(), 0);
+    const double seconds =
+        std::chrono::duration<double>(checkers::MovieReader(world.path("copy.mp4")).duration()).count();
+    EXPECT_GT(seconds, 2.0);
+    EXPECT_LT(seconds, 20.0);
+}
+
 TEST_F(Client, IsSeenInAWatchUntilTheDaemonEnds) {
     startRecording();
     checkers::Child watch({LC_CTL, "status", "--watch"}, world_.environment(), world_.path("tool.log"));
