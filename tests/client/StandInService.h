@@ -32,24 +32,25 @@ public:
         Array arguments;
     };
 
-    /// Listens, but accepts nobody before run.
+    /// Listens, but accepts nobody before run. It ends with the pointer that this answers: what else holds the object,
+    /// say a message that is being handled, doesn't count.
     static std::shared_ptr<StandInService> make(LinuxIpcOptions options, Answer answer = {}) {
         const auto service = std::make_shared<StandInService>(std::move(options), std::move(answer));
         service->listener_ = service->ipc_.listenerForService("com.orvane.lumacastd");
         service->listener_->setDelegate(service);
         service->listener_->resume();
-        return service;
+        return {service.get(), [service](StandInService*) { service->stop(); }};
     }
     StandInService(LinuxIpcOptions options, Answer answer)
         : answer_(std::move(answer)), ipc_(reactor_, log_, std::move(options)) {}
-    ~StandInService() override {
-        if (!thread_.joinable()) return;
-        reactor_.requestStop();
-        thread_.join();
-    }
 
     void run() {
         thread_ = std::thread([this] { reactor_.run(); });
+    }
+    void stop() {
+        if (!thread_.joinable()) return;
+        reactor_.requestStop();
+        thread_.join();
     }
 
     /// What came, but for the questions for the state with which each connection begins.
