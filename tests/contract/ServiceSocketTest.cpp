@@ -230,5 +230,22 @@ TEST_F(ServiceSocketTest, AServiceOnAnActivatedSocketServes) {
     EXPECT_EQ(peer.read(kHelloBytes), makeHello());
 }
 
+TEST_F(ServiceSocketTest, ACallTellsAServiceWithoutRoomFromNone) {
+    const ServiceCall toNobody = callServiceSocket(runtime(), "service");
+    EXPECT_FALSE(toNobody.socket);
+    EXPECT_FALSE(toNobody.isBusy);
+    const Fd foreign = bindForeign();
+    EXPECT_FALSE(callServiceSocket(runtime(), "service").isBusy) << "a socket that nobody listens at";
+    ASSERT_EQ(listen(foreign.get(), 0), 0);
+    const ServiceCall first = callServiceSocket(runtime(), "service");
+    EXPECT_TRUE(first.socket);
+    EXPECT_FALSE(first.isBusy);
+    const ServiceCall second = callServiceSocket(runtime(), "service");
+    EXPECT_FALSE(second.socket);
+    EXPECT_TRUE(second.isBusy);
+    const Fd accepted(accept(foreign.get(), nullptr, nullptr));
+    EXPECT_TRUE(callServiceSocket(runtime(), "service").socket);
+}
+
 }  // namespace
 }  // namespace lumacast
