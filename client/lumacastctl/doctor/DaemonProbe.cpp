@@ -59,8 +59,9 @@ DaemonFacts probeDaemon(const std::string& runtimeDirectory, bool runtimeVariabl
     } else if (connectTo(facts.adminPath)) {
         facts.admin = Socket::Silent;
     }
-    if (const Fd socket = connectToServiceSocket(runtimeDirectory, kService))
-        facts.service = greets(socket.get(), patience) ? Socket::Answers : Socket::Silent;
+    const ServiceCall call = callServiceSocket(runtimeDirectory, kService);
+    if (call.socket) facts.service = greets(call.socket.get(), patience) ? Socket::Answers : Socket::Silent;
+    else if (call.isBusy) facts.service = Socket::Silent;
     return facts;
 }
 

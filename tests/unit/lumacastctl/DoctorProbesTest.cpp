@@ -215,6 +215,16 @@ TEST(DaemonProbe, TellsSocketsThatSomebodyElseListensAt) {
     EXPECT_EQ(facts.service, DaemonFacts::Socket::Silent);
 }
 
+TEST(DaemonProbe, TellsADaemonThatHasNoPlaceToWaitLeft) {
+    const ScratchDirectory scratch;
+    const FileDescriptor service = listenAt(scratch.path("com.orvane.lumacastd.sock"));
+    ASSERT_EQ(::listen(service.get(), 0), 0);
+    const Fd waiting = connectToServiceSocket(scratch.path(), "com.orvane.lumacastd");
+    ASSERT_TRUE(waiting);
+    ASSERT_FALSE(connectToServiceSocket(scratch.path(), "com.orvane.lumacastd")) << "there is still a place";
+    EXPECT_EQ(probeDaemon(scratch.path(), true, kShort).service, DaemonFacts::Socket::Silent);
+}
+
 TEST(DaemonProbe, FindsARuntimeDirectoryWhosePathIsTooLong) {
     EXPECT_FALSE(probeDaemon("/" + std::string(100, 'x'), true, kShort).pathFits);
 }
