@@ -88,29 +88,29 @@ struct Events {
     /// The recording ended by itself (an error says why), or another one took its place (Interrupted). The movie only
     /// where there is one to hand out: after a resume with a foreign window, or an interrupted recording that the
     /// application comes back to.
-    std::function<void(std::optional<Error> error, std::optional<URL> movie)> stopped;
+    std::function<void(std::optional<Error> error, std::optional<URL> movie)> stopped = {};
     /// The connection has ended, or the daemon isn't there to begin with. A recording that was running has ended.
     /// `connected` and `disconnected` alternate.
-    std::function<void()> disconnected;
+    std::function<void()> disconnected = {};
     /// The daemon has answered: the first time, and after each `disconnected`. Nothing of an earlier connection is left
     /// at the daemon: start again what is to go on.
-    std::function<void()> connected;
+    std::function<void()> connected = {};
 
     // Of the messages below today's daemon sends none; they are delivered when it does.
 
     /// Recording is now on or off.
-    std::function<void(bool isOn)> recordingStateChanged;
+    std::function<void(bool isOn)> recordingStateChanged = {};
     /// What the broadcast's extension tells of itself.
-    std::function<void(const Value& info)> broadcastServiceInfo;
+    std::function<void(const Value& info)> broadcastServiceInfo = {};
     /// Where the broadcast can be watched.
-    std::function<void(std::optional<URL> url)> broadcastURL;
+    std::function<void(std::optional<URL> url)> broadcastURL = {};
     /// Pictures that come twice with one stamp (the last one before a pause is repeated after it) are told once.
-    std::function<void(const VideoSample& sample)> videoSample;
-    std::function<void(const AudioSample& sample)> audioSample;
+    std::function<void(const VideoSample& sample)> videoSample = {};
+    std::function<void(const AudioSample& sample)> audioSample = {};
     /// The device was locked.
-    std::function<void(const Value& details)> interrupted;
+    std::function<void(const Value& details)> interrupted = {};
     /// How long the recording has been going on, as the daemon shows it.
-    std::function<void(const Value& elapsed)> timerUpdated;
+    std::function<void(const Value& elapsed)> timerUpdated = {};
 };
 
 }  // namespace lumacast::client
