@@ -33,8 +33,8 @@ constexpr char kServiceName[] = "com.orvane.lumacastd";
 /// daemon that dies at once each time is not asked without end.
 constexpr auto kFirstDelay = 50ms;
 constexpr auto kLastDelay = 5000ms;
-/// A process that was killed may still be seen for a moment: how often, and how far apart, it must be seen alive after it
-/// has ended a connection until that counts as its will.
+/// A process that was killed may still be seen for a moment: how often, and how far apart, it must be seen alive after
+/// it has ended a connection until that counts as its will.
 constexpr int kLooks = 3;
 constexpr auto kLookDelay = 250ms;
 /// Between two attempts at a full backlog, and for how long they are made before the daemon counts as not there.

@@ -73,7 +73,8 @@ int main(int argc, char** argv) {
     status->footer(exitStatuses);
     bool json = false, watch = false;
     status->add_flag("--json", json, "Answer one line of JSON");
-    status->add_flag("--watch", watch, "Show the running recordings, anew each second, until Ctrl-C or the daemon's end");
+    status->add_flag("--watch", watch,
+                     "Show the running recordings, anew each second, until Ctrl-C or the daemon's end");
     CLI::App* doctor = app.add_subcommand(
         "doctor", "Look at all that recording takes; a line each: ok, warning or problem, and what to do");
     doctor->footer(exitStatuses);

@@ -138,9 +138,10 @@ TEST_F(ClientReconnect, AThousandConnectsAgainstABacklogOfOneAllGetThrough) {
     Fd listening = listenWithBacklog(1);
     LinuxIpcOptions options{.runtimeDirectory = runtime()};
     options.activated.add(kService, std::move(listening));
-    const auto daemon = StandInService::make(std::move(options), [](DaemonMessage, const Array&, const IpcReply& reply) {
-        if (reply) reply({Dictionary()});
-    });
+    const auto daemon =
+        StandInService::make(std::move(options), [](DaemonMessage, const Array&, const IpcReply& reply) {
+            if (reply) reply({Dictionary()});
+        });
     constexpr std::size_t kRounds = 10, kAtOnce = 100;
     for (std::size_t round = 0; round < kRounds; ++round) {
         Answers<StateAnswer> answers;

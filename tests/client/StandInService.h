@@ -71,8 +71,10 @@ public:
         const std::lock_guard lock(mutex_);
         return newest_.lock();
     }
+    /// Says something on the newest connection, if it is still there.
     void tell(ClientMessage message, Array arguments) {
-        connection()->remoteProxy([](const Error&) {})->send(static_cast<std::uint16_t>(message), std::move(arguments));
+        if (const auto reached = connection())
+            reached->remoteProxy([](const Error&) {})->send(static_cast<std::uint16_t>(message), std::move(arguments));
     }
 
     bool listenerShouldAcceptNewConnection(IpcListener&, const std::shared_ptr<IpcConnection>& connection) override {

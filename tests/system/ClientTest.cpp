@@ -246,7 +246,8 @@ TEST_F(Client, IsSeenInAWatchUntilTheDaemonEnds) {
         lines.push_back(watch.readLine());
         EXPECT_EQ(watch.readLine(), "");
     }
-    EXPECT_THAT(lines[0], ::testing::MatchesRegex("org.lumacast.Tester +recording +0:0[0-9].[0-9] .* [1-9][0-9]* +[0-9]+"));
+    EXPECT_THAT(lines[0],
+                ::testing::MatchesRegex("org.lumacast.Tester +recording +0:0[0-9].[0-9] .* [1-9][0-9]* +[0-9]+"));
     EXPECT_NE(lines[0], lines[1]);
     EXPECT_EQ(world_.endDaemon(SIGTERM), 0);
     (void)watch.readAll();
