@@ -1,5 +1,6 @@
 // The doctor's probes on real services of the test's own, each there and not there.
 
+#include <sys/socket.h>
 #include <unistd.h>
 
 #include "client/lumacastctl/doctor/Daemon.h"
