@@ -12,20 +12,21 @@
 namespace lumacast {
 
 /// The programs of processes that were looked up lately, so that a process that asks often is not looked up each time.
-/// Each is kept with a handle on its process: one that has ended or runs another program is known no more, however
-/// short ago it was looked up. Thread-safe; never waits for a disk.
+/// A process that has ended or runs another program is known no more, however short ago it was looked up: its folder in
+/// /proc has an inode of its own, and the program another file. Thread-safe; never waits for a disk; holds no
+/// descriptors.
 class KnownProcesses final {
 public:
     /// Where the program was started from, if it was looked up no longer ago than `freshness`.
     std::optional<std::string> path(ProcessID pid, std::chrono::steady_clock::duration freshness);
     /// Takes note of what was found through `process`, a handle on the process's folder.
-    void keep(ProcessID pid, FileDescriptor process, const ProcessImage& image);
+    void keep(ProcessID pid, const FileDescriptor& process, const ProcessImage& image);
 
 private:
-    static constexpr std::size_t kMost = 256;  // descriptors held
+    static constexpr std::size_t kMost = 1024;
 
     struct Known {
-        FileDescriptor process;
+        ino_t folder = 0;
         dev_t device = 0;
         ino_t file = 0;
         std::string path;
