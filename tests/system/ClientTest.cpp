@@ -118,6 +118,7 @@ TEST_F(Client, KeepsWhatItWantsToRemember) {
 
 TEST_F(Client, IsToldThatAForeignWindowFailsToStart) {
     const auto other = world_.application(kMoving);
+    window_->raise();  // it is in the foreground, so that nothing but the window can be wrong
     client::StartOptions foreign = options();
     foreign.windows = {ContextID{other->window()}};
     const auto error = recorder_->startAndWait(foreign).error;
@@ -126,6 +127,14 @@ TEST_F(Client, IsToldThatAForeignWindowFailsToStart) {
     EXPECT_EQ(client::keyOf(*error), "RECORDING_ERROR_FAILED_TO_START");
     EXPECT_TRUE(error->localizedDescription()) << "the daemon's text";
     EXPECT_EQ(client::textOf(*error), *error->localizedDescription());
+    EXPECT_THAT(world_.daemonLog(), HasSubstr("refused with -5803: a window layer is not the application's own"));
+}
+
+TEST_F(Client, IsToldThatItFailsToStartBehindAnotherApplication) {
+    const auto other = world_.application(kMoving);
+    ASSERT_TRUE(other->waitForFrame(1));
+    EXPECT_EQ(keyIn(recorder_->startAndWait(options()).error), "RECORDING_ERROR_FAILED_TO_START");
+    EXPECT_THAT(world_.daemonLog(), HasSubstr("refused with -5803: the application is not in the foreground"));
 }
 
 TEST_F(Client, IsToldThatASystemRecordingTakesAnEntitlement) {
