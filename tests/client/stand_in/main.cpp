@@ -1,5 +1,8 @@
 // A daemon that can be killed: it answers the first question for the state of each connection, or with "serving" all of
-// them, and nothing else. Prints "ready", then the name of each message that comes, a line each.
+// them, and nothing else. Prints "ready", then the name of each message that comes, a line each. Ends with its standard
+// input, so that a test that dies leaves nothing behind.
+
+#include <sys/epoll.h>
 
 #include <cstdio>
 #include <map>
@@ -55,6 +58,10 @@ int main(int argc, char** argv) {
     const auto delegate = std::make_shared<StandIn>(argc > 2 && std::string(argv[2]) == "serving");
     listener->setDelegate(delegate);
     listener->resume();
+    const auto input = reactor.watch(0, EPOLLIN, [&](std::uint32_t) {
+        reactor.requestStop();
+        return Reactor::Again::No;
+    });
     std::puts("ready");
     std::fflush(stdout);
     reactor.run();
