@@ -19,6 +19,11 @@ std::shared_ptr<DisplayCaptureDelegate> CaptureControl::delegate() const {
     return delegate_.lock();
 }
 
+std::shared_ptr<DisplayCaptureDelegate> CaptureControl::delegateOfEnded(std::uint64_t run) const {
+    const std::lock_guard lock(mutex_);
+    return run_ == run && !running_ ? delegate_.lock() : nullptr;
+}
+
 void CaptureControl::openGate(std::shared_ptr<CaptureClock> clock) {
     const std::lock_guard lock(mutex_);
     if (!clock) return;

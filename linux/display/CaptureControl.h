@@ -32,6 +32,8 @@ public:
 
     void setDelegate(std::weak_ptr<DisplayCaptureDelegate> delegate);
     std::shared_ptr<DisplayCaptureDelegate> delegate() const;
+    /// Whom to tell of the end of a run: nobody once the source has been started again.
+    std::shared_ptr<DisplayCaptureDelegate> delegateOfEnded(std::uint64_t run) const;
 
     /// Without a clock the gate stays closed.
     void openGate(std::shared_ptr<CaptureClock> clock);

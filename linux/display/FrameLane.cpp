@@ -247,9 +247,9 @@ bool FrameLane::deliver(const Order& order, std::shared_ptr<Picture> picture, Me
 void FrameLane::fail(const Order& order, std::int32_t status) {
     release();
     if (!setup_.control->endRun(order)) return;
-    setup_.scheduler->mainQueue().async([source = setup_.source, control = setup_.control, status] {
+    setup_.scheduler->mainQueue().async([source = setup_.source, control = setup_.control, run = order.run, status] {
         const auto failed = source.lock();
-        const auto delegate = control->delegate();
+        const auto delegate = control->delegateOfEnded(run);
         if (failed && delegate) delegate->screenCaptureControllerDidFailWithStatus(*failed, status);
     });
 }

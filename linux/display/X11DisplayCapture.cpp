@@ -61,9 +61,10 @@ std::shared_ptr<x11::FrameLane> X11DisplayCaptureSource::lane() {
 
 void X11DisplayCaptureSource::fail(std::int32_t status) {
     control_->stop();
-    setup_.scheduler.mainQueue().async([source = weak_from_this(), control = control_, status] {
+    setup_.scheduler.mainQueue().async([source = weak_from_this(), control = control_, run = control_->order().run,
+                                        status] {
         const auto failed = source.lock();
-        const auto delegate = control->delegate();
+        const auto delegate = control->delegateOfEnded(run);
         if (failed && delegate) delegate->screenCaptureControllerDidFailWithStatus(*failed, status);
     });
 }

@@ -79,10 +79,9 @@ void LCRecordingManager::startProper(const std::shared_ptr<LCRecordingSession>& 
     }
     microphoneRecording_ = request.microphoneEnabled;
     cameraRecording_ = request.cameraEnabled;
-    const auto preference = platform_.preferences.value(kPreferenceDomain, "LCSuppressAlert");
-    const bool* suppressAlert = preference ? preference->as<bool>() : nullptr;
-    log_.line("LCRecordingManager: suppressAlert=%d", suppressAlert && *suppressAlert);
-    if ((!suppressAlert || !*suppressAlert) && !isExemptFromAcknowledgementAlertSession(*session))
+    const bool suppressAlert = isTrue(platform_.preferences.value(kPreferenceDomain, "LCSuppressAlert"));
+    log_.line("LCRecordingManager: suppressAlert=%d", suppressAlert);
+    if (!suppressAlert && !isExemptFromAcknowledgementAlertSession(*session))
         return refuse(number, RecordingErrorCode::UserDeclined,
                       "this daemon can't ask the user; the preference LCSuppressAlert is not set", handler);
     if (request.captureEnabled)

@@ -14,7 +14,8 @@ namespace lumacast {
 class DisplayCaptureSource;
 
 /// Told of frames and failures by a capture source. Frames come on the source's own delivery thread (the frame lane),
-/// one at a time; failures on the main queue. Nothing is called inline from an operation of the source.
+/// one at a time; failures on the main queue. Nothing is called inline from an operation of the source. What happened to
+/// capture before the source was last started is not told any more.
 class DisplayCaptureDelegate {
 public:
     virtual ~DisplayCaptureDelegate() = default;

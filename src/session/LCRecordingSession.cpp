@@ -115,14 +115,15 @@ void LCRecordingSession::_resumeOrStartSession() {
         clone.setContexts({contextIDs_.begin(), contextIDs_.end()});
         clone.setMirroringMode(DisplayCloneControl::kCloneContexts);
     }
+    const int rate = captureRate();
     if (const auto agent = reportingAgent())
         agent->update([&](UsageMetrics& metrics) {
             metrics.videoCaptureSize = windowSize_;
-            metrics.videoCaptureRate = captureRate();
+            metrics.videoCaptureRate = rate;
         });
     auto source = screenCaptureController();
     if (!source) {
-        source = services_.platform.displayCapture.makeSource(windowSize_, MediaTime::make(1, captureRate()));
+        source = services_.platform.displayCapture.makeSource(windowSize_, MediaTime::make(1, rate));
         screenCaptureController_.set(source);
     }
     source->setDelegate(weak_from_this());
@@ -155,7 +156,7 @@ double LCRecordingSession::activeDuration() const {
     const auto agent = reportingAgent();
     if (!agent) return 0;
     const auto started = captureStartTime();
-    const bool running = recording_ && !paused_ && started;
+    const bool running = recording_ && !paused_ && !startIsPending_ && started;
     return agent->metrics().activeDuration + (running ? secondsBetween(*started, services_.platform.clock.now()) : 0);
 }
 
@@ -178,7 +179,14 @@ void LCRecordingSession::stopAllCapture() {
 }
 
 void LCRecordingSession::stopRecordingWithNotification(bool notification, const std::optional<Error>& error) {
-    if (!recording_ || stopIsRunning_.exchange(true)) return;
+    // The frame lane and the request lane may both stop: whoever has the flag looks, so that one stop is one stop.
+    if (stopIsRunning_.exchange(true)) return;
+    if (!recording_) {
+        stopIsRunning_ = false;
+        return;
+    }
+    // Of this recording: the next one may have begun when the delegate has been told.
+    const auto agent = reportingAgent();
     log_.line("LCRecordingSession: stop");
     ++stops_;
     if (const auto source = screenCaptureController()) source->closeGate(GateWait::No);
@@ -189,7 +197,7 @@ void LCRecordingSession::stopRecordingWithNotification(bool notification, const 
     if (notification)
         if (const auto delegate = delegate_.get().lock())
             delegate->recordingSessionStoppedWithError(shared_from_this(), error);
-    reportSummaryEvent(error ? error->code() : 0);
+    reportSummaryEvent(agent, error ? error->code() : 0);
 }
 
 void LCRecordingSession::finishSessionWithStartClipDuration(double startClipDuration, double endClipDuration,
@@ -251,7 +259,11 @@ void LCRecordingSession::finishAndCleanupSessionFilesWithHandler(Handler handler
 
 std::uint64_t LCRecordingSession::getRecordedFileSize() {
     const auto agent = reportingAgent();
-    if (!agent || (agent->serviceName() != "SystemRecording" && agent->serviceName() != "InAppRecording")) return 0;
+    return agent ? getRecordedFileSize(*agent) : 0;
+}
+
+std::uint64_t LCRecordingSession::getRecordedFileSize(const LCReportingAgent& agent) {
+    if (agent.serviceName() != "SystemRecording" && agent.serviceName() != "InAppRecording") return 0;
     const auto answer = services_.platform.fileSystem.attributes(outputURL().path());
     if (const auto* attributes = std::get_if<FileAttributes>(&answer)) {
         log_.line("recordedFileSize for URL %lu bytes", attributes->size);
@@ -277,16 +289,17 @@ std::string LCRecordingSession::_serviceNameForReporting() const {
     return "InAppRecording";
 }
 
-void LCRecordingSession::reportSummaryEvent(std::int64_t endReason) {
-    const auto agent = reportingAgent();
+void LCRecordingSession::reportSummaryEvent(const std::shared_ptr<LCReportingAgent>& agent, std::int64_t endReason) {
     if (!agent) return;
-    const std::uint64_t size = getRecordedFileSize();
+    const std::uint64_t size = getRecordedFileSize(*agent);
     agent->update([&](UsageMetrics& metrics) {
         metrics.recordedFileSize = size;
         metrics.endReason = endReason;
     });
     agent->reportEventWithType(LCReportingAgent::kSummaryEvent, agent->collectSummaryEventMetrics());
-    reportingAgent_.set(nullptr);
+    reportingAgent_.update([&](std::shared_ptr<LCReportingAgent>& current) {
+        if (current == agent) current = nullptr;
+    });
 }
 
 void LCRecordingSession::sessionReportCameraUsage(std::int32_t cameraPosition) {

@@ -95,6 +95,10 @@ public:
     void setBroadcastUploadExtensionProxy(std::shared_ptr<LCBroadcastExtensionProxy> proxy) {
         broadcastUploadExtensionProxy_.set(std::move(proxy));
     }
+    /// Kept for the extensions' sake; nothing uses them.
+    const std::shared_ptr<SerialQueue>& broadcastServiceInfoQueue() const { return broadcastServiceInfoQueue_; }
+    const std::shared_ptr<SerialQueue>& broadcastAggregatePayloadQueue() const { return broadcastAggregatePayloadQueue_; }
+    const Array& pendingBroadcastExtensionPayloads() const { return pendingBroadcastExtensionPayloads_; }
     /// What the application wants the extension to know. Request lane.
     const Dictionary& broadcastUserInfo() const { return broadcastUserInfo_; }
     void setBroadcastUserInfo(Dictionary info) { broadcastUserInfo_ = std::move(info); }
@@ -133,6 +137,8 @@ public:
     std::string outputPath() const;
     std::string trimmedOutputPath() const;
     URL outputURL() const { return URL::file(outputPath()); }
+    /// Deliberately without effect on what outputURL answers.
+    void setOutputURL(const URL&) {}
     URL trimmedOutputURL() const { return URL::file(trimmedOutputPath()); }
 
     // Lifecycle.
@@ -169,7 +175,8 @@ public:
 
     // Usage reporting.
     std::string _serviceNameForReporting() const;
-    void reportSummaryEvent(std::int64_t endReason);
+    /// `reportSummaryEvent:` — sends the summary of the recording that `agent` has counted, and lets the agent go.
+    void reportSummaryEvent(const std::shared_ptr<LCReportingAgent>& agent, std::int64_t endReason);
     /// `sessionReportCameraUsage:` — 1 back, 2 front.
     void sessionReportCameraUsage(std::int32_t cameraPosition);
 
@@ -200,15 +207,16 @@ public:
     };
     ManagerRecord managerRecord;
 
+    /// `isNativeScreenOrientationPortrait` — deliberately fixed; kept so that the rule that asks for it stays general.
+    static bool isNativeScreenOrientationPortrait() { return true; }
+
 private:
-    static bool isNativeScreenOrientationPortrait() {
-        return true;
-    }  // deliberately fixed; kept so that the rule stays general
     void continueStart(std::uint64_t start, std::uint64_t stops, const Handler& handler);
     void _resumeOrStartSession();
     /// `startWritingHandler:` or the extension's start, then the continuation on the request lane.
     void startWriter(Size size, Handler continuation);
     int captureRate() const;
+    std::uint64_t getRecordedFileSize(const LCReportingAgent& agent);
     void finishMovie(double startClipDuration, double endClipDuration, FinishHandler handler);
 
     void updateDuartionWithSample(const SampleRef& sample);
@@ -225,6 +233,8 @@ private:
     Log& log_;
     const BundleIdentifier bundleID_;
     const std::shared_ptr<SerialQueue> broadcastServiceInfoQueue_;
+    const std::shared_ptr<SerialQueue> broadcastAggregatePayloadQueue_;  ///< never made
+    const Array pendingBroadcastExtensionPayloads_;                      ///< stays empty
     const std::shared_ptr<SerialQueue> resetQueue_;
 
     Guarded<std::shared_ptr<LCClientProtocol>> clientProxy_;

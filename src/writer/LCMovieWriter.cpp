@@ -179,7 +179,10 @@ void LCMovieWriter::appendAudio(const SampleRef& sample, const Tracks& tracks, T
 }
 
 void LCMovieWriter::notifyRecordingMayBeStopped() {
-    movieWriterQueue_->sync([this] { trimVideoPresentationTime_ = lastVideoPresentationTime_; });
+    movieWriterQueue_->sync([this] {
+        const std::lock_guard lock(samplesMutex_);  // set-up may still be running
+        trimVideoPresentationTime_ = lastVideoPresentationTime_;
+    });
 }
 
 void LCMovieWriter::notifyRecordingResumed() {

@@ -446,6 +446,31 @@ TEST_P(DisplayCaptureContract, ReportsAFailureOnTheMainQueueAndCanBeStartedAgain
     EXPECT_EQ(watched.frames->failures().size(), 1u);
 }
 
+TEST_P(DisplayCaptureContract, TellsNoFailureOfARunBeforeTheLastStart) {
+    world_->clock().startCaptureClock();
+    world_->letTheNextStartFail();
+    Watched watched = make();
+    watched.source->openGate();
+    std::atomic<bool> goOn{false}, held{false};
+    world_->mainQueue().async([&] {
+        held = true;
+        while (!goOn) std::this_thread::yield();
+    });
+    while (!held) std::this_thread::yield();
+    watched.source->start();
+    passTime(200ms);  // enough for a lane to find out; if it was not, the next start fails by itself
+    world_->letStartsSucceed();
+    // The failure waits on the main queue; meanwhile the recording is paused and goes on.
+    watched.source->closeGate(GateWait::UntilDelivered);
+    watched.source->openGate();
+    watched.source->start();
+    ASSERT_TRUE(watched.frames->waitForCount(1));
+    goOn = true;
+    world_->mainQueue().sync([] {});
+    EXPECT_TRUE(watched.frames->failures().empty());
+    EXPECT_TRUE(deliversWithChanges(watched, watched.frames->count() + 1));
+}
+
 INSTANTIATE_TEST_SUITE_P(Fake, DisplayCaptureContract,
                          ::testing::Values([] { return std::make_unique<FakeCaptureWorld>(); }));
 INSTANTIATE_TEST_SUITE_P(Port, DisplayCaptureContract,

@@ -199,18 +199,20 @@ std::shared_ptr<SharedPlane> FakeDisplayCaptureSource::makePlaneLocked(Picture p
 
 void FakeDisplayCaptureSource::endAndTell(std::function<void(DisplayCaptureDelegate&, DisplayCaptureSource&)> tell) {
     std::unique_ptr<Timer> timer;
+    std::uint64_t run = 0;
     {
         const std::lock_guard lock(mutex_);
         timer = endLocked();
+        run = run_;
     }
     timer.reset();
-    settings_->scheduler.mainQueue().async([weak = weak_from_this(), tell = std::move(tell)] {
+    settings_->scheduler.mainQueue().async([weak = weak_from_this(), run, tell = std::move(tell)] {
         const auto self = weak.lock();
         if (!self) return;
         std::shared_ptr<DisplayCaptureDelegate> delegate;
         {
             const std::lock_guard lock(self->mutex_);
-            delegate = self->delegate_.lock();
+            if (self->run_ == run && !self->running_) delegate = self->delegate_.lock();
         }
         if (delegate) tell(*delegate, *self);
     });
