@@ -19,6 +19,7 @@
 #include "linux/media/LinuxMovieExporters.h"
 #include "linux/storage/LinuxFileSystem.h"
 #include "linux/storage/LinuxStoragePurgeService.h"
+#include "linux/system/Allocator.h"
 #include "linux/system/LinuxClock.h"
 #include "linux/system/LinuxDeviceInfo.h"
 #include "linux/system/LinuxEnvironment.h"
@@ -130,6 +131,7 @@ private:
 }  // namespace
 
 std::unique_ptr<PlatformOwner> makePlatform() {
+    keepMemoryFlat();
     blockTerminationSignals();
     const LinuxEnvironment environment = LinuxEnvironment::ofThisProcess();
     if (const auto error = environment.prepareDirectories()) {
