@@ -104,14 +104,14 @@ TEST(DiskTrouble, AStallOfTenSecondsHoldsNobodyUpAndTheRecordingGoesOn) {
 #endif
 }
 
-TEST(DiskTrouble, AFullDiskLeavesAMovieThatPlaysAndTheNextOneWorks) {
+TEST(DiskTrouble, AQuotaThatIsUsedUpLeavesAMovieThatPlaysAndTheNextOneWorks) {
     World world;
     world.startDaemon(world.troubledDisk());
     const auto application = world.application(kMoving);
     ASSERT_TRUE(application->waitForFrame(3));
     (void)application->askForFrame("start");
     ASSERT_TRUE(world.waitForElapsed(1));
-    world.setDiskFull(true);
+    world.setDiskQuotaUsedUp(true);
     ASSERT_TRUE(waitUntil([&] { return world.daemonLog().find("ERROR starting asset writer") != std::string::npos; }));
     const std::uint32_t from = application->askForFrame("frame");
     ASSERT_TRUE(application->waitForFrame(from + 30));
@@ -130,6 +130,27 @@ TEST(DiskTrouble, AFullDiskLeavesAMovieThatPlaysAndTheNextOneWorks) {
             EXPECT_FALSE(line.starts_with("error ")) << line;
         }
     }
+    world.setDiskQuotaUsedUp(false);
+    (void)application->askForFrame("start");
+    ASSERT_TRUE(world.waitForElapsed(1));
+    EXPECT_FALSE(picturesOf(application->stop()).empty());
+}
+
+TEST(DiskTrouble, AFullDiskStopsTheRecordingAndTheNextOneWorksOnceThereIsRoom) {
+    World world;
+    world.startDaemon(world.troubledDisk());
+    const auto application = world.application(kMoving);
+    ASSERT_TRUE(application->waitForFrame(3));
+    (void)application->askForFrame("start");
+    ASSERT_TRUE(world.waitForElapsed(0.5));
+    world.setDiskFull(true);
+    // Within ten seconds somebody looks at the space, and asks for it back.
+    ASSERT_TRUE(waitUntil([&] { return world.recording().is_null(); }));
+    EXPECT_TRUE(application->nextEvent().starts_with("event stopped -5805")) << world.daemonLog();
+    EXPECT_TRUE(waitUntil([&] { return std::filesystem::is_empty(std::filesystem::path(world.moviePath()).parent_path()); }))
+        << "every movie goes";
+    EXPECT_TRUE(application->ask("start").starts_with("error -5805")) << "none begins";
+    EXPECT_FALSE(world.status()["sessions"][0]["transactionOpen"].get<bool>());
     world.setDiskFull(false);
     (void)application->askForFrame("start");
     ASSERT_TRUE(world.waitForElapsed(1));

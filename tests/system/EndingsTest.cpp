@@ -66,7 +66,7 @@ TEST(Endings, AKilledClientLeavesNothing) {
         return world.status()["sessions"].empty() && !std::filesystem::exists(world.moviePath());
     };
     ASSERT_TRUE(waitUntil(atRest)) << world.status();
-    const std::size_t before = world.daemonDescriptors();
+    const std::size_t before = world.daemonDescriptors(), threads = world.daemonNumber("Threads");
     for (int i = 0; i < 3; ++i) {
         const auto application = world.application({"--size", "320x180", "--fps", "30"});
         ASSERT_TRUE(application->waitForFrame(1));
@@ -78,6 +78,8 @@ TEST(Endings, AKilledClientLeavesNothing) {
     }
     EXPECT_TRUE(waitUntil([&] { return world.daemonDescriptors() <= before; }))
         << before << " " << world.daemonDescriptors();
+    EXPECT_TRUE(waitUntil([&] { return world.daemonNumber("Threads") <= threads; }))
+        << threads << " " << world.daemonNumber("Threads");
 }
 
 TEST(Endings, ATerminatedDaemonFinishesItsMovieAndLeavesWithStatusZero) {

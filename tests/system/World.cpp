@@ -197,7 +197,8 @@ std::size_t World::daemonNumber(const std::string& name) {
 
 std::vector<std::string> World::troubledDisk() const {
     return {std::string("LD_PRELOAD=") + LC_SLOW_DISK, "LC_DISK=" + fs::path(moviePath()).parent_path().string(),
-            "LC_DISK_STALLED=" + path("disk stalled"), "LC_DISK_FULL=" + path("disk full")};
+            "LC_DISK_STALLED=" + path("disk stalled"), "LC_DISK_FULL=" + path("disk full"),
+            "LC_DISK_QUOTA=" + path("disk quota")};
 }
 
 void World::setFlag(const std::string& name, bool on) const {

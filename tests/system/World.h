@@ -95,7 +95,9 @@ public:
     /// The variables that make a daemon's disk one that can stop answering or be full (tests/system/slow_disk).
     std::vector<std::string> troubledDisk() const;
     void setDiskStalled(bool stalled) const { setFlag("disk stalled", stalled); }
+    /// Writes fail; the disk says that it is full, or, for a quota, that there is room.
     void setDiskFull(bool full) const { setFlag("disk full", full); }
+    void setDiskQuotaUsedUp(bool used) const { setFlag("disk quota", used); }
     const PrivateDisplay& display() const { return display_; }
     /// Installs a program as an application.
     void install(const std::string& identifier, const std::string& name, const std::string& executable);

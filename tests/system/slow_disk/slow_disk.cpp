@@ -1,6 +1,6 @@
 // A disk that stops answering, or is full: preloaded into the shipped daemon, which knows nothing of it. Calls of the
-// system that touch something below $LC_DISK wait as long as the file $LC_DISK_STALLED is there; writes fail with
-// ENOSPC as long as $LC_DISK_FULL is.
+// system that touch something below $LC_DISK wait as long as the file $LC_DISK_STALLED is there. Writes fail with ENOSPC
+// as long as $LC_DISK_QUOTA or $LC_DISK_FULL is: the one still says that there is room, as a quota does, the other not.
 //
 // A file system of the test's own would need privileges and a kernel that lets it be mounted; this works for every user
 // in every container. It waits where a file system would, in the call itself, in the middle of whatever thread makes it.
@@ -57,6 +57,7 @@ void stall() {
 }
 
 bool isFull() { return isThere(setting("LC_DISK_FULL")); }
+bool takesNothing() { return isFull() || isThere(setting("LC_DISK_QUOTA")); }
 
 template <class Function>
 Function next(const char* name) {
@@ -70,7 +71,7 @@ int modeOf(int flags, va_list arguments) {
 ssize_t writeAt(const char* name, int descriptor, const void* bytes, std::size_t count, off_t offset) {
     if (concerns(descriptor)) {
         stall();
-        if (isFull()) {
+        if (takesNothing()) {
             errno = ENOSPC;
             return -1;
         }
@@ -86,6 +87,15 @@ int openAt(const char* name, int folder, const char* path, int flags, int mode) 
 int openPath(const char* name, const char* path, int flags, int mode) {
     if (concerns(AT_FDCWD, path)) stall();
     return next<int (*)(const char*, int, ...)>(name)(path, flags, mode);
+}
+
+template <class Status>
+int roomOf(int (*ask)(int, Status*), int descriptor, Status* status) {
+    const bool isOurs = concerns(descriptor);
+    if (isOurs) stall();
+    const int result = ask(descriptor, status);
+    if (isOurs && isFull()) status->f_bavail = status->f_bfree = 0;
+    return result;
 }
 
 int synced(const char* name, int descriptor) {
@@ -134,12 +144,10 @@ int open64(const char* path, int flags, ...) {
 int fsync(int descriptor) { return synced("fsync", descriptor); }
 int fdatasync(int descriptor) { return synced("fdatasync", descriptor); }
 int fstatvfs(int descriptor, struct statvfs* status) noexcept {
-    if (concerns(descriptor)) stall();
-    return next<int (*)(int, struct statvfs*)>("fstatvfs")(descriptor, status);
+    return roomOf(next<int (*)(int, struct statvfs*)>("fstatvfs"), descriptor, status);
 }
 int fstatvfs64(int descriptor, struct statvfs64* status) noexcept {
-    if (concerns(descriptor)) stall();
-    return next<int (*)(int, struct statvfs64*)>("fstatvfs64")(descriptor, status);
+    return roomOf(next<int (*)(int, struct statvfs64*)>("fstatvfs64"), descriptor, status);
 }
 int statx(int folder, const char* path, int flags, unsigned mask, struct statx* status) noexcept {
     if (concerns(folder, path)) stall();
