@@ -8,6 +8,7 @@
 #include <memory>
 #include <string>
 
+#include "base/Limits.h"
 #include "linux/admin/LinuxAdminService.h"
 #include "linux/apps/Entitlements.h"
 #include "linux/apps/LinuxBundles.h"
@@ -20,6 +21,7 @@
 #include "linux/storage/LinuxFileSystem.h"
 #include "linux/storage/LinuxStoragePurgeService.h"
 #include "linux/system/Allocator.h"
+#include "linux/system/DescriptorLimit.h"
 #include "linux/system/LinuxClock.h"
 #include "linux/system/LinuxDeviceInfo.h"
 #include "linux/system/LinuxEnvironment.h"
@@ -34,6 +36,9 @@
 namespace lumacast {
 
 namespace {
+
+/// Two for each connection that one user may have, and as many again for other users and everything else.
+constexpr std::uint64_t kDescriptors = 4 * (limitOf(Limit::ConnectionsPerUser) + limitOf(Limit::ConnectionsBeforeHello));
 
 /// A daemon that nobody can reach must not run on: whoever started it hears of it by its exit status. At once, like every
 /// end of this process: other lanes may be in the middle of their work.
@@ -132,6 +137,7 @@ private:
 
 std::unique_ptr<PlatformOwner> makePlatform() {
     keepMemoryFlat();
+    allowDescriptors(kDescriptors);
     blockTerminationSignals();
     const LinuxEnvironment environment = LinuxEnvironment::ofThisProcess();
     if (const auto error = environment.prepareDirectories()) {

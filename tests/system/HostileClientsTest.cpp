@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/eventfd.h>
+#include <sys/resource.h>
 
 #include <algorithm>
 #include <functional>
@@ -193,7 +194,17 @@ TEST(HostileClients, OneThatNeverReadsCostsBoundedMemoryAndNobodyElse) {
 
 TEST(HostileClients, ASilentCrowdKeepsNobodyOut) {
     World world;
+    // What an ordinary session starts with; the daemon asks for more itself.
+    rlimit before{};
+    ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &before), 0);
+    const rlimit ordinary{std::min<rlim_t>(1024, before.rlim_max), before.rlim_max};
+    ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &ordinary), 0);
     world.startDaemon();
+    rlimit daemons{};
+    ASSERT_EQ(::prlimit(world.daemon().pid(), RLIMIT_NOFILE, nullptr, &daemons), 0);
+    EXPECT_GE(daemons.rlim_cur, std::min<rlim_t>(2 * limitOf(Limit::ConnectionsPerUser), before.rlim_max));
+    const rlimit wide{std::max<rlim_t>(before.rlim_cur, std::min<rlim_t>(4096, before.rlim_max)), before.rlim_max};
+    ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &wide), 0);
     const std::size_t descriptors = world.daemonDescriptors();
     std::vector<RawPeer> silent;
     for (std::uint64_t i = 0; i < limitOf(Limit::ConnectionsPerUser); ++i) silent.emplace_back(servicePath(world));
@@ -202,6 +213,7 @@ TEST(HostileClients, ASilentCrowdKeepsNobodyOut) {
     EXPECT_TRUE(application->ask("state").starts_with("state ")) << world.daemonLog();
     EXPECT_EQ(linesWith(world.daemonLog(), "too many without a hello").size(), 1u) << "one line for all of them";
     silent.clear();
+    ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &before), 0);
     EXPECT_TRUE(waitUntil([&] { return world.daemonDescriptors() <= descriptors + 8; }));
 }
 
