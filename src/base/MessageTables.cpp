@@ -1,5 +1,6 @@
 #include "base/MessageTables.h"
 
+#include <algorithm>
 #include <array>
 #include <limits>
 
@@ -95,6 +96,19 @@ bool isSize(const Value& value) {
     return pair && pair->size() == 2 && (*pair)[0].as<double>() && (*pair)[1].as<double>();
 }
 
+/// Without an endpoint or a plane in it, at any depth. Handles travel only where a message declares them.
+bool isPlain(const Value& value) {
+    if (value.as<Value::EndpointRef>() || value.as<Value::PlaneRef>()) return false;
+    if (const Array* array = value.as<Array>()) return std::all_of(array->begin(), array->end(), isPlain);
+    const auto isPlainDictionary = [](const Dictionary& dictionary) {
+        const auto& entries = dictionary.entries();
+        return std::all_of(entries.begin(), entries.end(), [](const auto& entry) { return isPlain(entry.second); });
+    };
+    if (const Dictionary* dictionary = value.as<Dictionary>()) return isPlainDictionary(*dictionary);
+    const Error* error = value.asError();
+    return !error || isPlainDictionary(error->userInfo());
+}
+
 bool isOfType(const Value& value, ArgumentType type) {
     switch (type) {
         case A::Bool: return value.as<bool>();
@@ -107,15 +121,15 @@ bool isOfType(const Value& value, ArgumentType type) {
         case A::Text: return value.as<std::string>();
         case A::Data: return value.as<Data>();
         case A::NullableData: return value.isNull() || value.as<Data>();
-        case A::Dictionary: return value.as<Dictionary>();
-        case A::NullableDictionary: return value.isNull() || value.as<Dictionary>();
-        case A::Array: return value.as<Array>();
+        case A::Dictionary: return value.as<Dictionary>() && isPlain(value);
+        case A::NullableDictionary: return value.isNull() || (value.as<Dictionary>() && isPlain(value));
+        case A::Array: return value.as<Array>() && isPlain(value);
         case A::URL: return value.as<URL>();
         case A::NullableURL: return value.isNull() || value.as<URL>();
         case A::NullableEndpoint: return value.isNull() || value.as<Value::EndpointRef>();
-        case A::NullableError: return value.isNull() || value.asError();
+        case A::NullableError: return value.isNull() || (value.asError() && isPlain(value));
         case A::SharedPlaneObject: return value.isNull() || value.as<Value::PlaneRef>();
-        case A::Any: return true;
+        case A::Any: return isPlain(value);
     }
     return false;
 }

@@ -125,9 +125,7 @@ bool LCRecordingSession::canCaptureSize(Size size) {
 }
 
 bool LCRecordingSession::hasFullResolution() const {
-    const auto fullResolution = services_.platform.preferences.value(kPreferenceDomain, "LCFullResCapture");
-    const bool* on = fullResolution ? fullResolution->as<bool>() : nullptr;
-    return on && *on;
+    return isTrue(services_.platform.preferences.value(kPreferenceDomain, "LCFullResCapture"));
 }
 
 Size LCRecordingSession::cappedSize(Size size) {

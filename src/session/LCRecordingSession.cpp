@@ -26,7 +26,6 @@ LCRecordingSession::LCRecordingSession(const SessionServices& services, BundleId
       bundleID_(std::move(bundleID)),
       broadcastServiceInfoQueue_(services.platform.scheduler.serialQueue("com.orvane.lumacastd.ServiceInfoQueue")),
       resetQueue_(services.platform.scheduler.serialQueue("com.orvane.lumacastd.MediaServicesReset")),
-      pathClaim_(services.tempStore.lastClaim()),
       shouldStopLock_(services.platform.scheduler.ownerlessLock()) {}
 
 void LCRecordingSession::setWindowSize(Size size) {

@@ -260,8 +260,8 @@ private:
     std::atomic<std::int64_t> broadcastFragmentIndex_{0};
     std::int64_t chipId_ = 0;
 
-    /// At first that of whatever was written before: an application that comes back can discard what it left.
-    std::uint64_t pathClaim_;
+    /// None at first: an application that comes back can discard what it left, but not what a writer still has.
+    std::uint64_t pathClaim_ = 0;
     std::atomic<std::uint64_t> starts_{0};  ///< counts startSessionWithHandler
     std::atomic<std::uint64_t> stops_{0};  ///< counts stops of a running recording
     std::atomic<bool> stopIsRunning_{false};  ///< the frame lane and the request lane may both stop; one does

@@ -1,4 +1,5 @@
 #pragma once
+#include <functional>
 #include <mutex>
 #include <vector>
 
@@ -10,6 +11,7 @@ namespace lumacast {
 class FakeDisplayCloneControl final : public DisplayCloneControl {
 public:
     void setMirroringMode(int mode) override {
+        if (whenSet_) whenSet_(mode);
         const std::lock_guard lock(mutex_);
         mode_ = mode;
         modes_.push_back(mode);
@@ -19,6 +21,8 @@ public:
         contexts_ = contexts;
     }
 
+    /// Called with each mode before it is set, on the lane that sets it. Set before the lanes run.
+    void setWhenSet(std::function<void(int)> whenSet) { whenSet_ = std::move(whenSet); }
     int mode() const {
         const std::lock_guard lock(mutex_);
         return mode_;
@@ -34,6 +38,7 @@ public:
     }
 
 private:
+    std::function<void(int)> whenSet_;
     mutable std::mutex mutex_;
     int mode_ = kOff;
     std::set<ContextID> contexts_;

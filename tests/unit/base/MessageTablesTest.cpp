@@ -111,7 +111,7 @@ TEST(MessageTables, EachTypeTakesItsKindAndNoOther) {
                                 {ArgumentType::NullableEndpoint, {12}, true},
                                 {ArgumentType::NullableError, {11}, true},
                                 {ArgumentType::SharedPlaneObject, {13}, true},
-                                {ArgumentType::Any, {1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13}, true}};
+                                {ArgumentType::Any, {1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11}, true}};
     ASSERT_EQ(rows.size(), static_cast<std::size_t>(ArgumentType::Any) + 1) << "a type without a row";
     for (const Row& row : rows)
         for (const Value& value : values) {
@@ -119,6 +119,21 @@ TEST(MessageTables, EachTypeTakesItsKindAndNoOther) {
             EXPECT_EQ(fits(value, row.type), kind == 0 ? row.nullable : row.kinds.contains(kind))
                 << static_cast<int>(row.type) << " " << kind;
         }
+}
+
+TEST(MessageTables, HandlesTravelOnlyWhereTheyAreDeclared) {
+    const Value endpoint = Value::EndpointRef(std::make_shared<Endpoint>());
+    const Value plane = Value::PlaneRef(std::make_shared<FakePlane>(1, 1, 1, std::vector<PixelRect>()));
+    for (const Value& handle : {endpoint, plane}) {
+        const Dictionary dictionary{{"deep", Array{Dictionary{{"deeper", handle}}}}};
+        EXPECT_FALSE(fits(dictionary, ArgumentType::Dictionary));
+        EXPECT_FALSE(fits(dictionary, ArgumentType::NullableDictionary));
+        EXPECT_FALSE(fits(Array{1, handle}, ArgumentType::Array));
+        EXPECT_FALSE(fits(Error("domain", 1, dictionary), ArgumentType::NullableError));
+        EXPECT_FALSE(fits(Array{dictionary}, ArgumentType::Any));
+    }
+    EXPECT_TRUE(fits(Dictionary{{"deep", Array{Dictionary{{"deeper", "x"}}}}}, ArgumentType::Dictionary));
+    EXPECT_TRUE(fits(Error("domain", 1, {{"why", Array{1}}}), ArgumentType::NullableError));
 }
 
 TEST(MessageTables, ASizeIsTwoNumbers) {

@@ -137,6 +137,28 @@ TEST_F(Accept, AnIdleSessionWhoseLastRecordingWasASystemOneStays) {
     EXPECT_EQ(logged("LCRecordingManager: stopRecordingSession:handler:"), 0u);
 }
 
+TEST_F(Accept, TheProxyOfNobodyIsOneAndHasNoConnection) {
+    const auto proxy = process_->clientProxy();
+    ASSERT_TRUE(proxy);
+    EXPECT_EQ(proxy, process_->clientProxy());
+    EXPECT_FALSE(proxy->bundleIdentifier());
+    EXPECT_FALSE(proxy->connection());
+}
+
+TEST_F(Accept, NothingOutlivesTheProcess) {
+    const auto client = makeRecording("Editor", 501, 8);
+    client->tell(DaemonMessage::ClientDidResignActive);
+    onRequestLane([&] { process_->manager().updateExemptionListWithSession(*session(*client)); });
+    client->die();
+    settle();
+    process_.reset();
+    Process next(fakes_.platform());
+    world_.scheduler.mainQueue().sync([&] { next.start(); });
+    EXPECT_TRUE(next.manager().exemptBundleIdentifiers().empty());
+    EXPECT_EQ(next.manager().snapshot().find("sessions")->as<Array>()->size(), 0u);
+    world_.scheduler.endWorld();
+}
+
 /// A purge service that looks what there is when the manager registers.
 class LookingPurgeService final : public StoragePurgeService {
     FakePlatform& fakes_;

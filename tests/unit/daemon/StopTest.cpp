@@ -37,6 +37,26 @@ TEST_F(Stop, AStopIsAnsweredWithTheMovieAndThenTheStateIsReset) {
     EXPECT_EQ(logged("LCRecordingManager:resetStatesForSession:"), 1u);
 }
 
+TEST_F(Stop, AnotherApplicationOfTheSameNameDiscardsNothingThatIsBeingRecorded) {
+    const auto client = makeRecording("Player", 500, 7);
+    TestClient namesake(fakes_, "org.other.Player", "Player", ProcessID{501}, ContextID{8});
+    namesake.connect();
+    settle();
+    const auto discard = namesake.ask(DaemonMessage::DiscardRecording);
+    settle();
+    EXPECT_EQ(discard->answers, 1);
+    EXPECT_TRUE(fakes_.fileSystem.exists(pathOf("Player")));
+    const auto stop = stopped(*client);
+    ASSERT_TRUE(stop->url(0));
+    EXPECT_TRUE(fakes_.fileSystem.movie(pathOf("Player")));
+    // Once its owner has gone the name is anybody's.
+    client->die();
+    settle();
+    namesake.ask(DaemonMessage::DiscardRecording);
+    settle();
+    EXPECT_FALSE(fakes_.fileSystem.exists(pathOf("Player")));
+}
+
 TEST_F(Stop, AClipThatFailsAfterItsApplicationHasLeftIsReset) {
     const auto client = makeRecording();
     advance(seconds(10));

@@ -17,6 +17,7 @@ class Link final : public LCBroadcastExtensionProxy {
 public:
     void processPayload(Dictionary payload, std::function<void()> completion) override {
         payloads.push_back(std::move(payload));
+        if (whenTold) whenTold();
         if (answers)
             completion();
         else
@@ -26,6 +27,7 @@ public:
 
     std::vector<Dictionary> payloads;
     std::vector<std::function<void()>> pending;
+    std::function<void()> whenTold;
     bool answers = true;
     int invalidations = 0;
 };
@@ -115,7 +117,10 @@ TEST_F(ExtensionActions, APauseAndAResumeTellTheExtensionOnceEach) {
     sendSamples();
     fakes_.displayCapture.setPlanes(0);
     start();
+    bool ran = true;
+    link_->whenTold = [&] { ran = source()->isRunning(); };
     pause();
+    EXPECT_FALSE(ran) << "the extension is told when capture has stopped";
     pause();
     EXPECT_EQ(actions(), (Actions{1, 2}));
     resume();

@@ -106,6 +106,14 @@ TEST_F(SessionReports, ARecordingIsReportedOnceWhenItStops) {
     EXPECT_FALSE(session_->reportingAgent());
 }
 
+TEST_F(SessionReports, TheSizeReportedIsThatOfTheCapture) {
+    session_->setWindowSize({2560, 1440});
+    start();
+    finish();
+    EXPECT_EQ(metric(events().at(0), "VideoCaptureWidth"), Value(std::int64_t{1920}));
+    EXPECT_EQ(metric(events().at(0), "VideoCaptureHeight"), Value(std::int64_t{1080}));
+}
+
 TEST_F(SessionReports, TheEndReasonIsTheErrorsCode) {
     start();
     source()->preempt();
@@ -141,6 +149,13 @@ TEST_F(SessionReports, EitherCameraSetsTheFrontFlag) {
         EXPECT_FALSE(metrics.backCameraUsed) << position;
         cleanUp();
     }
+    start();
+    session_->reportingAgent()->update([](UsageMetrics& metrics) { metrics.backCameraUsed = true; });
+    session_->sessionReportCameraUsage(1);
+    EXPECT_FALSE(session_->reportingAgent()->metrics().frontCameraUsed) << "the back camera was in use already";
+    session_->sessionReportCameraUsage(2);
+    EXPECT_TRUE(session_->reportingAgent()->metrics().frontCameraUsed);
+    cleanUp();
     start();
     session_->sessionReportCameraUsage(3);
     session_->sessionReportCameraUsage(0);

@@ -66,10 +66,23 @@ TEST_F(CaptureSizeCap, TheHeightIsFittedFirstAndNothingIsRounded) {
     EXPECT_DOUBLE_EQ(both.height, 1280);
 }
 
+TEST_F(CaptureSizeCap, ANumberOrATextTurnsItOffToo) {
+    const std::vector<std::pair<Value, bool>> values{{std::int64_t{1}, true}, {std::int64_t{0}, false}, {0.5, true},
+                                                     {0.0, false},            {Value("yes"), true},     {Value("TRUE"), true},
+                                                     {Value("1"), true},      {Value("0"), false},      {Value("no"), false},
+                                                     {Value(""), false},      {Value("false"), false}};
+    for (const auto& [value, isOn] : values) {
+        fakes_.preferences.set(kPreferenceDomain, "LCFullResCapture", value);
+        EXPECT_EQ(capped({2560, 1440}).width, isOn ? 2560 : 1920) << describe(value);
+    }
+}
+
 TEST_F(CaptureSizeCap, ThePreferenceTurnsItOff) {
+    const int questions = fakes_.deviceInfo.questions();
     fakes_.preferences.set(kPreferenceDomain, "LCFullResCapture", true);
     EXPECT_EQ(capped({2560, 1440}), (Size{2560, 1440}));
     EXPECT_EQ(logged("full res capture enabled"), 1u);
+    EXPECT_EQ(fakes_.deviceInfo.questions(), questions) << "the device is not asked at all";
     fakes_.preferences.set(kPreferenceDomain, "LCFullResCapture", false);
     EXPECT_EQ(capped({2560, 1440}), (Size{1920, 1080}));
     EXPECT_EQ(logged("full res capture enabled"), 1u);

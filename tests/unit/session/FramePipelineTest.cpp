@@ -260,6 +260,53 @@ TEST_F(FramePipeline, ADiscardedRecordingLeavesItsPausesToTheNext) {
     EXPECT_EQ(ticks(), (Ticks{5000 - 990, 5010 - 990})) << "only a finish forgets them";
 }
 
+TEST_F(FramePipeline, AFinishForgetsTheLastTimeToo) {
+    startQuietly();
+    for (const std::int64_t value : {1000, 1010}) deliver(value);
+    finish();
+    startQuietly();
+    interruption();
+    for (const std::int64_t value : {5000, 5010}) deliver(value);
+    EXPECT_EQ(ticks(), (Ticks{0, 10})) << "the gap is counted from no frame at all";
+}
+
+TEST_F(FramePipeline, AResumeThatNoFrameFollowedMeetsTheNextRecording) {
+    startQuietly();
+    interruption();
+    finish();
+    startQuietly();
+    for (const std::int64_t value : {5000, 5010}) deliver(value);
+    EXPECT_EQ(ticks(), (Ticks{0, 10}));
+}
+
+/// A writer that takes its time.
+class SlowWriter final : public LCMovieWriter {
+public:
+    SlowWriter(const Platform& platform, TempStore& tempStore, std::string path)
+        : LCMovieWriter(platform, tempStore, {640, 360}, std::move(path)), goOn(platform.scheduler.semaphore(0)) {}
+    bool appendVideoSampleBuffer(const SampleRef&, const AffineTransform&) override {
+        goOn->wait();
+        return true;
+    }
+    const std::unique_ptr<Semaphore> goOn;
+};
+
+TEST_F(FramePipeline, AResetOfTheMediaServicesWaitsForTheFrameThatIsOnItsWay) {
+    startQuietly();
+    const auto writer = std::make_shared<SlowWriter>(fakes_.platform(), tempStore_, session_->outputPath());
+    session_->setMovieWriter(writer);
+    const auto lane = fakes_.scheduler.serialQueue("other frame lane");
+    lane->async([this] { deliver(1000); });
+    settle();
+    session_->screenCaptureControllerMediaServicesWereReset(*source());
+    settle();
+    EXPECT_TRUE(session_->isRecording()) << "the frame has the lock";
+    writer->goOn->signal();
+    settle();
+    EXPECT_FALSE(session_->isRecording());
+    EXPECT_EQ(delegate_->stops, std::vector<std::int64_t>{-5817});
+}
+
 /// A writer that takes nothing.
 class RefusingWriter final : public LCMovieWriter {
 public:

@@ -257,6 +257,7 @@ TEST_F(SessionLifecycle, AStopWithNotificationTellsTheDelegateOnce) {
         session_->stopRecordingWithNotification(true, error);
     });
     EXPECT_EQ(delegate_->stops, std::vector<std::int64_t>{-42});
+    EXPECT_FALSE(delegate_->wasOnWhenTold);
     EXPECT_FALSE(session_->isRecording());
     EXPECT_FALSE(session_->isBroadcasting());
     EXPECT_EQ(logged("LCRecordingSession: stop"), 1u);
@@ -331,6 +332,75 @@ TEST_F(SessionLifecycle, AfterAResetOfTheMediaServicesNoPictureIsEverDeliveredAg
     const Answer answer = finish();
     ASSERT_TRUE(answer.error);
     EXPECT_EQ(answer.error->code(), -5812);
+}
+
+TEST_F(SessionLifecycle, TheWindowsAreNamedBeforeTheyAreCloned) {
+    std::vector<std::set<ContextID>> named;
+    fakes_.displayCloneControl.setWhenSet([&](int) { named.push_back(fakes_.displayCloneControl.contexts()); });
+    start();
+    EXPECT_EQ(named, std::vector<std::set<ContextID>>{{kWindow}});
+}
+
+TEST_F(SessionLifecycle, AStopEndsTheSourceThenTheMirroringAndClosesTheGate) {
+    start();
+    std::vector<bool> running;
+    fakes_.displayCloneControl.setWhenSet([&](int) { running.push_back(source()->isRunning()); });
+    onRequestLane([&] { session_->stopRecordingWithNotification(false, std::nullopt); });
+    EXPECT_EQ(running, std::vector<bool>{false});
+    EXPECT_FALSE(source()->isGateOpen());
+}
+
+TEST_F(SessionLifecycle, AStoppedSessionHearsNothingMoreOfItsSource) {
+    start();
+    onRequestLane([&] {
+        source()->fail(-3);
+        session_->stopRecordingWithNotification(false, std::nullopt);
+    });
+    settle();
+    EXPECT_EQ(logged("LCRecordingSession: screenCaptureController: didFailWithStatus:"), 0u);
+}
+
+TEST_F(SessionLifecycle, AStopLeavesThePauseAsItWas) {
+    start();
+    pause();
+    onRequestLane([&] { session_->stopRecordingWithNotification(false, std::nullopt); });
+    EXPECT_TRUE(session_->isPaused());
+}
+
+TEST_F(SessionLifecycle, ANewStartClosesTheGateOfTheOneBefore) {
+    start();
+    onRequestLane([&] {
+        session_->startSessionWithHandler([this] { ++startAnswers_; });
+        EXPECT_FALSE(source()->isGateOpen());
+    });
+    settle();
+    EXPECT_TRUE(source()->isGateOpen());
+}
+
+TEST_F(SessionLifecycle, OfTwoStartsOnlyTheLastCapturesAndBothAreAnswered) {
+    onRequestLane([&] {
+        session_->setRecording(true);
+        session_->startSessionWithHandler([this] { ++startAnswers_; });
+        session_->startSessionWithHandler([this] { ++startAnswers_; });
+    });
+    settle();
+    EXPECT_EQ(startAnswers_, 2);
+    EXPECT_EQ(logged("starting capture"), 1u);
+}
+
+TEST_F(SessionLifecycle, AMovieOfCaptureModeIsHandedOverWhereThereIsOne) {
+    start();
+    session_->setCaptureRecording(true);
+    EXPECT_EQ(finish().url, URL::file(path_));
+}
+
+TEST_F(SessionLifecycle, WhatNothingUsesIsThereAndEmpty) {
+    EXPECT_EQ(session_->broadcastServiceInfoQueue()->label(), "com.orvane.lumacastd.ServiceInfoQueue");
+    EXPECT_FALSE(session_->broadcastAggregatePayloadQueue());
+    EXPECT_TRUE(session_->pendingBroadcastExtensionPayloads().empty());
+    session_->setOutputURL(URL("file:///elsewhere.mp4"));
+    EXPECT_EQ(session_->outputURL(), URL::file(path_));
+    EXPECT_TRUE(LCRecordingSession::isNativeScreenOrientationPortrait());
 }
 
 TEST_F(SessionLifecycle, NeitherItsDelegateNorAFinishUnderWayIsHeld) {

@@ -17,8 +17,9 @@ namespace lumacast {
 /// Remembers what a session reports.
 class RecordingDelegate final : public LCRecordingSessionDelegate {
 public:
-    void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>&,
+    void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
                                           const std::optional<Error>& error) override {
+        wasOnWhenTold |= session->isRecording() || session->isBroadcasting();
         stops.push_back(error ? error->code() : 0);
     }
     void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<LCRecordingSession>&, const Value&) override {}
@@ -28,6 +29,7 @@ public:
 
     std::vector<std::int64_t> stops;  ///< the codes of the errors, 0 for none
     std::vector<double> durations;
+    bool wasOnWhenTold = false;  ///< the session still counted as recording or broadcasting when it told of a stop
 };
 
 class SessionWorld : public ::testing::Test {

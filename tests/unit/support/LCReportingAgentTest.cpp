@@ -47,6 +47,13 @@ TEST_F(LCReportingAgentTest, DurationsAreRoundedToTheNearestWholeNumber) {
     EXPECT_EQ(metric("ActiveDuration"), Value(std::int64_t{12}));
 }
 
+TEST_F(LCReportingAgentTest, NumbersAreRoundedInSinglePrecision) {
+    agent_.update([](UsageMetrics& m) { m.activeDuration = 16777217; });
+    EXPECT_EQ(metric("ActiveDuration"), Value(std::int64_t{16777216}));
+    agent_.update([](UsageMetrics& m) { m.activeDuration = 12.4999999; });
+    EXPECT_EQ(metric("ActiveDuration"), Value(std::int64_t{13})) << "12.5 in single precision";
+}
+
 TEST_F(LCReportingAgentTest, AnEventIsSentWithItsSessionAndUser) {
     agent_.reportEventWithType(1, agent_.collectSummaryEventMetrics());
     const auto events = telemetry_.events();

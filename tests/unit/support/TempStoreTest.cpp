@@ -64,6 +64,9 @@ TEST_F(TempStoreTest, AFailedSetUpIsPrintedAndLogged) {
               (std::vector<std::string>{"_srSetupTempDirectory", "error creating temp directory"}));
     ASSERT_EQ(fakes_.logSink.printed().size(), 1u);
     EXPECT_EQ(fakes_.logSink.printed()[0], "error: " + describe(fakeSystemError(ETIMEDOUT)));
+    const auto lines = fakes_.logSink.lines();
+    ASSERT_GE(lines.size(), 2u);
+    EXPECT_EQ(lines[lines.size() - 2].text, fakes_.logSink.printed()[0]) << "printed before it is logged";
 }
 
 TEST_F(TempStoreTest, ARemovalAnswersLaterWithoutBlocking) {

@@ -190,6 +190,27 @@ TEST_F(MovieWriterAppending, SoundThatIsNotLaterIsDiscardedOnItsOwnTrackOnly) {
     EXPECT_EQ(ticks(2), Ticks{105});
 }
 
+TEST_F(MovieWriterAppending, SoundBehindADiscardedOneWaitsForTheNextCall) {
+    append(100);
+    writer_->appendAudio1SampleBuffer(sound(110));
+    recording().setReady(1, false);
+    for (const std::int64_t value : {110, 120, 130}) writer_->appendAudio1SampleBuffer(sound(value));
+    recording().setReady(1, true);
+    writer_->appendAudio1SampleBuffer(sound(140));
+    EXPECT_EQ(ticks(1), Ticks{110}) << "the discarded one ended this call";
+    writer_->appendAudio1SampleBuffer(sound(150));
+    EXPECT_EQ(ticks(1), (Ticks{110, 120, 130, 140, 150}));
+}
+
+TEST_F(MovieWriterAppending, SoundIsDroppedWhileNoPictureWasProcessedThoughTheWriterWrites) {
+    writer_->appendVideoSampleBuffer(picture(kInvalidMediaTime), {});
+    ASSERT_EQ(recording().status(), ContainerStatus::Writing);
+    writer_->appendAudio1SampleBuffer(sound(110));
+    writer_->appendAudio2SampleBuffer(sound(110));
+    EXPECT_EQ(logged("appending audio 1 sample with timestamp:110 duration:20"), 0u);
+    EXPECT_EQ(logged("appending audio 2 sample with timestamp:110 duration:20"), 0u);
+}
+
 TEST_F(MovieWriterAppending, AMissingSoundIsIgnored) {
     append(100);
     writer_->appendAudio1SampleBuffer(nullptr);

@@ -125,6 +125,42 @@ TEST_F(MovieWriterFinishing, SamplesThatStillWaitAreNotInTheMovie) {
     EXPECT_EQ(logged("appending video sample"), 1u);
 }
 
+TEST_F(MovieWriterFinishing, SamplesThatStillWaitAreForgottenWhenTheFinishBegins) {
+    const auto writer = makeReadyWriter();
+    append(*writer, 100);
+    recording().setReady(0, false);
+    append(*writer, 120);
+    recording().holdFinish(true);
+    finish(writer);
+    settle();
+    recording().setReady(0, true);
+    append(*writer, 130);
+    EXPECT_EQ(logged("appending video sample"), 1u) << "the late one alone";
+    recording().holdFinish(false);
+    settle();
+}
+
+TEST_F(MovieWriterFinishing, AWriterWithoutAPictureIsNeitherFinishedNorCancelled) {
+    const auto writer = makeReadyWriter();
+    finish(writer);
+    settle();
+    EXPECT_EQ(recording().status(), ContainerStatus::Unknown);
+}
+
+TEST_F(MovieWriterFinishing, TheHandlerComesBeforeTheFirstSampleIsForgotten) {
+    for (const bool fails : {false, true}) {
+        const auto writer = makeReadyWriter();
+        append(*writer, 100);
+        if (fails) recording().fail(Error("disk", 28));
+        std::optional<bool> processed;
+        writer->finishWritingWithHandler([&](std::optional<URL>) { processed = writer->didProcessFirstSample(); });
+        settle();
+        EXPECT_EQ(processed, true);
+        EXPECT_FALSE(writer->didProcessFirstSample());
+        fakes_.fileSystem.remove(path_);
+    }
+}
+
 TEST_F(MovieWriterFinishing, AnAnnouncedStopCutsWhatCameAfterIt) {
     const auto writer = makeReadyWriter();
     for (const std::int64_t value : {100, 110, 120}) append(*writer, value);
