@@ -365,7 +365,7 @@ TEST(SeveralApplications, LeaveNothingBehindInAnyOfManySeeds) {
             return;
         }
     }
-    if (seeds.isOne() || seeds.last < 100) return;
+    if (seeds.isOne() || seeds.last < 2000) return;
     // The seeds really went everywhere.
     EXPECT_GT(tally.movies, 50);
     EXPECT_GT(tally.clips, 5);
