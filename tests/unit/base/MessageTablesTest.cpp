@@ -33,6 +33,59 @@ TEST(MessageTables, TheProtocolsHaveTheirMessages) {
               "recordingTimerDidUpdate:");
 }
 
+TEST(MessageTables, EachNumberHasItsName) {
+    // Only the number travels: written out by hand.
+    using D = DaemonMessage;
+    using C = ClientMessage;
+    const auto name = [](const Protocol& protocol, auto message) {
+        return protocol.messages[static_cast<std::size_t>(message)].name;
+    };
+    const std::vector<std::pair<D, std::string_view>> daemon{
+        {D::StartRecording,
+         "startRecordingWindowLayerContextIDs:windowSize:microphoneEnabled:cameraEnabled:broadcast:systemRecording:"
+         "captureEnabled:listenerEndpoint:withHandler:"},
+        {D::SetupBroadcast,
+         "setupBroadcastWithHostBundleID:broadcastExtensionBundleID:broadcastConfigurationData:userInfo:handler:"},
+        {D::GetCurrentBroadcastImages, "getCurrentBroadcastImages:"},
+        {D::GetSystemBroadcastExtensionInfo, "getSystemBroadcastExtensionInfo:"},
+        {D::StopRecording, "stopRecordingWithHandler:"},
+        {D::StopRecordingWithClipDurations, "stopRecordingWithStartClipDuration:endClipDuration:handler:"},
+        {D::SaveVideoToCameraRoll, "saveVideoToCameraRoll:handler:"},
+        {D::PauseRecording, "pauseRecording"},
+        {D::ResumeRecording, "resumeRecordingWithWindowLayerContextID:"},
+        {D::SetMicrophoneEnabled, "setMicrophoneEnabled:"},
+        {D::UpdateProcessIDForAudioCapture, "updateProcessIDForAudioCaptureWithPID:"},
+        {D::DiscardRecording, "discardRecordingWithHandler:"},
+        {D::ClientDidBecomeActive, "clientDidBecomeActive"},
+        {D::ClientDidResignActive, "clientDidResignActive"},
+        {D::SynchronousGetCurrentState, "synchronousGetCurrentState:"},
+        {D::SetHasUserConsentForCamera, "setHasUserConsentForCamera:"},
+        {D::SetHasUserConsentForMicrophone, "setHasUserConsentForMicrophone:"},
+        {D::SetBroadcastURL, "setBroadcastURL:"},
+        {D::SetMicrophoneEnabledPersistent, "setMicrophoneEnabledPersistent:"},
+        {D::ReportCameraUsage, "reportCameraUsage:"}};
+    ASSERT_EQ(daemon.size(), daemonProtocol().messages.size());
+    for (std::size_t i = 0; i < daemon.size(); ++i) {
+        EXPECT_EQ(static_cast<std::size_t>(daemon[i].first), i);
+        EXPECT_EQ(name(daemonProtocol(), daemon[i].first), daemon[i].second);
+    }
+    const std::vector<std::pair<C, std::string_view>> client{
+        {C::UpdateScreenRecordingState, "updateScreenRecordingState:"},
+        {C::StopRecordingWithError, "stopRecordingWithError:movieURL:"},
+        {C::UpdateBroadcastServiceInfo, "updateBroadcastServiceInfo:"},
+        {C::UpdateBroadcastURL, "updateBroadcastURL:"},
+        {C::CaptureHandlerWithSample, "captureHandlerWithSample:timingData:"},
+        {C::CaptureHandlerWithAudioSample,
+         "captureHandlerWithAudioSample:absdData:itemCount:bufferType:timingData:"},
+        {C::RecordingLockInterrupted, "recordingLockInterrupted:"},
+        {C::RecordingTimerDidUpdate, "recordingTimerDidUpdate:"}};
+    ASSERT_EQ(client.size(), clientProtocol().messages.size());
+    for (std::size_t i = 0; i < client.size(); ++i) {
+        EXPECT_EQ(static_cast<std::size_t>(client[i].first), i);
+        EXPECT_EQ(name(clientProtocol(), client[i].first), client[i].second);
+    }
+}
+
 TEST(MessageTables, NamesAreDistinctAndHaveAColonForEachArgumentAndTheHandler) {
     for (const Protocol* protocol : {&daemonProtocol(), &clientProtocol()}) {
         std::set<std::string_view> names;

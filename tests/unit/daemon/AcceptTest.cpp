@@ -33,14 +33,21 @@ public:
         note("entitlement " + std::string(entitlement));
         return std::nullopt;
     }
-    std::unique_ptr<IpcRemoteProxy> remoteProxy(ErrorHandler) override { return nullptr; }
+    std::unique_ptr<IpcRemoteProxy> remoteProxy(ErrorHandler) override {
+        ++proxies;
+        return std::make_unique<Nobody>();
+    }
 
     const std::string name;
     const ProcessID pid;
     std::vector<std::string>& calls;
     Handler interruption, invalidation;
+    int proxies = 0;
 
 private:
+    struct Nobody final : IpcRemoteProxy {
+        void send(std::uint16_t, Array, std::function<void(Array)>) override {}
+    };
     void note(const std::string& call) { calls.push_back(name + ": " + call); }
 };
 
@@ -103,6 +110,15 @@ TEST_F(Accept, AProxyIsMadeAnewAlsoWhereTheOlderOneHadLostItsConnection) {
     offer("second");
     EXPECT_NE(player()->clientProxy(), older);
     EXPECT_EQ(std::count(calls_.begin(), calls_.end(), "first: invalidate"), 0);
+}
+
+TEST_F(Accept, EveryMessageAsksForAProxyOfItsOwn) {
+    const auto connection = offer("first");
+    const auto proxy = player()->clientProxy();
+    for (int i = 1; i <= 3; ++i) {
+        proxy->updateScreenRecordingState(true);
+        EXPECT_EQ(connection->proxies, i);
+    }
 }
 
 TEST_F(Accept, AnInterruptionEndsTheSessionAsALossDoes) {

@@ -68,6 +68,13 @@ TEST_F(Exemptions, WithTheMicrophoneWantedOnlyTheSetOfSuchRecordingsCounts) {
     EXPECT_TRUE(isExempt(*client)) << "such an exemption is one of a plain recording too";
 }
 
+TEST_F(Exemptions, AnExemptionWithTheMicrophoneIsOneWithoutItToo) {
+    const auto client = makeConnected();
+    EXPECT_EQ(start(*client, true), -5801);
+    exempt(*client);
+    EXPECT_EQ(start(*client, false), 0);
+}
+
 TEST_F(Exemptions, ARefusedStartLeavesTheFlagsItAskedFor) {
     const auto client = makeConnected();
     const auto asked = client->start({client->window}, {.microphone = true, .camera = true});

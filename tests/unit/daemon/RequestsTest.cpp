@@ -106,6 +106,31 @@ TEST_F(Requests, WhatIsNotServedIsOnlyLogged) {
     }
 }
 
+TEST_F(Requests, AStartAfterTheApplicationWasUninstalledIsRefusedAndTheRestIgnored) {
+    const auto client = makeConnected(), other = makeRecording("Editor", 501, 8);
+    fakes_.bundles.uninstall(client->id);
+    const auto plain = client->start({});
+    const auto system = client->start({client->window}, {.system = true});
+    settle();
+    EXPECT_EQ(plain->code(), -5803) << "nobody is in the foreground";
+    EXPECT_EQ(system->code(), -5810);
+    // A window whose process belongs to no application is not that of a caller who belongs to none.
+    const auto third = makeRecording("Editor", 503, 10);
+    fakes_.renderServer.addLayer(ContextID{20}, ProcessID{900});
+    EXPECT_EQ(client->start({ContextID{20}})->answers, 0);
+    settle();
+    EXPECT_TRUE(session(*third)->isRecording()) << "it was refused before room was made";
+    const auto stop = client->ask(DaemonMessage::StopRecording);
+    const auto discard = client->ask(DaemonMessage::DiscardRecording);
+    for (const DaemonMessage message : {DaemonMessage::PauseRecording, DaemonMessage::ClientDidBecomeActive,
+                                        DaemonMessage::ClientDidResignActive})
+        client->tell(message);
+    client->tell(DaemonMessage::ResumeRecording, {number(client->window)});
+    settle();
+    EXPECT_EQ(stop->answers + discard->answers, 0);
+    EXPECT_TRUE(session(*third)->isRecording());
+}
+
 TEST_F(Requests, ARequestAfterTheApplicationWasUninstalledFindsNoSession) {
     const auto client = makeConnected();
     fakes_.bundles.uninstall(client->id);

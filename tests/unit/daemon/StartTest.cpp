@@ -165,6 +165,29 @@ TEST_F(Start, AnApplicationThatIsNotInTheForegroundIsRefused) {
     EXPECT_EQ(started(*client)->code(), 0) << "one bit of several";
 }
 
+TEST_F(Start, AStartThatIsRefusedForTheForegroundOrByTheUserHasStillStoppedThePreviousRecording) {
+    for (const bool inForeground : {false, true}) {
+        const auto other = makeRecording("Editor", 501, 8);
+        const auto client = makeConnected();
+        fakes_.appStateMonitor.setState(client->id, inForeground ? 8 : 4);
+        fakes_.preferences.set(kPreferenceDomain, "LCSuppressAlert", !inForeground);
+        EXPECT_EQ(started(*client)->code(), inForeground ? -5801 : -5803);
+        EXPECT_FALSE(session(*other)->isRecording());
+        EXPECT_EQ(other->toldOfStop(-5806), 1);
+        fakes_.preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
+    }
+}
+
+TEST_F(Start, TheAnswerHasTheManagersFlagsOfThatMomentNotTheRequests) {
+    const auto client = makeConnected();
+    const auto first = client->start({client->window}, {.microphone = true, .camera = true});
+    const auto second = client->start();
+    settle();
+    ASSERT_EQ(first->answers + second->answers, 2);
+    EXPECT_EQ(first->values[1], Value(false));
+    EXPECT_EQ(first->values[2], Value(false));
+}
+
 TEST_F(Start, LackOfSpaceIsFoundBeforeTheForeground) {
     const auto client = makeConnected();
     fakes_.appStateMonitor.setState(client->id, 4);

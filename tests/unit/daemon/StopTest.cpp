@@ -339,6 +339,40 @@ TEST_F(Stop, AResumeOfABroadcastDoesNothingAtAll) {
         EXPECT_TRUE(fakes_.logSink.logged().empty());
         EXPECT_TRUE(session(*client)->isPaused());
     }
+    session(*client)->setPaused(false);
+    tell(*client, DaemonMessage::ResumeRecording, {number(client->window)});
+    EXPECT_TRUE(fakes_.logSink.logged().empty()) << "paused or not";
+}
+
+TEST_F(Stop, AResumeLeavesASystemRecordingAndWhatDoesNotRecordAlone) {
+    const auto client = makeRecording();
+    tell(*client, DaemonMessage::PauseRecording);
+    session(*client)->setSystemRecording(true);
+    session(*client)->setIsBroadcasting(true);
+    tell(*client, DaemonMessage::ResumeRecording, {number(client->window)});
+    EXPECT_EQ(fakes_.logSink.logged(), Lines{"LCRecordingManager: resumeRecording"}) << "its window is looked at";
+    EXPECT_TRUE(session(*client)->isPaused());
+    session(*client)->setSystemRecording(false);
+    session(*client)->setIsBroadcasting(false);
+    session(*client)->setRecording(false);
+    tell(*client, DaemonMessage::ResumeRecording, {number(client->window)});
+    EXPECT_EQ(fakes_.logSink.logged(), Lines{"LCRecordingManager: resumeRecording"});
+    EXPECT_TRUE(session(*client)->isPaused());
+}
+
+TEST_F(Stop, TheReportOfAnOlderStartIsDropped) {
+    const auto client = makeRecording();
+    const auto recording = session(*client);
+    const Error error("test", -42);
+    // A start is on its way on the request lane when the frame lane reports the end of the one before.
+    fakes_.scheduler.mainQueue().async([recording] { recording->startSessionWithHandler([] {}); });
+    process_->manager().recordingSessionStoppedWithError(recording, error);
+    settle();
+    EXPECT_EQ(client->toldOfStop(-42), 0);
+    EXPECT_TRUE(recording->isRecording());
+    process_->manager().recordingSessionStoppedWithError(recording, error);
+    settle();
+    EXPECT_EQ(client->toldOfStop(-42), 1);
 }
 
 }  // namespace
