@@ -24,6 +24,8 @@ void Dictionary::set(std::string key, Value value) {
         entries_.emplace_back(std::move(key), std::move(value));
 }
 
+void Dictionary::addNew(std::string key, Value value) { entries_.emplace_back(std::move(key), std::move(value)); }
+
 const Value* Dictionary::find(std::string_view key) const {
     for (const auto& entry : entries_)
         if (entry.first == key) return &entry.second;

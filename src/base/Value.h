@@ -37,6 +37,9 @@ public:
 
     /// Adds the entry, or replaces the value of an entry with this key at its place.
     void set(std::string key, Value value);
+    /// Adds an entry without looking whether its key is there, which takes as long as there are entries. For whoever
+    /// knows that it is not.
+    void addNew(std::string key, Value value);
 
     /// The value under `key`, or null. Valid until the dictionary changes.
     const Value* find(std::string_view key) const;

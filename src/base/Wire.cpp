@@ -202,7 +202,7 @@ private:
             Value item;
             if (!string(key) || !seen.insert(key).second || !value(item, depth + 1)) return false;
             if (seen.size() > kMaximumEntries) return false;
-            out.set(std::move(key), std::move(item));
+            out.addNew(std::move(key), std::move(item));
         }
         return true;
     }

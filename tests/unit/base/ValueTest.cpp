@@ -56,6 +56,12 @@ TEST(Dictionary, EntriesKeepTheirFirstOrderAndAReplacedOneItsPlace) {
     EXPECT_TRUE(Dictionary().empty());
 }
 
+TEST(Dictionary, ANewEntryIsTheLast) {
+    Dictionary dictionary{{"b", 1}};
+    dictionary.addNew("a", 2);
+    EXPECT_EQ(dictionary, (Dictionary{{"b", 1}, {"a", 2}}));
+}
+
 TEST(Error, ItsDescriptionIsInItsUserInfo) {
     EXPECT_FALSE(Error("domain", 1).localizedDescription());
     EXPECT_FALSE(Error("domain", 1, {{std::string(kLocalizedDescriptionKey), 5}}).localizedDescription());

@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <chrono>
 #include <limits>
 
 #include "base/Limits.h"
@@ -172,6 +174,29 @@ TEST(Wire, AHandleMustBeThereAndOfItsKind) {
     EXPECT_FALSE(decode(Data{12, 1}, handles));
     EXPECT_FALSE(decode(Data{13, 0}, handles));
     EXPECT_FALSE(decode(Data{12, 0}, {}));
+}
+
+/// `count` dictionaries of `entries` entries.
+WireBody dictionaries(int count, int entries) {
+    Dictionary one;
+    for (int i = 0; i < entries; ++i) one.addNew("a key with the number " + std::to_string(i), Value());
+    WireBody body;
+    EXPECT_TRUE(encode(Value(Array(static_cast<std::size_t>(count), Value(one))), body));
+    return body;
+}
+
+TEST(Wire, LargeDictionariesTakeNoLongerThanAsManyEntriesInSmallOnes) {
+    // The shortest of several times says how much work it is, however busy the machine.
+    const auto shortestTime = [](const WireBody& body) {
+        auto shortest = std::chrono::steady_clock::duration::max();
+        for (int round = 0; round < 9; ++round) {
+            const auto begin = std::chrono::steady_clock::now();
+            EXPECT_TRUE(decode(body.bytes, body.handles));
+            shortest = std::min(shortest, std::chrono::steady_clock::now() - begin);
+        }
+        return shortest;
+    };
+    EXPECT_LT(shortestTime(dictionaries(16, 1000)), 6 * shortestTime(dictionaries(1000, 15)));
 }
 
 TEST(Wire, AnyChangedByteIsRefusedOrStillAValueThatTravels) {
