@@ -1,17 +1,10 @@
 // The frame layer: what a peer sends over a connection's socket, in pieces, with descriptors. The input is a script of
-// pieces; each is sent and read in one go:
-//
-//   byte: number of descriptors (below 11) · that many bytes: their kinds · u16: length of the piece, at most 1023 ·
-//   bytes
-//
-// A length's highest bit makes the piece a frame with a good header around the bytes (then also: byte: kind, byte:
-// handles declared, byte: bytes of the records at the end). So that reading does not depend on how a kernel cuts a
+// pieces (see Pieces.h); each is sent and read in one go. So that reading does not depend on how a kernel cuts a
 // stream, the same script is read a second time in crumbs.
 
 #include "linux/ipc/Frames.h"
 
 #include <fcntl.h>
-#include <sys/mman.h>
 #include <sys/socket.h>
 
 #include <array>
@@ -19,7 +12,7 @@
 #include <memory>
 
 #include "base/Limits.h"
-#include "fuzz/Input.h"
+#include "fuzz/Pieces.h"
 #include "fuzz/Property.h"
 #include "linux/ipc/Handles.h"
 #include "linux/ipc/IncomingFrames.h"
@@ -27,69 +20,6 @@
 namespace lumacast::fuzz {
 
 namespace {
-
-constexpr std::size_t kMaximumPieces = 24;
-
-/// Descriptors that pieces carry copies of. Made once: they cost more than everything else.
-class Wares {
-public:
-    Wares() {
-        descriptors_[0] = memory(4096, F_SEAL_SHRINK);
-        descriptors_[1] = memory(4096, 0);
-        descriptors_[2] = memory(0, F_SEAL_SHRINK | F_SEAL_GROW);
-        std::array<int, 2> pair{};
-        if (::socketpair(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0, pair.data()) == 0) {
-            descriptors_[3] = Fd(pair[0]);
-            other_ = Fd(pair[1]);
-        }
-        descriptors_[4] = Fd(::open("/dev/null", O_RDONLY | O_CLOEXEC));
-    }
-    int descriptor(unsigned kind) const { return descriptors_[kind % descriptors_.size()].get(); }
-
-private:
-    static Fd memory(off_t size, int seals) {
-        Fd file(::memfd_create("fuzz", MFD_CLOEXEC | MFD_ALLOW_SEALING));
-        if (::ftruncate(file.get(), size) != 0 || ::fcntl(file.get(), F_ADD_SEALS, seals) != 0) return Fd();
-        return file;
-    }
-
-    std::array<Fd, 5> descriptors_;
-    Fd other_;
-};
-
-struct Piece {
-    Data bytes;
-    std::vector<int> descriptors;
-};
-
-std::vector<Piece> piecesOf(Input in, const Wares& wares) {
-    std::vector<Piece> pieces;
-    while (!in.isAtEnd() && pieces.size() < kMaximumPieces) {
-        Piece& piece = pieces.emplace_back();
-        for (unsigned count = in.below(11); count > 0; --count)
-            piece.descriptors.push_back(wares.descriptor(in.byte()));
-        const std::uint64_t length = in.number(2);
-        const bool isFramed = (length & 0x8000) != 0;
-        FrameHeader header;
-        if (isFramed) {
-            header.kind = static_cast<FrameKind>(in.below(7));
-            header.handles = in.byte();
-            header.recordBytes = in.byte();
-            header.message = static_cast<std::uint16_t>(header.kind <= FrameKind::Request ? in.byte() : 0);
-            header.sequence = pieces.size();
-        }
-        const Bytes bytes = in.bytes(length & 0x3FF);
-        if (isFramed) {
-            header.recordBytes = std::min(header.recordBytes, static_cast<std::uint32_t>(bytes.size()));
-            header.valueBytes = static_cast<std::uint32_t>(bytes.size()) - header.recordBytes;
-            piece.bytes.resize(kFrameHeaderBytes);
-            writeFrameHeader(header, piece.bytes);
-        }
-        piece.bytes.insert(piece.bytes.end(), bytes.begin(), bytes.end());
-        if (piece.bytes.empty()) pieces.pop_back();  // a stream has no empty pieces
-    }
-    return pieces;
-}
 
 void send(int socket, Bytes bytes, const std::vector<int>& descriptors) {
     iovec part{const_cast<std::uint8_t*>(bytes.data()), bytes.size()};

@@ -36,6 +36,8 @@ void checkValue(std::string_view text) {
     require(value.as<bool>() || value.as<std::int64_t>() || number || value.as<std::string>(),
             "a preference is a bool, a number or a text");
     require(!number || std::isfinite(*number), "a number is finite");
+    if (const auto* string = value.as<std::string>())
+        require(*string == text || '"' + *string + '"' == text, "a text is what was written, or what was quoted");
     require(iniValue(printed(value)) == value, "a printed preference reads as the same preference");
 }
 
