@@ -155,7 +155,7 @@ double LCRecordingSession::activeDuration() const {
     const auto agent = reportingAgent();
     if (!agent) return 0;
     const auto started = captureStartTime();
-    const bool running = recording_ && !paused_ && !startIsPending_ && started;
+    const bool running = isRecording() && !paused_ && !startIsPending_ && started;
     return agent->metrics().activeDuration + (running ? secondsBetween(*started, services_.platform.clock.now()) : 0);
 }
 
@@ -180,7 +180,8 @@ void LCRecordingSession::stopAllCapture() {
 void LCRecordingSession::stopRecordingWithNotification(bool notification, const std::optional<Error>& error) {
     // The frame lane and the request lane may both stop: whoever has the flag looks, so that one stop is one stop.
     if (stopIsRunning_.exchange(true)) return;
-    if (!recording_) {
+    std::uint64_t state = recordingState_;
+    if (!(state & 1)) {
         stopIsRunning_ = false;
         return;
     }
@@ -190,8 +191,7 @@ void LCRecordingSession::stopRecordingWithNotification(bool notification, const 
     ++stops_;
     if (const auto source = screenCaptureController()) source->closeGate(GateWait::No);
     stopAllCapture();
-    recording_ = false;
-    isBroadcasting_ = false;
+    if (recordingState_.compare_exchange_strong(state, state & ~std::uint64_t{1})) isBroadcasting_ = false;
     stopIsRunning_ = false;
     if (notification)
         if (const auto delegate = delegate_.get().lock())
@@ -201,7 +201,7 @@ void LCRecordingSession::stopRecordingWithNotification(bool notification, const 
 
 void LCRecordingSession::finishSessionWithStartClipDuration(double startClipDuration, double endClipDuration,
                                                             FinishHandler handler) {
-    if (!recording_) return;
+    if (!isRecording()) return;
     log_.line("LCRecordingSession: finishSessionWithHandler");
     stopRecordingWithNotification(false, std::nullopt);
     lastSampleTimestamp_.set(kInvalidMediaTime);

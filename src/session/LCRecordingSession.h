@@ -62,8 +62,11 @@ public:
     std::shared_ptr<LCClientProtocol> clientProxy() const { return clientProxy_.get(); }
     void setClientProxy(std::shared_ptr<LCClientProtocol> proxy) { clientProxy_.set(std::move(proxy)); }
     void setDelegate(std::weak_ptr<LCRecordingSessionDelegate> delegate) { delegate_.set(std::move(delegate)); }
-    bool isRecording() const { return recording_; }
-    void setRecording(bool recording) { recording_ = recording; }
+    bool isRecording() const { return recordingState_ & 1; }
+    /// Request lane.
+    void setRecording(bool recording) {
+        recordingState_ = (((recordingState_ >> 1) + 1) << 1) | static_cast<std::uint64_t>(recording);
+    }
     bool isPaused() const { return paused_; }
     void setPaused(bool paused) { paused_ = paused; }
     bool isSystemRecording() const { return systemRecording_; }
@@ -86,7 +89,9 @@ public:
     std::optional<URL> broadcastURL() const { return broadcastURL_; }
     /// The upload extension of the broadcast; null when there is none.
     std::shared_ptr<AppExtension> broadcastExtension() const { return broadcastExtension_.get(); }
-    void setBroadcastExtension(std::shared_ptr<AppExtension> extension) { broadcastExtension_.set(std::move(extension)); }
+    void setBroadcastExtension(std::shared_ptr<AppExtension> extension) {
+        broadcastExtension_.set(std::move(extension));
+    }
     /// Of the extension, so none without one.
     std::optional<BundleIdentifier> broadcastExtensionID() const;
     std::shared_ptr<LCBroadcastExtensionProxy> broadcastUploadExtensionProxy() const {
@@ -97,7 +102,9 @@ public:
     }
     /// Kept for the extensions' sake; nothing uses them.
     const std::shared_ptr<SerialQueue>& broadcastServiceInfoQueue() const { return broadcastServiceInfoQueue_; }
-    const std::shared_ptr<SerialQueue>& broadcastAggregatePayloadQueue() const { return broadcastAggregatePayloadQueue_; }
+    const std::shared_ptr<SerialQueue>& broadcastAggregatePayloadQueue() const {
+        return broadcastAggregatePayloadQueue_;
+    }
     const Array& pendingBroadcastExtensionPayloads() const { return pendingBroadcastExtensionPayloads_; }
     /// What the application wants the extension to know. Request lane.
     const Dictionary& broadcastUserInfo() const { return broadcastUserInfo_; }
@@ -239,9 +246,12 @@ private:
 
     Guarded<std::shared_ptr<LCClientProtocol>> clientProxy_;
     Guarded<std::weak_ptr<LCRecordingSessionDelegate>> delegate_;
-    std::atomic<bool> recording_{false}, paused_{false}, systemRecording_{false}, isBroadcasting_{false},
-        captureRecording_{false}, microphoneEnabled_{false}, microphoneEnabledPersistent_{false},
-        hasUserConsentForCamera_{false}, hasUserConsentForMicrophone_{false}, sessionWasResumed_{false};
+    /// The lowest bit: whether it records; above it: how often that was set, so that a stop on the frame lane ends the
+    /// recording it found and not one that was begun meanwhile.
+    std::atomic<std::uint64_t> recordingState_{0};
+    std::atomic<bool> paused_{false}, systemRecording_{false}, isBroadcasting_{false}, captureRecording_{false},
+        microphoneEnabled_{false}, microphoneEnabledPersistent_{false}, hasUserConsentForCamera_{false},
+        hasUserConsentForMicrophone_{false}, sessionWasResumed_{false};
     std::atomic<ProcessID> frontmostPIDForAudioTap_{ProcessID{0}};
     std::optional<URL> broadcastURL_, interruptedMovieURL_;
     std::vector<ContextID> contextIDs_;
@@ -262,10 +272,10 @@ private:
 
     /// None at first: an application that comes back can discard what it left, but not what a writer still has.
     std::uint64_t pathClaim_ = 0;
-    std::atomic<std::uint64_t> starts_{0};  ///< counts startSessionWithHandler
-    std::atomic<std::uint64_t> stops_{0};  ///< counts stops of a running recording
+    std::atomic<std::uint64_t> starts_{0};    ///< counts startSessionWithHandler
+    std::atomic<std::uint64_t> stops_{0};     ///< counts stops of a running recording
     std::atomic<bool> stopIsRunning_{false};  ///< the frame lane and the request lane may both stop; one does
-    bool startIsPending_ = false;      ///< the continuation of the last start has not run yet
+    bool startIsPending_ = false;             ///< the continuation of the last start has not run yet
 
     /// Deliberately left held on the paused path of the frame pipeline; see _processSampleBuffer.
     const std::unique_ptr<OwnerlessLock> shouldStopLock_;

@@ -334,6 +334,16 @@ TEST_F(SessionLifecycle, AfterAResetOfTheMediaServicesNoPictureIsEverDeliveredAg
     EXPECT_EQ(answer.error->code(), -5812);
 }
 
+TEST_F(SessionLifecycle, AStopEndsOnlyTheRecordingItFound) {
+    start();
+    // The next recording is begun while the frame lane stops this one.
+    fakes_.displayCloneControl.setWhenSet([&](int mode) {
+        if (mode == DisplayCloneControl::kOff) session_->setRecording(true);
+    });
+    session_->stopRecordingWithNotification(false, std::nullopt);
+    EXPECT_TRUE(session_->isRecording());
+}
+
 TEST_F(SessionLifecycle, TheWindowsAreNamedBeforeTheyAreCloned) {
     std::vector<std::set<ContextID>> named;
     fakes_.displayCloneControl.setWhenSet([&](int) { named.push_back(fakes_.displayCloneControl.contexts()); });
