@@ -19,6 +19,7 @@ const std::shared_ptr<LCClientProxy>& Process::clientProxy() {
 }
 
 void Process::start() {
+    errors_.readTexts();
     manager_->finishStartup();
     manager_->serveStorageCommands();
     platform_.admin.resume([weak = std::weak_ptr(manager_)] {

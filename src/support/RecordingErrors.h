@@ -1,6 +1,11 @@
 #pragma once
 #include <cstdint>
+#include <map>
+#include <optional>
+#include <string>
+#include <string_view>
 
+#include "base/Guarded.h"
 #include "base/RecordingErrorCodes.h"
 #include "base/Value.h"
 
@@ -8,7 +13,8 @@ namespace lumacast {
 
 class Localization;
 
-/// The one place that builds recording errors. Callable from any lane.
+/// The one place that builds recording errors. Callable from any lane; a text that was found once is kept, so that lanes
+/// which must not wait for the disk don't.
 class RecordingErrors {
 public:
     explicit RecordingErrors(Localization& localization) : localization_(localization) {}
@@ -21,7 +27,13 @@ public:
         return _lcUserErrorForCode(static_cast<std::int64_t>(code), std::move(userInfo));
     }
 
+    /// Looks every text up that the daemon may need, waiting for the disk.
+    void readTexts() const;
+
 private:
+    std::optional<std::string> text(std::string_view key) const;
+
+    mutable Guarded<std::map<std::string, std::string, std::less<>>> texts_;
     Localization& localization_;
 };
 

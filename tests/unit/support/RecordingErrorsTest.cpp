@@ -74,5 +74,22 @@ TEST_F(RecordingErrorsTest, WithoutATextTheErrorCarriesNoDescriptionButKeepsAGiv
     EXPECT_EQ(*kept.localizedDescription(), "mine");
 }
 
+TEST_F(RecordingErrorsTest, TextsThatWereReadAreNotLookedUpAgainAndMissingOnesAre) {
+    const std::string missing(recordingErrorKey(-5812));
+    installTexts({missing});
+    errors_.readTexts();
+    FakeBundle empty;
+    empty.path = bundles_.frameworkBundlePath() + "/en.lproj";
+    bundles_.install(empty);
+    const Error read = errors_._lcUserErrorForCode(-5806), unread = errors_._lcUserErrorForCode(-5812);
+    ASSERT_TRUE(read.localizedDescription());
+    EXPECT_EQ(*read.localizedDescription(), "text of " + std::string(recordingErrorKey(-5806)));
+    EXPECT_FALSE(unread.localizedDescription());
+    installTexts();
+    const Error found = errors_._lcUserErrorForCode(-5812);
+    ASSERT_TRUE(found.localizedDescription());
+    EXPECT_EQ(*found.localizedDescription(), "text of " + missing);
+}
+
 }  // namespace
 }  // namespace lumacast
