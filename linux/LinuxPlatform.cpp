@@ -37,6 +37,9 @@ namespace lumacast {
 
 namespace {
 
+/// What closing the open movies may take at termination.
+constexpr std::chrono::seconds kTimeToClose{8};
+
 /// Two for each connection that one user may have, and as many again for other users and everything else.
 constexpr std::uint64_t kDescriptors = 4 * (limitOf(Limit::ConnectionsPerUser) + limitOf(Limit::ConnectionsBeforeHello));
 
@@ -85,10 +88,18 @@ public:
           platform_{log_,         scheduler_,  clock_,     ipc_,       bundles_,   renderServer_,
                     appState_,    capture_,    capture_,   writers_,   exporters_, fileSystem_,
                     preferences_, deviceInfo_, telemetry_, keepAlive_, admin_,    storagePurge_},
-          termination_([this] { writers_.closeOpenMovies(); }) {}
+          termination_([this] {
+              keepAlive_.announceStopping(static_cast<int>(kTimeToClose.count()));
+              writers_.closeOpenMovies();
+          }, kTimeToClose) {}
 
     /// What must be there before the daemon can work; the error when it can't be had.
-    std::optional<Error> prepare() { return fileSystem_.prepare(); }
+    std::optional<Error> prepare() {
+        if (auto error = fileSystem_.prepare()) return error;
+        // The main loop's first task: by then clients are accepted.
+        scheduler_.mainQueue().async([this] { keepAlive_.announceReady(); });
+        return std::nullopt;
+    }
 
     Platform& platform() override { return platform_; }
 

@@ -22,9 +22,10 @@ bool isSize(Size size) {
 bool LCRecordingManager::checkContextIDsMatch(const std::vector<ContextID>& contextIDs) {
     const auto caller = getCallingConnectionBundleID();
     for (const ContextID contextID : contextIDs) {
-        const auto port = platform_.renderServer.clientPort(contextID);
+        auto port = platform_.renderServer.clientPort(contextID);
         if (!port) return false;
         const auto pid = port->processIdentifier();
+        port.reset();
         if (!pid) return false;
         const auto owner = bundleIDOfProcess(*pid);
         if (!owner || owner != caller) return false;  // an absent identifier matches nobody

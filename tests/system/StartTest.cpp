@@ -2,13 +2,19 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <poll.h>
 #include <signal.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 #include <sys/wait.h>
 
+#include <algorithm>
+#include <array>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
 
+#include "linux/ipc/Fd.h"
 #include "tests/system/World.h"
 
 namespace lumacast::test {
@@ -79,6 +85,31 @@ TEST(Start, WithADirectoryInTheAdministratorsPlaceItEnds) {
     std::filesystem::remove(world.path("run/lumacast/admin.sock"));
     world.startDaemon();
     EXPECT_EQ(world.endDaemon(SIGTERM), 0);
+}
+
+TEST(Start, TheServiceManagerIsToldWhenClientsAreServedAndWhenItEnds) {
+    World world;
+    const std::string name = world.path("notify");
+    const Fd manager(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    ASSERT_LT(name.size(), sizeof address.sun_path);
+    name.copy(address.sun_path, name.size());
+    ASSERT_EQ(::bind(manager.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+    const auto told = [&] {
+        pollfd ready{manager.get(), POLLIN, 0};
+        std::array<char, 256> text{};
+        if (::poll(&ready, 1, 20'000) != 1) return std::string("(nothing)");
+        const ssize_t length = ::recv(manager.get(), text.data(), text.size(), 0);
+        return std::string(text.data(), static_cast<std::size_t>(std::max<ssize_t>(length, 0)));
+    };
+    world.startDaemon({"NOTIFY_SOCKET=" + name});
+    EXPECT_EQ(told(), "READY=1\n");
+    EXPECT_EQ(told(), "STATUS=Idle.\n");
+    const std::string log = world.daemonLog();
+    EXPECT_TRUE(log.starts_with("info lumacastd Starting!\ninfo _srSetupTempDirectory\n")) << log;
+    EXPECT_EQ(world.endDaemon(SIGTERM), 0);
+    EXPECT_THAT(told(), HasSubstr("STOPPING=1"));
 }
 
 }  // namespace
