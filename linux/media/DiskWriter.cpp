@@ -3,17 +3,26 @@
 #include <pthread.h>
 
 #include <algorithm>
+#include <cerrno>
+#include <system_error>
 #include <utility>
 
 namespace lumacast::media {
 
 DiskWriter::DiskWriter(std::shared_ptr<MovieFiles> files, std::string path, std::function<void(int)> failed)
-    : failed_(std::move(failed)),
-      thread_([this, files = std::move(files), path = std::move(path)] { run(files, path); }) {}
+    : failed_(std::move(failed)) {
+    try {
+        thread_ = std::thread([this, files = std::move(files), path = std::move(path)] { run(files, path); });
+    } catch (const std::system_error&) {
+        error_ = EAGAIN;
+        created_ = true;
+        ended_.store(true, std::memory_order_release);
+    }
+}
 
 DiskWriter::~DiskWriter() {
     close(Pending::Write);
-    thread_.join();
+    if (thread_.joinable()) thread_.join();
 }
 
 std::optional<int> DiskWriter::waitForCreation(std::chrono::milliseconds limit) {
@@ -72,14 +81,15 @@ void DiskWriter::run(const std::shared_ptr<MovieFiles>& files, const std::string
         {
             const std::lock_guard lock(mutex_);
             created_ = true;
+            changed_.notify_all();
         }
-        work(file ? file->get() : nullptr);
+        if (file) work(**file);
     }
     ended_.store(true, std::memory_order_release);
 }
 
-/// Until the writer is closed and nothing waits. After an error, such as no file at all, everything is dropped.
-void DiskWriter::work(MovieFile* file) {
+/// Until the writer is closed and nothing waits, or something fails.
+void DiskWriter::work(MovieFile& file) {
     std::unique_lock lock(mutex_);
     for (;;) {
         busy_ = false;
@@ -89,10 +99,8 @@ void DiskWriter::work(MovieFile* file) {
         const Operation operation = std::move(waiting_.front());
         waiting_.pop_front();
         busy_ = true;
-        const bool drops = error_ != 0;
         lock.unlock();
-        const int error = drops ? 0 : perform(*file, operation);
-        if (error != 0) fail(error);
+        if (const int error = perform(file, operation); error != 0) return fail(error);
         lock.lock();
         waitingBytes_ -= std::min(waitingBytes_, operation.bytes.size());
     }
@@ -112,6 +120,9 @@ void DiskWriter::fail(int error) {
     {
         const std::lock_guard lock(mutex_);
         error_ = error;
+        waiting_.clear();
+        waitingBytes_ = 0;
+        changed_.notify_all();
     }
     failed_(error);
 }

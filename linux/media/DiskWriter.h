@@ -18,14 +18,16 @@
 namespace lumacast::media {
 
 /// Writes one movie file on a thread of its own, behind a bounded buffer. What is appended from the movie's encoder
-/// thread waits there for room; nothing else ever waits for the disk. After the first failure everything is dropped.
+/// thread waits there for room; nothing else ever waits for the disk. The first failure closes the file as it is and
+/// drops everything else. Whether closed or failed, the file and the thread go at once, whoever keeps the object.
 /// The file is brought onto the disk for good whenever the box writer says so: with every fragment, and at the end.
 class DiskWriter final : public mp4::BoxSink {
 public:
     /// Bytes that may wait for the disk: more than ten seconds at the highest bit rate a window gets by itself.
     static constexpr std::size_t kBufferBytes = 16u << 20u;
 
-    /// Begins creating the file. `failed` is called once, on the disk's thread, when anything goes wrong.
+    /// Begins creating the file. `failed` is called once, on the disk's thread, when anything goes wrong. Where the
+    /// system has no thread nothing is created, and waitForCreation answers EAGAIN.
     DiskWriter(std::shared_ptr<MovieFiles> files, std::string path, std::function<void(int error)> failed);
     DiskWriter(const DiskWriter&) = delete;
     DiskWriter& operator=(const DiskWriter&) = delete;
@@ -41,7 +43,7 @@ public:
 
     /// Waits until all is done; the first error's number, 0 for none.
     int drain();
-    /// Drops what waits (when `keep` is false), closes the file and ends the thread, without waiting for either.
+    /// Writes or drops what waits, closes the file and ends the thread, without waiting for any of it. Again: nothing.
     enum class Pending { Write, Drop };
     void close(Pending pending);
 
@@ -58,7 +60,7 @@ private:
     };
 
     bool submit(Operation operation);
-    void work(MovieFile* file);
+    void work(MovieFile& file);
     void run(const std::shared_ptr<MovieFiles>& files, const std::string& path);
     int perform(MovieFile& file, const Operation& operation);
     void fail(int error);

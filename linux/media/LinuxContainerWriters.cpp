@@ -35,7 +35,8 @@ LinuxContainerWriters::~LinuxContainerWriters() {
 std::variant<std::unique_ptr<ContainerWriter>, Error> LinuxContainerWriters::make(const URL& outputURL,
                                                                                   ContainerType) {
     forgetEnded();
-    auto recording = std::make_shared<media::MovieRecording>(files_, outputURL.path(), clock_.captureClock(), choice_);
+    auto recording =
+        std::make_shared<media::MovieRecording>(files_, outputURL.path(), clock_.captureClock(), choice_, lane_);
     {
         const std::lock_guard lock(mutex_);
         recordings_.push_back({withSingleSlashes(outputURL.path()), recording});

@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "linux/media/CompletionLane.h"
 #include "linux/media/MovieFile.h"
 #include "linux/media/MovieRecording.h"
 #include "platform/Clock.h"
@@ -52,6 +53,7 @@ private:
     const Clock& clock_;
     const std::shared_ptr<media::MovieFiles> files_;
     const std::shared_ptr<media::EncoderChoice> choice_;
+    media::CompletionLane lane_;
     std::mutex mutex_;
     Recordings recordings_;  ///< whose threads have not all ended
 };

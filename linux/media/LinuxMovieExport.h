@@ -1,6 +1,8 @@
 #pragma once
 #include <atomic>
 #include <memory>
+#include <optional>
+#include <system_error>
 #include <thread>
 #include <utility>
 
@@ -20,22 +22,32 @@ public:
         if (thread_.joinable()) thread_.join();
     }
 
-    /// Once. `refusal` is reported instead of exporting anything.
-    void start(std::shared_ptr<media::MovieFiles> files, std::optional<Error> refusal) {
-        thread_ = std::thread([this, files = std::move(files), refusal = std::move(refusal)] {
-            const media::ExportResult result = refusal ? media::ExportResult{ExportStatus::Failed, refusal}
-                                                       : media::exportMovie(plan_, *files, cancelled_);
-            if (const auto completion = std::exchange(completion_, nullptr)) completion(result.status, result.error);
-            ended_.store(true, std::memory_order_release);
-        });
+    /// Once. False, and nobody is told, when the system has no thread.
+    [[nodiscard]] bool start(std::shared_ptr<media::MovieFiles> files) {
+        try {
+            thread_ = std::thread([this, files = std::move(files)] {
+                const media::ExportResult result = media::exportMovie(plan_, *files, cancelled_);
+                tell(result.status, result.error);
+                ended_.store(true, std::memory_order_release);
+            });
+        } catch (const std::system_error&) {
+            return false;
+        }
+        return true;
     }
+    /// Instead of start, on the lane that tells it.
+    void refuse(const Error& reason) { tell(ExportStatus::Failed, reason); }
     void cancel() { cancelled_.store(true, std::memory_order_relaxed); }
     /// Whether the thread has nothing left to do but end.
     bool hasEnded() const { return ended_.load(std::memory_order_acquire); }
 
 private:
+    void tell(ExportStatus status, const std::optional<Error>& error) {
+        if (const auto completion = std::exchange(completion_, nullptr)) completion(status, error);
+    }
+
     const media::ExportPlan plan_;
-    MovieExporter::Completion completion_;  ///< the thread's, once started
+    MovieExporter::Completion completion_;  ///< the thread's once started, else the lane's
     std::atomic<bool> cancelled_ = false, ended_ = false;
     std::thread thread_;
 };

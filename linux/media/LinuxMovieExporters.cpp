@@ -79,8 +79,13 @@ void LinuxMovieExporters::run(const std::shared_ptr<LinuxMovieExport>& job, std:
     const std::lock_guard lock(mutex_);
     // Joining a thread that has ended takes no time.
     std::erase_if(running_, [](const auto& other) { return other->hasEnded(); });
-    running_.push_back(job);
-    job->start(files_, std::move(refusal));
+    if (!refusal) {
+        running_.push_back(job);
+        if (job->start(files_)) return;
+        running_.pop_back();
+        refusal = media::systemError(EAGAIN);
+    }
+    lane_.post([job, refusal = std::move(*refusal)] { job->refuse(refusal); });
 }
 
 }  // namespace lumacast

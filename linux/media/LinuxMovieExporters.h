@@ -3,6 +3,7 @@
 #include <mutex>
 #include <vector>
 
+#include "linux/media/CompletionLane.h"
 #include "linux/media/MovieFile.h"
 #include "platform/MovieExporter.h"
 
@@ -25,11 +26,13 @@ public:
     std::shared_ptr<MovieExporter> makeExporter(std::shared_ptr<MovieAsset> movie, ExportPreset preset,
                                                 const URL& outputURL) override;
 
-    /// Runs an export on a thread of its own, or reports the refusal there. For the exporters.
+    /// Runs an export on a thread of its own, or reports the refusal on the lane: EAGAIN where the system has no thread.
+    /// For the exporters.
     void run(const std::shared_ptr<LinuxMovieExport>& job, std::optional<Error> refusal);
 
 private:
     const std::shared_ptr<media::MovieFiles> files_;
+    media::CompletionLane lane_;
     std::mutex mutex_;
     std::vector<std::shared_ptr<LinuxMovieExport>> running_;  ///< whose threads have not been joined
 };

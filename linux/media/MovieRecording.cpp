@@ -3,13 +3,16 @@
 #include <pthread.h>
 
 #include <algorithm>
+#include <cerrno>
+#include <system_error>
 #include <utility>
 
 namespace lumacast::media {
 
 MovieRecording::MovieRecording(std::shared_ptr<MovieFiles> files, std::string path,
-                               std::shared_ptr<CaptureClock> clock, std::shared_ptr<EncoderChoice> choice)
-    : clock_(std::move(clock)), choice_(std::move(choice)),
+                               std::shared_ptr<CaptureClock> clock, std::shared_ptr<EncoderChoice> choice,
+                               CompletionLane& lane)
+    : clock_(std::move(clock)), choice_(std::move(choice)), lane_(lane),
       disk_(std::move(files), std::move(path), [this](int error) { fail(systemError(error)); }) {}
 
 MovieRecording::~MovieRecording() {
@@ -35,9 +38,14 @@ void MovieRecording::setTransform(std::size_t track, const AffineTransform& tran
 
 bool MovieRecording::startWriting() {
     const std::lock_guard lock(mutex_);
-    if (status_ != ContainerStatus::Unknown || tracks_.empty()) return false;
+    if (status_ != ContainerStatus::Unknown || tracks_.empty() || abandoned_) return false;
     status_ = ContainerStatus::Writing;
-    startThread();
+    try {
+        thread_ = std::thread([this] { run(); });
+    } catch (const std::system_error&) {
+        failLocked(systemError(EAGAIN));
+        return false;
+    }
     return true;
 }
 
@@ -79,9 +87,9 @@ bool MovieRecording::append(std::size_t number, const SampleRef& sample) {
 
 void MovieRecording::finish(std::function<void()> completion) {
     const std::lock_guard lock(mutex_);
-    completions_.push_back(std::move(completion));
     finishLocked();
-    startThread();  // where nothing was started a thread is needed for the completion alone
+    if (ended_.load(std::memory_order_relaxed)) return lane_.post(std::move(completion));
+    completions_.push_back(std::move(completion));
     changed_.notify_all();
 }
 
@@ -95,10 +103,7 @@ void MovieRecording::finishLocked() {
 void MovieRecording::abandon() {
     const std::lock_guard lock(mutex_);
     abandoned_ = true;
-    if (!thread_.joinable()) {  // never started
-        disk_.close(DiskWriter::Pending::Drop);
-        ended_.store(true, std::memory_order_release);
-    }
+    if (!thread_.joinable()) endWithoutThread();
     changed_.notify_all();
 }
 
@@ -126,15 +131,18 @@ void MovieRecording::waitUntilFinished(std::chrono::steady_clock::time_point dea
 
 // --- Called with the lock held ---------------------------------------------------------------------------------------
 
-void MovieRecording::startThread() {
-    if (!thread_.joinable() && !abandoned_) thread_ = std::thread([this] { run(); });
-}
-
 void MovieRecording::failLocked(Error error) {
     if (status_ != ContainerStatus::Unknown && status_ != ContainerStatus::Writing) return;
     status_ = ContainerStatus::Failed;
     error_ = std::move(error);
+    if (!thread_.joinable()) endWithoutThread();
     changed_.notify_all();
+}
+
+/// Where the encoder thread was never started, and never will be.
+void MovieRecording::endWithoutThread() {
+    disk_.close(DiskWriter::Pending::Drop);
+    ended_.store(true, std::memory_order_release);
 }
 
 void MovieRecording::fail(Error error) {
@@ -162,18 +170,13 @@ std::optional<MovieRecording::Item> MovieRecording::takeItem() {
 
 void MovieRecording::run() {
     pthread_setname_np(pthread_self(), "lc-encoder");  // the encoder's own threads inherit it
-    {
-        std::unique_lock lock(mutex_);
-        if (status_ == ContainerStatus::Writing) runPipeline(lock);
-        for (;;) {  // finished or failed: drop what still comes, answer who still asks
-            items_.clear();
-            for (Track& track : tracks_) track.waiting = 0;
-            runCompletions(lock);
-            if (abandoned_ && completions_.empty()) break;
-            changed_.wait(lock, [this] { return abandoned_ || !completions_.empty() || !items_.empty(); });
-        }
-    }
+    std::unique_lock lock(mutex_);
+    runPipeline(lock);
+    // Finished, failed or abandoned: no sample is taken any more, and whoever asks after this is told on the lane.
     disk_.close(DiskWriter::Pending::Write);
+    items_.clear();
+    for (Track& track : tracks_) track.waiting = 0;
+    runCompletions(lock);
     ended_.store(true, std::memory_order_release);
 }
 

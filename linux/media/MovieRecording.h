@@ -13,6 +13,7 @@
 #include <thread>
 #include <vector>
 
+#include "linux/media/CompletionLane.h"
 #include "linux/media/MoviePipeline.h"
 #include "platform/CaptureClock.h"
 #include "platform/ContainerWriter.h"
@@ -21,6 +22,7 @@ namespace lumacast::media {
 
 /// One movie being written: its state, the bounded queues of its tracks, its encoder thread and its disk thread. Every
 /// operation may come from any lane and returns at once; none waits for the encoder or the disk, but where it says so.
+/// Once the movie is over, finished or failed, the file is closed and the threads end, whoever keeps the object.
 class MovieRecording final {
 public:
     /// Pictures that wait for the encoder. One more may be held while it is converted: a pool must have more than
@@ -30,9 +32,10 @@ public:
     /// Sound buffers that wait for the encoder: about five seconds of a tap.
     static constexpr std::size_t kSoundQueueDepth = 256;
 
-    /// Begins creating the file. The clock may be null: the last picture then lasts as long as it says itself.
+    /// Begins creating the file. The clock may be null: the last picture then lasts as long as it says itself. `lane`
+    /// tells those who finish what has no encoder thread (any more); it must outlive every call of finish.
     MovieRecording(std::shared_ptr<MovieFiles> files, std::string path, std::shared_ptr<CaptureClock> clock,
-                   std::shared_ptr<EncoderChoice> choice);
+                   std::shared_ptr<EncoderChoice> choice, CompletionLane& lane);
     MovieRecording(const MovieRecording&) = delete;
     MovieRecording& operator=(const MovieRecording&) = delete;
     /// Waits for the threads: not to be the last holder on a lane that must not wait, unless hasEnded().
@@ -44,12 +47,14 @@ public:
     /// Adds a track; its number, or none once writing has started, and for a second picture track.
     std::optional<std::size_t> addTrack(TrackPlan plan);
     void setTransform(std::size_t track, const AffineTransform& transform);
+    /// Where the system has no thread the movie fails with EAGAIN.
     bool startWriting();
     void startSession(MediaTime time);
     void endSession(MediaTime time);
     bool hasRoom(std::size_t track) const;
     bool append(std::size_t track, const SampleRef& sample);
-    /// Ends the recording at the end of its session, or now. `completion` runs on the encoder thread, once.
+    /// Ends the recording at the end of its session, or now. `completion` runs once, on the encoder thread; on the lane
+    /// where there is none.
     void finish(std::function<void()> completion);
     /// Nobody will call any more: what was asked for is finished, else the file is closed as it is; then the threads
     /// end.
@@ -80,7 +85,6 @@ private:
         std::int64_t nanoseconds = 0;  ///< after the movie's zero
     };
 
-    void startThread();
     void run();
     void runPipeline(std::unique_lock<std::mutex>& lock);
     bool waitForWork(std::unique_lock<std::mutex>& lock, std::optional<MoviePipeline::SteadyTime> until);
@@ -89,11 +93,13 @@ private:
     void runCompletions(std::unique_lock<std::mutex>& lock);
     void fail(Error error);
     void failLocked(Error error);
+    void endWithoutThread();
     MoviePipeline::End movieEnd() const;
     void finishLocked();
 
     const std::shared_ptr<CaptureClock> clock_;
     const std::shared_ptr<EncoderChoice> choice_;
+    CompletionLane& lane_;
 
     mutable std::mutex mutex_;
     std::condition_variable changed_;
@@ -106,7 +112,7 @@ private:
     std::vector<std::function<void()>> completions_;
     bool finishing_ = false;  ///< finish was asked for; no samples are taken
     bool abandoned_ = false;
-    std::atomic<bool> ended_ = false;
+    std::atomic<bool> ended_ = false;  ///< no encoder thread, and none will come; set with the lock held
     std::atomic<std::uint64_t> picturesTaken_ = 0;
 
     DiskWriter disk_;

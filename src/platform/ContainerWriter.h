@@ -59,8 +59,9 @@ enum class ContainerStatus : std::int32_t { Unknown = 0, Writing = 1, Completed 
 /// Writes one MPEG-4 file. Unknown becomes Writing by startWriting; Writing becomes Completed or Failed by
 /// finishWriting, and Failed at any time when the disk or an encoder fails; Completed and Failed stay. Its operations
 /// are called on one lane at a time (the movie writer's queue); completions come on a lane of the platform, never
-/// inline. The file appears at creation and can be played while it grows, up to a second ago. Destroying a writer that
-/// has not finished closes the file as it is and never re-creates it.
+/// inline. The file appears at creation and can be played while it grows, up to a second ago. It is closed as soon as
+/// the movie is Completed or Failed, however long the writer is kept. Destroying a writer that has not finished closes
+/// the file as it is and never re-creates it.
 class ContainerWriter {
 public:
     virtual ~ContainerWriter() = default;
@@ -76,7 +77,8 @@ public:
     virtual std::optional<Error> error() const = 0;
     virtual URL outputURL() const = 0;
 
-    /// Begins writing. False, changing nothing, in every state but Unknown, and without a track.
+    /// Begins writing. False, changing nothing, in every state but Unknown, and without a track; false and Failed with
+    /// EAGAIN when the system has no thread left for it.
     virtual bool startWriting() = 0;
     /// The movie begins at `time` of the samples' clock. Only the first one counts, and only while writing.
     virtual void startSession(MediaTime time) = 0;
