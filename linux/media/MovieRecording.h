@@ -115,8 +115,8 @@ private:
     std::atomic<bool> ended_ = false;  ///< no encoder thread, and none will come; set with the lock held
     std::atomic<std::uint64_t> picturesTaken_ = 0;
 
-    DiskWriter disk_;
     std::thread thread_;
+    DiskWriter disk_;  ///< last: its thread uses the rest as soon as it is made, and until it has gone
 };
 
 }  // namespace lumacast::media
