@@ -151,6 +151,7 @@ ConnectionError Link::errorFor(const Error& error) const {
         case ENOBUFS: return ConnectionError::Busy;
         case EMSGSIZE:
         case EINVAL: return ConnectionError::Unsendable;
+        case ENODATA: return ConnectionError::NoAnswer;
         case EPIPE: return state_ == LinkState::Reached ? ConnectionError::NotReached : ConnectionError::Lost;
         default: return ConnectionError::BadAnswer;
     }

@@ -30,8 +30,9 @@ inline constexpr std::chrono::milliseconds kPatience = std::chrono::seconds(60);
 ///
 /// Answers: each question is answered exactly once: by the daemon, or with a connection error when it can't be reached,
 /// goes away, or the recorder is destroyed (see ConnectionError for what each means). Questions that the daemon
-/// deliberately leaves without an answer say so below: they wait until the connection ends, and 64 that wait are the
-/// most there can be.
+/// deliberately leaves without an answer say so below: they wait until the connection ends, and keep no other question
+/// from being asked. 1024 of them are kept; one more, and the oldest is answered with NoAnswer. Of all others 64 may be
+/// under way at a time; what is asked beyond that is answered with Busy.
 ///
 /// Connection: made at once, and again by itself after it was lost, 50 ms later at first, then less and less often, at
 /// the longest every 5 s. In between, questions are answered with NotReached at once and messages without an answer are

@@ -41,7 +41,9 @@ enum class FrameKind : std::uint8_t {
     Request = 2,  ///< a message that wants a reply
     Reply = 3,  ///< `sequence` is the request's
     PlaneReturned = 4,  ///< transport: `sequence` is the lease that ends
-    NoReply = 5,  ///< transport: the request `sequence` gets no reply; `message` is the system's error number
+    /// transport: the request `sequence` gets no reply; `message` is the system's error number, or 0 when the receiver
+    /// deliberately gives none
+    NoReply = 5,
 };
 
 /// valueBytes u32 · recordBytes u32 · kind u8 · handles u8 · message u16 · zero u32 · sequence u64

@@ -40,6 +40,7 @@ LinuxIpcConnection::LinuxIpcConnection(std::shared_ptr<IpcCore> core, Fd socket,
 LinuxIpcConnection::~LinuxIpcConnection() {
     watch_.reset();
     if (budget_) budget_->give(heldBytes_);
+    for (const ErrorHandler& errorHandler : unanswered_) fail(errorHandler, EPIPE);
     for (auto& [sequence, pending] : pending_) fail(pending.errorHandler, EPIPE);
     for (OutgoingFrame& frame : outgoing_.takeAll()) fail(frame.onLost, EPIPE);
 }
@@ -134,6 +135,7 @@ void LinuxIpcConnection::deliverLoss() {
     std::optional<UserTable::Seat> seat;
     Handler interruption, invalidation;
     std::deque<OutgoingFrame> unsent;
+    std::deque<ErrorHandler> unanswered;
     std::unordered_map<std::uint64_t, PendingReply> pending;
     std::unordered_map<std::uint64_t, std::shared_ptr<SharedPlane>> leases;
     {
@@ -143,6 +145,7 @@ void LinuxIpcConnection::deliverLoss() {
         seat_.reset();
         interruption.swap(interruptionHandler_);
         unsent = outgoing_.takeAll();
+        unanswered.swap(unanswered_);
         pending.swap(pending_);
         leases.swap(leases_);
     }
@@ -155,6 +158,7 @@ void LinuxIpcConnection::deliverLoss() {
     core_->waitingRoom.leave(this);
     greeted_ = nullptr;
     const Error error(std::string(kSystemErrorDomain), EPIPE);
+    for (const ErrorHandler& errorHandler : unanswered) errorHandler(error);
     for (auto& [sequence, waiting] : pending)
         if (waiting.errorHandler) waiting.errorHandler(error);
     for (OutgoingFrame& frame : unsent)

@@ -1,6 +1,7 @@
 #pragma once
 #include <atomic>
 #include <cstdint>
+#include <deque>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -60,6 +61,8 @@ public:
     void send(std::uint16_t message, Array arguments, ReplyHandler reply, ErrorHandler errorHandler);
     /// Sends the reply of the request `sequence`. Callable from any lane.
     void reply(std::uint64_t sequence, const MessageDeclaration& declaration, Array values);
+    /// The request `sequence` will have no reply. Callable from any lane.
+    void leaveUnanswered(std::uint64_t sequence);
 
 private:
     struct PendingReply {
@@ -84,7 +87,9 @@ private:
     void dispatch(IncomingFrames::Frame& frame);
     const char* receiveMessage(IncomingFrames::Frame& frame);
     const char* receiveReply(IncomingFrames::Frame& frame);
-    const char* receiveTransport(const FrameHeader& header);
+    const char* receivePlaneReturned(const FrameHeader& header);
+    const char* receiveNoReply(const FrameHeader& header);
+    bool finishRequest();
     bool startWatching();
     [[nodiscard]] bool hold(std::uint64_t bytes);
 
@@ -112,8 +117,9 @@ private:
     OutgoingQueue outgoing_;
     std::uint64_t nextSequence_ = 1;
     std::unordered_map<std::uint64_t, PendingReply> pending_;
+    std::deque<ErrorHandler> unanswered_;  ///< of requests that will have no reply, oldest first; to be told of the loss
     std::unordered_map<std::uint64_t, std::shared_ptr<SharedPlane>> leases_;
-    std::uint64_t requestsToAnswer_ = 0;
+    std::uint64_t requestsToAnswer_ = 0;  ///< the peer's whose reply is neither given nor released
 
     // The reactor's own.
     IncomingFrames incoming_;

@@ -20,7 +20,7 @@ namespace {
 constexpr int kFramesPerTurn = 64;
 constexpr std::chrono::milliseconds kTimePerTurn{2};
 
-/// A request's one answer.
+/// A request's one answer, or the word that there is none: when the last copy of it goes without having been called.
 IpcReply replyOnce(const std::shared_ptr<LinuxIpcConnection>& connection, std::uint64_t sequence,
                    const MessageDeclaration& declaration) {
     struct Answer {
@@ -28,6 +28,16 @@ IpcReply replyOnce(const std::shared_ptr<LinuxIpcConnection>& connection, std::u
         std::uint64_t sequence;
         const MessageDeclaration& declaration;
         std::atomic<bool> given{false};
+
+        Answer(std::weak_ptr<LinuxIpcConnection> theConnection, std::uint64_t theSequence,
+               const MessageDeclaration& theDeclaration)
+            : connection(std::move(theConnection)), sequence(theSequence), declaration(theDeclaration) {}
+        Answer(const Answer&) = delete;
+        Answer& operator=(const Answer&) = delete;
+        ~Answer() {
+            if (given) return;
+            if (const auto live = connection.lock()) live->leaveUnanswered(sequence);
+        }
     };
     return [answer = std::make_shared<Answer>(connection, sequence, declaration)](Array values) {
         if (answer->given.exchange(true)) return;
@@ -154,8 +164,8 @@ void LinuxIpcConnection::dispatch(IncomingFrames::Frame& frame) {
         case FrameKind::Message:
         case FrameKind::Request: reason = receiveMessage(frame); break;
         case FrameKind::Reply: reason = receiveReply(frame); break;
-        case FrameKind::PlaneReturned:
-        case FrameKind::NoReply: reason = receiveTransport(frame.header); break;
+        case FrameKind::PlaneReturned: reason = receivePlaneReturned(frame.header); break;
+        case FrameKind::NoReply: reason = receiveNoReply(frame.header); break;
     }
     if (reason) drop(reason);
 }
@@ -178,10 +188,10 @@ const char* LinuxIpcConnection::receiveMessage(IncomingFrames::Frame& frame) {
     Array arguments;
     if (const char* reason = decodeFrame(frame, weak_from_this(), arguments)) return reason;
     if (!matches(arguments, declaration.arguments)) return "a message with arguments of other types";
-    if (!object) return nullptr;
     const auto self = shared_from_this();
     IpcReply reply;
     if (isRequest) reply = replyOnce(self, header.sequence, declaration);
+    if (!object) return nullptr;
     object->receiveMessage(self, header.message, std::move(arguments), std::move(reply));
     return nullptr;
 }
@@ -206,21 +216,34 @@ const char* LinuxIpcConnection::receiveReply(IncomingFrames::Frame& frame) {
     return nullptr;
 }
 
-const char* LinuxIpcConnection::receiveTransport(const FrameHeader& header) {
-    PendingReply pending;
+const char* LinuxIpcConnection::receivePlaneReturned(const FrameHeader& header) {
     std::shared_ptr<SharedPlane> plane;
     const std::lock_guard lock(mutex_);
-    if (header.kind == FrameKind::PlaneReturned) {
-        const auto found = leases_.find(header.sequence);
-        if (found == leases_.end()) return "a plane given back that was not lent";
-        plane = std::move(found->second);
-        leases_.erase(found);
-        return nullptr;
+    const auto found = leases_.find(header.sequence);
+    if (found == leases_.end()) return "a plane given back that was not lent";
+    plane = std::move(found->second);
+    leases_.erase(found);
+    return nullptr;
+}
+
+const char* LinuxIpcConnection::receiveNoReply(const FrameHeader& header) {
+    PendingReply pending;
+    ErrorHandler oldest;
+    {
+        const std::lock_guard lock(mutex_);
+        const auto found = pending_.find(header.sequence);
+        if (found == pending_.end()) return "a reply to nothing";
+        pending = std::move(found->second);
+        pending_.erase(found);
+        if (header.message == 0 && pending.errorHandler) {
+            unanswered_.push_back(std::exchange(pending.errorHandler, nullptr));
+            if (unanswered_.size() > limitOf(Limit::RequestsWithoutReply)) {
+                oldest = std::move(unanswered_.front());
+                unanswered_.pop_front();
+            }
+        }
     }
-    const auto found = pending_.find(header.sequence);
-    if (found == pending_.end()) return "a reply to nothing";
-    pending = std::move(found->second);
-    pending_.erase(found);
+    fail(oldest, ENODATA);
     fail(pending.errorHandler, header.message);
     return nullptr;
 }

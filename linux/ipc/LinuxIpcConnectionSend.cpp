@@ -59,12 +59,20 @@ int LinuxIpcConnection::commit(EncodedFrame& encoded, PendingReply& pending) {
     return 0;
 }
 
+/// One of the peer's requests is in flight no more. False when nobody is there any more to be told.
+bool LinuxIpcConnection::finishRequest() {
+    const std::lock_guard lock(mutex_);
+    if (state_ == State::Lost) return false;
+    --requestsToAnswer_;
+    return true;
+}
+
+void LinuxIpcConnection::leaveUnanswered(std::uint64_t sequence) {
+    if (finishRequest()) sendTransport(FrameKind::NoReply, sequence, 0);
+}
+
 void LinuxIpcConnection::reply(std::uint64_t sequence, const MessageDeclaration& declaration, Array values) {
-    {
-        const std::lock_guard lock(mutex_);
-        if (state_ == State::Lost) return;
-        --requestsToAnswer_;
-    }
+    if (!finishRequest()) return;
     int error = EINVAL;
     EncodedFrame encoded;
     if (matches(values, declaration.replyValues)) {

@@ -18,6 +18,8 @@ namespace {
 constexpr std::size_t kMaximumDescriptors = limitOf(Limit::HandlesPerMessage);
 constexpr std::size_t kFramesPerWrite = 32;
 constexpr int kWritesPerFlush = 8;
+/// Small frames that wait are put together, so that what they take is not many times what they count.
+constexpr std::size_t kPutTogetherBytes = 4096;
 
 /// Writes once. Answers the bytes that went, or -1 with errno set.
 ssize_t write(int socket, std::span<iovec> parts, std::span<const int> descriptors) {
@@ -42,6 +44,10 @@ ssize_t write(int socket, std::span<iovec> parts, std::span<const int> descripto
     }
 }
 
+bool isBytesOnly(const OutgoingFrame& frame) {
+    return frame.descriptors.empty() && frame.keep.empty() && frame.own.empty() && !frame.onLost;
+}
+
 iovec rest(OutgoingFrame& frame) { return {frame.bytes.data() + frame.written, frame.bytes.size() - frame.written}; }
 
 }  // namespace
@@ -59,6 +65,12 @@ OutgoingQueue::Result OutgoingQueue::send(int socket, OutgoingFrame& frame) {
     }
     if (!hasRoomFor(frame)) return Result::Full;
     waitingBytes_ += frame.bytes.size() - frame.written;
+    if (!waiting_.empty() && isBytesOnly(frame) && isBytesOnly(waiting_.back()) &&
+        waiting_.back().bytes.size() + frame.bytes.size() <= kPutTogetherBytes) {
+        Data& bytes = waiting_.back().bytes;
+        bytes.insert(bytes.end(), frame.bytes.begin(), frame.bytes.end());
+        return Result::Queued;
+    }
     waiting_.push_back(std::move(frame));
     return Result::Queued;
 }

@@ -20,6 +20,7 @@ enum class Limit : std::uint8_t {
     MessageValues,
     HeldBytesPerUser,
     ConnectionsBeforeHello,
+    RequestsWithoutReply,
 };
 
 struct LimitRow {
@@ -42,6 +43,7 @@ inline constexpr std::array kLimits{
     LimitRow{Limit::MessageValues, 16'384, "values in one message, at all depths"},
     LimitRow{Limit::HeldBytesPerUser, 64 << 20, "bytes of unfinished and of unread messages of one user's connections"},
     LimitRow{Limit::ConnectionsBeforeHello, 64, "connections of one user that have not said hello"},
+    LimitRow{Limit::RequestsWithoutReply, 1024, "requests of one connection known to get no reply, kept until it ends"},
 };
 
 /// How little space may be free where movies are written before temporary ones are asked for.

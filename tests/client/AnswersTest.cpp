@@ -7,6 +7,7 @@
 
 #include <atomic>
 
+#include "base/Limits.h"
 #include "tests/checkers/tests/Child.h"
 #include "tests/client/StandInService.h"
 #include "tests/client/WaitUntil.h"
@@ -211,13 +212,57 @@ TEST_F(ClientAnswers, ThatTheDaemonGivesTwiceCountOnce) {
 }
 
 TEST_F(ClientAnswers, AreErrorsAtOnceWhenTooManyWait) {
-    const auto daemon = service();
+    std::vector<IpcReply> kept;
+    const auto daemon = service([&](DaemonMessage, const Array&, const IpcReply& reply) { kept.push_back(reply); });
     Recorder recorder({}, runtime());
     ASSERT_TRUE(waitUntil([&] { return daemon->connections() == 1; }));
     Answers<StopAnswer> stops;
     for (std::size_t i = 0; i < 100; ++i) recorder.stop(stops.handler(i));
     ASSERT_TRUE(waitUntil([&] { return stops.total() >= 36; }));
     EXPECT_EQ(keyIn(stops.last().error), "CONNECTION_ERROR_BUSY");
+}
+
+TEST_F(ClientAnswers, ThatNeverComeTakeNoPlaceAndAreErrorsOnceWhenTheDaemonIsKilled) {
+    auto daemon = process("serving");
+    ASSERT_EQ(daemon.readLine(), "ready");
+    Comings comings;
+    Recorder recorder(comings.events(), runtime());
+    ASSERT_TRUE(waitUntil([&] { return !comings.all().empty(); }));
+    Answers<std::optional<Error>> discards;
+    for (std::size_t i = 0; i < 1000; ++i) {
+        recorder.discard(discards.handler(i));
+        if (i % 50 != 49) continue;
+        ASSERT_FALSE(recorder.stateAndWait().error) << i;
+        while (daemon.readLine() != "synchronousGetCurrentState:") {}
+    }
+    EXPECT_EQ(discards.total(), 0);
+    ::kill(daemon.pid(), SIGKILL);
+    ASSERT_TRUE(waitUntil([&] { return discards.total() >= 1000 && comings.all().size() == 2; }));
+    EXPECT_TRUE(discards.eachOnce());
+    EXPECT_EQ(keyIn(discards.last()), "CONNECTION_ERROR_LOST");
+}
+
+TEST_F(ClientAnswers, ThatNeverComeAreNoneForTheOldestOfTooMany) {
+    const auto daemon = service([](DaemonMessage message, const Array&, const IpcReply& reply) {
+        if (message == DaemonMessage::SynchronousGetCurrentState) reply({Dictionary()});
+    });
+    Answers<std::optional<Error>> oldest, others;
+    {
+        Recorder recorder({}, runtime());
+        recorder.discard(oldest.handler());
+        for (std::size_t i = 0; i < limitOf(Limit::RequestsWithoutReply); ++i) {
+            if (i % 50 == 0) { ASSERT_FALSE(recorder.stateAndWait().error) << i; }
+            EXPECT_EQ(oldest.total(), 0);
+            recorder.discard(others.handler(i));
+        }
+        ASSERT_TRUE(waitUntil([&] { return oldest.total() > 0; }));
+        EXPECT_EQ(keyIn(oldest.last()), "CONNECTION_ERROR_NO_ANSWER");
+        EXPECT_FALSE(recorder.stateAndWait().error);
+        EXPECT_EQ(others.total(), 0);
+    }
+    EXPECT_TRUE(oldest.eachOnce());
+    EXPECT_TRUE(others.eachOnce());
+    EXPECT_EQ(keyIn(others.last()), "CONNECTION_ERROR_CLOSED");
 }
 
 TEST_F(ClientAnswers, AreErrorsWhenTheRequestCannotBeSent) {

@@ -220,6 +220,11 @@ TEST(ClientOfAHostileDaemon, AnswersEachQuestionOnceWhateverIsSaid) {
     const auto reply = [](std::uint64_t to, const Value& values) {
         return rawFrame(messageHeader(FrameKind::Reply, 0, to), encoded(values));
     };
+    const auto both = [](Data first, const Data& second) {
+        first.insert(first.end(), second.begin(), second.end());
+        return first;
+    };
+    const auto twice = [&](const Data& bytes) { return both(bytes, bytes); };
     FrameHeader vast = messageHeader(FrameKind::Message, 0, 1);
     vast.valueBytes = 0xFFFFFFFF;
     Value deep = Array();
@@ -247,6 +252,13 @@ TEST(ClientOfAHostileDaemon, AnswersEachQuestionOnceWhateverIsSaid) {
          "CONNECTION_ERROR_NOT_REACHED"},
         {"a wrong first answer", true, reply(1, Array{12}), "CONNECTION_ERROR_NOT_REACHED"},
         {"a stop's answer of other types", true, reply(2, Array{true, false}), "CONNECTION_ERROR_BAD_ANSWER"},
+        {"twice that there is deliberately no answer", true, twice(rawFrame(messageHeader(FrameKind::NoReply, 0, 2), {})),
+         "CONNECTION_ERROR_NOT_REACHED"},
+        {"an answer after it said that there is none", true,
+         both(rawFrame(messageHeader(FrameKind::NoReply, 0, 2), {}), reply(2, Array{Value(), Value()})),
+         "CONNECTION_ERROR_NOT_REACHED"},
+        {"no answer to what was not asked", true, rawFrame(messageHeader(FrameKind::NoReply, 0, 3), {}),
+         "CONNECTION_ERROR_NOT_REACHED"},
         {"that there is no answer", true, rawFrame(messageHeader(FrameKind::NoReply, 9999, 2), {}),
          "CONNECTION_ERROR_BAD_ANSWER"},
     };

@@ -154,6 +154,20 @@ protected:
     void ask(IpcConnection& client, DaemonMessage message, Array arguments, Outcome& outcome) {
         send(Side::Client, client, id(message), std::move(arguments), outcome, true);
     }
+    /// The daemon answers questions for the state, and releases the replies of all other requests.
+    void answerOnlyStates() {
+        daemonObject->onMessage.set([this](const auto&, const IpcReply& reply) {
+            const auto received = daemonObject->received.get();
+            daemonObject->received.set({});
+            if (received.back().message == id(DaemonMessage::SynchronousGetCurrentState)) reply({Value()});
+        });
+    }
+    /// Whether a question for the state is answered, and with it all that was sent before has been looked at.
+    [[nodiscard]] bool isAnswered(const Link& link) {
+        Outcome outcome;
+        ask(*link.client, DaemonMessage::SynchronousGetCurrentState, {}, outcome);
+        return until([&] { return outcome.replyCount() + outcome.errorCount() > 0; }) && outcome.replyCount() == 1;
+    }
     void tellClient(const Link& link, ClientMessage message, Array arguments, Outcome& outcome) {
         const auto daemon = link.daemon.lock();
         ASSERT_TRUE(daemon);
@@ -331,6 +345,156 @@ TEST_P(IpcContract, AReplyReleasedWithoutACallLeavesTheAskerWaitingUntilTheConne
     world->on(Side::Daemon, [&] { l.daemon.lock()->invalidate(); });
     ASSERT_TRUE(until([&] { return outcome.errorCount() == 1; }));
     EXPECT_EQ(outcome.replyCount(), 0u);
+}
+
+TEST_P(IpcContract, ARequestWhoseReplyWasReleasedIsNotInFlightAnyMore) {
+    const Link l = link();
+    constexpr std::size_t kReleased = 1000;
+    answerOnlyStates();
+    Outcome released;
+    for (std::size_t i = 1; i <= kReleased; ++i) {
+        ask(*l.client, DaemonMessage::DiscardRecording, {}, released);
+        if (i % 50 == 0) { ASSERT_TRUE(isAnswered(l)) << i; }
+    }
+    EXPECT_EQ(released.replyCount() + released.errorCount(), 0u);
+    EXPECT_EQ(clientLoss.invalidations.get() + daemonLoss.invalidations.get(), 0);
+    world->on(Side::Daemon, [&] { l.daemon.lock()->invalidate(); });
+    ASSERT_TRUE(until([&] { return clientLoss.invalidations.get() == 1; }));
+    world->settle();
+    EXPECT_EQ(released.errorCount(), kReleased) << "each is told of the loss, once";
+    EXPECT_EQ(released.errors->get().back().code(), EPIPE);
+    EXPECT_EQ(released.replyCount(), 0u);
+}
+
+TEST_P(IpcContract, OfTooManyRequestsWithoutAReplyTheOldestAreToldSo) {
+    const Link l = link();
+    constexpr std::size_t kExcess = 3;
+    answerOnlyStates();
+    std::vector<Outcome> outcomes(limitOf(Limit::RequestsWithoutReply) + kExcess);
+    for (std::size_t i = 0; i < outcomes.size(); ++i) {
+        ask(*l.client, DaemonMessage::DiscardRecording, {}, outcomes[i]);
+        if (i % 50 == 0) { ASSERT_TRUE(isAnswered(l)) << i; }
+    }
+    for (std::size_t i = 0; i < kExcess; ++i) {
+        ASSERT_TRUE(until([&] { return outcomes[i].errorCount() == 1; })) << i;
+        EXPECT_EQ(outcomes[i].errors->get().front().code(), ENODATA);
+    }
+    ASSERT_TRUE(isAnswered(l));
+    EXPECT_EQ(outcomes[kExcess].errorCount(), 0u);
+    world->on(Side::Client, [&] { l.client->invalidate(); });
+    ASSERT_TRUE(until([&] { return clientLoss.invalidations.get() == 1; }));
+    for (std::size_t i = 0; i < outcomes.size(); ++i) {
+        ASSERT_EQ(outcomes[i].errorCount(), 1u) << i;
+        EXPECT_EQ(outcomes[i].replyCount(), 0u) << i;
+        EXPECT_EQ(outcomes[i].errors->get().front().code(), i < kExcess ? ENODATA : EPIPE) << i;
+    }
+}
+
+TEST_P(IpcContract, ReleasingAConnectionFailsItsRequestsWithoutAReply) {
+    Link l = link();
+    answerOnlyStates();
+    Outcome outcome;
+    ask(*l.client, DaemonMessage::DiscardRecording, {}, outcome);
+    ASSERT_TRUE(isAnswered(l));
+    EXPECT_EQ(outcome.errorCount(), 0u);
+    world->on(Side::Client, [&] { l.client.reset(); });
+    EXPECT_TRUE(until([&] { return outcome.errorCount() == 1; }));
+}
+
+TEST_P(IpcContract, TheReleaseOfAReplyIsThatOfItsLastCopyOnWhateverLane) {
+    const Link l = link();
+    daemonObject->onMessage.set({});
+    std::vector<Outcome> outcomes(limitOf(Limit::MessagesInFlight));
+    for (Outcome& outcome : outcomes) ask(*l.client, DaemonMessage::DiscardRecording, {}, outcome);
+    ASSERT_TRUE(until([&] { return daemonObject->count() == outcomes.size(); }));
+    std::vector<IpcReply> copies;
+    for (const auto& received : daemonObject->received.get()) copies.push_back(received.reply);
+    daemonObject->received.set({});
+    world->settle();
+    Outcome excess, next;
+    ask(*l.client, DaemonMessage::DiscardRecording, {}, excess);
+    ASSERT_TRUE(until([&] { return excess.errorCount() == 1; })) << "a copy still lives";
+    world->on(Side::Other, [&] { copies.clear(); });
+    world->settle();
+    daemonObject->onMessage.set([](const auto&, const IpcReply& reply) { reply({}); });
+    ask(*l.client, DaemonMessage::DiscardRecording, {}, next);
+    ASSERT_TRUE(until([&] { return next.replyCount() + next.errorCount() == 1; }));
+    EXPECT_EQ(next.replyCount(), 1u);
+    for (const Outcome& outcome : outcomes) EXPECT_EQ(outcome.errorCount() + outcome.replyCount(), 0u);
+}
+
+TEST_P(IpcContract, AReplyReleasedInsideAnotherConnectionsHandlerIsReleased) {
+    const Link first = link();
+    const Link second = link();
+    Outcome one, two, next;
+    ask(*first.client, DaemonMessage::DiscardRecording, {}, one);
+    ASSERT_TRUE(until([&] { return daemonObject->count() == 1; }));
+    // The handlers of the other connection hold it, and go with them.
+    world->on(Side::Daemon, [&] {
+        auto received = daemonObject->received.get();
+        daemonObject->received.set({});
+        const auto held = std::make_shared<IpcReply>(std::move(received.front().reply));
+        received.clear();
+        const auto daemon = second.daemon.lock();
+        daemon->setInterruptionHandler([held] {});
+        daemon->setInvalidationHandler([this, held] { daemonLoss.invalidations.change([](int& n) { ++n; }); });
+    });
+    for (std::uint64_t i = 1; i < limitOf(Limit::MessagesInFlight); ++i)
+        ask(*first.client, DaemonMessage::DiscardRecording, {}, two);
+    ASSERT_TRUE(until([&] { return daemonObject->count() == limitOf(Limit::MessagesInFlight) - 1; }));
+    Outcome excess;
+    ask(*first.client, DaemonMessage::SynchronousGetCurrentState, {}, excess);
+    ASSERT_TRUE(until([&] { return excess.errorCount() == 1; }));
+    world->on(Side::Client, [&] { second.client->invalidate(); });
+    ASSERT_TRUE(until([&] { return daemonLoss.invalidations.get() == 1; }));
+    world->settle();
+    daemonObject->onMessage.set([](const auto&, const IpcReply& reply) { reply({Value()}); });
+    ask(*first.client, DaemonMessage::SynchronousGetCurrentState, {}, next);
+    ASSERT_TRUE(until([&] { return next.replyCount() + next.errorCount() == 1; }));
+    EXPECT_EQ(next.replyCount(), 1u);
+    EXPECT_EQ(one.replyCount() + one.errorCount(), 0u);
+}
+
+TEST_P(IpcContract, AReplyReleasedAfterTheConnectionHasGoneDoesNothing) {
+    const Link l = link();
+    Outcome outcome;
+    ask(*l.client, DaemonMessage::DiscardRecording, {}, outcome);
+    ASSERT_TRUE(until([&] { return daemonObject->count() == 1; }));
+    // The daemon's end is kept, so that the release finds it.
+    const auto daemon = l.daemon.lock();
+    world->on(Side::Client, [&] { l.client->invalidate(); });
+    ASSERT_TRUE(until([&] { return daemonLoss.invalidations.get() == 1; }));
+    ASSERT_TRUE(until([&] { return outcome.errorCount() == 1; }));
+    world->on(Side::Daemon, [&] { daemonObject->received.set({}); });
+    world->settle();
+    EXPECT_EQ(outcome.errorCount(), 1u);
+    EXPECT_EQ(outcome.replyCount(), 0u);
+    EXPECT_EQ(daemonLoss.invalidations.get(), 1);
+}
+
+TEST_P(IpcContract, ARequestThatNobodyReceivesIsNotInFlightAnyMore) {
+    const Link l = link();
+    world->on(Side::Daemon, [&] { daemonObject.reset(); });
+    Outcome unheard;
+    const auto ping = [&] {
+        // A frame of the daemon's own shows that it has looked at all that was sent before.
+        const std::size_t before = clientObject->count();
+        tellClient(l, ClientMessage::UpdateScreenRecordingState, {true}, ignored);
+        return until([&] { return clientObject->count() > before; });
+    };
+    for (std::uint64_t i = 0; i < 3 * limitOf(Limit::MessagesInFlight); ++i) {
+        ask(*l.client, DaemonMessage::SynchronousGetCurrentState, {}, unheard);
+        if (i % 16 == 0) {
+            world->settle();
+            ASSERT_TRUE(ping());
+        }
+    }
+    world->settle();
+    EXPECT_EQ(unheard.errorCount() + unheard.replyCount(), 0u);
+    daemonObject = std::make_shared<RecordingObject>(*world, Side::Daemon);
+    answerOnlyStates();
+    world->on(Side::Daemon, [&] { l.daemon.lock()->setExportedObject(daemonObject); });
+    EXPECT_TRUE(isAnswered(l));
 }
 
 TEST_P(IpcContract, MessagesCanBeSentFromWithinAMessageAndAReply) {

@@ -56,6 +56,7 @@ protected:
                 return expectDropped(peer, "malformed message", 1);
             case Limit::HeldBytesPerUser: return overflowUnfinished();
             case Limit::ConnectionsBeforeHello: return overflowSilent(peer);
+            case Limit::RequestsWithoutReply: return overflowUnanswered();
         }
         FAIL() << "no overflow for this limit";
     }
@@ -137,6 +138,27 @@ protected:
         expectDropped(peer, "too many requests in flight");
     }
 
+    /// It is the asker who keeps this limit: the other end says how many there are.
+    void overflowUnanswered() {
+        object->onMessage.set([this](const auto&, const IpcReply& reply) {
+            const auto received = object->received.get();
+            object->received.set({});
+            if (received.back().message == id(DaemonMessage::SynchronousGetCurrentState)) reply({Value()});
+        });
+        const std::uint64_t limit = limitOf(Limit::RequestsWithoutReply);
+        std::vector<Outcome> outcomes(limit + 1);
+        for (std::uint64_t i = 0; i <= limit; ++i) {
+            if (i == limit || i % 32 == 0) { ASSERT_TRUE(isServed()); }
+            EXPECT_EQ(outcomes[0].errorCount(), 0u) << "the limit itself is fine";
+            friendly->remoteProxy(outcomes[i].onError())
+                ->send(id(DaemonMessage::DiscardRecording), {}, outcomes[i].onReply());
+        }
+        ASSERT_TRUE(until([&] { return outcomes[0].errorCount() == 1; }));
+        EXPECT_TRUE(isServed());
+        EXPECT_EQ(outcomes[1].errorCount(), 0u);
+        EXPECT_TRUE(lines().empty());
+    }
+
     void overflowReplies(RawPeer& peer) {
         object->onMessage.set([](const auto&, const IpcReply& reply) {
             reply({Dictionary{{"k", Data(limitOf(Limit::MessageBytes) / 2)}}});
@@ -211,7 +233,8 @@ std::string limitName(const ::testing::TestParamInfo<LimitRow>& info) {
                                 "PlanesLeased",
                                 "MessageValues",
                                 "HeldBytesPerUser",
-                                "ConnectionsBeforeHello"};
+                                "ConnectionsBeforeHello",
+                                "RequestsWithoutReply"};
     static_assert(kNames.size() == kLimits.size());
     return kNames.at(static_cast<std::size_t>(info.param.limit));
 }

@@ -60,6 +60,31 @@ private:
     const std::uint64_t lease_;
 };
 
+/// A request's one answer, or the word that there is none.
+class FakeIpcConnection::Answer {
+public:
+    Answer(std::weak_ptr<FakeIpcConnection> connection, std::uint64_t sequence, const MessageDeclaration& declaration)
+        : connection_(std::move(connection)), sequence_(sequence), declaration_(declaration) {}
+    Answer(const Answer&) = delete;
+    Answer& operator=(const Answer&) = delete;
+    ~Answer() {
+        if (given_) return;
+        const auto live = connection_.lock();
+        if (live && live->finishRequest()) live->giveNoReply(sequence_, 0);
+    }
+    void give(Array values) {
+        if (given_.exchange(true)) return;
+        const auto live = connection_.lock();
+        if (live && live->finishRequest()) live->reply(sequence_, declaration_, std::move(values));
+    }
+
+private:
+    const std::weak_ptr<FakeIpcConnection> connection_;
+    const std::uint64_t sequence_;
+    const MessageDeclaration& declaration_;
+    std::atomic<bool> given_{false};
+};
+
 FakeIpcConnection::FakeIpcConnection(std::shared_ptr<FakeIpc::Process> process, ProcessID peerPid, bool isAccepted)
     : process_(std::move(process)), peerPid_(peerPid), isAccepted_(isAccepted) {
     if (!isAccepted_) return;
@@ -68,6 +93,7 @@ FakeIpcConnection::FakeIpcConnection(std::shared_ptr<FakeIpc::Process> process, 
 }
 
 FakeIpcConnection::~FakeIpcConnection() {
+    for (const ErrorHandler& errorHandler : unanswered_) fail(errorHandler, EPIPE);
     for (const auto& [sequence, pending] : pending_) fail(pending.errorHandler, EPIPE);
     if (!lost_)
         if (const auto peer = peer_.lock()) peer->receive({});
@@ -246,11 +272,23 @@ void FakeIpcConnection::reply(std::uint64_t sequence, const MessageDeclaration& 
     if (error == 0) error = commit(frame, nobody);
     if (error == 0 || error == EPIPE) return;
     if (error == ENOBUFS) return drop("it does not read its replies");
-    FakeFrame refusal;
-    refusal.kind = FakeFrame::Kind::NoReply;
-    refusal.sequence = sequence;
-    refusal.error = error;
-    give(std::move(refusal));
+    giveNoReply(sequence, error);
+}
+
+void FakeIpcConnection::giveNoReply(std::uint64_t sequence, int error) {
+    FakeFrame frame;
+    frame.kind = FakeFrame::Kind::NoReply;
+    frame.sequence = sequence;
+    frame.error = error;
+    give(std::move(frame));
+}
+
+/// One of the peer's requests is in flight no more. False when nobody is there any more to be told.
+bool FakeIpcConnection::finishRequest() {
+    const std::lock_guard lock(mutex_);
+    if (lost_) return false;
+    --requestsToAnswer_;
+    return true;
 }
 
 void FakeIpcConnection::giveBack(std::uint64_t lease) {
@@ -307,28 +345,26 @@ void FakeIpcConnection::dispatch(FakeFrame frame) {
 const char* FakeIpcConnection::dispatchMessage(FakeFrame& frame) {
     const Protocol* interface = nullptr;
     std::shared_ptr<IpcExportedObject> object;
+    const bool isRequest = frame.kind == FakeFrame::Kind::Request;
     {
         const std::lock_guard lock(mutex_);
         interface = exportedInterface_;
         object = exportedObject_.lock();
+        if (isRequest && ++requestsToAnswer_ > limitOf(Limit::MessagesInFlight)) return "too many requests in flight";
     }
     if (!interface || frame.message >= interface->messages.size()) return "an unknown message";
     const MessageDeclaration& declaration = interface->messages[frame.message];
-    const bool isRequest = frame.kind == FakeFrame::Kind::Request;
     if (isRequest != (declaration.reply == Reply::Expected)) return "a message whose reply is declared otherwise";
     std::optional<Value> decoded = decode(frame.body.bytes, frame.body.handles);
     const Array* arguments = decoded ? decoded->as<Array>() : nullptr;
     if (!arguments) return "a malformed message";
     if (!matches(*arguments, declaration.arguments)) return "a message with arguments of other types";
-    if (!object) return nullptr;
     IpcReply answer;
-    if (isRequest) {
-        answer = [weak = weak_from_this(), sequence = frame.sequence, &declaration,
-                  given = std::make_shared<std::atomic<bool>>(false)](Array values) {
-            if (given->exchange(true)) return;
-            if (const auto self = weak.lock()) self->reply(sequence, declaration, std::move(values));
+    if (isRequest)
+        answer = [shared = std::make_shared<Answer>(weak_from_this(), frame.sequence, declaration)](Array values) {
+            shared->give(std::move(values));
         };
-    }
+    if (!object) return nullptr;
     Array taken = *arguments;
     frame.body = {};
     decoded.reset();
@@ -346,7 +382,8 @@ const char* FakeIpcConnection::dispatchReply(FakeFrame& frame) {
         pending_.erase(found);
     }
     if (frame.kind == FakeFrame::Kind::NoReply) {
-        fail(pending.errorHandler, frame.error);
+        if (frame.error != 0) fail(pending.errorHandler, frame.error);
+        else leaveUnanswered(std::move(pending.errorHandler));
         return nullptr;
     }
     const std::optional<Value> decoded = decode(frame.body.bytes, frame.body.handles);
@@ -357,6 +394,19 @@ const char* FakeIpcConnection::dispatchReply(FakeFrame& frame) {
     }
     if (pending.reply) pending.reply(*values);
     return nullptr;
+}
+
+void FakeIpcConnection::leaveUnanswered(ErrorHandler errorHandler) {
+    if (!errorHandler) return;
+    ErrorHandler oldest;
+    {
+        const std::lock_guard lock(mutex_);
+        unanswered_.push_back(std::move(errorHandler));
+        if (unanswered_.size() <= limitOf(Limit::RequestsWithoutReply)) return;
+        oldest = std::move(unanswered_.front());
+        unanswered_.pop_front();
+    }
+    fail(oldest, ENODATA);
 }
 
 // The end
@@ -380,6 +430,7 @@ void FakeIpcConnection::lose(bool tellPeer) {
 
 void FakeIpcConnection::processDied() {
     std::shared_ptr<FakeIpcConnection> peer;
+    std::deque<ErrorHandler> unanswered;
     std::map<std::uint64_t, Pending> pending;
     std::deque<FakeFrame> incoming;
     Leases leases;
@@ -389,6 +440,7 @@ void FakeIpcConnection::processDied() {
         if (lost_) return;
         lost_ = true;
         peer = peer_.lock();
+        unanswered.swap(unanswered_);
         pending.swap(pending_);
         incoming.swap(incoming_);
         leases.swap(leases_);
@@ -401,17 +453,20 @@ void FakeIpcConnection::processDied() {
 void FakeIpcConnection::deliverLoss() {
     Handler interruption, invalidation;
     std::deque<FakeFrame> incoming;
+    std::deque<ErrorHandler> unanswered;
     std::map<std::uint64_t, Pending> pending;
     Leases leases;
     {
         const std::lock_guard lock(mutex_);
         interruption.swap(interruptionHandler_);
         incoming.swap(incoming_);
+        unanswered.swap(unanswered_);
         pending.swap(pending_);
         leases.swap(leases_);
     }
     leases.clear();
     incoming.clear();
+    for (const ErrorHandler& errorHandler : unanswered) errorHandler(fakeSystemError(EPIPE));
     for (const auto& [sequence, waiting] : pending)
         if (waiting.errorHandler) waiting.errorHandler(fakeSystemError(EPIPE));
     {

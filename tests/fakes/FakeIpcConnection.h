@@ -63,7 +63,7 @@ struct FakeFrame {
     Kind kind = Kind::End;
     std::uint16_t message = 0;
     std::uint64_t sequence = 0;
-    int error = 0;  ///< for NoReply
+    int error = 0;  ///< for NoReply; 0 when the receiver deliberately gives none
     WireBody body;
 };
 
@@ -96,6 +96,7 @@ public:
 private:
     class Proxy;
     class LentPlane;
+    class Answer;
     struct Pending {
         const MessageDeclaration* declaration = nullptr;
         std::function<void(Array)> reply;
@@ -106,6 +107,8 @@ private:
     void send(std::uint16_t message, Array arguments, std::function<void(Array)> reply, ErrorHandler errorHandler);
     int commit(FakeFrame& frame, Pending& pending);
     void reply(std::uint64_t sequence, const MessageDeclaration& declaration, Array values);
+    bool finishRequest();
+    void giveNoReply(std::uint64_t sequence, int error);
     int pack(Array values, FakeFrame& frame);
     void fail(const ErrorHandler& errorHandler, int error);
     bool give(FakeFrame frame);
@@ -115,6 +118,7 @@ private:
     void dispatch(FakeFrame frame);
     const char* dispatchMessage(FakeFrame& frame);
     const char* dispatchReply(FakeFrame& frame);
+    void leaveUnanswered(ErrorHandler errorHandler);
     void drop(const char* reason);
     void lose(bool tellPeer);
     void deliverLoss();
@@ -138,6 +142,8 @@ private:
     std::uint64_t nextSequence_ = 1;
     std::uint64_t nextLease_ = 1;
     std::map<std::uint64_t, Pending> pending_;
+    std::deque<ErrorHandler> unanswered_;  ///< of requests that will have no reply, oldest first
+    std::uint64_t requestsToAnswer_ = 0;   ///< the peer's whose reply is neither given nor released
     Leases leases_;
 };
 

@@ -218,6 +218,27 @@ TEST_F(Client, IsAnsweredOnceWhenTheDaemonIsKilledAndRecordsWithTheNextOne) {
                 ElementsAre("connected", "disconnected", "connected", "disconnected", "connected"));
 }
 
+TEST_F(Client, StopsAfterAThousandDiscardsWhileRecording) {
+    Answers<std::optional<Error>> discards;
+    startRecording();
+    for (std::size_t i = 0; i < 1000; ++i) {
+        recorder_->discard(discards.handler(i));
+        if (i % 50 != 49) continue;
+        const StateAnswer state = recorder_->stateAndWait();
+        ASSERT_FALSE(state.error) << i << keyIn(state.error);
+        ASSERT_TRUE(client::recordingState(*state.state).isRecording) << i;
+    }
+    const StopAnswer stopped = recorder_->stopAndWait();
+    ASSERT_TRUE(stopped.movie) << keyIn(stopped.error);
+    EXPECT_TRUE(std::filesystem::exists(stopped.movie->path()));
+    EXPECT_EQ(discards.total(), 0);
+    EXPECT_THAT(comings_.all(), ElementsAre("connected"));
+    EXPECT_EQ(world_.endDaemon(SIGKILL), -1);
+    ASSERT_TRUE(waitUntil([&] { return discards.total() >= 1000; }));
+    EXPECT_TRUE(discards.eachOnce());
+    EXPECT_EQ(keyIn(discards.last()), "CONNECTION_ERROR_LOST");
+}
+
 TEST_F(Client, GivesItsPlaceToTheNewestRecorderOfTheApplicationWhichGoesOnRecording) {
     startRecording();
     Comings newest;

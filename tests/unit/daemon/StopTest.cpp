@@ -168,6 +168,40 @@ TEST_F(Stop, ADiscardWhileRecordingIsNeverAnswered) {
                                               "can't discard recording while recording is in progress"}));
 }
 
+TEST_F(Stop, IsAnsweredAfterManyDiscardsWhileRecording) {
+    const auto client = makeRecording();
+    std::vector<TestClient::AskedRef> discards;
+    for (int i = 0; i < 200; ++i) {
+        discards.push_back(client->ask(DaemonMessage::DiscardRecording));
+        settle();
+    }
+    advance(seconds(2));
+    const auto asked = stopped(*client);
+    EXPECT_EQ(asked->failures, 0);
+    ASSERT_EQ(asked->answers, 1);
+    ASSERT_TRUE(asked->url(0));
+    for (const auto& discard : discards) EXPECT_EQ(discard->answers + discard->failures, 0);
+    EXPECT_EQ(client->losses, 0);
+}
+
+TEST_F(Stop, AreNotUsedUpByStopsOfAnIdleSessionOrByClipsThatFail) {
+    const auto client = makeConnected();
+    for (int i = 0; i < 100; ++i) EXPECT_EQ(stopped(*client)->answers, 0);
+    for (int i = 0; i < 100; ++i) {
+        ASSERT_EQ(client->start()->failures, 0);
+        advance(seconds(5));
+        fakes_.faults.failNext("MovieExporter.export");
+        const auto clip = client->ask(DaemonMessage::StopRecordingWithClipDurations, {1.0, 1.0});
+        settle();
+        ASSERT_EQ(clip->answers + clip->failures, 0) << i;
+    }
+    const auto start = client->start();
+    advance(seconds(1));
+    ASSERT_EQ(start->answers, 1);
+    EXPECT_EQ(stopped(*client)->answers, 1);
+    EXPECT_EQ(client->losses, 0);
+}
+
 TEST_F(Stop, ADiscardAfterwardsDeletesTheMovieAndAnswersWithNothing) {
     const auto client = makeRecording();
     stopped(*client);
