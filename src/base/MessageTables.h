@@ -30,7 +30,7 @@ enum class ArgumentType : std::uint8_t {
     NullableEndpoint,
     NullableError,
     SharedPlaneObject,  ///< a shared plane, or null for a frame without one
-    Any,  ///< anything but an endpoint or a plane; nor may one be in an array, a dictionary or an error
+    Any,  ///< anything; arrays, dictionaries and errors of the other types hold no endpoints
 };
 
 enum class Reply : bool { None, Expected };
