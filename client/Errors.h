@@ -24,10 +24,10 @@ enum class ConnectionError : std::int64_t {
     /// The connection ended before the answer came: the daemon died, mostly. Whether the request was carried out is
     /// unknown; a recording that was running has ended.
     Lost = 2,
-    /// No answer within the limit of a call that waits; or the daemon has said that there will be none, and this was the
-    /// oldest of more such questions than are kept. The request is not taken back.
+    /// No answer within the limit of a call that waits; or the daemon has said that there will be none, and this was
+    /// the oldest of more such questions than are kept. The request is not taken back.
     NoAnswer = 3,
-    /// Too many requests wait for the daemon to answer them, or too many bytes for the daemon to read them. This one was not sent.
+    /// Too many requests are under way, or too many bytes for the daemon to read them. This one was not sent.
     Busy = 4,
     /// The request can't be sent: too many windows, a text that is not UTF-8. Nothing was done.
     Unsendable = 5,

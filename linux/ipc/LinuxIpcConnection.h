@@ -117,7 +117,7 @@ private:
     OutgoingQueue outgoing_;
     std::uint64_t nextSequence_ = 1;
     std::unordered_map<std::uint64_t, PendingReply> pending_;
-    std::deque<ErrorHandler> unanswered_;  ///< of requests that will have no reply, oldest first; to be told of the loss
+    std::deque<ErrorHandler> unanswered_;  ///< of requests without a reply, oldest first; to be told of the loss
     std::unordered_map<std::uint64_t, std::shared_ptr<SharedPlane>> leases_;
     std::uint64_t requestsToAnswer_ = 0;  ///< the peer's whose reply is neither given nor released
 

@@ -16,9 +16,9 @@ class IpcConnection;
 
 /// Sends a message's reply. Callable once, from any lane; later calls and calls after the connection has gone do
 /// nothing. Releasing the last copy of it without a call, on whatever lane, leaves the peer without an answer (see
-/// IpcRemoteProxy::send): the request no longer counts as one in flight, at either end. A release never blocks and calls
-/// nobody's handlers; after the connection has gone it does nothing. It sends, though: do as little under a lock of
-/// one's own as for a call.
+/// IpcRemoteProxy::send): the request is in flight no more, at either end. A release never blocks and calls nobody's
+/// handlers; after the connection has gone it does nothing. It sends, though: where a call would not do, under a lock
+/// of one's own say, a release does not either.
 using IpcReply = std::function<void(Array values)>;
 
 /// An object that receives the messages of an interface.
@@ -39,10 +39,10 @@ public:
     /// slow, message over a limit) the proxy's error handler is called later, on the main queue, and `reply` is not.
     /// `reply` is called on the main queue.
     ///
-    /// A request whose reply the receiver has released is in flight no more, but neither `reply` nor the error handler is
-    /// called then: the asker is left waiting, and the error handler is called once when the connection is lost.
-    /// Limit::RequestsWithoutReply of these error handlers are kept for a connection; one more, and the oldest of them is
-    /// called, later, with ENODATA. So each request still ends in exactly one call of one of the two.
+    /// A request whose reply the receiver has released is in flight no more, but neither `reply` nor the error handler
+    /// is called then: the asker is left waiting, and the error handler is called once when the connection is lost.
+    /// Limit::RequestsWithoutReply of these error handlers are kept for a connection; one more, and the oldest of them
+    /// is called, later, with ENODATA. So each request still ends in exactly one call of one of the two.
     virtual void send(std::uint16_t message, Array arguments, std::function<void(Array values)> reply = {}) = 0;
 };
 

@@ -252,7 +252,7 @@ TEST(ClientOfAHostileDaemon, AnswersEachQuestionOnceWhateverIsSaid) {
          "CONNECTION_ERROR_NOT_REACHED"},
         {"a wrong first answer", true, reply(1, Array{12}), "CONNECTION_ERROR_NOT_REACHED"},
         {"a stop's answer of other types", true, reply(2, Array{true, false}), "CONNECTION_ERROR_BAD_ANSWER"},
-        {"twice that there is deliberately no answer", true, twice(rawFrame(messageHeader(FrameKind::NoReply, 0, 2), {})),
+        {"twice that there is no answer", true, twice(rawFrame(messageHeader(FrameKind::NoReply, 0, 2), {})),
          "CONNECTION_ERROR_NOT_REACHED"},
         {"an answer after it said that there is none", true,
          both(rawFrame(messageHeader(FrameKind::NoReply, 0, 2), {}), reply(2, Array{Value(), Value()})),
