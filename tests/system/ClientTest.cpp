@@ -239,6 +239,45 @@ TEST_F(Client, StopsAfterAThousandDiscardsWhileRecording) {
     EXPECT_EQ(keyIn(discards.last()), "CONNECTION_ERROR_LOST");
 }
 
+TEST_F(Client, SeesSevenThingsInItsStateAndAnEighthWithABroadcastURL) {
+    const auto keys = [this] {
+        std::vector<std::string> names;
+        const Dictionary state = recorder_->stateAndWait().state.value_or(Dictionary());
+        for (const auto& [key, value] : state.entries()) names.push_back(key);
+        return names;
+    };
+    EXPECT_THAT(keys(), ElementsAre("isRecording", "isBroadcasting", "microphoneEnabled", "isSystemRecording",
+                                    "hasUserConsentForMicrophone", "hasUserConsentForCamera",
+                                    "microphoneEnabledPersistent"));
+    recorder_->setBroadcastURL(URL("https://example.org/live"));
+    EXPECT_EQ(keys().back(), "broadcastURL");
+    EXPECT_EQ(keys().size(), 8u);
+}
+
+TEST_F(Client, IsNotHeardAboutItsMicrophoneWhileItDoesNotRecord) {
+    const auto microphone = [this] {
+        return client::recordingState(recorder_->stateAndWait().state.value_or(Dictionary())).microphoneEnabled;
+    };
+    recorder_->setMicrophoneEnabled(true);
+    EXPECT_FALSE(microphone());
+    startRecording();
+    recorder_->setMicrophoneEnabled(true);
+    EXPECT_TRUE(microphone());
+}
+
+TEST_F(Client, GetsTheWholeMovieForOneClipDurationAndNoAnswerForAStopWhenIdle) {
+    startRecording();
+    const StopAnswer stopped = recorder_->stopWithClipAndWait(1, 0);
+    ASSERT_TRUE(stopped.movie) << keyIn(stopped.error);
+    EXPECT_TRUE(stopped.movie->path().ends_with("/Tester.mp4")) << stopped.movie->path();
+    Answers<StopAnswer> idle;
+    recorder_->stop(idle.handler(0));
+    EXPECT_FALSE(recorder_->stateAndWait().error) << "a later question is answered";
+    EXPECT_EQ(idle.total(), 0);
+    EXPECT_EQ(world_.endDaemon(SIGKILL), -1);
+    EXPECT_TRUE(waitUntil([&] { return idle.total() == 1; })) << "the end of the connection answers it";
+}
+
 TEST_F(Client, GivesItsPlaceToTheNewestRecorderOfTheApplicationWhichGoesOnRecording) {
     startRecording();
     Comings newest;

@@ -35,6 +35,8 @@ public:
 class ExtensionActions : public SessionWorld {
 protected:
     ExtensionActions() { fakes_.log.setVerbose(false); }
+    /// What waits for an answer holds the session, which holds the link.
+    ~ExtensionActions() override { link_->pending.clear(); }
 
     void sendSamples(std::int64_t mode = 1) {
         session_->setBroadcastExtension(std::make_shared<Extension>());
