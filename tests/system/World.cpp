@@ -196,7 +196,11 @@ std::size_t World::daemonNumber(const std::string& name) {
 }
 
 std::vector<std::string> World::troubledDisk() const {
-    return {std::string("LD_PRELOAD=") + LC_SLOW_DISK, "LC_DISK=" + fs::path(moviePath()).parent_path().string(),
+    // A blank in the library's own path would end it there.
+    const std::string library = path("slow_disk.so");
+    std::error_code known;
+    fs::create_symlink(LC_SLOW_DISK, library, known);
+    return {"LD_PRELOAD=" + library, "LC_DISK=" + fs::path(moviePath()).parent_path().string(),
             "LC_DISK_STALLED=" + path("disk stalled"), "LC_DISK_FULL=" + path("disk full"),
             "LC_DISK_QUOTA=" + path("disk quota")};
 }
