@@ -12,10 +12,13 @@
 #include "linux/admin/LinuxAdminService.h"
 #include "linux/apps/Entitlements.h"
 #include "linux/apps/LinuxBundles.h"
+#include "linux/audio/LinuxAudioInputQueues.h"
+#include "linux/audio/LinuxDeviceCapture.h"
 #include "linux/display/X11AppStateMonitor.h"
 #include "linux/display/X11DisplayCapture.h"
 #include "linux/display/X11RenderServer.h"
 #include "linux/ipc/LinuxIpc.h"
+#include "linux/library/LinuxPhotoLibrary.h"
 #include "linux/media/LinuxContainerWriters.h"
 #include "linux/media/LinuxMovieExporters.h"
 #include "linux/storage/LinuxFileSystem.h"
@@ -85,9 +88,12 @@ public:
                      endUnreachable();
                  }),
           storagePurge_(scheduler_, fileSystem_),
-          platform_{log_,         scheduler_,  clock_,     ipc_,       bundles_,   renderServer_,
-                    appState_,    capture_,    capture_,   writers_,   exporters_, fileSystem_,
-                    preferences_, deviceInfo_, telemetry_, keepAlive_, admin_,    storagePurge_},
+          platform_{log_,       scheduler_, clock_,   ipc_,
+                    bundles_,   renderServer_, appState_, capture_,
+                    capture_,   audioInputQueues_, deviceCapture_, writers_,
+                    exporters_, photoLibrary_, fileSystem_, preferences_,
+                    deviceInfo_, telemetry_, keepAlive_, admin_,
+                    storagePurge_},
           termination_([this] {
               keepAlive_.announceStopping(static_cast<int>(kTimeToClose.count()));
               writers_.closeOpenMovies();
@@ -128,8 +134,11 @@ private:
     Entitlements entitlements_;
     LinuxIpc ipc_;
     const std::shared_ptr<media::MovieFiles> movieFiles_;
+    LinuxAudioInputQueues audioInputQueues_;
+    LinuxDeviceCapture deviceCapture_;
     LinuxContainerWriters writers_;
     LinuxMovieExporters exporters_;
+    LinuxPhotoLibrary photoLibrary_;
     LinuxFileSystem fileSystem_;
     LinuxPreferences preferences_;
     LinuxDeviceInfo deviceInfo_;

@@ -39,6 +39,7 @@ public:
     void resume() override;
     void invalidate() override;
     ProcessID processIdentifier() const override { return peer_.pid; }
+    UserID userIdentifier() const override { return UserID{peer_.uid}; }
     std::optional<Value> valueForEntitlement(std::string_view name) override;
     std::unique_ptr<IpcRemoteProxy> remoteProxy(ErrorHandler errorHandler) override;
 

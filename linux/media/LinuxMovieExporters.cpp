@@ -17,6 +17,7 @@ public:
         if (auto* const source = std::get_if<0>(&opened)) nanoseconds_ = (*source)->duration();
     }
     MediaTime duration() const override { return MediaTime::make(nanoseconds_, 1'000'000'000); }
+    std::vector<std::int32_t> audioTracks() const override { return {}; }
     const std::string& path() const { return path_; }
 
 private:
@@ -37,6 +38,11 @@ public:
 
     URL outputURL() const override { return outputURL_; }
     void setTimeRange(MediaTimeRange range) override { range_ = range; }
+    void setAudioMix(AudioMix) override {}
+    void cancel() override {
+        if (job_) job_->cancel();
+    }
+    double progress() const override { return 0; }
     void exportAsynchronously(Completion completion) override {
         const auto* const movie = dynamic_cast<const LinuxMovieAsset*>(movie_.get());
         std::optional<Error> refusal;

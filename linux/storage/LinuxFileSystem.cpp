@@ -186,6 +186,10 @@ Result<FileAttributes> LinuxFileSystem::attributes(const std::string& path) {
     return resultOf(std::move(answer));
 }
 
+bool LinuxFileSystem::userMayReadAndRemove(UserID, const std::string&) { return false; }
+
+std::optional<Error> LinuxFileSystem::removeForUser(UserID, const std::string&) { return systemError(EPERM); }
+
 Result<std::uint64_t> LinuxFileSystem::freeSize(const std::string& path) {
     return resultOf(ask<std::uint64_t>([path](const Place& place) -> std::variant<std::uint64_t, int> {
         const auto opened = place.isDirectory(path) ? place.openDirectoryAgain() : place.open(path, O_PATH);

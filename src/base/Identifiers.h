@@ -29,6 +29,12 @@ enum class ContextID : std::uint32_t {};
 /// A process identifier of this machine. 0 and below name no process.
 enum class ProcessID : std::int32_t {};
 
+/// A user of this machine, by the kernel's number.
+enum class UserID : std::uint32_t {};
+/// Nobody: what a peer that can't be told has.
+inline constexpr UserID kNoUser{0xffffffff};
+
+constexpr std::uint32_t number(UserID user) { return static_cast<std::uint32_t>(user); }
 constexpr std::int32_t number(ProcessID pid) { return static_cast<std::int32_t>(pid); }
 constexpr std::uint32_t number(ContextID id) { return static_cast<std::uint32_t>(id); }
 

@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "base/Date.h"
+#include "base/Identifiers.h"
 #include "base/Value.h"
 
 namespace lumacast {
@@ -47,6 +48,12 @@ public:
     virtual Result<std::vector<std::string>> list(const std::string& directory) = 0;
     /// Removes a file, or a directory with what it holds.
     virtual std::optional<Error> remove(const std::string& path) = 0;
+    /// Whether this user may itself read and remove the regular file at `path`, wherever it is; no link on the way is
+    /// followed that is not the user's own or the administrator's. False too when the disk has not answered.
+    virtual bool userMayReadAndRemove(UserID user, const std::string& path) = 0;
+    /// Removes a file, wherever it is, with that user's rights and as remove() does. EPERM where this process can't act
+    /// for the user.
+    virtual std::optional<Error> removeForUser(UserID user, const std::string& path) = 0;
     virtual std::optional<Error> move(const std::string& from, const std::string& to) = 0;
     /// Bytes available to this process on the file system that holds `path`.
     virtual Result<std::uint64_t> freeSize(const std::string& path) = 0;

@@ -74,6 +74,8 @@ public:
 
     /// The process at the other end, as the kernel says; 0 when it can't be told. Fixed at the connection's birth.
     virtual ProcessID processIdentifier() const = 0;
+    /// The user whose process it is, as the kernel says; kNoUser when it can't be told. Fixed likewise.
+    virtual UserID userIdentifier() const = 0;
     /// The value that the administrator granted the peer under this name, or none.
     virtual std::optional<Value> valueForEntitlement(std::string_view name) = 0;
 

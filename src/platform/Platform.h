@@ -6,9 +6,11 @@
 #include "base/Log.h"
 #include "platform/AdminService.h"
 #include "platform/AppStateMonitor.h"
+#include "platform/AudioInputQueue.h"
 #include "platform/Bundles.h"
 #include "platform/Clock.h"
 #include "platform/ContainerWriter.h"
+#include "platform/DeviceCapture.h"
 #include "platform/DeviceInfo.h"
 #include "platform/DisplayCapture.h"
 #include "platform/FileSystem.h"
@@ -16,6 +18,7 @@
 #include "platform/KeepAlive.h"
 #include "platform/LogSink.h"
 #include "platform/MovieExporter.h"
+#include "platform/PhotoLibrary.h"
 #include "platform/Preferences.h"
 #include "platform/RenderServer.h"
 #include "platform/Scheduler.h"
@@ -35,8 +38,11 @@ struct Platform {
     AppStateMonitor& appStateMonitor;
     DisplayCapture& displayCapture;
     DisplayCloneControl& displayCloneControl;
+    AudioInputQueues& audioInputQueues;
+    DeviceCapture& deviceCapture;
     ContainerWriters& containerWriters;
     MovieExporters& movieExporters;
+    PhotoLibrary& photoLibrary;
     FileSystem& fileSystem;
     Preferences& preferences;
     DeviceInfo& deviceInfo;

@@ -152,6 +152,38 @@ std::optional<Error> FakeFileSystem::move(const std::string& from, const std::st
     return std::nullopt;
 }
 
+bool FakeFileSystem::userMayReadAndRemove(UserID user, const std::string& path) {
+    if (faults_.fails("FileSystem.userMayReadAndRemove")) return false;
+    const std::lock_guard lock(mutex_);
+    const auto found = usersFiles_.find(path);
+    return found != usersFiles_.end() && found->second.first == user;
+}
+
+std::optional<Error> FakeFileSystem::removeForUser(UserID user, const std::string& path) {
+    if (disk_) disk_(path);
+    if (faults_.fails("FileSystem.removeForUser")) return fakeSystemError(EIO);
+    const std::lock_guard lock(mutex_);
+    const auto found = usersFiles_.find(path);
+    if (found == usersFiles_.end()) return fakeSystemError(ENOENT);
+    if (found->second.first != user) return fakeSystemError(EACCES);
+    usersFiles_.erase(found);
+    return std::nullopt;
+}
+
+void FakeFileSystem::addUsersFile(UserID user, const std::string& path, std::uint64_t size,
+                                  std::shared_ptr<const FakeMovie> movie) {
+    const std::lock_guard lock(mutex_);
+    auto file = std::make_shared<FakeFile>();
+    file->size = size;
+    file->movie = std::move(movie);
+    usersFiles_[path] = {user, std::move(file)};
+}
+
+bool FakeFileSystem::isThere(const std::string& path) const {
+    const std::lock_guard lock(mutex_);
+    return usersFiles_.contains(path) || std::holds_alternative<std::shared_ptr<FakeFile>>(find(path));
+}
+
 Result<std::uint64_t> FakeFileSystem::freeSize(const std::string& path) {
     if (faults_.fails("FileSystem.freeSize")) return fakeSystemError(ETIMEDOUT);
     const std::lock_guard lock(mutex_);
@@ -214,6 +246,7 @@ void FakeFileSystem::setMovie(FakeFile& file, std::shared_ptr<const FakeMovie> m
 
 std::shared_ptr<const FakeMovie> FakeFileSystem::movie(const std::string& path) const {
     const std::lock_guard lock(mutex_);
+    if (const auto users = usersFiles_.find(path); users != usersFiles_.end()) return users->second.second->movie;
     const auto found = find(path);
     const auto* file = std::get_if<std::shared_ptr<FakeFile>>(&found);
     return file ? (*file)->movie : nullptr;

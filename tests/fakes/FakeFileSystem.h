@@ -38,7 +38,15 @@ public:
     Result<std::vector<std::string>> list(const std::string& directory) override;
     std::optional<Error> remove(const std::string& path) override;
     std::optional<Error> move(const std::string& from, const std::string& to) override;
+    bool userMayReadAndRemove(UserID user, const std::string& path) override;
+    std::optional<Error> removeForUser(UserID user, const std::string& path) override;
     Result<std::uint64_t> freeSize(const std::string& path) override;
+
+    /// A movie outside of the temporary directory that only this user can read and remove.
+    void addUsersFile(UserID user, const std::string& path, std::uint64_t size,
+                      std::shared_ptr<const FakeMovie> movie = nullptr);
+    /// Whether a file stands at a path, a user's or a temporary one.
+    bool isThere(const std::string& path) const;
 
     /// The temporary directory, without a slash at its end.
     const std::string& temporaryDirectory() const { return base_; }
@@ -78,6 +86,7 @@ private:
     std::function<void(const std::string& path)> disk_;
     mutable std::mutex mutex_;
     std::map<std::string, std::shared_ptr<FakeFile>> nodes_;
+    std::map<std::string, std::pair<UserID, std::shared_ptr<FakeFile>>> usersFiles_;
     std::uint64_t capacity_ = 1'000'000'000;
     std::uint64_t made_ = 0;
 };

@@ -175,6 +175,11 @@ void FakeIpc::grant(ProcessID peer, const std::string& name, Value value) {
     process_->grants.insert_or_assign({peer, name}, std::move(value));
 }
 
+void FakeIpc::setUser(ProcessID peer, UserID user) {
+    const std::lock_guard lock(process_->mutex);
+    process_->users[peer] = user;
+}
+
 void FakeIpc::kill() {
     std::vector<std::weak_ptr<FakeIpcConnection>> ends;
     std::vector<std::weak_ptr<FakeListenerState>> listeners;

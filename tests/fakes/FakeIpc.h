@@ -43,6 +43,9 @@ public:
 
     /// What this process is told when it asks for the entitlement of a peer with this number.
     void grant(ProcessID peer, const std::string& name, Value value);
+    /// Whose process that peer is, as this process is told; kUser at first.
+    void setUser(ProcessID peer, UserID user);
+    static constexpr UserID kUser{1000};
     /// The process dies: its listeners close, its connections break as its peers see it, and it is told nothing any
     /// more.
     void kill();

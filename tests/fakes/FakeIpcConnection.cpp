@@ -141,6 +141,12 @@ std::unique_ptr<IpcRemoteProxy> FakeIpcConnection::remoteProxy(ErrorHandler erro
     return std::make_unique<Proxy>(shared_from_this(), std::move(errorHandler));
 }
 
+UserID FakeIpcConnection::userIdentifier() const {
+    const std::lock_guard lock(process_->mutex);
+    const auto found = process_->users.find(peerPid_);
+    return found == process_->users.end() ? FakeIpc::kUser : found->second;
+}
+
 std::optional<Value> FakeIpcConnection::valueForEntitlement(std::string_view name) {
     if (process_->faults.fails("IpcConnection.valueForEntitlement")) return std::nullopt;
     const std::lock_guard lock(process_->mutex);

@@ -32,6 +32,7 @@ struct FakeIpc::Process {
     bool alive = true;
     bool reading = true;
     std::map<std::pair<ProcessID, std::string>, Value> grants;
+    std::map<ProcessID, UserID> users;
     std::vector<std::weak_ptr<FakeIpcConnection>> ends;
     std::set<std::shared_ptr<FakeIpcConnection>> accepted;  ///< owned until they are lost
     std::vector<std::weak_ptr<FakeListenerState>> listeners;
@@ -83,6 +84,7 @@ public:
     void resume() override;
     void invalidate() override;
     ProcessID processIdentifier() const override { return peerPid_; }
+    UserID userIdentifier() const override;
     std::optional<Value> valueForEntitlement(std::string_view name) override;
     std::unique_ptr<IpcRemoteProxy> remoteProxy(ErrorHandler errorHandler) override;
 

@@ -17,6 +17,12 @@ class FakeMovieAsset final : public MovieAsset {
 public:
     explicit FakeMovieAsset(std::shared_ptr<const FakeMovie> movie) : movie_(std::move(movie)) {}
     MediaTime duration() const override { return movie_ ? movie_->duration() : kZeroMediaTime; }
+    std::vector<std::int32_t> audioTracks() const override {
+        std::vector<std::int32_t> tracks;
+        for (std::size_t i = 0; movie_ && i < movie_->tracks.size(); ++i)
+            if (movie_->tracks[i].type == MediaType::Audio) tracks.push_back(static_cast<std::int32_t>(i) + 1);
+        return tracks;
+    }
     const std::shared_ptr<const FakeMovie>& movie() const { return movie_; }
 
 private:
@@ -50,8 +56,22 @@ struct Export {
     FaultPlan& faults;
     std::shared_ptr<const FakeMovie> movie;
     URL outputURL;
+    ExportPreset preset = ExportPreset::PassThrough;
     std::optional<MediaTimeRange> range;
+    std::optional<AudioMix> mix;
     std::atomic<bool> cancelled{false};
+    std::atomic<double> progress{0};
+
+    /// Whether the track with this number, from 0 on, is in the new movie: of a mix only the first of the mixed ones,
+    /// for all of them.
+    bool keeps(std::size_t index) const {
+        if (preset == ExportPreset::PassThrough || !mix || movie->tracks[index].type != MediaType::Audio) return true;
+        for (std::size_t i = 0; i <= index; ++i)
+            for (const AudioMixInputParameters& input : mix->inputParameters)
+                if (movie->tracks[i].type == MediaType::Audio && input.trackID == static_cast<std::int32_t>(i) + 1)
+                    return i == index;
+        return false;
+    }
 
     std::optional<Error> run() {
         if (faults.fails("MovieExporter.export")) return fakeSystemError(EIO);
@@ -69,8 +89,9 @@ struct Export {
         copy->end = add(movie->start, partEnd);
         copy->finished = true;
         std::uint64_t samples = 0;
-        for (const FakeTrack& track : movie->tracks) {
-            copy->tracks.push_back(cut(track, copy->start, copy->end));
+        for (std::size_t i = 0; i < movie->tracks.size(); ++i) {
+            if (!keeps(i)) continue;
+            copy->tracks.push_back(cut(movie->tracks[i], copy->start, copy->end));
             samples += copy->tracks.back().samples.size();
         }
         if (!files.append(*file, samples * kBytesOfSample)) {
@@ -90,10 +111,14 @@ public:
 
     URL outputURL() const override { return export_->outputURL; }
     void setTimeRange(MediaTimeRange range) override { export_->range = range; }
+    void setAudioMix(AudioMix mix) override { export_->mix = std::move(mix); }
+    void cancel() override { export_->cancelled = true; }
+    double progress() const override { return export_->progress; }
     void exportAsynchronously(Completion completion) override {
         scheduler_.globalQueue(QueuePriority::Default).async([job = export_, completion = std::move(completion)] {
             if (job->cancelled) return completion(ExportStatus::Cancelled, fakeSystemError(ECANCELED));
             const std::optional<Error> error = job->run();
+            if (!error) job->progress = 1;
             completion(error ? ExportStatus::Failed : ExportStatus::Completed, error);
         });
     }
@@ -106,14 +131,20 @@ private:
 }  // namespace
 
 std::shared_ptr<MovieAsset> FakeMovieExporters::openMovie(const URL& url) {
+    if (whenOpened_) whenOpened_(url);
     if (faults_.fails("MovieExporters.openMovie")) return std::make_shared<FakeMovieAsset>(nullptr);
     return std::make_shared<FakeMovieAsset>(files_.movie(url.path()));
 }
 
-std::shared_ptr<MovieExporter> FakeMovieExporters::makeExporter(std::shared_ptr<MovieAsset> movie, ExportPreset,
-                                                                const URL& outputURL) {
+std::shared_ptr<MovieExporter> FakeMovieExporters::makeExporter(std::shared_ptr<MovieAsset> movie,
+                                                                ExportPreset preset, const URL& outputURL) {
     const auto* fake = dynamic_cast<const FakeMovieAsset*>(movie.get());
-    auto job = std::shared_ptr<Export>(new Export{files_, faults_, fake ? fake->movie() : nullptr, outputURL, {}, {}});
+    auto job = std::shared_ptr<Export>(
+        new Export{files_, faults_, fake ? fake->movie() : nullptr, outputURL, preset, {}, {}, {}, {}});
+    {
+        const std::lock_guard lock(mutex_);
+        presets_.push_back(preset);
+    }
     return std::make_shared<FakeMovieExporter>(scheduler_, std::move(job));
 }
 

@@ -1,6 +1,11 @@
 #pragma once
 // Copies of movies in memory.
 
+#include <functional>
+#include <mutex>
+#include <utility>
+#include <vector>
+
 #include "platform/MovieExporter.h"
 #include "platform/Scheduler.h"
 #include "tests/fakes/FakeFileSystem.h"
@@ -20,7 +25,18 @@ public:
     std::shared_ptr<MovieExporter> makeExporter(std::shared_ptr<MovieAsset> movie, ExportPreset preset,
                                                 const URL& outputURL) override;
 
+    /// Called with each movie before it is opened, on the lane that opens it. Set before the lanes run.
+    void setWhenOpened(std::function<void(const URL&)> opened) { whenOpened_ = std::move(opened); }
+    /// Of every exporter that was made, in order.
+    std::vector<ExportPreset> presets() const {
+        const std::lock_guard lock(mutex_);
+        return presets_;
+    }
+
 private:
+    std::function<void(const URL&)> whenOpened_;
+    mutable std::mutex mutex_;
+    std::vector<ExportPreset> presets_;
     Scheduler& scheduler_;
     FakeFileSystem& files_;
     FaultPlan& faults_;

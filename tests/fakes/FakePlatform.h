@@ -8,9 +8,11 @@
 #include "platform/Platform.h"
 #include "tests/fakes/FakeAdminService.h"
 #include "tests/fakes/FakeAppStateMonitor.h"
+#include "tests/fakes/FakeAudioInputQueue.h"
 #include "tests/fakes/FakeBundles.h"
 #include "tests/fakes/FakeClock.h"
 #include "tests/fakes/FakeContainerWriter.h"
+#include "tests/fakes/FakeDeviceCapture.h"
 #include "tests/fakes/FakeDeviceInfo.h"
 #include "tests/fakes/FakeDisplayCapture.h"
 #include "tests/fakes/FakeDisplayCloneControl.h"
@@ -19,6 +21,7 @@
 #include "tests/fakes/FakeKeepAlive.h"
 #include "tests/fakes/FakeLogSink.h"
 #include "tests/fakes/FakeMovieExporter.h"
+#include "tests/fakes/FakePhotoLibrary.h"
 #include "tests/fakes/FakePreferences.h"
 #include "tests/fakes/FakeRenderServer.h"
 #include "tests/fakes/FakeStoragePurgeService.h"
@@ -57,9 +60,12 @@ public:
     FakeAppStateMonitor appStateMonitor;
     FakeDisplayCapture displayCapture;
     FakeDisplayCloneControl displayCloneControl;
+    FakeAudioInputQueues audioInputQueues;
+    FakeDeviceCapture deviceCapture;
     FakeFileSystem fileSystem;
     FakeContainerWriters containerWriters;
     FakeMovieExporters movieExporters;
+    FakePhotoLibrary photoLibrary;
     FakePreferences preferences;
     FakeDeviceInfo deviceInfo;
     FakeTelemetry telemetry;

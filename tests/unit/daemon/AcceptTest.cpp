@@ -29,6 +29,7 @@ public:
     void resume() override { note("resume"); }
     void invalidate() override { note("invalidate"); }
     ProcessID processIdentifier() const override { return pid; }
+    UserID userIdentifier() const override { return UserID{1000}; }
     std::optional<Value> valueForEntitlement(std::string_view entitlement) override {
         note("entitlement " + std::string(entitlement));
         return std::nullopt;
@@ -207,8 +208,11 @@ TEST(StartUp, TheDirectoryAndTheListenerComeBeforeThePurgeServiceAndNobodyIsServ
                             p.appStateMonitor,
                             p.displayCapture,
                             p.displayCloneControl,
+                            p.audioInputQueues,
+                            p.deviceCapture,
                             p.containerWriters,
                             p.movieExporters,
+                            p.photoLibrary,
                             p.fileSystem,
                             p.preferences,
                             p.deviceInfo,

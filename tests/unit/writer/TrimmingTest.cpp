@@ -91,11 +91,15 @@ class CancellingExporters final : public MovieExporters {
 public:
     struct Asset final : MovieAsset {
         MediaTime duration() const override { return MediaTime::make(30, 1); }
+        std::vector<std::int32_t> audioTracks() const override { return {}; }
     };
     struct Exporter final : MovieExporter {
         Exporter(CancellingExporters& theOwner, URL theURL) : owner(theOwner), url(std::move(theURL)) {}
         URL outputURL() const override { return url; }
         void setTimeRange(MediaTimeRange given) override { owner.range = given; }
+        void setAudioMix(AudioMix) override {}
+        void cancel() override {}
+        double progress() const override { return 0; }
         void exportAsynchronously(Completion completion) override {
             completion(ExportStatus::Cancelled, Error("cancelled", 125));
         }

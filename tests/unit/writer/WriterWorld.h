@@ -42,7 +42,8 @@ protected:
         const Platform& p = fakes_.platform();
         return {p.log,           p.scheduler,      p.clock,           p.ipc,
                 p.bundles,       p.renderServer,   p.appStateMonitor, p.displayCapture,
-                p.displayCloneControl, writers,    exporters,         p.fileSystem,
+                p.displayCloneControl, p.audioInputQueues, p.deviceCapture, writers,
+                exporters,       p.photoLibrary,   p.fileSystem,
                 p.preferences,   p.deviceInfo,     p.telemetry,       p.keepAlive,
                 p.admin,
                 p.storagePurge};
