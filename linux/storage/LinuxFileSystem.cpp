@@ -186,6 +186,8 @@ Result<FileAttributes> LinuxFileSystem::attributes(const std::string& path) {
     return resultOf(std::move(answer));
 }
 
+UserID LinuxFileSystem::user() const { return UserID{::geteuid()}; }
+
 bool LinuxFileSystem::userMayReadAndRemove(UserID, const std::string&) { return false; }
 
 std::optional<Error> LinuxFileSystem::removeForUser(UserID, const std::string&) { return systemError(EPERM); }

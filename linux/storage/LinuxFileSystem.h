@@ -45,6 +45,7 @@ public:
     Result<std::vector<std::string>> list(const std::string& directory) override;
     std::optional<Error> remove(const std::string& path) override;
     std::optional<Error> move(const std::string& from, const std::string& to) override;
+    UserID user() const override;
     bool userMayReadAndRemove(UserID user, const std::string& path) override;
     std::optional<Error> removeForUser(UserID user, const std::string& path) override;
     Result<std::uint64_t> freeSize(const std::string& path) override;

@@ -28,6 +28,23 @@ struct StartRequest {
     bool captureEnabled = false;
 };
 
+/// One movie on its way to the user's library. Request lane; what does not change is read elsewhere too.
+struct MovieSave {
+    enum class State { Mixing, Adding, Saved, Failed };
+
+    std::uint64_t number = 0;
+    std::optional<URL> movie;
+    UserID user{};
+    bool removesAsUser = false;  ///< the movie is not a temporary file
+    std::uint64_t claim = 0;     ///< later ones of its path are other recordings'
+    std::function<void(std::optional<Error>)> handler;
+
+    State state = State::Mixing;
+    std::shared_ptr<MovieExporter> exporter;  ///< while it is mixed
+    std::optional<URL> savedAs;
+    std::string problem;
+};
+
 /// Owns the sessions, one per client application, and everything that clients ask of them. Everything here runs on the
 /// request lane (the main queue); what comes from other lanes hops there first. One file per concern.
 class LCRecordingManager final : public IpcListenerDelegate,
@@ -37,6 +54,7 @@ class LCRecordingManager final : public IpcListenerDelegate,
 public:
     using StartHandler = std::function<void(std::optional<Error>, bool microphoneRecording, bool cameraRecording)>;
     using StopHandler = std::function<void(std::optional<URL>, std::optional<Error>)>;
+    using SaveHandler = std::function<void(std::optional<Error>)>;
     using Handler = std::function<void()>;
 
     /// Makes the session of an application.
@@ -87,6 +105,9 @@ public:
     /// Serves the administrator's commands about the temporary movies, "storage" and "purge". Before the service is
     /// resumed.
     void serveStorageCommands();
+    /// Serves the administrator's command "save", see saveVideoToCameraRoll; how far each is stands in the snapshot
+    /// under "saves".
+    void serveSaveCommand();
 
     // LCRecordingSessionDelegate; from any lane.
     void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
@@ -115,6 +136,14 @@ private:
     void startRecording(const StartRequest& request, StartHandler handler);
     void stopRecordingWithHandler(StopHandler handler);
     void stopRecordingWithStartClipDuration(double startClipDuration, double endClipDuration, StopHandler handler);
+    /// `saveVideoToCameraRoll:handler:` — has the movie's sound mixed, adds it to this user's library and removes its
+    /// files. The handler is called once, on the request lane, with an error when it is not in the library. Refused, and
+    /// left alone, is a movie that is neither a temporary file nor one that the user may read and remove.
+    void saveVideoToCameraRoll(const std::optional<URL>& movie, UserID user, SaveHandler handler);
+    /// On a global queue.
+    void addToLibrary(const std::shared_ptr<MovieSave>& save, const std::optional<URL>& mixed, bool mixingFailed);
+    void endSave(const std::shared_ptr<MovieSave>& save, const std::optional<URL>& savedAs, const std::string& problem);
+    Array describeSaves() const;
     void pauseRecording();
     void resumeRecordingWithWindowLayerContextID(ContextID contextID);
     void discardRecordingWithHandler(Handler handler);
@@ -183,6 +212,9 @@ private:
     /// The connection whose message is being handled; only then.
     std::shared_ptr<IpcConnection> callingConnection_;
     std::uint64_t requestNumber_ = 0;
+
+    std::vector<std::shared_ptr<MovieSave>> saves_;  ///< those under way and the last that have ended, oldest first
+    std::uint64_t lastSave_ = 0;
 };
 
 }  // namespace lumacast

@@ -53,6 +53,12 @@ void LCRecordingManager::receiveMessage(const std::shared_ptr<IpcConnection>& co
         case DaemonMessage::StopRecordingWithClipDurations:
             stopRecordingWithStartClipDuration(argument<double>(arguments, 0), argument<double>(arguments, 1), stopped);
             break;
+        case DaemonMessage::SaveVideoToCameraRoll:
+            saveVideoToCameraRoll(
+                arguments[0].isNull() ? std::nullopt : std::optional(argument<URL>(arguments, 0)),
+                connection->userIdentifier(),
+                [reply](std::optional<Error> error) { reply({Value(std::move(error))}); });
+            break;
         case DaemonMessage::PauseRecording: pauseRecording(); break;
         case DaemonMessage::ResumeRecording:
             resumeRecordingWithWindowLayerContextID(
@@ -128,7 +134,7 @@ void LCRecordingManager::setMicrophoneEnabled(bool enabled) {
 void LCRecordingManager::updateProcessIDForAudioCaptureWithPID(ProcessID pid) {
     log_.line("LCRecordingManager: updateProcessIDForAudioCaptureWithPID:%i", pid);
     const auto session = getCallingConnectionRecordingSession();
-    if (session && session->isRecording()) session->setFrontmostPIDForAudioTap(pid);
+    if (session && session->isRecording()) session->updateProcessIDForAudioCaptureWithPID(pid);
 }
 
 std::optional<Dictionary> LCRecordingManager::synchronousGetCurrentState() {

@@ -116,6 +116,7 @@ void LCRecordingManager::startProper(const std::shared_ptr<LCRecordingSession>& 
     session->setMicrophoneEnabled(microphoneRecording_);
     session->setDelegate(weak_from_this());
     session->setCaptureRecording(request.captureEnabled);
+    frontmostSession(*session, [&](ProcessID pid) { session->setFrontmostPIDForAudioTap(pid); });
     session->startSessionWithHandler([self = shared_from_this(), handler = std::move(handler)] {
         self->log_.line("recording session started");
         handler(std::nullopt, self->microphoneRecording_, self->cameraRecording_);

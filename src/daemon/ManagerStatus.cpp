@@ -44,7 +44,8 @@ Dictionary LCRecordingManager::snapshot() const {
     return {{"service", "com.orvane.lumacastd"},
             {"temporaryDirectory", services_.tempStore._srTempPath()},
             {"freeBytes", services_.tempStore._srDeviceFreeDiskSpace()},
-            {"sessions", std::move(sessions)}};
+            {"sessions", std::move(sessions)},
+            {"saves", describeSaves()}};
 }
 
 }  // namespace lumacast

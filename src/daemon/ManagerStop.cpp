@@ -1,5 +1,7 @@
 // Stopping, discarding, and the reports of sessions that stopped.
 
+#include <algorithm>
+
 #include "daemon/LCRecordingManager.h"
 
 namespace lumacast {
@@ -105,6 +107,10 @@ void LCRecordingManager::recordingSessionStoppedWithError(const std::shared_ptr<
         self->recordingSessionStoppedWithError(session, error, std::nullopt);
         // A session that stopped by itself is finished by nobody else.
         self->resetAfterStop(session, session->managerRecord.startGeneration);
+        // A tap may have been started while the session stopped.
+        const auto& sessions = self->bundleIDToRecordingSessionLookup_;
+        if (std::none_of(sessions.begin(), sessions.end(), [](const auto& s) { return s.second->isRecording(); }))
+            self->services_.captureManager.stopAppAudioCapture();
     });
 }
 

@@ -2,14 +2,18 @@
 
 namespace lumacast {
 
-Process::Process(const Platform& platform, LCRecordingManager::SessionMaker makeSession)
+Process::Process(const Platform& platform, LCRecordingManager::SessionMaker makeSession,
+                 const CaptureDevices* captureDevices)
     : platform_(platform),
       tempStore_(platform_),
       localization_(platform_.bundles),
       errors_(localization_),
+      captureManager_(LCCaptureManager::init(platform_)),
       alertQueue_(platform_.scheduler) {
     manager_ = LCRecordingManager::init(
-        {platform_, tempStore_, localization_, errors_, captureManager_, &platform_.scheduler.mainQueue()}, alertQueue_,
+        {platform_, tempStore_, localization_, errors_, *captureManager_, &platform_.scheduler.mainQueue(),
+         captureDevices},
+        alertQueue_,
         std::move(makeSession));
 }
 
@@ -22,6 +26,7 @@ void Process::start() {
     errors_.readTexts();
     manager_->finishStartup();
     manager_->serveStorageCommands();
+    manager_->serveSaveCommand();
     platform_.admin.resume([weak = std::weak_ptr(manager_)] {
         const auto manager = weak.lock();
         return manager ? manager->snapshot() : Dictionary();

@@ -16,15 +16,16 @@ namespace lumacast {
 /// platform's lanes must have come to rest before it is destroyed.
 class Process {
 public:
-    /// An empty maker makes the real sessions.
-    explicit Process(const Platform& platform, LCRecordingManager::SessionMaker makeSession = {});
+    /// An empty maker makes the real sessions; without `captureDevices` the capture manager says what there is.
+    explicit Process(const Platform& platform, LCRecordingManager::SessionMaker makeSession = {},
+                     const CaptureDevices* captureDevices = nullptr);
 
     /// Sends the manager `finishStartup` and opens the administrator's service. On the main queue's thread.
     void start();
 
     LCRecordingManager& manager() { return *manager_; }
     TempStore& tempStore() { return tempStore_; }
-    LCCaptureManager& captureManager() { return captureManager_; }
+    LCCaptureManager& captureManager() { return *captureManager_; }
     /// `+clientProxy` — the proxy of nobody, the same one at every call. Nothing uses it.
     const std::shared_ptr<LCClientProxy>& clientProxy();
 
@@ -33,7 +34,7 @@ private:
     TempStore tempStore_;
     Localization localization_;
     RecordingErrors errors_;
-    LCCaptureManager captureManager_;
+    const std::shared_ptr<LCCaptureManager> captureManager_;
     AlertQueue alertQueue_;
     std::once_flag clientProxyOnce_;
     std::shared_ptr<LCClientProxy> clientProxy_;

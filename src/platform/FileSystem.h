@@ -48,6 +48,8 @@ public:
     virtual Result<std::vector<std::string>> list(const std::string& directory) = 0;
     /// Removes a file, or a directory with what it holds.
     virtual std::optional<Error> remove(const std::string& path) = 0;
+    /// Whose files this process makes.
+    virtual UserID user() const = 0;
     /// Whether this user may itself read and remove the regular file at `path`, wherever it is; no link on the way is
     /// followed that is not the user's own or the administrator's. False too when the disk has not answered.
     virtual bool userMayReadAndRemove(UserID user, const std::string& path) = 0;

@@ -127,8 +127,8 @@ void LCRecordingSession::_resumeOrStartSession() {
     }
     source->setDelegate(weak_from_this());
     source->openGate();
-    log_.line("starting capture");
-    source->start();
+    setupMicTapIfWanted();
+    startAppAudioThenCapture();
     captureStartTime_.set(services_.platform.clock.now());
 }
 
@@ -175,6 +175,7 @@ void LCRecordingSession::stopAllCapture() {
     services_.captureManager.stopAllCapture();
     log_.line("Stop mirroring");
     services_.platform.displayCloneControl.setMirroringMode(DisplayCloneControl::kOff);
+    haveMicTap_ = false;
 }
 
 void LCRecordingSession::stopRecordingWithNotification(bool notification, const std::optional<Error>& error) {

@@ -36,10 +36,15 @@ struct SessionServices {
     LCCaptureManager& captureManager;
     /// Where the continuation of a start runs; null lets it run where it stands.
     SerialQueue* requestLane = nullptr;
+    /// Who is asked whether there is a microphone; null asks the capture manager.
+    const CaptureDevices* captureDevices = nullptr;
 };
 
 /// How a session's samples leave it.
 enum class BroadcastProcessMode : std::int64_t { MovieClips = 0, SampleBuffers = 1 };
+
+/// What a sample is that leaves the session as such.
+enum class SampleType : std::int64_t { Video = 1, AppAudio = 2, Microphone = 3 };
 
 /// What a broadcast extension is told about the recording.
 enum class ExtensionAction : std::int64_t { Start = 1, Pause = 2, Resume = 3, Finish = 4 };
@@ -76,7 +81,15 @@ public:
     bool isCapturing() const { return captureRecording_; }
     void setCaptureRecording(bool capturing) { captureRecording_ = capturing; }
     bool microphoneEnabled() const { return microphoneEnabled_; }
-    void setMicrophoneEnabled(bool enabled) { microphoneEnabled_ = enabled; }
+    /// `setMicrophoneEnabled:` — of a system recording that runs without the microphone it also starts capturing it.
+    /// Request lane.
+    void setMicrophoneEnabled(bool enabled);
+    /// `haveMicTap` — whether the microphone's capture has begun for this session.
+    bool haveMicTap() const { return haveMicTap_; }
+    /// The first application in front of this broadcast; deliberately never forgotten. Request lane.
+    const std::optional<BundleIdentifier>& bundleIDOfFirstForegroundApp() const {
+        return bundleIDOfFirstForegroundApp_;
+    }
     /// The process whose sound is captured; below 1 none is.
     ProcessID frontmostPIDForAudioTap() const { return frontmostPIDForAudioTap_; }
     void setFrontmostPIDForAudioTap(ProcessID pid) { frontmostPIDForAudioTap_ = pid; }
@@ -194,6 +207,16 @@ public:
     void screenCaptureControllerWasPreempted(DisplayCaptureSource& source) override;
     void screenCaptureControllerMediaServicesWereReset(DisplayCaptureSource& source) override;
 
+    /// `setupMicTap` — starts capturing the microphone for this session.
+    void setupMicTap();
+    /// `updateProcessIDForAudioCaptureWithPID:` — the sound captured is that process's from now on. Deliberately nothing
+    /// changes for a number below 1 but that it is kept. Request lane.
+    void updateProcessIDForAudioCaptureWithPID(ProcessID pid);
+    /// `checkAndStopAppAudioForPID:` — no sound any more if it is that process's. Request lane.
+    void checkAndStopAppAudioForPID(ProcessID pid);
+    /// `updateBundleIdForFirstForegroundApp` — remembers and announces the first application of a broadcast.
+    void updateBundleIdForFirstForegroundApp();
+
     /// `_maximumSizeWithSize:` — the capture-size cap.
     Size _maximumSizeWithSize(Size size);
     /// Whether a picture can have what the cap leaves of this size: a very long and narrow one loses its short side. A
@@ -217,6 +240,18 @@ public:
     /// `isNativeScreenOrientationPortrait` — deliberately fixed; kept so that the rule that asks for it stays general.
     static bool isNativeScreenOrientationPortrait() { return true; }
 
+protected:
+    // Where sound goes that is not for a movie of this session. No recording of this daemon gets that far yet: an
+    // extension can't be set up, and starts that hand samples to the client are refused.
+    /// `_notifyExtensionOfAudioSampleBuffer:withType:`
+    virtual void _notifyExtensionOfAudioSampleBuffer(const SampleRef&, SampleType) {}
+    /// `packageAudioSampleBufferForCapture:withType:`
+    virtual void packageAudioSampleBufferForCapture(const SampleRef&, SampleType) {}
+    /// `_processAudioSampleBufferForMP4ClipHandler:`
+    virtual void _processAudioSampleBufferForMP4ClipHandler(const SampleRef&) {}
+    /// `_notifyExtensionOfFrontmostProcessBundleID:`
+    virtual void _notifyExtensionOfFrontmostProcessBundleID(const BundleIdentifier&) {}
+
 private:
     void continueStart(std::uint64_t start, std::uint64_t stops, const Handler& handler);
     void _resumeOrStartSession();
@@ -226,6 +261,18 @@ private:
     std::uint64_t getRecordedFileSize(const LCReportingAgent& agent);
     void finishMovie(double startClipDuration, double endClipDuration, FinishHandler handler);
 
+    bool hasAudioCaptureDevice() const;
+    void setupMicTapIfWanted();
+    /// Starts the tap, which starts the capture source when it runs; the source at once when there is nobody to tap.
+    void startAppAudioThenCapture();
+    /// Starts the source, once since the last startAppAudioThenCapture. Request lane and audio capture queue.
+    void beginCapture();
+    void beginCaptureWithoutTap();
+    void takeMicrophoneSample(const SampleRef& sample);
+    void takeAppAudioSample(const SampleRef& sample);
+    void takeResumedAppAudioSample(ProcessID pid, const SampleRef& sample);
+    void appendAudio(const SampleRef& sample, SampleType type);
+    void countAppAudio();
     void updateDuartionWithSample(const SampleRef& sample);
     void _processSampleBuffer(const SampleRef& sample, std::uint32_t transformFlags);
     void _processSampleBufferForStreaming(const SampleRef& sample, std::uint32_t transformFlags);
@@ -251,8 +298,10 @@ private:
     std::atomic<std::uint64_t> recordingState_{0};
     std::atomic<bool> paused_{false}, systemRecording_{false}, isBroadcasting_{false}, captureRecording_{false},
         microphoneEnabled_{false}, microphoneEnabledPersistent_{false}, hasUserConsentForCamera_{false},
-        hasUserConsentForMicrophone_{false}, sessionWasResumed_{false};
+        hasUserConsentForMicrophone_{false}, sessionWasResumed_{false}, haveMicTap_{false},
+        captureHasBegun_{false};
     std::atomic<ProcessID> frontmostPIDForAudioTap_{ProcessID{0}};
+    std::optional<BundleIdentifier> bundleIDOfFirstForegroundApp_;
     std::optional<URL> broadcastURL_, interruptedMovieURL_;
     std::vector<ContextID> contextIDs_;
     Size windowSize_, originalWindowSize_;

@@ -22,13 +22,14 @@ bool saysNothingIsThere(const Error& error) {
 
 }  // namespace
 
-void FileRemovals::remove(std::string path, std::optional<std::uint64_t> claim, Completion completion) {
+void FileRemovals::remove(std::string path, std::optional<std::uint64_t> claim, Completion completion,
+                          std::optional<UserID> user) {
     const std::string key = keyOf(path);
     bool isFirst = false;
     {
         const std::lock_guard lock(mutex_);
         const auto [place, isNew] = waiting_.try_emplace(key);
-        place->second.push_back({std::move(path), claim, std::move(completion)});
+        place->second.push_back({std::move(path), claim, std::move(completion), user});
         isFirst = isNew && makeReady(key);
     }
     if (isFirst) submitTask();
@@ -77,9 +78,9 @@ void FileRemovals::work() {
 std::optional<Error> FileRemovals::perform(const std::string& key, const Removal& removal) {
     if (removal.claim) {
         const std::lock_guard lock(mutex_);
-        if (isClaimedAfter(key, *removal.claim)) return std::nullopt;
+        if (isClaimedAfterLocked(key, *removal.claim)) return std::nullopt;
     }
-    auto error = fileSystem_.remove(removal.path);
+    auto error = removal.user ? fileSystem_.removeForUser(*removal.user, removal.path) : fileSystem_.remove(removal.path);
     if (error && saysNothingIsThere(*error)) return std::nullopt;
     if (error) log_.line("_lxRemoveFile error: %i", error->code());
     return error;
@@ -112,7 +113,12 @@ std::size_t FileRemovals::claimedPathCount() const {
     return claims_.size();
 }
 
-bool FileRemovals::isClaimedAfter(const std::string& key, std::uint64_t claim) const {
+bool FileRemovals::isClaimedAfter(const std::string& path, std::uint64_t claim) const {
+    const std::lock_guard lock(mutex_);
+    return isClaimedAfterLocked(keyOf(path), claim);
+}
+
+bool FileRemovals::isClaimedAfterLocked(const std::string& key, std::uint64_t claim) const {
     const auto found = claims_.find(key);
     return found != claims_.end() && found->second.latest > claim;
 }
@@ -120,7 +126,7 @@ bool FileRemovals::isClaimedAfter(const std::string& key, std::uint64_t claim) c
 std::shared_ptr<void> FileRemovals::takeTurn(const std::string& path, std::uint64_t lastClaim) {
     const std::string key = keyOf(path);
     const std::lock_guard lock(mutex_);
-    if (isClaimedAfter(key, lastClaim)) return nullptr;
+    if (isClaimedAfterLocked(key, lastClaim)) return nullptr;
     const bool hasTheTurn = waiting_.try_emplace(key).second;
     return {static_cast<void*>(this), [self = shared_from_this(), key, hasTheTurn](void*) {
                 if (hasTheTurn) self->endTurn(key);

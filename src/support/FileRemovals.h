@@ -33,7 +33,11 @@ public:
 
     /// Removes what is at `path`, on the background queue, and completes there: with none when nothing was there, or
     /// when a claim later than `claim` is on the path at that moment.
-    void remove(std::string path, std::optional<std::uint64_t> claim, Completion completion);
+    /// With `user` given the file may be anywhere, and is removed with that user's rights.
+    void remove(std::string path, std::optional<std::uint64_t> claim, Completion completion,
+                std::optional<UserID> user = {});
+    /// Whether a claim later than `claim` is on the path.
+    bool isClaimedAfter(const std::string& path, std::uint64_t claim) const;
 
     /// A number for who is about to write `path`; later ones are larger.
     std::uint64_t claim(const std::string& path);
@@ -54,13 +58,14 @@ private:
         std::string path;
         std::optional<std::uint64_t> claim;
         Completion completion;
+        std::optional<UserID> user;
     };
     struct Claims {
         std::uint64_t latest = 0;
         std::set<std::uint64_t> held;
     };
 
-    bool isClaimedAfter(const std::string& key, std::uint64_t claim) const;
+    bool isClaimedAfterLocked(const std::string& key, std::uint64_t claim) const;
     std::optional<Error> perform(const std::string& key, const Removal& removal);
     /// Under the lock: the path's removals may go on. Whether a task has to be submitted for that.
     [[nodiscard]] bool makeReady(const std::string& key);

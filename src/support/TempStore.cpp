@@ -110,6 +110,19 @@ void TempStore::removeFileOfClaim(const URL& url, std::uint64_t claim, Completio
     removals_->remove(url.path(), claim, std::move(completion));
 }
 
+void TempStore::removeFileOfUser(const URL& url, UserID user, Completion completion) {
+    removals_->remove(url.path(), std::nullopt, std::move(completion), user);
+}
+
+bool TempStore::isTemporaryFile(const URL& url) const {
+    const std::string path = url.path(), directory = _srTempPath();
+    if (!path.starts_with(directory)) return false;
+    const std::size_t name = path.find_first_not_of('/', directory.size());
+    if (name == std::string::npos || path.find('/', name) != std::string::npos) return false;
+    const std::string file = path.substr(name);
+    return file != "." && file != ".." && file.find('\0') == std::string::npos;
+}
+
 void TempStore::_srMoveFileFromURL(const URL& from, const URL& to, Completion completion) {
     default_.async([&log = log_, &fileSystem = fileSystem_, from, to, completion = std::move(completion)] {
         (void)fileSystem.remove(to.path());  // deliberately ignored: the move tells

@@ -49,6 +49,14 @@ public:
     /// `_srRemoveFile:completion:` — removes a file on the background queue, in the order asked for its path. Completes
     /// there, with none when the file did not exist.
     void _srRemoveFile(const URL& url, Completion completion);
+    /// The same for a file anywhere, with its user's rights.
+    void removeFileOfUser(const URL& url, UserID user, Completion completion);
+    /// Whether the URL is that of a file directly in the temporary directory, by its name alone.
+    bool isTemporaryFile(const URL& url) const;
+    /// Whether a writer has claimed the path later than that.
+    bool isClaimedAfter(const std::string& path, std::uint64_t claim) const {
+        return removals_->isClaimedAfter(path, claim);
+    }
     /// `_srMoveFileFromURL:toURL:completion:` — moves a file on the default queue, over one that is there.
     void _srMoveFileFromURL(const URL& from, const URL& to, Completion completion);
     /// `_srDeleteFilesWithPrefix:` — deletes, on the default queue, all files whose names begin with it, case and

@@ -1,5 +1,7 @@
 #include "writer/media/SampleBuffer.h"
 
+#include <algorithm>
+
 namespace lumacast {
 
 SampleRef SampleBuffer::makeVideo(PixelBuffer image, MediaTime presentation, MediaTime duration) {
@@ -16,7 +18,7 @@ SampleRef SampleBuffer::makeAudio(const AudioFormat& format, Data data, std::int
     sample->format_ = {MediaType::Audio, format};
     sample->timing_.push_back(timing);
     sample->sampleCount_ = sampleCount;
-    sample->data_ = std::make_shared<const Data>(std::move(data));
+    sample->data_ = std::make_shared<Data>(std::move(data));
     return sample;
 }
 
@@ -24,6 +26,10 @@ SampleRef SampleBuffer::copyWithTiming(std::vector<SampleTiming> timing) const {
     std::shared_ptr<SampleBuffer> sample(new SampleBuffer(*this));
     sample->timing_ = std::move(timing);
     return sample;
+}
+
+void SampleBuffer::overwriteDataWithZero() const {
+    if (data_) std::fill(data_->begin(), data_->end(), std::uint8_t{0});
 }
 
 MediaTime SampleBuffer::presentationTime() const {

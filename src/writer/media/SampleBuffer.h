@@ -33,7 +33,7 @@ class SampleBuffer;
 /// Samples are shared: a holder that keeps one past the call that delivered it keeps the reference.
 using SampleRef = std::shared_ptr<const SampleBuffer>;
 
-/// One video frame or a run of audio packets. Immutable.
+/// One video frame or a run of audio packets. Immutable, but for overwriteDataWithZero.
 class SampleBuffer {
 public:
     /// A video frame. `decode` is left invalid.
@@ -54,7 +54,10 @@ public:
     /// The picture of a video frame; none for audio.
     const std::optional<PixelBuffer>& image() const { return image_; }
     /// The bytes of an audio buffer; null for video.
-    const std::shared_ptr<const Data>& data() const { return data_; }
+    std::shared_ptr<const Data> data() const { return data_; }
+    /// Makes every byte of an audio buffer zero, in place: for all who share it. Only for whom the buffer was just
+    /// delivered to, before anybody else has it.
+    void overwriteDataWithZero() const;
 
 private:
     SampleBuffer() = default;
@@ -63,7 +66,7 @@ private:
     std::vector<SampleTiming> timing_;
     std::int64_t sampleCount_ = 0;
     std::optional<PixelBuffer> image_;
-    std::shared_ptr<const Data> data_;
+    std::shared_ptr<Data> data_;
 };
 
 }  // namespace lumacast

@@ -166,6 +166,22 @@ protected:
     std::string pathOf(const std::string& name) { return process_->tempStore().pathFor(name + ".mp4"); }
     std::size_t logged(std::string_view text) { return fakes_.logSink.count(text); }
     using Lines = std::vector<std::string>;
+    static Lines joined(Lines lines, const Lines& more) {
+        lines.insert(lines.end(), more.begin(), more.end());
+        return lines;
+    }
+    /// What stopping all capture says, with a tap and without.
+    static Lines captureStops(bool tapped = true) {
+        Lines lines{"LCRecordingSession: stopAllCapture",
+                    "LCCaptureManager: stopDeviceCaptureSessionWithFinishHandler"};
+        if (tapped) {
+            lines.emplace_back("LCRecordingManager:stopAudioCapture: Audio Queue successfully stopped");
+            lines = joined(std::move(lines), Lines(10, "LCRecordingManager: Audio Queue buffer released"));
+            lines.emplace_back("LCRecordingManager: Audio Queue has been disposed");
+        }
+        lines.emplace_back("Stop mirroring");
+        return lines;
+    }
 
     SimWorld world_{1};
     FakePlatform& fakes_ = world_.fakes;

@@ -175,20 +175,22 @@ TEST_F(Exemptions, AnInterruptedMovieIsReportedWhenTheApplicationRecordsAgain) {
 TEST_F(Exemptions, WhatTheMicrophoneAndTheSoundFollowIsTakenOnlyWhileRecording) {
     fakes_.preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
     const auto client = makeConnected();
-    const auto both = [&] {
+    const auto both = [&](const Lines& ofTheSession) {
         fakes_.logSink.clear();
         client->tell(DaemonMessage::SetMicrophoneEnabled, {true});
         client->tell(DaemonMessage::UpdateProcessIDForAudioCapture, {std::int32_t{-7}});
         settle();
-        EXPECT_EQ(fakes_.logSink.logged(), (Lines{"LCRecordingManager: setMicrophoneEnabled:1",
-                                                  "LCRecordingManager: updateProcessIDForAudioCaptureWithPID:-7"}));
+        EXPECT_EQ(fakes_.logSink.logged(), joined({"LCRecordingManager: setMicrophoneEnabled:1",
+                                                   "LCRecordingManager: updateProcessIDForAudioCaptureWithPID:-7"},
+                                                  ofTheSession));
     };
-    both();
+    both({});
     EXPECT_FALSE(session(*client)->microphoneEnabled());
     EXPECT_EQ(session(*client)->frontmostPIDForAudioTap(), ProcessID{0});
     ASSERT_EQ(start(*client, false), 0);
     session(*client)->setSystemRecording(true);  // system recordings too
-    both();
+    both({"updateProcessIDForAudioCaptureWithPID: -7", "stopping audio capture",
+          "invalid pid stopping audio capture"});
     EXPECT_TRUE(session(*client)->microphoneEnabled());
     EXPECT_EQ(session(*client)->frontmostPIDForAudioTap(), ProcessID{-7});
 }

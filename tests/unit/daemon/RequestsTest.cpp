@@ -87,8 +87,7 @@ TEST_F(Requests, WhatIsNotServedIsOnlyLogged) {
     const std::vector<std::pair<DaemonMessage, Array>> unserved{
         {DaemonMessage::SetupBroadcast, {"a", "b", Data(), Value()}},
         {DaemonMessage::GetCurrentBroadcastImages, {}},
-        {DaemonMessage::GetSystemBroadcastExtensionInfo, {}},
-        {DaemonMessage::SaveVideoToCameraRoll, {URL("file:///a.mp4")}}};
+        {DaemonMessage::GetSystemBroadcastExtensionInfo, {}}};
     const auto client = makeRecording();
     for (const auto& [message, arguments] : unserved) {
         fakes_.logSink.clear();

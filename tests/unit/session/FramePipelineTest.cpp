@@ -64,7 +64,7 @@ TEST_F(FramePipeline, TheFirstFrameSetsTheCaptureStartTime) {
     startQuietly();
     deliver(1000);
     deliver(1010);
-    EXPECT_EQ(compare(captureManager_.captureStartTime(), MediaTime::make(1000, 600)), 0);
+    EXPECT_EQ(compare(captureManager_->captureStartTime(), MediaTime::make(1000, 600)), 0);
 }
 
 TEST_F(FramePipeline, AfterAPauseTheFirstFrameHasTheTimeOfTheLastOneBefore) {
@@ -123,7 +123,7 @@ TEST_F(FramePipeline, ARetimedFrameIsACopyWithItsPictureAndDuration) {
     EXPECT_FALSE(last->timing()[0].decode.isValid());
     ASSERT_TRUE(last->image());
     EXPECT_EQ(last->image()->width(), 640u);
-    EXPECT_EQ(compare(captureManager_.captureStartTime(), MediaTime::make(2010, 600)), 0)
+    EXPECT_EQ(compare(captureManager_->captureStartTime(), MediaTime::make(2010, 600)), 0)
         << "a re-timed frame sets the start to its own time";
 }
 

@@ -114,7 +114,7 @@ TEST_F(SessionLifecycle, AnUprightSystemRecordingStaysAsItIs) {
 
 TEST_F(SessionLifecycle, APauseStopsEverythingInOrder) {
     start();
-    captureManager_.setCaptureStartTime(MediaTime::make(5, 600));
+    captureManager_->setCaptureStartTime(MediaTime::make(5, 600));
     fakes_.logSink.clear();
     pause();
     EXPECT_TRUE(session_->isPaused());
@@ -122,9 +122,10 @@ TEST_F(SessionLifecycle, APauseStopsEverythingInOrder) {
     EXPECT_FALSE(source()->isRunning());
     EXPECT_FALSE(source()->isGateOpen());
     EXPECT_EQ(fakes_.displayCloneControl.mode(), 0);
-    EXPECT_EQ(compare(captureManager_.captureStartTime(), kInvalidMediaTime), 0);
+    EXPECT_EQ(compare(captureManager_->captureStartTime(), kInvalidMediaTime), 0);
     EXPECT_EQ(fakes_.logSink.logged(),
-              (Lines{"LCRecordingSession: pauseSession", "LCRecordingSession: stopAllCapture", "Stop mirroring"}));
+              (Lines{"LCRecordingSession: pauseSession", "LCRecordingSession: stopAllCapture",
+                     "LCCaptureManager: stopDeviceCaptureSessionWithFinishHandler", "Stop mirroring"}));
 }
 
 TEST_F(SessionLifecycle, ASecondPauseDoesNothingAtAll) {
@@ -174,7 +175,8 @@ TEST_F(SessionLifecycle, AFinishLogsItsStepsAndHandsTheMovieOver) {
     EXPECT_EQ(
         fakes_.logSink.logged(),
         (Lines{"LCRecordingSession: finishSessionWithHandler", "LCRecordingSession: stop",
-               "LCRecordingSession: stopAllCapture", "Stop mirroring", "recordedFileSize for URL 1000 bytes",
+               "LCRecordingSession: stopAllCapture", "LCCaptureManager: stopDeviceCaptureSessionWithFinishHandler",
+               "Stop mirroring", "recordedFileSize for URL 1000 bytes",
                "LCMovieWriter: finishWritingWithHandler: status = 1", "LCRecordingSession: finishWritingWithHandler"}));
     EXPECT_TRUE(delegate_->stops.empty()) << "a finish notifies nobody";
 }

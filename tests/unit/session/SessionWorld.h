@@ -131,9 +131,14 @@ protected:
     TempStore tempStore_{fakes_.platform()};
     Localization localization_{fakes_.bundles};
     RecordingErrors errors_{localization_};
-    LCCaptureManager captureManager_;
-    const SessionServices services_{fakes_.platform(), tempStore_,      localization_,
-                                    errors_,           captureManager_, &world_.scheduler.mainQueue()};
+    struct Devices final : CaptureDevices {
+        bool hasAudioCaptureDevice() const override { return there; }
+        bool there = true;
+    } devices_;
+    const std::shared_ptr<LCCaptureManager> captureManager_ = LCCaptureManager::init(fakes_.platform());
+    const SessionServices services_{fakes_.platform(), tempStore_,       localization_,
+                                    errors_,           *captureManager_, &world_.scheduler.mainQueue(),
+                                    &devices_};
     const std::shared_ptr<RecordingDelegate> delegate_ = std::make_shared<RecordingDelegate>();
     std::shared_ptr<LCRecordingSession> session_;
     int startAnswers_ = 0;

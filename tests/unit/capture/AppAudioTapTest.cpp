@@ -1,0 +1,310 @@
+#include "tests/unit/capture/CaptureWorld.h"
+
+namespace lumacast {
+namespace {
+
+using AppAudioTap = CaptureWorld;
+
+TEST_F(AppAudioTap, AStartMakesTenBuffersAndSaysSoStepByStep) {
+    start();
+    EXPECT_EQ(fakes_.logSink.logged(),
+              (Lines{"LCRecordingManager: startAudioCapture: Created Audio Queue Input",
+                     "LCRecordingManager: startAudioCapture: Successfully set Audio Queue to PID",
+                     "LCRecordingManager: startAudioCapture: Successfully started Audio Queue Recording"}));
+    EXPECT_EQ(queue()->process(), kPlayer);
+    EXPECT_EQ(queue()->enqueuedBuffers(), 10u);
+    EXPECT_EQ(queue()->bufferBytes(), 57344u);
+    EXPECT_EQ(fakes_.audioInputQueues.lastFlags(), 0x800u);
+    const auto recorder = manager_->audioRecorderQueue();
+    ASSERT_TRUE(recorder);
+    EXPECT_TRUE(recorder->isRunning);
+    EXPECT_EQ(recorder->format, manager_->audioBasicDescription());
+    EXPECT_EQ(recorder->audioFile, nullptr);
+    EXPECT_EQ(didStart_, 1);
+    EXPECT_FALSE(queue()->hasListener()) << "it fires once";
+}
+
+TEST_F(AppAudioTap, TheFormatAskedForIsBigEndianMono) {
+    const AudioFormat format = manager_->audioBasicDescription();
+    EXPECT_EQ(format.sampleRate, 44100.0);
+    EXPECT_EQ(format.formatID, kAudioFormatLinearPCM);
+    EXPECT_EQ(format.formatFlags, 14u);
+    EXPECT_EQ(format.bytesPerPacket, 2u);
+    EXPECT_EQ(format.framesPerPacket, 1u);
+    EXPECT_EQ(format.bytesPerFrame, 2u);
+    EXPECT_EQ(format.channelsPerFrame, 1u);
+    EXPECT_EQ(format.bitsPerChannel, 16u);
+    EXPECT_EQ(manager_->initialTimestamp(), (AudioTimeStamp{0.0, 0, 1.0, 0}));
+    EXPECT_EQ(manager_->audioDispatchQueue()->label(), "com.orvane.Lumacast.CaptureQueue");
+    EXPECT_EQ(manager_->sessionSampleBufferQueue()->label(), "com.orvane.lumacast.capture.session");
+}
+
+TEST_F(AppAudioTap, EveryErrorOfAStartIsLoggedAndNoneEndsIt) {
+    for (const char* call : {"setProcessTap", "streamFormat", "start"})
+        fakes_.faults.failNext(std::string("AudioInputQueue.") + call);
+    start();
+    EXPECT_EQ(fakes_.logSink.logged(),
+              (Lines{"LCRecordingManager: startAudioCapture: Created Audio Queue Input",
+                     "LCRecordingManager: startAudioCapture error: -99",
+                     "LCRecordingManager: startAudioCapture: Successfully set Audio Queue to PID",
+                     "LCRecordingManager: startAudioCapture error: -99",
+                     "LCRecordingManager: startAudioCapture error: -99",
+                     "LCRecordingManager: startAudioCapture: Successfully started Audio Queue Recording"}));
+    EXPECT_EQ(queue()->enqueuedBuffers(), 10u);
+    EXPECT_TRUE(manager_->audioRecorderQueue());
+}
+
+TEST_F(AppAudioTap, AQueueThatCannotBeMadeIsStartedAndStoppedAllTheSame) {
+    fakes_.faults.failNext("AudioInputQueues.makeInputQueue");
+    start();
+    EXPECT_EQ(logged("LCRecordingManager: startAudioCapture error: -8"), 4u);
+    EXPECT_EQ(logged("LCRecordingManager: startAudioCapture: Successfully started Audio Queue Recording"), 1u);
+    ASSERT_TRUE(manager_->audioRecorderQueue());
+    manager_->stopAppAudioCapture();
+    EXPECT_EQ(logged("LCRecordingManager:stopAudioCapture:error: -8"), 1u);
+    EXPECT_FALSE(manager_->audioRecorderQueue());
+    EXPECT_EQ(didStart_, 0);
+}
+
+TEST_F(AppAudioTap, WithoutBytesPerPacketTheQueueSaysHowLargeItsPacketsAre) {
+    fakes_.audioInputQueues.setMaximumPacketSize(1);
+    start();
+    EXPECT_EQ(queue()->bufferBytes(), 44100u);
+}
+
+TEST_F(AppAudioTap, ABufferBecomesASampleAndGoesBackToTheQueue) {
+    start();
+    screenHasBegun();
+    fakes_.logSink.clear();
+    ASSERT_TRUE(hear(1764, 5'000'000, 9));
+    ASSERT_EQ(samples_.size(), 1u);
+    EXPECT_TRUE(onCaptureQueue_);
+    EXPECT_EQ(samples_[0]->format().audio, manager_->audioBasicDescription());
+    EXPECT_EQ(samples_[0]->sampleCount(), 882);
+    EXPECT_EQ(*samples_[0]->data(), Data(1764, 9));
+    EXPECT_EQ(compare(samples_[0]->presentationTime(), MediaTime::make(5, 1000)), 0);
+    EXPECT_EQ(compare(samples_[0]->duration(), MediaTime::make(20, 1000)), 0);
+    EXPECT_EQ(queue()->enqueuedBuffers(), 10u);
+    EXPECT_EQ(manager_->audioRecorderQueue()->currentPacket, 882);
+    EXPECT_EQ(fakes_.logSink.logged(),
+              Lines{"LCRecordingManager: HandleInputBuffer: Successfully enqueued the audio buffer"});
+    EXPECT_DOUBLE_EQ(manager_->lastAudioDate()->secondsSince1970, fakes_.clock.now().secondsSince1970 + 0.02);
+}
+
+TEST_F(AppAudioTap, TheSampleHasTheCallbacksCountAndTheTotalTheComputedOne) {
+    start();
+    screenHasBegun();
+    ASSERT_TRUE(queue()->deliver(Data(100, 1), 0, 0));
+    settle();
+    ASSERT_EQ(samples_.size(), 1u);
+    EXPECT_EQ(samples_[0]->sampleCount(), 0);
+    EXPECT_EQ(samples_[0]->data()->size(), 100u);
+    EXPECT_EQ(manager_->audioRecorderQueue()->currentPacket, 50);
+}
+
+TEST_F(AppAudioTap, ASampleThatCannotBeMadeIsCountedAndItsBufferGoesBack) {
+    start();
+    screenHasBegun();
+    ASSERT_TRUE(queue()->deliver(Data(100, 1), 0, 50, {{90, 0, 20}}));
+    settle();
+    EXPECT_TRUE(samples_.empty());
+    EXPECT_FALSE(manager_->lastAudioDate());
+    EXPECT_EQ(manager_->audioRecorderQueue()->currentPacket, 50);
+    EXPECT_EQ(queue()->enqueuedBuffers(), 10u);
+}
+
+TEST_F(AppAudioTap, UntilTheScreenHasBegunTheBuffersAreLostAndAfterTenTheTapStallsForGood) {
+    start();
+    for (int i = 0; i < 10; ++i) EXPECT_TRUE(hear());
+    EXPECT_FALSE(hear());
+    screenHasBegun();
+    EXPECT_FALSE(hear());
+    EXPECT_TRUE(samples_.empty());
+    EXPECT_EQ(queue()->enqueuedBuffers(), 0u);
+    EXPECT_FALSE(queue()->isDisposed()) << "it is still the current one";
+}
+
+TEST_F(AppAudioTap, AResumeAfterSilenceDeliversSilenceFirst) {
+    start();
+    screenHasBegun();
+    hear(2, 1);
+    samples_.clear();
+    manager_->stopAppAudioCapture();
+    advance(std::chrono::milliseconds(2500));
+    manager_->setLastAudioDate(Date{fakes_.clock.now().secondsSince1970 - 2.5});
+    fakes_.logSink.clear();
+    resume();
+    hear(1764, 9, 3);
+    ASSERT_EQ(samples_.size(), 2u);
+    EXPECT_EQ(samples_[0]->sampleCount(), 110250);
+    EXPECT_EQ(*samples_[0]->data(), Data(220500, 0));
+    EXPECT_EQ(samples_[0]->duration().value, 110250);
+    EXPECT_EQ(samples_[0]->duration().timescale, 44100);
+    EXPECT_EQ(compare(samples_[0]->presentationTime(), kZeroMediaTime), 0);
+    EXPECT_FALSE(samples_[0]->timing()[0].decode.isValid());
+    EXPECT_EQ(samples_[1]->data()->front(), 3);
+    EXPECT_EQ(logged("gap since last audio tap, filling with empty sample buffer"), 1u);
+    hear();
+    EXPECT_EQ(samples_.size(), 3u) << "once";
+}
+
+TEST_F(AppAudioTap, AResumeWithoutAnythingBeforeOrWithoutAGapInsertsNothing) {
+    screenHasBegun();
+    resume();
+    hear();
+    EXPECT_EQ(samples_.size(), 1u);
+    EXPECT_FALSE(manager_->isResumed());
+    manager_->stopAppAudioCapture();
+    manager_->setLastAudioDate(Date{fakes_.clock.now().secondsSince1970 + 1});
+    resume();
+    hear();
+    EXPECT_EQ(samples_.size(), 2u);
+    EXPECT_EQ(logged("gap since last audio tap, filling with empty sample buffer"), 0u);
+}
+
+TEST_F(AppAudioTap, TheSilenceComesBeforeTheLookAtTheRecorder) {
+    start();
+    screenHasBegun();
+    manager_->setLastAudioDate(Date{fakes_.clock.now().secondsSince1970 - 1});
+    manager_->setResumed(true);
+    manager_->audioRecorderQueue()->isRunning = false;
+    hear();
+    EXPECT_EQ(samples_.size(), 1u) << "the silence";
+    EXPECT_EQ(logged("recorder is not running, ignoring audio data"), 1u);
+    EXPECT_EQ(queue()->enqueuedBuffers(), 9u) << "the buffer stays out";
+}
+
+TEST_F(AppAudioTap, AStopFreesTheBuffersAndDisposesOfTheQueue) {
+    start();
+    screenHasBegun();
+    fakes_.logSink.clear();
+    const auto tapped = queue();
+    manager_->stopAppAudioCapture();
+    Lines expected{"LCRecordingManager:stopAudioCapture: Audio Queue successfully stopped"};
+    expected.insert(expected.end(), 10, "LCRecordingManager: Audio Queue buffer released");
+    expected.emplace_back("LCRecordingManager: Audio Queue has been disposed");
+    EXPECT_EQ(fakes_.logSink.logged(), expected);
+    EXPECT_TRUE(tapped->isDisposed());
+    EXPECT_FALSE(manager_->audioRecorderQueue());
+    fakes_.logSink.clear();
+    manager_->stopAppAudioCapture();
+    EXPECT_TRUE(fakes_.logSink.logged().empty());
+}
+
+TEST_F(AppAudioTap, AStopThatFailsGoesOnToForgetTheTap) {
+    start();
+    const std::weak_ptr<AudioRecorderState> recorder = manager_->audioRecorderQueue();
+    fakes_.logSink.clear();
+    fakes_.faults.failNext("AudioInputQueue.stop");
+    manager_->stopAppAudioCapture();
+    EXPECT_EQ(fakes_.logSink.logged(), Lines{"LCRecordingManager:stopAudioCapture:error: -99"});
+    EXPECT_FALSE(manager_->audioRecorderQueue());
+    screenHasBegun();
+    while (hear()) {
+    }
+    EXPECT_TRUE(samples_.empty());
+    EXPECT_TRUE(recorder.expired()) << "released when its queue has run dry";
+}
+
+TEST_F(AppAudioTap, FailuresToFreeAndToDisposeAreLogged) {
+    start();
+    fakes_.logSink.clear();
+    fakes_.faults.failNext("AudioInputQueue.freeBuffer", 2);
+    fakes_.faults.failNext("AudioInputQueue.dispose");
+    const auto tapped = queue();
+    manager_->stopAppAudioCapture();
+    EXPECT_EQ(logged("LCRecordingManager: error: -99"), 3u);
+    EXPECT_EQ(logged("LCRecordingManager: Audio Queue buffer released"), 8u);
+    EXPECT_EQ(logged("LCRecordingManager: Audio Queue has been disposed"), 0u);
+    EXPECT_FALSE(manager_->audioRecorderQueue());
+    tapped->dispose();
+}
+
+TEST_F(AppAudioTap, BuffersOfATapThatWasStoppedAreDroppedWithoutALine) {
+    start();
+    screenHasBegun();
+    manager_->audioDispatchQueue()->async([&] {
+        ASSERT_TRUE(queue()->deliver(Data(100, 1), 0));
+        // By then the callback has been, and its work waits behind this task.
+        queue()->lane().sync([] {});
+        manager_->stopAppAudioCapture();
+        fakes_.logSink.clear();
+    });
+    settle();
+    EXPECT_TRUE(samples_.empty());
+    EXPECT_TRUE(fakes_.logSink.logged().empty());
+}
+
+TEST_F(AppAudioTap, AStartReplacesATapWithoutStoppingItAndTheOldOneEndsWhenItHasRunDry) {
+    start();
+    screenHasBegun();
+    const auto old = queue();
+    const std::weak_ptr<AudioRecorderState> recorder = manager_->audioRecorderQueue();
+    start(ProcessID{501});
+    EXPECT_EQ(fakes_.audioInputQueues.queues().size(), 2u);
+    EXPECT_TRUE(old->isRunning());
+    for (int i = 0; i < 10; ++i) {
+        EXPECT_TRUE(old->deliver(Data(100, 1), 0));
+        settle();
+    }
+    EXPECT_TRUE(samples_.empty());
+    EXPECT_TRUE(old->isDisposed());
+    EXPECT_TRUE(recorder.expired());
+    EXPECT_TRUE(hear());
+    EXPECT_EQ(samples_.size(), 1u);
+}
+
+TEST_F(AppAudioTap, ATapThatStalledIsDisposedOfWhenItIsReplaced) {
+    start();
+    while (hear()) {
+    }
+    const std::weak_ptr<AudioRecorderState> recorder = manager_->audioRecorderQueue();
+    start();
+    EXPECT_TRUE(recorder.expired());
+    EXPECT_EQ(fakes_.audioInputQueues.queues().size(), 1u);
+}
+
+TEST_F(AppAudioTap, TheDidStartHandlerIsNotCalledForATapThatWasStopped) {
+    manager_->startAppAudioCaptureForProcessID(kPlayer, keep(), [this] { ++didStart_; });
+    manager_->stopAppAudioCapture();
+    settle();
+    EXPECT_EQ(didStart_, 0);
+    start();
+    EXPECT_EQ(didStart_, 1);
+}
+
+TEST_F(AppAudioTap, AResumeHasNoDidStartHandler) {
+    start();
+    manager_->stopAppAudioCapture();
+    resume();
+    EXPECT_EQ(didStart_, 1);
+    EXPECT_FALSE(manager_->appTapDidStartHandler());
+}
+
+TEST_F(AppAudioTap, AStopFromWithinAHandlerIsLegal) {
+    manager_->startAppAudioCaptureForProcessID(
+        kPlayer, [this](const SampleRef&) { manager_->stopAllCapture(); }, {});
+    settle();
+    screenHasBegun();
+    hear();
+    EXPECT_FALSE(manager_->audioRecorderQueue());
+    EXPECT_FALSE(manager_->appAudioOutputHandler());
+    EXPECT_EQ(compare(manager_->captureStartTime(), kInvalidMediaTime), 0);
+}
+
+TEST(SilentSample, OfAFormatWithoutFramesPerPacketThereIsNone) {
+    AudioFormat format{.sampleRate = 44100, .formatID = kAudioFormatLinearPCM, .bytesPerPacket = 2, .bytesPerFrame = 2};
+    EXPECT_FALSE(makeSilentSample(format, 1, kZeroMediaTime));
+    format.framesPerPacket = 2;
+    const auto half = makeSilentSample(format, 1, kZeroMediaTime);
+    ASSERT_TRUE(half);
+    EXPECT_EQ(half->sampleCount(), 22050);
+    EXPECT_EQ(half->data()->size(), 44100u);
+    format.bytesPerFrame = 0;
+    EXPECT_EQ(makeSilentSample(format, 1, kZeroMediaTime)->data()->size(), 22050u) << "a byte a sample";
+    EXPECT_FALSE(makeSilentSample(format, 0, kZeroMediaTime));
+    EXPECT_FALSE(makeSilentSample(format, 601, kZeroMediaTime)) << "more than any interruption is worth";
+}
+
+}  // namespace
+}  // namespace lumacast
