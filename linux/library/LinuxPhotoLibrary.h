@@ -1,12 +1,34 @@
 #pragma once
+#include <string>
+
+#include "linux/library/CopyBytes.h"
+#include "linux/library/NewFile.h"
+#include "linux/system/UserRights.h"
 #include "platform/PhotoLibrary.h"
 
 namespace lumacast {
 
-/// There is no library yet.
+/// The folder Lumacast in the user's Videos folder. Each movie is copied on a thread of its own, at idle priority, with
+/// the rights of the user; any number at a time. EPERM for a user this process can't act for; EINVAL for what is not a
+/// file URL; what is not a regular file, or is reached through somebody else's link, is refused (EACCES, ELOOP). Its
+/// name has the local time of the movie's last change.
 class LinuxPhotoLibrary final : public PhotoLibrary {
 public:
+    struct Options {
+        std::string home;             ///< of this process's user
+        std::string configHome;       ///< the same user's; another one's is ~/.config
+        std::string videosDirectory;  ///< $XDG_VIDEOS_DIR of this process; empty for none
+        AccountLookup accounts = systemAccount;
+        // What is tried first; tests take the detours.
+        Unseen unseen = Unseen::WithoutName;
+        CopyBy copyBy = CopyBy::Clone;
+    };
+    explicit LinuxPhotoLibrary(Options options);
+
     Result<URL> addVideo(const URL& movie, UserID user) override;
+
+private:
+    const Options options_;
 };
 
 }  // namespace lumacast

@@ -46,7 +46,7 @@ std::vector<std::string> componentsOf(std::string_view path) {
     return result;
 }
 
-bool isTrusted(const struct stat& status) { return status.st_uid == 0 || status.st_uid == ::geteuid(); }
+bool isTrusted(const struct stat& status, uid_t user) { return status.st_uid == 0 || status.st_uid == user; }
 
 /// Puts the components of `path` before those that are still to be walked.
 void walkFirst(std::vector<std::string>& rest, std::string_view path) {
@@ -91,7 +91,8 @@ std::string withSingleSlashes(std::string_view path) {
     return result;
 }
 
-std::variant<FileDescriptor, int> openTrusted(const std::string& directory) {
+std::variant<FileDescriptor, int> openFolder(const std::string& directory, uid_t user) {
+    if (directory.find('\0') != std::string::npos) return EINVAL;
     FileDescriptor at(::open("/", kDirectoryFlags));
     std::vector<std::string> rest;  // the next one last
     walkFirst(rest, directory);
@@ -106,7 +107,7 @@ std::variant<FileDescriptor, int> openTrusted(const std::string& directory) {
             at = std::move(next);
             continue;
         }
-        if (!isTrusted(status)) return EACCES;
+        if (!isTrusted(status, user)) return EACCES;
         if (++links > kMaximumLinks) return ELOOP;
         std::array<char, 4096> target{};
         const ssize_t length = ::readlinkat(next.get(), "", target.data(), target.size());
@@ -114,10 +115,35 @@ std::variant<FileDescriptor, int> openTrusted(const std::string& directory) {
         if (target[0] == '/') at.reset(::open("/", kDirectoryFlags));
         walkFirst(rest, std::string_view(target.data(), static_cast<std::size_t>(length)));
     }
-    struct stat status = {};
-    if (!at || ::fstat(at.get(), &status) != 0) return errno;
-    if (!isTrusted(status)) return EACCES;
+    if (!at) return errno;
     return at;
+}
+
+std::variant<FileDescriptor, int> openTrusted(const std::string& directory, uid_t user) {
+    auto opened = openFolder(directory, user);
+    const auto* folder = std::get_if<FileDescriptor>(&opened);
+    struct stat status = {};
+    if (folder && ::fstat(folder->get(), &status) != 0) return errno;
+    if (folder && !isTrusted(status, user)) return EACCES;
+    return opened;
+}
+
+std::variant<FileDescriptor, int> openTrusted(const std::string& directory) {
+    return openTrusted(directory, ::geteuid());
+}
+
+std::variant<ResolvedName, int> resolveForUser(const std::string& path, uid_t user) {
+    const std::size_t slash = path.rfind('/');
+    if (!path.starts_with('/')) return EINVAL;
+    ResolvedName result;
+    result.name = path.substr(slash + 1);
+    if (result.name.empty() || result.name == "." || result.name == ".." ||
+        result.name.find('\0') != std::string::npos)
+        return EINVAL;
+    auto folder = openFolder(path.substr(0, slash + 1), user);
+    if (const int* error = std::get_if<int>(&folder)) return *error;
+    result.directory = std::move(std::get<FileDescriptor>(folder));
+    return result;
 }
 
 std::variant<ResolvedName, int> resolveBeneath(const std::string& base, const std::string& path,

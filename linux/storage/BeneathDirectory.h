@@ -1,5 +1,7 @@
 #pragma once
-// Names resolved beneath one directory.
+// Names resolved beneath one directory, and a user's own names.
+
+#include <sys/types.h>
 
 #include <optional>
 #include <string>
@@ -36,6 +38,15 @@ std::variant<ResolvedName, int> resolveBeneath(const std::string& base, const st
 /// administrator made them; one that somebody else planted, and a directory of somebody else's at the end, are EACCES.
 /// Blocks as long as the disk does.
 std::variant<FileDescriptor, int> openTrusted(const std::string& directory);
+/// The same for another user than this process's.
+std::variant<FileDescriptor, int> openTrusted(const std::string& directory, uid_t user);
+/// The same for a directory at the end that may be anybody's: what may be done in it, its rights say.
+std::variant<FileDescriptor, int> openFolder(const std::string& directory, uid_t user);
+
+/// Finds the place of any absolute path, its folder reached as openFolder does, with the rights of the calling thread.
+/// The last component is not looked at; what is done with it must not follow links either. EINVAL for a path that names
+/// no file. Blocks as long as the disk does.
+std::variant<ResolvedName, int> resolveForUser(const std::string& path, uid_t user);
 
 /// `path` with every run of slashes as one and none at its end.
 std::string withSingleSlashes(std::string_view path);

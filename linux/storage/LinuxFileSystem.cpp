@@ -11,6 +11,7 @@
 #include <cerrno>
 #include <cstdio>
 
+#include "linux/storage/UsersFiles.h"
 #include "linux/system/LinuxEnvironment.h"
 #include "linux/system/SystemError.h"
 
@@ -113,7 +114,8 @@ LinuxFileSystem::LinuxFileSystem(Options options)
           options.root, withSingleSlashes(options.root + std::string(kDeviceTemporaryDirectory)),
           options.resolution ? *options.resolution : availableResolution(), options.beforeEachQuestion)),
       bytesBeingWritten_(options.bytesBeingWritten),
-      patience_(options.patience) {}
+      patience_(options.patience),
+      accounts_(std::move(options.accounts)) {}
 
 std::optional<Error> LinuxFileSystem::prepare() {
     const std::string parent = place_->directory.substr(0, place_->directory.rfind('/'));
@@ -188,9 +190,20 @@ Result<FileAttributes> LinuxFileSystem::attributes(const std::string& path) {
 
 UserID LinuxFileSystem::user() const { return UserID{::geteuid()}; }
 
-bool LinuxFileSystem::userMayReadAndRemove(UserID, const std::string&) { return false; }
+bool LinuxFileSystem::userMayReadAndRemove(UserID user, const std::string& path) {
+    const auto answer = ask<Done>([user, path, accounts = accounts_](const Place& place) -> std::variant<Done, int> {
+        if (place.beforeEachQuestion) place.beforeEachQuestion();
+        const int error = performAs(number(user), accounts, [&] { return mayReadAndRemove(path, number(user)); });
+        if (error != 0) return error;
+        return Done{};
+    });
+    return std::holds_alternative<Done>(answer);
+}
 
-std::optional<Error> LinuxFileSystem::removeForUser(UserID, const std::string&) { return systemError(EPERM); }
+std::optional<Error> LinuxFileSystem::removeForUser(UserID user, const std::string& path) {
+    const int error = performAs(number(user), accounts_, [&] { return removeFile(path, number(user)); });
+    return error == 0 ? std::nullopt : std::optional(systemError(error));
+}
 
 Result<std::uint64_t> LinuxFileSystem::freeSize(const std::string& path) {
     return resultOf(ask<std::uint64_t>([path](const Place& place) -> std::variant<std::uint64_t, int> {

@@ -6,6 +6,7 @@
 
 #include "linux/storage/BeneathDirectory.h"
 #include "linux/system/DiskLane.h"
+#include "linux/system/UserRights.h"
 #include "platform/FileSystem.h"
 
 namespace lumacast {
@@ -18,7 +19,7 @@ inline constexpr std::string_view kDeviceTemporaryDirectory = "/private/var/mobi
 using BytesBeingWritten = std::function<std::optional<std::uint64_t>(const std::string& path)>;
 
 /// The file system role on the disk of this machine. Only the temporary directory and what is beneath it can be
-/// reached; links in it are never followed: they answer with their own attributes, and removing one removes the link.
+/// reached, but by the two operations of users' files; links in it are never followed: they answer with their own attributes, and removing one removes the link.
 /// What the disk has not answered in time is ETIMEDOUT. Everything is made for this user alone, whatever the process's
 /// umask. The temporary directory that was there and is gone is made again when its free size is asked for, which every
 /// recording begins with.
@@ -29,6 +30,7 @@ public:
         BytesBeingWritten bytesBeingWritten;
         std::chrono::milliseconds patience{40};
         std::optional<Resolution> resolution;  ///< as the kernel offers when not given
+        AccountLookup accounts = systemAccount;    ///< of the users whose files are asked for
         std::function<void()> beforeEachQuestion;  ///< tests put a slow disk here; runs on the disk's thread
     };
     explicit LinuxFileSystem(Options options);
@@ -61,6 +63,7 @@ private:
     const std::shared_ptr<const Place> place_;
     const BytesBeingWritten bytesBeingWritten_;
     const std::chrono::milliseconds patience_;
+    const AccountLookup accounts_;
     DiskLane disk_;
 };
 

@@ -8,4 +8,9 @@ namespace lumacast {
 /// had.
 [[nodiscard]] bool startDetachedThread(std::function<void()> body);
 
+/// Runs `action` on a thread of its own that takes no signals and ends with it, waits for it, and answers its error
+/// number: for what changes the thread itself (rights, priority). EAGAIN when no thread was to be had. `action` must
+/// not throw.
+[[nodiscard]] int performOnOwnThread(const std::function<int()>& action);
+
 }  // namespace lumacast

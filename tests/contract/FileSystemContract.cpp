@@ -1,5 +1,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include <functional>
 #include <map>
@@ -28,6 +29,13 @@ public:
     /// A writer has written so many bytes to a file it made, whether or not they are on the disk.
     virtual void writeThroughWriter(const std::string& path, std::uint64_t bytes) = 0;
     virtual Date now() const = 0;
+    /// A user this process can act for, and one who has no rights to that user's files.
+    virtual UserID user() const = 0;
+    virtual UserID stranger() const = 0;
+    /// A file of `user`'s outside of the temporary directory; its path.
+    virtual std::string addUsersFile(const std::string& name, std::uint64_t size) = 0;
+    /// Whether a file stands at any path.
+    virtual bool isThere(const std::string& path) = 0;
 };
 
 class FakeFileSystemWorld final : public FileSystemWorld {
@@ -43,6 +51,13 @@ public:
         ASSERT_TRUE(fileSystem_.append(*std::get<0>(made), bytes));
     }
     Date now() const override { return clock_.now(); }
+    UserID user() const override { return UserID{1000}; }
+    UserID stranger() const override { return UserID{1001}; }
+    std::string addUsersFile(const std::string& name, std::uint64_t size) override {
+        fileSystem_.addUsersFile(user(), "/home/user/" + name, size);
+        return "/home/user/" + name;
+    }
+    bool isThere(const std::string& path) override { return fileSystem_.isThere(path); }
 
 private:
     FakeClock clock_;
@@ -52,7 +67,9 @@ private:
 
 class PortFileSystemWorld final : public FileSystemWorld {
 public:
-    explicit PortFileSystemWorld(Resolution resolution) : fileSystem_(options(resolution)) {
+    /// `user` is one this process can act for: its own, or any when it is the administrator.
+    explicit PortFileSystemWorld(Resolution resolution, uid_t user = ::geteuid())
+        : user_(user), fileSystem_(options(resolution)) {
         EXPECT_FALSE(fileSystem_.prepare());
     }
     FileSystem& fileSystem() override { return fileSystem_; }
@@ -70,6 +87,18 @@ public:
     Date now() const override {
         return Date{std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count()};
     }
+    UserID user() const override { return UserID{user_}; }
+    UserID stranger() const override { return UserID{54321}; }
+    std::string addUsersFile(const std::string& name, std::uint64_t size) override {
+        std::filesystem::permissions(scratch_.path(), std::filesystem::perms(0755));
+        const std::string home = scratch_.makeDirectory("users home");
+        const std::string path = scratch_.write("users home/" + name, std::string(size, 'x'));
+        EXPECT_EQ(::chown(home.c_str(), user_, user_), 0);
+        EXPECT_EQ(::chown(path.c_str(), user_, user_), 0);
+        std::filesystem::permissions(home, std::filesystem::perms(0700));
+        return path;
+    }
+    bool isThere(const std::string& path) override { return std::filesystem::exists(path); }
 
 private:
     LinuxFileSystem::Options options(Resolution resolution) {
@@ -77,6 +106,7 @@ private:
         result.root = scratch_.path();
         result.resolution = resolution;
         result.patience = std::chrono::seconds(30);  // this machine may be busy; its patience has a test of its own
+        result.accounts = [](uid_t asked) { return std::optional(UserAccount{asked, asked, {asked}, "/"}); };
         result.bytesBeingWritten = [this](const std::string& path) -> std::optional<std::uint64_t> {
             const auto found = writers_.find(path);
             return found == writers_.end() ? std::nullopt : std::optional(found->second);
@@ -84,6 +114,7 @@ private:
         return result;
     }
 
+    const uid_t user_;
     ScratchDirectory scratch_;
     std::map<std::string, std::uint64_t> writers_;
     LinuxFileSystem fileSystem_;
@@ -275,12 +306,44 @@ TEST_P(FileSystemContract, TheDiskHasRoom) {
     EXPECT_GT(std::get<std::uint64_t>(free), 0u);
 }
 
+TEST_P(FileSystemContract, AUserMayReadAndRemoveItsOwnFileAndNobodyElseMay) {
+    const std::string movie = world_->addUsersFile("movie.mp4", 100);
+    EXPECT_TRUE(fileSystem_.userMayReadAndRemove(world_->user(), movie));
+    EXPECT_FALSE(fileSystem_.userMayReadAndRemove(world_->stranger(), movie));
+    EXPECT_FALSE(fileSystem_.userMayReadAndRemove(kNoUser, movie));
+    const std::int64_t refusal = code(fileSystem_.removeForUser(world_->stranger(), movie));
+    EXPECT_TRUE(refusal == EACCES || refusal == EPERM) << refusal;
+    EXPECT_NE(code(fileSystem_.removeForUser(kNoUser, movie)), 0);
+    EXPECT_TRUE(world_->isThere(movie)) << "a question and a refusal remove nothing";
+
+    EXPECT_EQ(code(fileSystem_.removeForUser(world_->user(), movie)), 0);
+    EXPECT_FALSE(world_->isThere(movie));
+    EXPECT_FALSE(fileSystem_.userMayReadAndRemove(world_->user(), movie));
+    EXPECT_EQ(code(fileSystem_.removeForUser(world_->user(), movie)), ENOENT);
+}
+
+TEST_P(FileSystemContract, AUsersPathThatNamesNoFileIsRefused) {
+    const std::string movie = world_->addUsersFile("movie.mp4", 100);
+    const std::string folder = movie.substr(0, movie.rfind('/'));
+    for (const std::string& path : {std::string(), std::string("/"), std::string("movie.mp4"), movie + "/", folder,
+                                    folder + "/..", movie + std::string("\0x", 2)}) {
+        EXPECT_FALSE(fileSystem_.userMayReadAndRemove(world_->user(), path)) << path;
+        EXPECT_NE(code(fileSystem_.removeForUser(world_->user(), path)), 0) << path;
+    }
+    EXPECT_TRUE(world_->isThere(movie));
+}
+
 INSTANTIATE_TEST_SUITE_P(Fake, FileSystemContract,
                          ::testing::Values(Maker([] { return std::make_unique<FakeFileSystemWorld>(); })));
 INSTANTIATE_TEST_SUITE_P(
     Port, FileSystemContract,
     ::testing::Values(Maker([] { return std::make_unique<PortFileSystemWorld>(availableResolution()); }),
-                      Maker([] { return std::make_unique<PortFileSystemWorld>(Resolution::Walk); })));
+                      Maker([] { return std::make_unique<PortFileSystemWorld>(Resolution::Walk); }),
+                      // For another user, where this process is the administrator (else for its own).
+                      Maker([] {
+                          const uid_t user = ::geteuid() == 0 ? 12345 : ::geteuid();
+                          return std::make_unique<PortFileSystemWorld>(availableResolution(), user);
+                      })));
 
 }  // namespace
 }  // namespace lumacast

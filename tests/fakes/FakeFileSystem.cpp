@@ -184,6 +184,13 @@ bool FakeFileSystem::isThere(const std::string& path) const {
     return usersFiles_.contains(path) || std::holds_alternative<std::shared_ptr<FakeFile>>(find(path));
 }
 
+bool FakeFileSystem::isFolder(const std::string& path) const {
+    const std::lock_guard lock(mutex_);
+    const auto found = find(path);
+    const auto* file = std::get_if<std::shared_ptr<FakeFile>>(&found);
+    return file && (*file)->isDirectory;
+}
+
 Result<std::uint64_t> FakeFileSystem::freeSize(const std::string& path) {
     if (faults_.fails("FileSystem.freeSize")) return fakeSystemError(ETIMEDOUT);
     const std::lock_guard lock(mutex_);

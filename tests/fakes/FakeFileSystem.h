@@ -48,6 +48,8 @@ public:
                       std::shared_ptr<const FakeMovie> movie = nullptr);
     /// Whether a file stands at a path, a user's or a temporary one.
     bool isThere(const std::string& path) const;
+    /// Whether what stands there is a directory.
+    bool isFolder(const std::string& path) const;
 
     /// The temporary directory, without a slash at its end.
     const std::string& temporaryDirectory() const { return base_; }

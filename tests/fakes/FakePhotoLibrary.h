@@ -13,11 +13,12 @@
 namespace lumacast {
 
 /// Movies in a list. A failing call ("PhotoLibrary.addVideo") is a full disk; a movie that is not in the FakeFileSystem
-/// is ENOENT. Thread-safe; never waits.
+/// is ENOENT. It can act for every user but kNoUser. Thread-safe; never waits.
 class FakePhotoLibrary final : public PhotoLibrary {
 public:
     struct Asset {
         URL movie;  ///< what it is a copy of
+        URL file;   ///< where it is
         UserID user{};
         std::shared_ptr<const FakeMovie> content;
     };
@@ -26,10 +27,20 @@ public:
 
     Result<URL> addVideo(const URL& movie, UserID user) override {
         if (faults_.fails("PhotoLibrary.addVideo")) return fakeSystemError(ENOSPC);
+        if (!movie.path().starts_with('/')) return fakeSystemError(EINVAL);
+        if (user == kNoUser) return fakeSystemError(EPERM);
         if (!files_.isThere(movie.path())) return fakeSystemError(ENOENT);
+        if (files_.isFolder(movie.path())) return fakeSystemError(EISDIR);
         const std::lock_guard lock(mutex_);
-        assets_.push_back({movie, user, files_.movie(movie.path())});
-        return URL("file:///library/" + std::to_string(assets_.size()) + ".mp4");
+        if (isReadOnly_) return fakeSystemError(EACCES);
+        const URL file("file:///library/" + std::to_string(assets_.size() + 1) + ".mp4");
+        assets_.push_back({movie, file, user, files_.movie(movie.path())});
+        return file;
+    }
+    /// From now on nothing can be written into it.
+    void takeRightsAway() {
+        const std::lock_guard lock(mutex_);
+        isReadOnly_ = true;
     }
     std::vector<Asset> assets() const {
         const std::lock_guard lock(mutex_);
@@ -41,6 +52,7 @@ private:
     FaultPlan& faults_;
     mutable std::mutex mutex_;
     std::vector<Asset> assets_;
+    bool isReadOnly_ = false;
 };
 
 }  // namespace lumacast

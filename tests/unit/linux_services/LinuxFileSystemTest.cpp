@@ -133,6 +133,15 @@ TEST(LinuxFileSystem, AHungDiskIsUnreadableAfter40Milliseconds) {
     EXPECT_TRUE(until([&] { return disk.fileSystem->exists(disk.directory); })) << "the disk came back";
 }
 
+TEST(LinuxFileSystem, AHungDiskSaysNoToTheQuestionForAUsersFile) {
+    Disk disk(40ms);
+    const std::string movie = disk.scratch.write("movie.mp4", "movie");
+    const UserID user{::geteuid()};
+    EXPECT_TRUE(until([&] { return disk.fileSystem->userMayReadAndRemove(user, movie); }));
+    disk.gate->shut();
+    EXPECT_FALSE(disk.fileSystem->userMayReadAndRemove(user, movie));
+}
+
 TEST(LinuxFileSystem, AFileBeingWrittenAnswersEvenOnAHungDisk) {
     Disk disk(40ms);
     ASSERT_TRUE(until(

@@ -1,0 +1,76 @@
+#include "linux/library/LibraryFolder.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <utility>
+
+#include "linux/storage/BeneathDirectory.h"
+
+namespace lumacast {
+
+namespace {
+
+constexpr mode_t kMode = 0755;  // less the umask
+
+int syncFolder(int folder) {
+    // Some file systems have nothing to sync in a folder and say so.
+    return ::fsync(folder) == 0 || errno == EINVAL ? 0 : errno;
+}
+
+FileDescriptor readable(int folder) {
+    return FileDescriptor(::openat(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+}
+
+}  // namespace
+
+LibraryFolder::LibraryFolder(LibraryFolder&& other) noexcept
+    : path_(std::move(other.path_)), folder_(std::move(other.folder_)), made_(std::exchange(other.made_, {})) {}
+
+LibraryFolder::~LibraryFolder() {
+    for (auto made = made_.rbegin(); made != made_.rend(); ++made)
+        ::unlinkat(made->parent.get(), made->name.c_str(), AT_REMOVEDIR);
+}
+
+std::variant<FileDescriptor, int> LibraryFolder::openOrMake(const std::string& path, uid_t user, bool isOurs) {
+    const auto open = [&] { return isOurs ? openTrusted(path, user) : openFolder(path, user); };
+    auto opened = open();
+    const int* missing = std::get_if<int>(&opened);
+    if (!missing || *missing != ENOENT) return opened;
+
+    auto place = resolveForUser(path, user);
+    if (const int* error = std::get_if<int>(&place)) return *error;
+    auto& [parent, name] = std::get<ResolvedName>(place);
+    if (::mkdirat(parent.get(), name.c_str(), kMode) == 0) {
+        made_.push_back({std::move(parent), std::move(name)});
+    } else if (errno != EEXIST) {  // two saves may make it at once
+        return errno;
+    }
+    return open();
+}
+
+std::variant<LibraryFolder, int> LibraryFolder::open(const std::string& videos, uid_t user) {
+    LibraryFolder result;
+    result.path_ = withSingleSlashes(videos + "/Lumacast");
+    const auto around = result.openOrMake(withSingleSlashes(videos), user, false);
+    if (const int* error = std::get_if<int>(&around)) return *error;
+    const auto inside = result.openOrMake(result.path_, user, true);
+    if (const int* error = std::get_if<int>(&inside)) return *error;
+    result.folder_ = readable(std::get<FileDescriptor>(inside).get());
+    if (!result.folder_) return errno;
+    return result;
+}
+
+int LibraryFolder::sync() const {
+    if (const int error = syncFolder(folder_.get()); error != 0) return error;
+    for (const Made& made : made_) {
+        const FileDescriptor parent = readable(made.parent.get());
+        if (!parent) return errno;
+        if (const int error = syncFolder(parent.get()); error != 0) return error;
+    }
+    return 0;
+}
+
+}  // namespace lumacast
