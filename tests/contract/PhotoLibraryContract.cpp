@@ -1,6 +1,4 @@
 #include <gtest/gtest.h>
-#include <signal.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 
 #include <functional>
@@ -79,26 +77,6 @@ std::string bytesOf(std::size_t size, char seed) {
     for (std::size_t i = 0; i < size; ++i) bytes[i] = static_cast<char>(seed + static_cast<char>(i * 31 / 7));
     return bytes;
 }
-
-/// The most that a file of this process may grow to, for as long as this lives.
-class SmallFilesOnly final {
-public:
-    explicit SmallFilesOnly(rlim_t bytes) : before_(::signal(SIGXFSZ, SIG_IGN)) {
-        EXPECT_EQ(::getrlimit(RLIMIT_FSIZE, &limit_), 0);
-        const rlimit small{bytes, limit_.rlim_max};
-        EXPECT_EQ(::setrlimit(RLIMIT_FSIZE, &small), 0);
-    }
-    ~SmallFilesOnly() {
-        ::setrlimit(RLIMIT_FSIZE, &limit_);
-        ::signal(SIGXFSZ, before_);
-    }
-    SmallFilesOnly(const SmallFilesOnly&) = delete;
-    SmallFilesOnly& operator=(const SmallFilesOnly&) = delete;
-
-private:
-    void (*before_)(int);
-    rlimit limit_{};
-};
 
 struct Way {
     Unseen unseen;

@@ -1,14 +1,13 @@
 #pragma once
+#include <gtest/gtest.h>
 #include <sched.h>
+#include <signal.h>
 #include <sys/mount.h>
+#include <sys/resource.h>
 
-#include <cerrno>
-#include <cstring>
 #include <functional>
 #include <string>
 #include <thread>
-
-#include <gtest/gtest.h>
 
 namespace lumacast {
 
@@ -26,5 +25,25 @@ inline bool withSmallDisk(const std::string& directory, const std::string& size,
     }).join();
     return mounted;
 }
+
+/// The most that a file of this process may grow to, for as long as this lives.
+class SmallFilesOnly final {
+public:
+    explicit SmallFilesOnly(rlim_t bytes) : before_(::signal(SIGXFSZ, SIG_IGN)) {
+        EXPECT_EQ(::getrlimit(RLIMIT_FSIZE, &limit_), 0);
+        const rlimit small{bytes, limit_.rlim_max};
+        EXPECT_EQ(::setrlimit(RLIMIT_FSIZE, &small), 0);
+    }
+    ~SmallFilesOnly() {
+        ::setrlimit(RLIMIT_FSIZE, &limit_);
+        ::signal(SIGXFSZ, before_);
+    }
+    SmallFilesOnly(const SmallFilesOnly&) = delete;
+    SmallFilesOnly& operator=(const SmallFilesOnly&) = delete;
+
+private:
+    void (*before_)(int);
+    rlimit limit_{};
+};
 
 }  // namespace lumacast

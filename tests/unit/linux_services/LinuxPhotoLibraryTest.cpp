@@ -247,6 +247,23 @@ TEST(CopyBytes, AMovieThatGrewIsCopiedWhole) {
     }
 }
 
+TEST(CopyBytes, ADiskThatBecomesFullMeanwhileIsAnError) {
+    const ScratchDirectory scratch;
+    const std::string movie = scratch.write("movie", std::string(1'000'000, 'm'));
+    const std::string small = scratch.makeDirectory("small");
+    // As if the movie had been short when the room was asked for.
+    const auto copy = [&](CopyBy copyBy) {
+        const FileDescriptor from(::open(movie.c_str(), O_RDONLY | O_CLOEXEC));
+        const FileDescriptor to(::open((small + "/copy").c_str(), O_RDWR | O_CREAT | O_TRUNC | O_CLOEXEC, 0600));
+        return copyBytes(from.get(), to.get(), 1, copyBy);
+    };
+    for (const CopyBy copyBy : {CopyBy::Kernel, CopyBy::Hand}) {
+        if (withSmallDisk(small, "300k", [&] { EXPECT_EQ(copy(copyBy), ENOSPC); })) continue;
+        const SmallFilesOnly limit(300'000);
+        EXPECT_EQ(copy(copyBy), EFBIG);
+    }
+}
+
 TEST(CopyBytes, AFileWhoseSizeIsNotKnownBeforehandIsReadToItsEnd) {
     const ScratchDirectory scratch;
     const FileDescriptor from(::open("/proc/self/status", O_RDONLY | O_CLOEXEC));
