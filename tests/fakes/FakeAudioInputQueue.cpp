@@ -174,10 +174,10 @@ std::int32_t FakeAudioInputQueue::dispose() {
     return AudioStatus::kSuccess;
 }
 
-void FakeAudioInputQueue::handOverLocked(AudioQueueBufferRef buffer, const AudioTimeStamp& start, std::uint32_t packets,
+Task FakeAudioInputQueue::handOverLocked(AudioQueueBufferRef buffer, const AudioTimeStamp& start, std::uint32_t packets,
                                          std::vector<AudioPacketDescription> descriptions) {
     handedOver_.push_back(buffer.get());
-    lane_->async([weak = weak_from_this(), run = run_, buffer = std::move(buffer), start, packets,
+    return [weak = weak_from_this(), run = run_, buffer = std::move(buffer), start, packets,
                   descriptions = std::move(descriptions)] {
         const auto self = weak.lock();
         if (!self) return;
@@ -188,7 +188,7 @@ void FakeAudioInputQueue::handOverLocked(AudioQueueBufferRef buffer, const Audio
             callback = self->callback_;
         }
         if (callback) callback(buffer, start, packets, descriptions);
-    });
+    };
 }
 
 void FakeAudioInputQueue::hear(std::uint32_t frames) {
@@ -199,6 +199,12 @@ void FakeAudioInputQueue::hear(std::uint32_t frames) {
         const auto playing = settings_->playing.find(pid_);
         if (playing != settings_->playing.end()) byte = playing->second;
     }
+    std::vector<Task> tasks;
+    fill(frames, byte, tasks);
+    for (Task& task : tasks) lane_->async(std::move(task));
+}
+
+void FakeAudioInputQueue::fill(std::uint32_t frames, std::uint8_t byte, std::vector<Task>& tasks) {
     const std::lock_guard lock(mutex_);
     if (!running_ || !clock_ || !clock_->isRunning()) return;
     const std::int64_t now = clock_->now().value;
@@ -220,23 +226,27 @@ void FakeAudioInputQueue::hear(std::uint32_t frames) {
         start.flags = AudioTimeStamp::kSampleTimeValid | AudioTimeStamp::kHostTimeValid | AudioTimeStamp::kRateScalarValid;
         AudioQueueBufferRef filled = std::move(enqueued_.front());
         enqueued_.pop_front();
-        handOverLocked(std::move(filled), start, inBuffer, {});
+        tasks.push_back(handOverLocked(std::move(filled), start, inBuffer, {}));
     }
 }
 
 bool FakeAudioInputQueue::deliver(const Data& bytes, std::uint64_t hostTime, std::optional<std::uint32_t> packets,
                                   std::vector<AudioPacketDescription> descriptions) {
-    const std::lock_guard lock(mutex_);
-    if (!running_ || enqueued_.empty()) return false;
-    AudioQueueBufferRef buffer = std::move(enqueued_.front());
-    enqueued_.pop_front();
-    buffer->byteSize = static_cast<std::uint32_t>(std::min(bytes.size(), buffer->bytes.size()));
-    std::copy_n(bytes.begin(), buffer->byteSize, buffer->bytes.begin());
-    AudioTimeStamp start;
-    start.hostTime = hostTime;
-    start.flags = AudioTimeStamp::kHostTimeValid;
-    const std::uint32_t count = packets.value_or(buffer->byteSize / format_.bytesPerFrame);
-    handOverLocked(std::move(buffer), start, count, std::move(descriptions));
+    Task task;
+    {
+        const std::lock_guard lock(mutex_);
+        if (!running_ || enqueued_.empty()) return false;
+        AudioQueueBufferRef buffer = std::move(enqueued_.front());
+        enqueued_.pop_front();
+        buffer->byteSize = static_cast<std::uint32_t>(std::min(bytes.size(), buffer->bytes.size()));
+        std::copy_n(bytes.begin(), buffer->byteSize, buffer->bytes.begin());
+        AudioTimeStamp start;
+        start.hostTime = hostTime;
+        start.flags = AudioTimeStamp::kHostTimeValid;
+        const std::uint32_t count = packets.value_or(buffer->byteSize / format_.bytesPerFrame);
+        task = handOverLocked(std::move(buffer), start, count, std::move(descriptions));
+    }
+    lane_->async(std::move(task));
     return true;
 }
 

@@ -67,8 +67,11 @@ public:
 
 private:
     std::int32_t checkLocked(const char* call) const;
-    void handOverLocked(AudioQueueBufferRef buffer, const AudioTimeStamp& start, std::uint32_t packets,
-                        std::vector<AudioPacketDescription> descriptions);
+    /// What hands the buffer over, for the queue's lane: submitted when the lock has been released.
+    [[nodiscard]] Task handOverLocked(AudioQueueBufferRef buffer, const AudioTimeStamp& start, std::uint32_t packets,
+                                      std::vector<AudioPacketDescription> descriptions);
+    /// Fills buffers; what hands them over is for the lane.
+    void fill(std::uint32_t frames, std::uint8_t byte, std::vector<Task>& tasks);
     void tellRunning();
 
     const std::shared_ptr<FakeSoundSettings> settings_;

@@ -26,9 +26,15 @@ public:
         queue_ = std::move(queue);
     }
     void deliver(SampleRef sample) {
-        const std::lock_guard lock(mutex_);
-        if (!queue_) return;
-        queue_->async([self = shared_from_this(), delegate = delegate_, sample = std::move(sample)] {
+        std::weak_ptr<CaptureOutputDelegate> whom;
+        std::shared_ptr<SerialQueue> where;
+        {
+            const std::lock_guard lock(mutex_);
+            whom = delegate_;
+            where = queue_;
+        }
+        if (!where) return;
+        where->async([self = shared_from_this(), delegate = std::move(whom), sample = std::move(sample)] {
             if (const auto told = delegate.lock()) told->captureOutputDidOutputSampleBuffer(self, sample);
         });
     }
@@ -124,12 +130,16 @@ public:
 
 private:
     void setRunning(bool running) {
-        const std::lock_guard lock(mutex_);
-        if (running_ == running) return;
-        running_ = running;
-        for (const auto& [path, observer] : observers_) {
-            if (path != kRunning) continue;
-            lane_->async([observer = observer] {
+        std::vector<std::weak_ptr<CaptureSessionObserver>> whom;
+        {
+            const std::lock_guard lock(mutex_);
+            if (running_ == running) return;
+            running_ = running;
+            for (const auto& [path, observer] : observers_)
+                if (path == kRunning) whom.push_back(observer);
+        }
+        for (const auto& observer : whom) {
+            lane_->async([observer] {
                 if (const auto told = observer.lock()) told->observeValueForKeyPath(kRunning);
             });
         }

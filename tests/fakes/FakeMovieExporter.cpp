@@ -105,13 +105,16 @@ struct Export {
 
 class FakeMovieExporter final : public MovieExporter {
 public:
-    FakeMovieExporter(Scheduler& scheduler, std::shared_ptr<Export> job)
-        : scheduler_(scheduler), export_(std::move(job)) {}
+    FakeMovieExporter(FakeMovieExporters& owner, Scheduler& scheduler, std::shared_ptr<Export> job)
+        : owner_(owner), scheduler_(scheduler), export_(std::move(job)) {}
     ~FakeMovieExporter() override { export_->cancelled = true; }
 
     URL outputURL() const override { return export_->outputURL; }
     void setTimeRange(MediaTimeRange range) override { export_->range = range; }
-    void setAudioMix(AudioMix mix) override { export_->mix = std::move(mix); }
+    void setAudioMix(AudioMix mix) override {
+        owner_.noteMix(mix);
+        export_->mix = std::move(mix);
+    }
     void cancel() override { export_->cancelled = true; }
     double progress() const override { return export_->progress; }
     void exportAsynchronously(Completion completion) override {
@@ -124,6 +127,7 @@ public:
     }
 
 private:
+    FakeMovieExporters& owner_;
     Scheduler& scheduler_;
     const std::shared_ptr<Export> export_;
 };
@@ -145,7 +149,7 @@ std::shared_ptr<MovieExporter> FakeMovieExporters::makeExporter(std::shared_ptr<
         const std::lock_guard lock(mutex_);
         presets_.push_back(preset);
     }
-    return std::make_shared<FakeMovieExporter>(scheduler_, std::move(job));
+    return std::make_shared<FakeMovieExporter>(*this, scheduler_, std::move(job));
 }
 
 }  // namespace lumacast

@@ -33,7 +33,19 @@ public:
         return presets_;
     }
 
+    /// What the last export that was given a mix is to mix.
+    std::optional<AudioMix> lastMix() const {
+        const std::lock_guard lock(mutex_);
+        return lastMix_;
+    }
+    /// For the exporters.
+    void noteMix(const AudioMix& mix) {
+        const std::lock_guard lock(mutex_);
+        lastMix_ = mix;
+    }
+
 private:
+    std::optional<AudioMix> lastMix_;
     std::function<void(const URL&)> whenOpened_;
     mutable std::mutex mutex_;
     std::vector<ExportPreset> presets_;
