@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <utility>
 
+#include "linux/media/EncodingQueue.h"
 #include "linux/media/LinuxMovieExport.h"
 #include "linux/media/MovieSource.h"
 
@@ -14,15 +15,23 @@ class LinuxMovieAsset final : public MovieAsset {
 public:
     explicit LinuxMovieAsset(const URL& url) : path_(url.path()) {
         auto opened = media::MovieSource::open(path_);
-        if (auto* const source = std::get_if<0>(&opened)) nanoseconds_ = (*source)->duration();
+        if (auto* const source = std::get_if<0>(&opened)) read(**source);
     }
     MediaTime duration() const override { return MediaTime::make(nanoseconds_, 1'000'000'000); }
-    std::vector<std::int32_t> audioTracks() const override { return {}; }
+    std::vector<std::int32_t> audioTracks() const override { return audioTracks_; }
     const std::string& path() const { return path_; }
 
 private:
+    void read(const media::MovieSource& source) {
+        nanoseconds_ = source.duration();
+        for (const auto& track : source.tracks()) {
+            if (!track.isVideo) audioTracks_.push_back(track.id);
+        }
+    }
+
     const std::string path_;
     std::int64_t nanoseconds_ = 0;
+    std::vector<std::int32_t> audioTracks_;
 };
 
 }  // namespace
@@ -30,41 +39,57 @@ private:
 /// The role's face of an export.
 class LinuxMovieExporter final : public MovieExporter {
 public:
-    LinuxMovieExporter(std::shared_ptr<MovieAsset> movie, URL outputURL, LinuxMovieExporters& exporters)
-        : movie_(std::move(movie)), outputURL_(std::move(outputURL)), exporters_(exporters) {}
-    ~LinuxMovieExporter() override {
-        if (job_) job_->cancel();
+    LinuxMovieExporter(std::shared_ptr<MovieAsset> movie, ExportPreset preset, URL outputURL,
+                       LinuxMovieExporters& exporters)
+        : movie_(std::move(movie)), outputURL_(std::move(outputURL)), exporters_(exporters) {
+        plan_.preset = preset;
+        plan_.destination = outputURL_.path();
     }
+    ~LinuxMovieExporter() override { cancel(); }
 
     URL outputURL() const override { return outputURL_; }
-    void setTimeRange(MediaTimeRange range) override { range_ = range; }
-    void setAudioMix(AudioMix) override {}
+    void setTimeRange(MediaTimeRange range) override { plan_.range = range; }
+    void setAudioMix(AudioMix mix) override { plan_.mix = std::move(mix); }
     void cancel() override {
-        if (job_) job_->cancel();
+        if (const auto running = job()) exporters_.cancel(running);
     }
-    double progress() const override { return 0; }
+    double progress() const override {
+        const auto running = job();
+        return running ? running->progress() : 0;
+    }
     void exportAsynchronously(Completion completion) override {
         const auto* const movie = dynamic_cast<const LinuxMovieAsset*>(movie_.get());
         std::optional<Error> refusal;
-        if (job_) refusal = media::systemError(EALREADY);
+        if (movie) plan_.source = movie->path();
         if (!movie) refusal = media::systemError(EINVAL);
-        const auto job = std::make_shared<LinuxMovieExport>(
-            media::ExportPlan{movie ? movie->path() : "", outputURL_.path(), range_}, std::move(completion));
-        if (!job_) job_ = job;
-        exporters_.run(job, std::move(refusal));
+        const auto made = std::make_shared<LinuxMovieExport>(plan_, std::move(completion), exporters_.lane());
+        {
+            const std::lock_guard lock(mutex_);
+            if (job_) refusal = media::systemError(EALREADY);
+            else job_ = made;
+        }
+        exporters_.run(made, std::move(refusal));
     }
 
 private:
+    std::shared_ptr<LinuxMovieExport> job() const {
+        const std::lock_guard lock(mutex_);
+        return job_;
+    }
+
     const std::shared_ptr<MovieAsset> movie_;
     const URL outputURL_;
     LinuxMovieExporters& exporters_;
-    std::optional<MediaTimeRange> range_;
-    std::shared_ptr<LinuxMovieExport> job_;
+    media::ExportPlan plan_;
+    mutable std::mutex mutex_;
+    std::shared_ptr<LinuxMovieExport> job_;  ///< the first one
 };
 
 LinuxMovieExporters::LinuxMovieExporters() : LinuxMovieExporters(std::make_shared<media::PosixMovieFiles>()) {}
 
-LinuxMovieExporters::LinuxMovieExporters(std::shared_ptr<media::MovieFiles> files) : files_(std::move(files)) {
+LinuxMovieExporters::LinuxMovieExporters(std::shared_ptr<media::MovieFiles> files, media::EncodingPriority priority)
+    : files_(std::move(files)) {
+    encodings_ = std::make_unique<media::EncodingQueue>(files_, priority);
     av_log_set_level(AV_LOG_QUIET);  // the library talks to the standard error output by itself
 }
 
@@ -76,22 +101,29 @@ std::shared_ptr<MovieAsset> LinuxMovieExporters::openMovie(const URL& url) {
     return std::make_shared<LinuxMovieAsset>(url);
 }
 
-std::shared_ptr<MovieExporter> LinuxMovieExporters::makeExporter(std::shared_ptr<MovieAsset> movie, ExportPreset,
+std::shared_ptr<MovieExporter> LinuxMovieExporters::makeExporter(std::shared_ptr<MovieAsset> movie, ExportPreset preset,
                                                                  const URL& outputURL) {
-    return std::make_shared<LinuxMovieExporter>(std::move(movie), outputURL, *this);
+    return std::make_shared<LinuxMovieExporter>(std::move(movie), preset, outputURL, *this);
 }
 
 void LinuxMovieExporters::run(const std::shared_ptr<LinuxMovieExport>& job, std::optional<Error> refusal) {
     const std::lock_guard lock(mutex_);
     // Joining a thread that has ended takes no time.
     std::erase_if(running_, [](const auto& other) { return other->hasEnded(); });
+    if (!refusal && job->isEncoding()) return encodings_->add(job);
     if (!refusal) {
         running_.push_back(job);
         if (job->start(files_)) return;
         running_.pop_back();
         refusal = media::systemError(EAGAIN);
     }
-    lane_.post([job, refusal = std::move(*refusal)] { job->refuse(refusal); });
+    job->tellLater(ExportStatus::Failed, std::move(refusal));
+}
+
+/// One that waits for its turn ends at once; one that runs sees it soon.
+void LinuxMovieExporters::cancel(const std::shared_ptr<LinuxMovieExport>& job) {
+    job->cancel();
+    if (encodings_->remove(job)) job->tellLater(ExportStatus::Cancelled, media::systemError(ECANCELED));
 }
 
 }  // namespace lumacast

@@ -41,7 +41,7 @@ std::string nameOf(const AVStream& stream) {
     return entry ? entry->value : "";
 }
 
-mp4::VideoTrackDescription describeVideo(const AVStream& stream) {
+mp4::VideoTrackDescription describeVideoStream(const AVStream& stream) {
     const AVCodecParameters& parameters = *stream.codecpar;
     mp4::VideoTrackDescription description;
     description.width = static_cast<std::uint16_t>(parameters.width);
@@ -71,7 +71,7 @@ mp4::VideoTrackDescription describeVideo(const AVStream& stream) {
     return description;
 }
 
-mp4::AudioTrackDescription describeAudio(const AVStream& stream) {
+mp4::AudioTrackDescription describeAudioStream(const AVStream& stream) {
     const AVCodecParameters& parameters = *stream.codecpar;
     mp4::AudioTrackDescription description;
     description.sampleRate = static_cast<std::uint32_t>(parameters.sample_rate);
@@ -109,7 +109,7 @@ std::variant<std::unique_ptr<MovieSource>, Error> MovieSource::open(const std::s
         if (stream.time_base.num != 1 || stream.time_base.den <= 0) return systemError(ENOTSUP);
         source->trackOfStream_[i] = source->tracks_.size();
         source->streamOfTrack_.push_back(static_cast<int>(i));
-        source->tracks_.push_back({type == AVMEDIA_TYPE_VIDEO, stream.time_base.den});
+        source->tracks_.push_back({type == AVMEDIA_TYPE_VIDEO, stream.time_base.den, stream.id});
     }
     if (source->tracks_.empty()) return systemError(ENODATA);
     // The movie of a recording that was killed says no duration: it takes a look at the samples.
@@ -122,15 +122,33 @@ std::int64_t MovieSource::duration() const {
 }
 
 bool MovieSource::declareTracks(mp4::MovieBoxWriter& movie, std::vector<mp4::TrackId>& ids) const {
-    for (const int index : streamOfTrack_) {
-        const AVStream& stream = *file_->streams[index];
-        const bool isVideo = stream.codecpar->codec_type == AVMEDIA_TYPE_VIDEO;
-        const auto id =
-            isVideo ? movie.addVideoTrack(describeVideo(stream)) : movie.addAudioTrack(describeAudio(stream));
+    for (std::size_t track = 0; track < tracks_.size(); ++track) {
+        const auto id = tracks_[track].isVideo ? movie.addVideoTrack(describeVideo(track))
+                                               : movie.addAudioTrack(describeAudio(track));
         if (!id) return false;
         ids.push_back(*id);
     }
     return true;
+}
+
+mp4::VideoTrackDescription MovieSource::describeVideo(std::size_t track) const {
+    return describeVideoStream(streamOf(track));
+}
+
+mp4::AudioTrackDescription MovieSource::describeAudio(std::size_t track) const {
+    return describeAudioStream(streamOf(track));
+}
+
+double MovieSource::rateOf(std::size_t track) const {
+    const AVRational rate = streamOf(track).avg_frame_rate;
+    return rate.num > 0 && rate.den > 0 ? av_q2d(rate) : 0;
+}
+
+void MovieSource::readOnly(std::size_t track) {
+    for (unsigned i = 0; i < file_->nb_streams; ++i) {
+        const bool isWanted = static_cast<int>(i) == streamOfTrack_[track];
+        file_->streams[i]->discard = isWanted ? AVDISCARD_DEFAULT : AVDISCARD_ALL;
+    }
 }
 
 const AVStream* MovieSource::videoStream() const {

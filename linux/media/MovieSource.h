@@ -25,7 +25,8 @@ public:
     };
     struct Track {
         bool isVideo = false;
-        int timescale = 0;  ///< ticks per second
+        int timescale = 0;    ///< ticks per second
+        std::int32_t id = 0;  ///< in the file
     };
 
     /// An error for what is no movie, and for tracks that can't be copied: other codecs than ours.
@@ -38,6 +39,16 @@ public:
     /// Declares the tracks, in order, to a movie that is to hold copies of them.
     [[nodiscard]] bool declareTracks(mp4::MovieBoxWriter& movie, std::vector<mp4::TrackId>& ids) const;
 
+    /// What a track is declared with, as it is in this movie.
+    mp4::VideoTrackDescription describeVideo(std::size_t track) const;
+    mp4::AudioTrackDescription describeAudio(std::size_t track) const;
+    /// For a decoder. Valid while this lives.
+    const AVCodecParameters& codecOf(std::size_t track) const { return *streamOf(track).codecpar; }
+    /// Pictures a second on average, as far as the movie knows; 0 when it does not.
+    double rateOf(std::size_t track) const;
+    /// From now on only this track is read; what belongs to others is not even fetched from the disk.
+    void readOnly(std::size_t track);
+
     /// The time of the key frame from which the picture at `nanoseconds` is decoded, ticks of the video track; none
     /// without pictures that early.
     std::optional<std::int64_t> keyFrameBefore(std::int64_t nanoseconds) const;
@@ -49,6 +60,7 @@ public:
 private:
     explicit MovieSource(AvOwned<AVFormatContext> file);
     const AVStream* videoStream() const;
+    const AVStream& streamOf(std::size_t track) const { return *file_->streams[streamOfTrack_[track]]; }
 
     AvOwned<AVFormatContext> file_;
     AvOwned<AVPacket> packet_;

@@ -20,42 +20,6 @@ constexpr std::int64_t kSoundLeadNanoseconds = 70'000'000;
 /// How far tracks may lie apart in a file; past the range by so much nothing of it follows.
 constexpr std::int64_t kInterleavingNanoseconds = 10'000'000'000;
 
-/// Writes at once, and brings the file onto the disk only at the end: a copy that is lost can be made again.
-class ExportSink final : public mp4::BoxSink {
-public:
-    explicit ExportSink(MovieFile& file) : file_(file) {}
-    bool append(std::span<const std::uint8_t> bytes) override {
-        const std::uint64_t offset = std::exchange(end_, end_ + bytes.size());
-        return overwrite(offset, bytes);
-    }
-    bool overwrite(std::uint64_t offset, std::span<const std::uint8_t> bytes) override {
-        if (error_ == 0) error_ = file_.write(offset, bytes);
-        return error_ == 0;
-    }
-    bool sync() override { return error_ == 0; }
-    int error() const { return error_; }
-
-private:
-    MovieFile& file_;
-    std::uint64_t end_ = 0;
-    int error_ = 0;
-};
-
-/// A range in nanoseconds.
-struct Span {
-    std::int64_t start = 0;
-    std::int64_t end = 0;
-};
-
-std::variant<Span, Error> spanOf(const ExportPlan& plan, std::int64_t movieDuration) {
-    if (!plan.range) return Span{0, movieDuration};
-    const auto start = nanosecondsOf(plan.range->start);
-    const auto end = nanosecondsOf(add(plan.range->start, plan.range->duration));
-    const bool isInside = start && end && *start >= 0 && *end > *start && *end <= movieDuration;
-    if (!isInside) return systemError(EINVAL);
-    return Span{*start, *end};
-}
-
 std::int64_t nanosecondsOfTicks(std::int64_t ticks, int timescale) {
     return av_rescale(ticks, 1'000'000'000, timescale);
 }
@@ -63,8 +27,8 @@ std::int64_t nanosecondsOfTicks(std::int64_t ticks, int timescale) {
 /// One export while it runs.
 class Copy final {
 public:
-    Copy(MovieSource& source, ExportSink& sink, Span span, const std::atomic<bool>& cancelled)
-        : source_(source), sink_(sink), span_(span), cancelled_(cancelled), movie_(sink, options(span)) {}
+    Copy(MovieSource& source, ExportSink& sink, ExportSpan span, ExportState& state)
+        : source_(source), sink_(sink), span_(span), state_(state), movie_(sink, options(span)) {}
 
     ExportResult run() {
         if (!source_.declareTracks(movie_, ids_)) return failed(systemError(ENOTSUP));
@@ -73,13 +37,14 @@ public:
         if (const auto error = source_.seek(span_.start - kSoundLeadNanoseconds)) return failed(*error);
         std::vector<bool> passed(source_.tracks().size());
         for (;;) {
-            if (cancelled_.load(std::memory_order_relaxed)) return {ExportStatus::Cancelled, std::nullopt};
+            if (state_.isCancelled()) return {ExportStatus::Cancelled, systemError(ECANCELED)};
             auto next = source_.read();
             if (auto* const error = std::get_if<Error>(&next)) return failed(*error);
             const auto& sample = std::get<0>(next);
             if (!sample) break;
             const int timescale = source_.tracks()[sample->track].timescale;
             const std::int64_t begin = nanosecondsOfTicks(sample->stamp, timescale);
+            state_.advance(static_cast<double>(begin - span_.start) / static_cast<double>(span_.end - span_.start));
             if (begin >= span_.end + kInterleavingNanoseconds) break;
             if (begin >= span_.end) {
                 passed[sample->track] = true;
@@ -93,7 +58,7 @@ public:
     }
 
 private:
-    static mp4::MovieOptions options(const Span& span) {
+    static mp4::MovieOptions options(const ExportSpan& span) {
         mp4::MovieOptions options;
         options.presentationStart = span.start;
         return options;
@@ -129,8 +94,8 @@ private:
 
     MovieSource& source_;
     ExportSink& sink_;
-    const Span span_;
-    const std::atomic<bool>& cancelled_;
+    const ExportSpan span_;
+    ExportState& state_;
     mp4::MovieBoxWriter movie_;
     std::vector<mp4::TrackId> ids_;
     std::optional<std::int64_t> keyFrame_;
@@ -139,23 +104,8 @@ private:
 
 }  // namespace
 
-ExportResult exportMovie(const ExportPlan& plan, MovieFiles& files, const std::atomic<bool>& cancelled) {
-    auto opened = MovieSource::open(plan.source);
-    if (auto* const error = std::get_if<Error>(&opened)) return {ExportStatus::Failed, *error};
-    MovieSource& source = *std::get<0>(opened);
-    const auto span = spanOf(plan, source.duration());
-    if (auto* const error = std::get_if<Error>(&span)) return {ExportStatus::Failed, *error};
-
-    auto made = files.create(plan.destination);
-    if (auto* const error = std::get_if<int>(&made)) return {ExportStatus::Failed, systemError(*error)};
-    MovieFile& file = *std::get<0>(made);
-    ExportSink sink(file);
-    ExportResult result = Copy(source, sink, std::get<Span>(span), cancelled).run();
-    if (result.status == ExportStatus::Completed) {
-        if (const int error = file.sync(); error != 0) result = {ExportStatus::Failed, systemError(error)};
-    }
-    if (result.status != ExportStatus::Completed) file.removeName(plan.destination);
-    return result;
+ExportResult exportPassThrough(MovieSource& source, ExportSink& sink, ExportSpan span, ExportState& state) {
+    return Copy(source, sink, span, state).run();
 }
 
 }  // namespace lumacast::media

@@ -20,10 +20,30 @@ bool SoundTimeline::add(const AudioFormat& format, std::span<const std::uint8_t>
     if (format_ != format && !adopt(format)) return false;
     incoming_.clear();
     readPcm(format, bytes, frameCount, incoming_);
+    layOut(nanoseconds);
+    return true;
+}
+
+bool SoundTimeline::add(const StereoSound& sound, int rate, std::int64_t nanoseconds) {
+    AudioFormat format;
+    format.sampleRate = rate;
+    format.formatID = kAudioFormatLinearPCM;
+    format.formatFlags = AudioFormat::kFlagFloat;
+    format.bytesPerPacket = format.bytesPerFrame = 8;
+    format.framesPerPacket = 1;
+    format.channelsPerFrame = 2;
+    format.bitsPerChannel = 32;
+    if (format_ != format && !adopt(format)) return false;
+    incoming_ = sound;
+    layOut(nanoseconds);
+    return true;
+}
+
+/// The buffer at hand.
+void SoundTimeline::layOut(std::int64_t nanoseconds) {
     place(av_rescale_rnd(nanoseconds, sampleRate_, 1'000'000'000, AV_ROUND_NEAR_INF));
     if (incoming_.frames() > 0) resample(incoming_);
     take_();
-    return true;
 }
 
 void SoundTimeline::finish() {

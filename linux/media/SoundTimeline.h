@@ -26,6 +26,8 @@ public:
     /// Adds a buffer that begins at `nanoseconds` after the movie's zero. False for a format that can't be read.
     bool add(const AudioFormat& format, std::span<const std::uint8_t> bytes, std::size_t frameCount,
              std::int64_t nanoseconds);
+    /// The same for sound that has been read already, of so many frames a second.
+    bool add(const StereoSound& sound, int rate, std::int64_t nanoseconds);
     /// Adds what the resampler still holds, after the last buffer.
     void finish();
 
@@ -36,6 +38,7 @@ public:
 
 private:
     bool adopt(const AudioFormat& format);
+    void layOut(std::int64_t nanoseconds);
     /// Frames after zero at which the next sound would stand, what the resampler holds included.
     std::int64_t end() const;
     void emptyResampler();

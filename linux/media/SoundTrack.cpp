@@ -46,6 +46,11 @@ std::optional<Error> SoundTrack::add(const SampleBuffer& sample, std::int64_t na
     return error_;
 }
 
+std::optional<Error> SoundTrack::add(const StereoSound& sound, int rate, std::int64_t nanoseconds) {
+    if (!timeline_.add(sound, rate, nanoseconds)) return systemError(ENOTSUP);
+    return error_;
+}
+
 std::optional<Error> SoundTrack::finish() {
     if (!timeline_.origin()) return error_;
     timeline_.finish();

@@ -23,6 +23,8 @@ public:
     /// Adds a buffer that begins at `nanoseconds` after the movie's zero. Buffers of a format that can't be read are
     /// dropped.
     std::optional<Error> add(const SampleBuffer& sample, std::int64_t nanoseconds);
+    /// The same for sound that has been read already, of so many frames a second.
+    std::optional<Error> add(const StereoSound& sound, int rate, std::int64_t nanoseconds);
     std::optional<Error> finish();
 
 private:

@@ -55,7 +55,7 @@ public:
 private:
     OwnDirectory directory_;
     LinuxContainerWriters writers_{clock};
-    LinuxMovieExporters exporters_;
+    LinuxMovieExporters exporters_{std::make_shared<media::PosixMovieFiles>(), media::EncodingPriority::AsUsual};
 };
 
 using Maker = std::function<std::unique_ptr<ExporterWorld>()>;
@@ -76,19 +76,31 @@ struct Outcome {
 
 class MovieExporterContract : public ::testing::TestWithParam<Maker> {
 protected:
+    /// A movie of ten seconds, ten pictures a second, that begins at 3 s of its clock.
     void SetUp() override {
-        // A movie of ten seconds, ten pictures a second, that begins at 3 s of its clock.
         world_->clock.startCaptureClock();
-        auto made = world_->writers().make(movie_, ContainerType::Mpeg4);
+        record(movie_, 0);
+    }
+
+    /// The same with so many sound tracks.
+    void record(const URL& url, int soundTracks) {
+        auto made = world_->writers().make(url, ContainerType::Mpeg4);
         ASSERT_TRUE(std::get_if<0>(&made));
         ContainerWriter& writer = *std::get<0>(made);
         const auto input = writer.addVideoInput(videoSettings(64, 64));
+        std::vector<std::shared_ptr<TrackInput>> sounds;
+        for (int i = 0; i < soundTracks; ++i) sounds.push_back(writer.addAudioInput(audioSettings()));
         ASSERT_TRUE(writer.startWriting());
         writer.startSession(atSeconds(3));
         for (int i = 0; i < 100; ++i) {
             ASSERT_TRUE(eventually([&] { return input->isReadyForMoreMediaData(); }));
             ASSERT_TRUE(input->append(greyPicture(64, 64, static_cast<std::uint64_t>(i),
                                                   static_cast<std::uint8_t>(i + 50), atSeconds(3 + i * 0.1))));
+        }
+        for (const auto& sound : sounds) {
+            const MediaTime length = MediaTime::make(44100, 44100);
+            ASSERT_TRUE(sound->append(SampleBuffer::makeAudio(tapFormat(), Data(2 * 44100), 44100,
+                                                              {length, atSeconds(3), kInvalidMediaTime})));
         }
         writer.endSession(atSeconds(13));
         Happening done;
@@ -224,6 +236,89 @@ TEST_P(MovieExporterContract, AnExporterCanBeLetGoOfInItsCompletion) {
         done.happen();
     });
     EXPECT_TRUE(done.waitFor());
+}
+
+TEST_P(MovieExporterContract, SoundTracksAreToldApart) {
+    EXPECT_TRUE(world_->exporters().openMovie(movie_)->audioTracks().empty());
+    EXPECT_TRUE(world_->exporters().openMovie(world_->url("missing.mp4"))->audioTracks().empty());
+    record(copy_, 2);
+    const auto tracks = world_->exporters().openMovie(copy_)->audioTracks();
+    ASSERT_EQ(tracks.size(), 2u);
+    EXPECT_NE(tracks[0], tracks[1]);
+}
+
+TEST_P(MovieExporterContract, AMixHasOneTrackForAllThatItNamesOrNone) {
+    const URL source = world_->url("sound.mp4");
+    record(source, 2);
+    const auto movie = world_->exporters().openMovie(source);
+    const auto tracks = movie->audioTracks();
+    ASSERT_EQ(tracks.size(), 2u);
+    struct Case {
+        ExportPreset preset;
+        std::optional<AudioMix> mix;
+        std::size_t sounds;
+    };
+    const AudioMix both{{{tracks[0]}, {tracks[1]}}}, twice{{{tracks[1]}, {tracks[1]}}}, none{}, unknown{{{4711}}};
+    const Case cases[] = {{ExportPreset::HighestQuality, both, 1},    {ExportPreset::HighestQuality, twice, 1},
+                          {ExportPreset::HighestQuality, none, 0},    {ExportPreset::HighestQuality, unknown, 0},
+                          {ExportPreset::HighestQuality, std::nullopt, 2}, {ExportPreset::PassThrough, none, 2}};
+    int number = 0;
+    for (const Case& each : cases) {
+        SCOPED_TRACE(number);
+        const URL output = world_->url("mix" + std::to_string(number++) + ".mp4");
+        const auto made = world_->exporters().makeExporter(movie, each.preset, output);
+        if (each.mix) made->setAudioMix(*each.mix);
+        Outcome outcome;
+        made->exportAsynchronously(outcome.completion());
+        ASSERT_TRUE(outcome.done.waitFor());
+        EXPECT_EQ(outcome.status, static_cast<int>(ExportStatus::Completed));
+        EXPECT_EQ(world_->exporters().openMovie(output)->audioTracks().size(), each.sounds);
+        EXPECT_NEAR(durationOf(output), 10.0, 1e-5);
+    }
+    EXPECT_EQ(world_->exporters().openMovie(source)->audioTracks(), tracks);
+}
+
+TEST_P(MovieExporterContract, CancellingBeforeTheBeginningAndAfterTheEndDoesNothing) {
+    const auto made = exporter(copy_);
+    made->cancel();
+    EXPECT_EQ(made->progress(), 0);
+    Outcome outcome;
+    made->exportAsynchronously(outcome.completion());
+    ASSERT_TRUE(outcome.done.waitFor());
+    EXPECT_EQ(outcome.status, static_cast<int>(ExportStatus::Completed));
+    EXPECT_EQ(made->progress(), 1);
+    made->cancel();
+    EXPECT_EQ(made->progress(), 1);
+    EXPECT_TRUE(world_->fileExists(copy_));
+    EXPECT_EQ(outcome.done.count(), 1);
+}
+
+TEST_P(MovieExporterContract, ACancelledExportEndsOnceAndLeavesNoFile) {
+    for (int round = 0; round < 10; ++round) {
+        const URL output = world_->url("copy" + std::to_string(round) + ".mp4");
+        const auto made = world_->exporters().makeExporter(world_->exporters().openMovie(movie_),
+                                                           ExportPreset::HighestQuality, output);
+        Outcome outcome;
+        made->exportAsynchronously(outcome.completion());
+        made->cancel();
+        ASSERT_TRUE(outcome.done.waitFor());
+        const bool completed = outcome.status == static_cast<int>(ExportStatus::Completed);
+        EXPECT_TRUE(completed || outcome.status == static_cast<int>(ExportStatus::Cancelled));
+        EXPECT_EQ(outcome.hasError, !completed);
+        EXPECT_EQ(world_->fileExists(output), completed);
+    }
+}
+
+TEST_P(MovieExporterContract, ASecondExportOfAnExporterFails) {
+    const auto made = exporter(copy_);
+    Outcome first, second;
+    made->exportAsynchronously(first.completion());
+    made->exportAsynchronously(second.completion());
+    ASSERT_TRUE(first.done.waitFor());
+    ASSERT_TRUE(second.done.waitFor());
+    EXPECT_EQ(first.status, static_cast<int>(ExportStatus::Completed));
+    EXPECT_EQ(second.status, static_cast<int>(ExportStatus::Failed));
+    EXPECT_TRUE(world_->fileExists(copy_));
 }
 
 INSTANTIATE_TEST_SUITE_P(Fake, MovieExporterContract,

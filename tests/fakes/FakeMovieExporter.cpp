@@ -59,7 +59,7 @@ struct Export {
     ExportPreset preset = ExportPreset::PassThrough;
     std::optional<MediaTimeRange> range;
     std::optional<AudioMix> mix;
-    std::atomic<bool> cancelled{false};
+    std::atomic<bool> begun{false}, cancelled{false};
     std::atomic<double> progress{0};
 
     /// Whether the track with this number, from 0 on, is in the new movie: of a mix only the first of the mixed ones,
@@ -115,10 +115,14 @@ public:
         owner_.noteMix(mix);
         export_->mix = std::move(mix);
     }
-    void cancel() override { export_->cancelled = true; }
+    void cancel() override {
+        if (export_->begun) export_->cancelled = true;
+    }
     double progress() const override { return export_->progress; }
     void exportAsynchronously(Completion completion) override {
-        scheduler_.globalQueue(QueuePriority::Default).async([job = export_, completion = std::move(completion)] {
+        const bool isSecond = export_->begun.exchange(true);
+        scheduler_.globalQueue(QueuePriority::Default).async([job = export_, isSecond, completion = std::move(completion)] {
+            if (isSecond) return completion(ExportStatus::Failed, fakeSystemError(EALREADY));
             if (job->cancelled) return completion(ExportStatus::Cancelled, fakeSystemError(ECANCELED));
             const std::optional<Error> error = job->run();
             if (!error) job->progress = 1;
@@ -144,7 +148,7 @@ std::shared_ptr<MovieExporter> FakeMovieExporters::makeExporter(std::shared_ptr<
                                                                 ExportPreset preset, const URL& outputURL) {
     const auto* fake = dynamic_cast<const FakeMovieAsset*>(movie.get());
     auto job = std::shared_ptr<Export>(
-        new Export{files_, faults_, fake ? fake->movie() : nullptr, outputURL, preset, {}, {}, {}, {}});
+        new Export{files_, faults_, fake ? fake->movie() : nullptr, outputURL, preset, {}, {}, {}, {}, {}});
     {
         const std::lock_guard lock(mutex_);
         presets_.push_back(preset);
