@@ -75,8 +75,8 @@ void SoundTimeline::place(std::int64_t start) {
     if (!origin_) {
         if (start < 0) dropIncoming(-start);
         if (incoming_.frames() == 0) return;
-        origin_ = placed_ = std::max<std::int64_t>(start, 0);
-        return;
+        origin_ = 0;
+        return fillHole(start);  // the track begins with the movie, with silence
     }
     const std::int64_t jitter = kJitterNanoseconds * sampleRate_ / 1'000'000'000;
     const std::int64_t late = start - end();
