@@ -252,18 +252,23 @@ TEST_F(Mix, OntoAFullDiskLeavesNoFile) {
 
 TEST_F(Mix, OfADamagedMovieFailsAndLeavesNoFile) {
     record(3, [](RecordedMovie& movie) { appendTone(*movie.sound, tapFormat(), 0, 0, 3 * 44100); });
-    const std::string damaged = path("damaged.mp4");
-    std::filesystem::copy_file(movie_->path(), damaged);
-    {
-        std::fstream file(damaged, std::ios::in | std::ios::out | std::ios::binary);
-        file.seekp(static_cast<std::streamoff>(std::filesystem::file_size(damaged) / 3));
-        const std::string garbage(3000, '\xA7');
-        file.write(garbage.data(), static_cast<std::streamsize>(garbage.size()));
+    // Here and there in the media, a few bytes at a time, so that the samples still look like samples.
+    const auto size = std::filesystem::file_size(movie_->path());
+    for (int where = 2; where < 7; ++where) {
+        const std::string damaged = path("damaged" + std::to_string(where) + ".mp4");
+        std::filesystem::copy_file(movie_->path(), damaged);
+        {
+            std::fstream file(damaged, std::ios::in | std::ios::out | std::ios::binary);
+            for (std::uint64_t at = size * static_cast<unsigned>(where) / 10; at < size * 8 / 10; at += 97) {
+                file.seekp(static_cast<std::streamoff>(at));
+                file.put('\xA7');
+            }
+        }
+        const auto made = job("mixed.mp4", damaged);
+        made->run();
+        EXPECT_EQ(made->wait(), ExportStatus::Failed) << where;
+        EXPECT_FALSE(exists());
     }
-    const auto made = job("mixed.mp4", damaged);
-    made->run();
-    EXPECT_EQ(made->wait(), ExportStatus::Failed);
-    EXPECT_FALSE(exists());
 
     const std::string cut = path("cut.mp4");
     std::filesystem::copy_file(movie_->path(), cut);
@@ -280,6 +285,44 @@ TEST_F(Mix, OfADamagedMovieFailsAndLeavesNoFile) {
     EXPECT_TRUE(asset->audioTracks().empty());
 }
 
+TEST_F(Mix, OfADamagedPictureFails) {
+    movie_ = std::make_unique<RecordedMovie>(320, 240);
+    movie_->start();
+    std::uint32_t noise = 1;
+    for (int i = 0; i < 20; ++i) {
+        auto plane = std::make_shared<PaintedPlane>(320, 240, static_cast<std::uint64_t>(i));
+        for (std::int32_t pixel = 0; pixel < 320 * 240; ++pixel) {
+            noise = noise * 1664525 + 1013904223;
+            const auto grey = static_cast<std::uint8_t>(noise >> 24u);
+            plane->setPixel(pixel % 320, pixel / 320, grey, grey, grey);
+        }
+        ASSERT_TRUE(movie_->append(picture(std::move(plane), atNanoseconds(i * kSecond / kRate))));
+    }
+    movie_->clock.advance(std::chrono::seconds(1));
+    ASSERT_EQ(movie_->finish(), ContainerStatus::Completed);
+    const std::string damaged = path("damaged.mp4");
+    std::filesystem::copy_file(movie_->path(), damaged);
+    {
+        std::fstream file(damaged, std::ios::in | std::ios::out | std::ios::binary);
+        const std::string bytes((std::istreambuf_iterator<char>(file)), std::istreambuf_iterator<char>());
+        // Within the first key frame's data, where no length stands.
+        const std::size_t media = bytes.find("mdat", bytes.find("moof"));
+        ASSERT_LT(media, bytes.size() - 4000);
+        file.clear();
+        for (std::size_t at = media + 3000; at < media + 3100; at += 11) {
+            file.seekp(static_cast<std::streamoff>(at));
+            file.put(static_cast<char>(bytes.at(at) ^ 0x5A));
+        }
+    }
+    const auto made = job("mixed.mp4", damaged);
+    made->run();
+    EXPECT_EQ(made->wait(), ExportStatus::Failed);
+    EXPECT_FALSE(exists());
+    const auto whole = job();
+    whole->run();
+    EXPECT_EQ(whole->wait(), ExportStatus::Completed);
+}
+
 TEST_F(Mix, ThatIsCancelledInTheMiddleEndsSoonWithoutAFile) {
     record(30, [](RecordedMovie& movie) { appendTone(*movie.sound, tapFormat(), 0, 0, 44100); }, 640, 480);
     const auto made = job();
@@ -291,12 +334,13 @@ TEST_F(Mix, ThatIsCancelledInTheMiddleEndsSoonWithoutAFile) {
         last = now;
         return now > 0 || made->done.count() > 0;
     }));
+    last = made->exporter->progress();
     const double taken = secondsTaken([&] {
         made->exporter->cancel();
         EXPECT_EQ(made->wait(), ExportStatus::Cancelled) << (made->error ? made->error->code() : 0);
     });
     EXPECT_LT(taken, 5.0);
-    EXPECT_LT(made->exporter->progress(), 1.0);
+    EXPECT_LT(made->exporter->progress(), std::min(last + 0.3, 1.0));
     EXPECT_FALSE(exists());
 }
 
