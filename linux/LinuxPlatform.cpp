@@ -71,6 +71,8 @@ public:
                 .entitlements = [this](ProcessID pid, std::string_view name) { return entitlements_.value(pid, name); },
                 .activated = ActivatedSockets::fromEnvironment(),
                 .serviceUnavailable = endUnreachable}),
+          soundServer_(std::make_shared<sound::PulseConnection>()),
+          audioInputQueues_(soundServer_, clock_, [this](ProcessID pid) { return applicationOf(pid); }),
           movieFiles_(std::make_shared<media::PosixMovieFiles>(environment.root + std::string(kDeviceTemporaryDirectory))),
           writers_(clock_, movieFiles_),
           exporters_(movieFiles_),
@@ -136,8 +138,9 @@ private:
     LinuxBundles bundles_;
     Entitlements entitlements_;
     LinuxIpc ipc_;
-    const std::shared_ptr<media::MovieFiles> movieFiles_;
+    const std::shared_ptr<sound::PulseConnection> soundServer_;
     LinuxAudioInputQueues audioInputQueues_;
+    const std::shared_ptr<media::MovieFiles> movieFiles_;
     LinuxDeviceCapture deviceCapture_;
     LinuxContainerWriters writers_;
     LinuxMovieExporters exporters_;

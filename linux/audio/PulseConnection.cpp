@@ -182,8 +182,27 @@ private:
         ready_ = true;
         delay_ = options_.firstRetry;
         givesUp_->cancel();
+        pa_context_set_subscribe_callback(
+            context_.get(),
+            [](pa_context*, pa_subscription_event_type_t event, std::uint32_t index, void* core) {
+                const auto users = static_cast<Core*>(core)->users_;
+                for (const auto& user : users) user->serverChanged(event, index);
+            },
+            this);
+        interest_ = PA_SUBSCRIPTION_MASK_NULL;
         const auto users = users_;
-        for (const auto& user : users) user->serverCame({*context_, *api_});
+        for (const auto& user : users) introduce(*user);
+    }
+
+    void introduce(PulseUser& user) {
+        const auto interest = static_cast<pa_subscription_mask_t>(interest_ | user.interest());
+        if (interest != interest_) {
+            // Unanswered at worst: then the server goes, too.
+            if (pa_operation* const operation = pa_context_subscribe(context_.get(), interest, nullptr, nullptr))
+                pa_operation_unref(operation);
+            interest_ = interest;
+        }
+        user.serverCame({*context_, *api_});
     }
 
     /// Lets go of the server, or of the attempt, and tries again later.
@@ -202,7 +221,7 @@ private:
 
     void addUser(const std::shared_ptr<PulseUser>& user) {
         users_.push_back(user);
-        if (ready_) user->serverCame({*context_, *api_});
+        if (ready_) introduce(*user);
     }
 
     void removeUser(const std::shared_ptr<PulseUser>& user) {
@@ -226,6 +245,7 @@ private:
     pa_mainloop_api* api_ = nullptr;
     ContextHandle context_;
     bool ready_ = false, lost_ = false;
+    pa_subscription_mask_t interest_ = PA_SUBSCRIPTION_MASK_NULL;
     std::vector<std::shared_ptr<PulseUser>> users_;
     PulseTimer* retry_ = nullptr;
     PulseTimer* givesUp_ = nullptr;
@@ -233,7 +253,7 @@ private:
 };
 
 PulseConnection::PulseConnection(Options options) : core_(std::make_shared<Core>(std::move(options))) {}
-PulseConnection::~PulseConnection() { core_->end(); }
+void PulseConnection::end() { core_->end(); }
 bool PulseConnection::attach(std::shared_ptr<PulseUser> user) { return core_->attach(std::move(user)); }
 void PulseConnection::detach(const std::shared_ptr<PulseUser>& user) { core_->detach(user); }
 void PulseConnection::post(std::function<void()> task) { core_->post(std::move(task)); }

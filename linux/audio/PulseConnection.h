@@ -2,6 +2,7 @@
 // The process's connection to the sound server, and the thread it lives on.
 
 #include <chrono>
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <string>
@@ -25,6 +26,10 @@ public:
     /// The server has gone, or the user is being detached: let go of every stream and operation of the context now.
     /// Only after serverCame.
     virtual void serverWent() = 0;
+    /// What it wants to hear of in serverChanged; always the same.
+    virtual pa_subscription_mask_t interest() const { return PA_SUBSCRIPTION_MASK_NULL; }
+    /// Something of the server has come, gone or changed; other users' interests come here too.
+    virtual void serverChanged(pa_subscription_event_type_t /*event*/, std::uint32_t /*index*/) {}
 };
 
 /// One connection to the user's sound server (PulseAudio, or PipeWire in its place), and one thread on which everything
@@ -46,8 +51,7 @@ public:
 
     PulseConnection() : PulseConnection(Options{}) {}
     explicit PulseConnection(Options options);
-    /// Waits for the sound thread to end, unless it is the caller. Users that are still attached hear serverWent.
-    ~PulseConnection();
+    ~PulseConnection() { end(); }
     PulseConnection(const PulseConnection&) = delete;
     PulseConnection& operator=(const PulseConnection&) = delete;
 
@@ -57,6 +61,8 @@ public:
     void detach(const std::shared_ptr<PulseUser>& user);
     /// Runs `task` on the sound thread, in order; it is dropped when nobody is attached.
     void post(std::function<void()> task);
+    /// Detaches everybody, for good, and waits for the sound thread to end, unless it is the caller.
+    void end();
     /// Whether there is a sound thread now. For tests.
     bool hasThread() const;
 

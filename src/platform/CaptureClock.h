@@ -1,8 +1,11 @@
 #pragma once
 // The clock of one recording.
 
+#include <array>
+#include <cstddef>
 #include <functional>
 #include <mutex>
+#include <optional>
 #include <utility>
 
 #include "base/Date.h"
@@ -33,7 +36,10 @@ public:
     void stand() {
         const std::lock_guard lock(mutex_);
         if (!running_) return;
-        elapsed_ += hostTime_().nanoseconds - runningSince_.nanoseconds;
+        const HostTime until = hostTime_();
+        ended_[nextEnded_] = Run{runningSince_, until, elapsed_};
+        nextEnded_ = (nextEnded_ + 1) % ended_.size();
+        elapsed_ += until.nanoseconds - runningSince_.nanoseconds;
         running_ = false;
     }
 
@@ -49,12 +55,31 @@ public:
         return MediaTime::make(elapsed_ + since, kTimescale);
     }
 
+    /// The time on this clock at a moment up to now; none when it stood then, or where that is further back than the
+    /// last four times it ran. For what is heard and arrives a little later.
+    std::optional<MediaTime> at(HostTime moment) const {
+        const std::lock_guard lock(mutex_);
+        if (running_ && moment >= runningSince_)
+            return MediaTime::make(elapsed_ + moment.nanoseconds - runningSince_.nanoseconds, kTimescale);
+        for (const Run& run : ended_)
+            if (moment >= run.since && moment < run.until)
+                return MediaTime::make(run.elapsedBefore + moment.nanoseconds - run.since.nanoseconds, kTimescale);
+        return std::nullopt;
+    }
+
 private:
+    struct Run {
+        HostTime since, until;
+        std::int64_t elapsedBefore = 0;
+    };
+
     const std::function<HostTime()> hostTime_;
     mutable std::mutex mutex_;
     bool running_ = false;
     std::int64_t elapsed_ = 0;
     HostTime runningSince_;
+    std::array<Run, 4> ended_{};
+    std::size_t nextEnded_ = 0;
 };
 
 }  // namespace lumacast
