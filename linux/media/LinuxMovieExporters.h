@@ -15,9 +15,9 @@ namespace media {
 class EncodingQueue;
 }
 
-/// Opens movies by libavformat, and copies or encodes ranges of them into files of our own box writer. Callable from any
-/// lane. Copies run on threads of their own, encoding exports one after the other on one that is idle otherwise. To be
-/// destroyed after its exporters; that cancels exports that still run, and waits for them.
+/// Opens movies by libavformat, and copies or encodes ranges of them into files of our own box writer. Callable from
+/// any lane. Copies run on threads of their own, encoding exports one after the other on one that is idle otherwise. To
+/// be destroyed after its exporters; that cancels exports that still run, and waits for them.
 class LinuxMovieExporters final : public MovieExporters {
 public:
     LinuxMovieExporters();

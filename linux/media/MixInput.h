@@ -9,14 +9,15 @@
 
 namespace lumacast::media {
 
-/// One sound track on its way into a mix: decoded, at the mix's rate, laid out by its stamps. What it holds in memory is
-/// what was asked for and a packet more, wherever the track's sound lies. Belongs to one thread.
+/// One sound track on its way into a mix: decoded, at the mix's rate, laid out by its stamps. What it holds in memory
+/// is what was asked for and a packet more, wherever the track's sound lies. Belongs to one thread.
 class MixInput final {
 public:
     /// `zero` is the mix's beginning, nanoseconds of the movie.
     MixInput(std::unique_ptr<TrackDecoder> decoder, float volume, int sampleRate, std::int64_t zero);
 
-    /// Adds the track's sound from frame `position` of the mix on to `mix`, which decides how much. Positions only go on.
+    /// Adds the track's sound from frame `position` of the mix on to `mix`, which decides how much. Positions only go
+    /// on.
     std::optional<Error> addTo(StereoSound& mix, std::int64_t position);
     /// Whether the track has no sound after what it was asked for.
     bool hasEnded() const { return isAtEnd_ && runs_.empty(); }

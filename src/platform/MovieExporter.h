@@ -10,8 +10,8 @@
 
 namespace lumacast {
 
-/// PassThrough copies the samples as they are. HighestQuality encodes the picture anew, as well as the encoder can, at the
-/// size it has, and mixes the sound into one track.
+/// PassThrough copies the samples as they are. HighestQuality encodes the picture anew, hardly to be told from
+/// what it was, at the size it has, and mixes the sound into one track.
 enum class ExportPreset { PassThrough, HighestQuality };
 enum class ExportStatus : std::int32_t { Completed, Failed, Cancelled };
 
@@ -48,16 +48,16 @@ public:
     /// The part to copy; the whole movie when never set. The new movie starts with a picture at zero.
     virtual void setTimeRange(MediaTimeRange range) = 0;
     /// For HighestQuality: the sound of the new movie, mixed without clipping into one track; a mix of no track gives a
-    /// movie without sound. A track named twice counts once, as named first; one alone keeps its level. Never set: every
-    /// track as it is. PassThrough copies the tracks, whatever is set.
+    /// movie without sound. A track named twice counts once, as named first; one alone keeps its level. Never set:
+    /// every track as it is. PassThrough copies the tracks, whatever is set.
     virtual void setAudioMix(AudioMix mix) = 0;
     /// Exports on a lane of the platform and calls `completion` there once. A range that is empty, negative or outside
-    /// the movie fails; so do a destination that exists and, for HighestQuality, a movie that can't be decoded whole. Every
-    /// end but Completed comes with an error. A failed or cancelled export leaves no file. Encoding
+    /// the movie fails; so do a destination that exists and, for HighestQuality, a movie that can't be decoded whole.
+    /// Every end but Completed comes with an error. A failed or cancelled export leaves no file. Encoding
     /// exports run one at a time, at the lowest priority: a recording that goes on meanwhile loses nothing by them.
     virtual void exportAsynchronously(Completion completion) = 0;
-    /// Ends the export, soon, as Cancelled, unless it ends by itself before. Nothing happens before it has begun and after
-    /// it has ended. Callable from any lane.
+    /// Ends the export, soon, as Cancelled, unless it ends by itself before. Nothing happens before it has begun and
+    /// after it has ended. Callable from any lane.
     virtual void cancel() = 0;
     /// How much of the export is done, 0 to 1, and 1 once it is Completed; never goes back. Callable from any lane.
     virtual double progress() const = 0;

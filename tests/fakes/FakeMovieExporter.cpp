@@ -121,7 +121,8 @@ public:
     double progress() const override { return export_->progress; }
     void exportAsynchronously(Completion completion) override {
         const bool isSecond = export_->begun.exchange(true);
-        scheduler_.globalQueue(QueuePriority::Default).async([job = export_, isSecond, completion = std::move(completion)] {
+        scheduler_.globalQueue(QueuePriority::Default).async([job = export_, isSecond,
+                                                              completion = std::move(completion)] {
             if (isSecond) return completion(ExportStatus::Failed, fakeSystemError(EALREADY));
             if (job->cancelled) return completion(ExportStatus::Cancelled, fakeSystemError(ECANCELED));
             const std::optional<Error> error = job->run();

@@ -85,7 +85,8 @@ protected:
     /// The level of one tone in what is heard.
     static double levelOf(const checkers::Sound& sound, double hertz, double from, double to) {
         double sine = 0, cosine = 0;
-        const auto first = static_cast<std::size_t>(from * sound.rate), last = static_cast<std::size_t>(to * sound.rate);
+        const auto first = static_cast<std::size_t>(from * sound.rate);
+        const auto last = static_cast<std::size_t>(to * sound.rate);
         if (last > sound.samples.size()) return -1;
         for (std::size_t i = first; i < last; ++i) {
             const double angle = 2 * std::numbers::pi * hertz * static_cast<double>(i) / sound.rate;
