@@ -87,16 +87,18 @@ Scene::Scene(int width, int height, Motion motion)
     }
 }
 
-std::vector<Rect> Scene::draw(const Picture& picture, std::uint32_t number, const WallTime& time) {
-    const bool whole = motion_ == Motion::Everywhere || drawnInto_ != picture.pixels;
+std::vector<Rect> Scene::draw(const Picture& picture, std::uint32_t number, const WallTime& time, Mark mark) {
+    const bool whole = motion_ == Motion::Everywhere || drawnInto_ != picture.pixels || drawnMark_ != mark;
     const bool upperRowChanged = (drawnNumber_ ^ number) >> 8 != 0;
     drawnInto_ = picture.pixels;
     drawnNumber_ = number;
+    drawnMark_ = mark;
     if (whole) {
         const std::uint32_t phase = motion_ == Motion::Everywhere ? number : 0;
         drawBackground(picture, phase, {0, 0, width_, footer_.y});
         drawZonePlate(picture);
         drawBalls(picture, phase);
+        if (mark == Mark::Border) drawMark(picture, footer_.y);
     }
     drawFooter(picture, number, time);
     drawFrameNumber(picture, number);

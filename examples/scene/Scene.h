@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <vector>
 
+#include "examples/scene/Mark.h"
 #include "examples/scene/Picture.h"
 
 namespace lumacast::scene {
@@ -21,7 +22,7 @@ struct WallTime {
 };
 
 /// A colourful moving scene with the time of day and the frame number in it. The picture is a pure function of size,
-/// motion, number and time. An object serves one size; use from one lane at a time.
+/// motion, number, time and mark. An object serves one size; use from one lane at a time.
 class Scene final {
 public:
     /// At least kMinimumWidth x kMinimumHeight; smaller values are raised to it.
@@ -31,7 +32,7 @@ public:
     /// this object's last drawing, which is everything for the first one. With Motion::SmallPart later drawings write
     /// only those, so the caller passes the same buffer each time; another buffer is drawn whole. The picture has this
     /// object's size.
-    std::vector<Rect> draw(const Picture& picture, std::uint32_t number, const WallTime& time);
+    std::vector<Rect> draw(const Picture& picture, std::uint32_t number, const WallTime& time, Mark mark = Mark::None);
 
     [[nodiscard]] int width() const { return width_; }
     [[nodiscard]] int height() const { return height_; }
@@ -54,6 +55,7 @@ private:
     int plateSize_;
     const std::uint8_t* drawnInto_ = nullptr;
     std::uint32_t drawnNumber_ = 0;
+    Mark drawnMark_ = Mark::None;
 };
 
 }  // namespace lumacast::scene

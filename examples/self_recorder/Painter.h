@@ -2,11 +2,13 @@
 
 #include <cstdint>
 #include <cstdio>
+#include <functional>
 #include <memory>
 #include <string>
 
 #include "examples/scene/Scene.h"
 #include "examples/self_recorder/Loop.h"
+#include "examples/self_recorder/MarkPlan.h"
 #include "examples/self_recorder/SceneWindow.h"
 #include "examples/self_recorder/UniqueFd.h"
 
@@ -21,6 +23,8 @@ public:
         int framesPerSecond = 60;
         scene::Motion motion = scene::Motion::Everywhere;
         bool still = false;
+        std::uint32_t markEvery = 0;                         ///< frames from one mark to the next; 0: none
+        std::function<void(std::int64_t hostTime)> onMark;  ///< a mark will be on the window at that time
         std::string framesLog;  ///< empty: none
     };
 
@@ -43,9 +47,9 @@ private:
         void operator()(std::FILE* file) const { std::fclose(file); }
     };
 
-    void startTimer(int framesPerSecond);
+    void startTimer();
     void tick();
-    void draw(std::uint32_t number);
+    void draw(std::uint32_t number, scene::Mark mark);
     void shown();
     void redraw();
 
@@ -57,6 +61,13 @@ private:
     scene::Motion motion_;
     bool still_;
     bool redrawWhenShown_ = false;
+    const std::int64_t interval_;
+    std::int64_t tickAt_ = 0;         ///< the nominal time of the last tick
+    std::int64_t showingTakes_ = 0;   ///< from a tick to its frame being on the window, lately
+    MarkPlan marks_;
+    const std::function<void(std::int64_t)> onMark_;
+    scene::Mark drawnMark_ = scene::Mark::None;
+    bool isFirstMarked_ = false;
     std::uint32_t drawnNumber_ = 0;
     std::uint32_t shownNumber_ = 0;
     std::int64_t sentAt_ = 0;

@@ -4,8 +4,10 @@
 
 #include <CLI/CLI.hpp>
 #include <cstdio>
+#include <optional>
 #include <string>
 
+#include "examples/self_recorder/Beeper.h"
 #include "examples/self_recorder/CommandReader.h"
 #include "examples/self_recorder/CommandTable.h"
 #include "examples/self_recorder/DrawingCommands.h"
@@ -30,12 +32,17 @@ int main(int argc, char** argv) {
     example::Painter::Options painting;
     std::string size = "640x360", name = "self recorder";
     bool part = false;
+    double beepFrequency = 1000;
     options.add_option("--fps", painting.framesPerSecond, "frames per second")->check(CLI::Range(1, 240));
     options.add_option("--size", size, "size of the window, WxH");
     options.add_option("--name", name, "title and class of the window");
     options.add_option("--frames-log", painting.framesLog,
                        "file for one line per frame: number, host time in ns when shown, and when sent");
     options.add_flag("--still", painting.still, "draw one frame, then nothing until the command 'moving'");
+    options.add_option("--beep-every", painting.markEvery,
+                       "mark every so many frames with a white border, and beep when they are shown")
+        ->check(CLI::Range(10, 1'000'000));
+    options.add_option("--beep-frequency", beepFrequency, "of the beeps, in Hz")->check(CLI::Range(100, 10'000));
     options.add_flag("--part", part, "move only a small part of the scene");
     example::CommandTable commands;
     const auto run = [&] {
@@ -48,11 +55,15 @@ int main(int argc, char** argv) {
         example::Loop loop;
         example::SceneWindow window(width, height, name);
         if (!window.error().empty()) return fail(window.error());
+        std::optional<example::Beeper> beeper;
+        if (painting.markEvery > 0) beeper.emplace(beepFrequency);
+        painting.onMark = [&beeper](std::int64_t hostTime) { beeper->playAt(hostTime); };
         example::Painter painter(loop, window, painting);
         if (!painter.error().empty()) return fail(painter.error());
         window.events.closed = [&loop] { loop.quit(0); };
         window.events.lost = [&loop] { loop.quit(1); };
         example::addDrawingCommands(commands, loop, window, painter);
+        if (beeper) example::addBeepCommands(commands, *beeper);
         const example::Recording recording(loop, commands, window, painter);
         loop.watch(window.descriptor(), [&window] { window.pump(); });
         // Events that arrived while a reply was awaited don't wake the descriptor again.

@@ -168,7 +168,8 @@ FrameReport checkFrameNumbers(const std::vector<NumberedPicture>& pictures, cons
 
 bool readFrameNumbers(MovieReader& reader, std::vector<NumberedPicture>& pictures, int quarterTurns) {
     return reader.readPictures([&](const DecodedPicture& picture) {
-        pictures.push_back({picture.time, frameNumberIn(picture.luma, quarterTurns)});
+        pictures.push_back(
+            {picture.time, frameNumberIn(picture.luma, quarterTurns), isMarked(picture.luma, quarterTurns)});
     });
 }
 

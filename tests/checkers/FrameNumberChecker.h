@@ -17,6 +17,7 @@ class MovieReader;
 struct NumberedPicture {
     std::chrono::nanoseconds time{};
     std::optional<std::uint32_t> number;
+    bool isMarked = false;  ///< it has the scene's mark
 };
 
 /// Numbers from `first` to `last`, both included.
@@ -88,7 +89,7 @@ struct FrameReport {
 [[nodiscard]] FrameReport checkFrameNumbers(const std::vector<NumberedPicture>& pictures,
                                             const FrameExpectation& expectation);
 
-/// Reads the number of every picture; `quarterTurns` is how far the pictures were turned clockwise. False, with the
+/// Reads the number and the mark of every picture; `quarterTurns` is how far the pictures were turned clockwise. False, with the
 /// reason in the reader, when the movie can't be decoded to its end.
 [[nodiscard]] bool readFrameNumbers(MovieReader& reader, std::vector<NumberedPicture>& pictures, int quarterTurns = 0);
 

@@ -24,12 +24,13 @@ std::optional<FramesLog> readFramesLog(const std::string& path, std::string& err
             valid = words.eof();
             sent = shown;
         }
-        std::string rest;
-        if (!valid || words >> rest || sent > shown) {
-            error = path + ": line " + std::to_string(count) + " is not 'number shown_ns [sent_ns]'";
+        std::string mark, rest;
+        const bool isMarked = valid && static_cast<bool>(words >> mark);
+        if (!valid || (isMarked && mark != "mark") || words >> rest || sent > shown) {
+            error = path + ": line " + std::to_string(count) + " is not 'number shown_ns [sent_ns [mark]]'";
             return std::nullopt;
         }
-        log[number] = {std::chrono::nanoseconds(sent), std::chrono::nanoseconds(shown)};
+        log[number] = {std::chrono::nanoseconds(sent), std::chrono::nanoseconds(shown), isMarked};
     }
     return log;
 }

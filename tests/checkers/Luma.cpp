@@ -3,6 +3,7 @@
 #include <algorithm>
 
 #include "examples/scene/FramePattern.h"
+#include "examples/scene/Mark.h"
 
 namespace lumacast::checkers {
 
@@ -33,6 +34,13 @@ std::optional<std::uint32_t> frameNumberIn(const LumaView& view, int quarterTurn
     const LumaPlane upright = turned(view, -quarterTurns);
     return scene::readFrameNumber(upright.samples.data(), upright.width, upright.height,
                                   static_cast<std::size_t>(upright.width));
+}
+
+bool isMarked(const LumaView& view, int quarterTurns) {
+    if (quarterTurns % 4 == 0) return scene::hasMark(view.samples, view.width, view.height, view.stride);
+    const LumaPlane upright = turned(view, -quarterTurns);
+    return scene::hasMark(upright.samples.data(), upright.width, upright.height,
+                          static_cast<std::size_t>(upright.width));
 }
 
 }  // namespace lumacast::checkers

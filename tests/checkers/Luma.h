@@ -33,4 +33,7 @@ struct LumaPlane {
 /// movie.
 [[nodiscard]] std::optional<std::uint32_t> frameNumberIn(const LumaView& view, int quarterTurns = 0);
 
+/// Whether the picture has the scene's mark; turned as above.
+[[nodiscard]] bool isMarked(const LumaView& view, int quarterTurns = 0);
+
 }  // namespace lumacast::checkers

@@ -69,7 +69,7 @@ private:
     }
 
     void judgeFrames() {
-        std::vector<NumberedPicture> pictures;
+        std::vector<NumberedPicture>& pictures = pictures_;
         if (!readFrameNumbers(reader_, pictures, options_.turnedDegrees / 90)) find("pictures", reader_.error());
         const FrameReport frames = checkFrameNumbers(pictures, options_.frames);
         for (const FrameFinding& finding : frames.findings) find("frames", finding.text);
@@ -87,7 +87,7 @@ private:
     }
 
     void judgeSound() {
-        if (options_.tones.empty() && options_.noTones.empty() && !options_.beeps) return;
+        if (options_.tones.empty() && options_.noTones.empty() && !options_.beeps && !options_.beepsAtMarks) return;
         const auto sound = reader_.readSound(options_.audioTrack);
         if (!sound) return find("sound", reader_.error());
         const nanoseconds margin(static_cast<std::int64_t>(options_.marginSeconds * 1e9));
@@ -99,10 +99,24 @@ private:
         for (const double tone : options_.noTones) addAll(checkToneAbsent(*sound, tone, options_.mostLevel, stretch));
         json& report = result_.report["sound"];
         report["duration_s"] = seconds(wholeOf(*sound).to);
+        if (options_.beepsAtMarks) judgeSync(*sound);
         if (!options_.beeps) return;
         report["beeps_ms"] = json::array();
         for (const nanoseconds onset : beepOnsets(*sound, *options_.beeps, options_.leastLevel))
             report["beeps_ms"].push_back(milliseconds(onset));
+    }
+
+    void judgeSync(const Sound& sound) {
+        SyncExpectation expectation = options_.sync;
+        expectation.forbidden = options_.frames.forbidden;
+        const SyncReport sync = checkBeepsAtMarks(
+            pictures_, beepOnsets(sound, *options_.beepsAtMarks, options_.leastLevel), expectation);
+        for (const std::string& text : sync.findings) find("sync", text);
+        json& report = result_.report["sync"];
+        report = {{"pairs", sync.pairs.size()}, {"worst_ms", milliseconds(sync.worst)}};
+        report["drift_ms"] = sync.drift ? json(milliseconds(*sync.drift)) : json();
+        report["late_ms"] = json::array();
+        for (const SyncPair& pair : sync.pairs) report["late_ms"].push_back(milliseconds(pair.late));
     }
 
     void judgeBoxes() {
@@ -131,6 +145,7 @@ private:
 
     const MovieCheckOptions& options_;
     MovieReader reader_;
+    std::vector<NumberedPicture> pictures_;
     MovieCheckResult result_;
 };
 

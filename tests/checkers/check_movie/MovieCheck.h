@@ -8,6 +8,7 @@
 
 #include "tests/checkers/Finding.h"
 #include "tests/checkers/FrameNumberChecker.h"
+#include "tests/checkers/SyncChecker.h"
 
 namespace lumacast::checkers {
 
@@ -24,6 +25,8 @@ struct MovieCheckOptions {
     std::vector<double> tones;    ///< each heard from beginning to end
     std::vector<double> noTones;  ///< none of them heard anywhere
     std::optional<double> beeps;  ///< frequency of beeps to report
+    std::optional<double> beepsAtMarks;  ///< frequency of beeps that begin when a marked frame is shown
+    SyncExpectation sync;                ///< of those; `forbidden` is taken from `frames`
     double leastLevel = -40;      ///< dB
     double mostLevel = -60;       ///< dB
     double marginSeconds = 0.1;   ///< not judged at either end of the sound

@@ -62,6 +62,12 @@ int main(int argc, char** argv) {
     app.add_option("--tone", options.tones, "frequency heard from beginning to end");
     app.add_option("--no-tone", options.noTones, "frequency heard nowhere");
     app.add_option("--beeps", options.beeps, "report when beeps of this frequency begin");
+    auto* sync = app.add_option("--beeps-at-marked-frames", options.beepsAtMarks,
+                                "beeps of this frequency begin when marked frames are shown");
+    double mostSync = 20;
+    app.add_option("--max-sync-ms", mostSync, "how far a beep may be from its marked frame")->needs(sync);
+    app.add_option("--min-sync-pairs", options.sync.leastPairs, "how many marked frames with a beep there must be")
+        ->needs(sync);
     app.add_option("--tone-level", options.leastLevel, "a tone or beep is at least this loud, dB");
     app.add_option("--no-tone-level", options.mostLevel, "an absent tone is at most this loud, dB");
     app.add_option("--tone-margin", options.marginSeconds, "seconds at either end in which tones aren't judged");
@@ -79,8 +85,13 @@ int main(int argc, char** argv) {
             frames.expected.insert(static_cast<std::uint32_t>(number));
     }
     if (hole->count() > 0) frames.largestHole = fromMilliseconds(largestHole);
+    options.sync.tolerance = fromMilliseconds(mostSync);
     frames.lateness = fromMilliseconds(lateness);
     options.readNumbers = !noNumbers;
+    if (noNumbers && options.beepsAtMarks) {
+        std::fprintf(stderr, "check_movie: the marks are on the frames with numbers\n");
+        return 2;
+    }
     if (!framesLog.empty()) {
         std::string error;
         frames.drawn = readFramesLog(framesLog, error);

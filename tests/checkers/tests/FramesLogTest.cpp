@@ -22,12 +22,14 @@ protected:
 };
 
 TEST_F(FramesLogTest, ReadsLinesWithTwoAndThreeWords) {
-    const auto log = read("1 5000 4000\n2 9000\n");
+    const auto log = read("1 5000 4000\n2 9000\n3 9500 9400 mark\n");
     ASSERT_TRUE(log) << error_;
-    EXPECT_EQ(log->size(), 2U);
+    EXPECT_EQ(log->size(), 3U);
     EXPECT_EQ(log->at(1).shown, 5000ns);
     EXPECT_EQ(log->at(1).sent, 4000ns);
     EXPECT_EQ(log->at(2).sent, 9000ns);
+    EXPECT_FALSE(log->at(1).isMarked);
+    EXPECT_TRUE(log->at(3).isMarked);
 }
 
 TEST_F(FramesLogTest, LeavesOutALineThatIsStillBeingWritten) {
@@ -36,7 +38,7 @@ TEST_F(FramesLogTest, LeavesOutALineThatIsStillBeingWritten) {
 }
 
 TEST_F(FramesLogTest, RefusesLinesOfAnotherForm) {
-    for (const char* text : {"x\n", "1\n", "1 2 x\n", "1 5 4 3\n", "1 4 5\n", "\n"}) {
+    for (const char* text : {"x\n", "1\n", "1 2 x\n", "1 5 4 3\n", "1 5 4 mark x\n", "1 5 4 x\n", "1 4 5\n", "\n"}) {
         EXPECT_FALSE(read(text)) << text;
         EXPECT_NE(error_, "");
     }

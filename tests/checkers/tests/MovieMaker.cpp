@@ -19,10 +19,10 @@ struct OutputFree {
 };
 
 // The scene's frame as B, G, R, X bytes.
-std::vector<std::uint8_t> sceneBytes(int width, int height, std::uint32_t number) {
+std::vector<std::uint8_t> sceneBytes(int width, int height, std::uint32_t number, scene::Mark mark) {
     std::vector<std::uint8_t> bytes(static_cast<std::size_t>(width) * static_cast<std::size_t>(height) * 4);
     scene::Scene(width, height, scene::Motion::Everywhere)
-        .draw({bytes.data(), width, height, static_cast<std::size_t>(width) * 4}, number, {12, 34, 56, 789});
+        .draw({bytes.data(), width, height, static_cast<std::size_t>(width) * 4}, number, {12, 34, 56, 789}, mark);
     return bytes;
 }
 
@@ -99,7 +99,8 @@ private:
     }
 
     void encodePicture(const MoviePlan& plan, const PlannedPicture& picture) {
-        const auto bytes = sceneBytes(plan.width, plan.height, picture.number);
+        const auto bytes = sceneBytes(plan.width, plan.height, picture.number,
+                                      picture.isMarked ? scene::Mark::Border : scene::Mark::None);
         const AvOwned<AVFrame> frame(av_frame_alloc());
         frame->format = AV_PIX_FMT_YUV420P;
         frame->width = video_->width;
@@ -158,7 +159,7 @@ std::vector<PlannedPicture> steadyPictures(std::uint32_t first, int count, int f
     std::vector<PlannedPicture> pictures;
     for (int place = 0; place < count; ++place)
         pictures.push_back({first + static_cast<std::uint32_t>(place),
-                            std::chrono::nanoseconds(1'000'000'000LL * place / framesPerSecond)});
+                            std::chrono::nanoseconds(1'000'000'000LL * place / framesPerSecond), false});
     return pictures;
 }
 
@@ -166,8 +167,8 @@ std::string makeMovie(const MoviePlan& plan, const std::string& path) {
     return Maker().run(plan, path);
 }
 
-LumaPlane sceneLuma(int width, int height, std::uint32_t number) {
-    const auto bytes = sceneBytes(width, height, number);
+LumaPlane sceneLuma(int width, int height, std::uint32_t number, scene::Mark mark) {
+    const auto bytes = sceneBytes(width, height, number, mark);
     LumaPlane plane{width, height, std::vector<std::uint8_t>(bytes.size() / 4)};
     for (std::size_t place = 0; place < plane.samples.size(); ++place) {
         // BT.601, limited range.

@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "examples/scene/Mark.h"
 #include "tests/checkers/Luma.h"
 
 namespace lumacast::checkers {
@@ -14,6 +15,7 @@ namespace lumacast::checkers {
 struct PlannedPicture {
     std::uint32_t number = 0;
     std::chrono::nanoseconds time{};
+    bool isMarked = false;
 };
 
 /// What a test wants in a movie. The defaults are the hard case: half size and a low bit rate.
@@ -35,6 +37,7 @@ struct MoviePlan {
 [[nodiscard]] std::string makeMovie(const MoviePlan& plan, const std::string& path);
 
 /// The luma of the scene as a movie would hold it, not encoded.
-[[nodiscard]] LumaPlane sceneLuma(int width, int height, std::uint32_t number);
+[[nodiscard]] LumaPlane sceneLuma(int width, int height, std::uint32_t number,
+                                  scene::Mark mark = scene::Mark::None);
 
 }  // namespace lumacast::checkers

@@ -50,11 +50,11 @@ protected:
         ASSERT_EQ(xcb_connection_has_error(connection_.get()), 0);
     }
 
-    void start(std::vector<std::string> options) {
+    void start(std::vector<std::string> options, std::vector<std::string> environment = {}) {
         options.insert(options.begin(), LC_SELF_RECORDER);
         options.insert(options.end(), {"--frames-log", log_});
-        application_ =
-            std::make_unique<Child>(options, std::vector<std::string>{"DISPLAY=" + display_}, folder_.file("errors"));
+        environment.push_back("DISPLAY=" + display_);
+        application_ = std::make_unique<Child>(options, environment, folder_.file("errors"));
         const std::string line = application_->readLine();
         ASSERT_EQ(line.substr(0, 9), "window 0x") << line;
         window_ = static_cast<xcb_window_t>(std::stoul(line.substr(7), nullptr, 16));
@@ -250,6 +250,26 @@ TEST_F(SelfRecorder, SaysWhatIsWrongWithItsOptions) {
     }
     Child lost({LC_SELF_RECORDER}, {"DISPLAY=:nowhere"}, folder_.file("errors"));
     EXPECT_EQ(lost.wait(), 1);
+}
+
+TEST_F(SelfRecorder, MarksFramesAndSaysOnceThatThereIsNobodyToBeepFor) {
+    // Nobody serves sound there.
+    start({"--size", "320x180", "--fps", "60", "--beep-every", "30"}, {"PULSE_SERVER=unix:" + folder_.file("nobody")});
+    EXPECT_TRUE(eventually([&] { return isMarked(content().view()); }));
+    EXPECT_TRUE(eventually([&] { return !isMarked(content().view()); })) << "for a moment only";
+    EXPECT_TRUE(reachesFrame(100));
+    EXPECT_EQ(application_->ask("beeps"), "beeps 0 late 0 left-out 0 underflows 0");
+    std::string error;
+    const auto log = readFramesLog(log_, error);
+    ASSERT_TRUE(log) << error;
+    int marked = 0;
+    for (const auto& [number, stamp] : *log) marked += stamp.isMarked ? 1 : 0;
+    EXPECT_GE(marked, 2);
+    EXPECT_LE(marked, 3);
+    const auto bytes = bytesOf(folder_.file("errors"));
+    const std::string said(bytes.begin(), bytes.end());
+    EXPECT_EQ(said.find("no beeps"), said.rfind("no beeps")) << said;
+    EXPECT_NE(said.find("no beeps"), std::string::npos) << said;
 }
 
 }  // namespace
