@@ -20,10 +20,12 @@ using std::chrono::milliseconds;
 const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "6"};
 constexpr std::uint32_t kStretch = 12;
 constexpr milliseconds kLargestHole{1500};
+constexpr milliseconds kEndsApart{2000};
 #else
 const std::vector<std::string> kMoving{"--size", "640x360", "--fps", "30"};
 constexpr std::uint32_t kStretch = 60;
 constexpr milliseconds kLargestHole{67};  // two frame times
+constexpr milliseconds kEndsApart{250};   // sound against picture
 #endif
 
 void addRange(std::set<std::uint32_t>& numbers, std::uint32_t first, std::uint32_t last) {
@@ -79,7 +81,15 @@ TEST(Recording, ShowsEveryFrameThatWasDrawnInOrderAndOnTime) {
     ASSERT_EQ(reader.videoTracks().size(), 1u);
     EXPECT_EQ(reader.videoTracks()[0].codec, "h264");
     EXPECT_EQ(reader.videoTracks()[0].profile, "High");
-    EXPECT_TRUE(reader.audioTracks().empty());  // nothing was heard, so the finished movie has no sound track
+    // The application plays nothing, and there is no sound server: silence for as long as the pictures last.
+    ASSERT_EQ(reader.audioTracks().size(), 1u);
+    EXPECT_EQ(reader.audioTracks()[0].codec, "aac");
+    EXPECT_LT(abs(reader.audioTracks()[0].duration - reader.videoTracks()[0].duration), kEndsApart);
+    const auto sound = reader.readSound();
+    ASSERT_TRUE(sound.has_value()) << reader.error();
+    float loudest = 0;
+    for (const float sample : sound->samples) loudest = std::max(loudest, std::abs(sample));
+    EXPECT_LT(loudest, 1e-4F);
     checkers::MovieCheckOptions whole;
     whole.movie = movie;
     whole.frames.allowedRepeats = 2;
