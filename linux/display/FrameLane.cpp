@@ -101,9 +101,15 @@ void FrameLane::sleep(std::int64_t deadline) {
     if (polled[1].revents != 0) drainEvents(false);
     // Between recordings nobody is to be told; the next start connects anew.
     if (connection_ && connection_->broken() && stoppedSince_ != 0) {
-        setup_.selection->forgetAll();
+        forgetWindows();
         release();
     }
+}
+
+// The display has gone, and its windows with it; not so when it is this lane that is to end and whose connection was
+// cut for that: other lanes go on with the selection.
+void FrameLane::forgetWindows() {
+    if (!setup_.control->order().quit) setup_.selection->forgetAll();
 }
 
 bool FrameLane::drainEvents(bool onlyQueued) {
@@ -120,7 +126,7 @@ bool FrameLane::drainEvents(bool onlyQueued) {
 void FrameLane::work(const Order& order) {
     if (order.run != run_ && !beginRun(order)) return;
     if (connection_->broken()) {
-        setup_.selection->forgetAll();
+        forgetWindows();
         return fail(order, X11CaptureStatus::kDisplayLost);
     }
     if (selectionVersion_ != setup_.selection->version() && !followSelection(order)) return;
@@ -164,7 +170,7 @@ bool FrameLane::followSelection(const Order& order) {
     const bool any = scene_->follow(wanted);
     shown_ = scene_->picture();
     if (connection_->broken()) {
-        setup_.selection->forgetAll();
+        forgetWindows();
         return fail(order, X11CaptureStatus::kDisplayLost), false;
     }
     if (wanted.mode == DisplayCloneControl::kCloneContexts)

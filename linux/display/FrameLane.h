@@ -65,6 +65,7 @@ private:
     bool deliver(const Order& order, std::shared_ptr<Picture> picture, MediaTime stamp, CaptureControl::Stamp kind);
     void fail(const Order& order, std::int32_t status);
 
+    void forgetWindows();
     bool drainEvents(bool onlyQueued);
     std::int64_t nextDeadline(const Order& order) const;
     void sleep(std::int64_t deadline);

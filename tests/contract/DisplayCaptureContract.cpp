@@ -422,6 +422,21 @@ TEST_P(DisplayCaptureContract, DeliversToNobodyWithoutADelegate) {
     EXPECT_TRUE(deliversWithChanges(watched, count + 2));
 }
 
+TEST_P(DisplayCaptureContract, GoesOnWhenAnotherSourceEnds) {
+    world_->clock().startCaptureClock();
+    const Watched watched = started();
+    ASSERT_TRUE(watched.frames->waitForCount(1));
+    for (int end = 0; end < 10; ++end) {
+        Watched other = started();
+        ASSERT_TRUE(other.frames->waitForCount(1)) << end;
+        other.source->stop();
+        // It has come to rest when its last owner lets it go.
+        ASSERT_TRUE(deliversWithChanges(watched, watched.frames->count() + 2)) << end;
+    }
+    const Watched later = started();
+    EXPECT_TRUE(later.frames->waitForCount(1));
+}
+
 TEST_P(DisplayCaptureContract, ReportsAFailureOnTheMainQueueAndCanBeStartedAgain) {
     world_->clock().startCaptureClock();
     world_->letTheNextStartFail();
