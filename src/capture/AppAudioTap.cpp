@@ -106,8 +106,12 @@ void LCCaptureManager::startTap(ProcessID pid, SampleHandler outputHandler, Hand
     log_.line("LCRecordingManager: startAudioCapture: Successfully started Audio Queue Recording");
     // Last: the listener's task comes behind this one.
     appTapDidStartHandler_.set(std::move(didStartHandler));
-    // What was replaced ends by itself when its last buffer has come and gone.
-    if (replaced && replaced->buffersInRotation == 0) replaced->queue->dispose();
+    // What was replaced ends by itself when its last buffer has come and gone, with the next stop at the latest.
+    if (!replaced) return;
+    if (replaced->buffersInRotation == 0)
+        replaced->queue->dispose();
+    else
+        formerTaps_.push_back(replaced);
 }
 
 void LCCaptureManager::leaveRotation(const std::shared_ptr<AudioRecorderState>& recorder) {
@@ -168,12 +172,16 @@ void LCCaptureManager::fillGapAfterResume() {
 }
 
 void LCCaptureManager::stopTap() {
+    // Its buffers may never be filled once the recording's clock stands.
+    for (const auto& weak : std::exchange(formerTaps_, {}))
+        if (const auto former = weak.lock()) former->queue->dispose();
     const auto recorder = audioRecorderQueue();
     if (!recorder) return;
     AudioInputQueue& queue = *recorder->queue;
     if (recorder->isRunning) {
         if (const std::int32_t status = queue.stop()) {
             log_.line("LCRecordingManager:stopAudioCapture:error: %i", status);
+            formerTaps_.push_back(recorder);  // deliberately neither freed nor disposed of now
         } else {
             log_.line("LCRecordingManager:stopAudioCapture: Audio Queue successfully stopped");
             recorder->isRunning = false;

@@ -8,6 +8,7 @@
 #include <memory>
 #include <optional>
 #include <span>
+#include <vector>
 
 #include "base/Date.h"
 #include "base/Guarded.h"
@@ -193,7 +194,8 @@ private:
     bool isCurrent(const std::shared_ptr<AudioRecorderState>& recorder) const {
         return audioRecorderQueue_.get() == recorder;
     }
-    /// A buffer will never be filled again. The last one of a tap that has been replaced ends its queue.
+    /// A buffer will never be filled again. The last one of a tap that has been replaced ends its queue, if no stop has
+    /// ended it before.
     void leaveRotation(const std::shared_ptr<AudioRecorderState>& recorder);
     /// Takes the handler out and calls it.
     void tellMicrophoneStarted();
@@ -208,6 +210,7 @@ private:
     Guarded<SampleHandler> appAudioOutputHandler_;
     Guarded<Handler> appTapDidStartHandler_;
     Guarded<std::shared_ptr<AudioRecorderState>> audioRecorderQueue_;
+    std::vector<std::weak_ptr<AudioRecorderState>> formerTaps_;  ///< may still run; of the audio capture queue alone
     Guarded<AudioFormat> audioBasicDescription_;
     AudioTimeStamp initialTimestamp_;
     Guarded<std::optional<Date>> lastAudioDate_;

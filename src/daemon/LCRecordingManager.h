@@ -138,9 +138,11 @@ private:
     void stopRecordingWithStartClipDuration(double startClipDuration, double endClipDuration, StopHandler handler);
     /// `saveVideoToCameraRoll:handler:` — has the movie's sound mixed, adds it to this user's library and removes its
     /// files. The handler is called once, on the request lane, with an error when it is not in the library. Refused, and
-    /// left alone, is a movie that is neither a temporary file nor one that the user may read and remove.
+    /// left alone, is a movie that is neither a temporary file nor one that the user may read and remove, and one that
+    /// is still being recorded.
     void saveVideoToCameraRoll(const std::optional<URL>& movie, UserID user, SaveHandler handler);
     /// On a global queue.
+    bool isBeingRecorded(const URL& movie) const;
     void addToLibrary(const std::shared_ptr<MovieSave>& save, const std::optional<URL>& mixed, bool mixingFailed);
     void endSave(const std::shared_ptr<MovieSave>& save, const std::optional<URL>& savedAs, const std::string& problem);
     Array describeSaves() const;

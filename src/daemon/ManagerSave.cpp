@@ -55,6 +55,11 @@ void LCRecordingManager::saveVideoToCameraRoll(const std::optional<URL>& movie, 
         if (handler) handler(services_.errors._lcUserErrorForCode(RecordingErrorCode::FailedToSave));
         return;
     }
+    if (movie && isBeingRecorded(*movie)) {
+        log_.line("a movie is not saved: it is being recorded");
+        if (handler) handler(services_.errors._lcUserErrorForCode(RecordingErrorCode::FailedToSave));
+        return;
+    }
     const auto save = std::make_shared<MovieSave>();
     save->number = ++lastSave_;
     save->movie = movie;
@@ -79,6 +84,14 @@ void LCRecordingManager::saveVideoToCameraRoll(const std::optional<URL>& movie, 
             if (save->state == MovieSave::State::Mixing) save->exporter = exporter;
         });
     });
+}
+
+bool LCRecordingManager::isBeingRecorded(const URL& movie) const {
+    for (const auto& [id, session] : bundleIDToRecordingSessionLookup_) {
+        const auto writer = session->isRecording() ? session->movieWriter() : nullptr;
+        if (writer && FileRemovals::isSamePath(writer->outputPath(), movie.path())) return true;
+    }
+    return false;
 }
 
 void LCRecordingManager::addToLibrary(const std::shared_ptr<MovieSave>& save, const std::optional<URL>& mixed,
@@ -161,7 +174,7 @@ void LCRecordingManager::serveSaveCommand() {
             const std::uint64_t before = self->lastSave_;
             self->saveVideoToCameraRoll(movie, self->platform_.fileSystem.user(), {});
             if (self->lastSave_ == before)
-                return answer({{"error", "the movie is not there, or it may not be read and removed"}});
+                return answer({{"error", "the movie is not there, it may not be read and removed, or it is being recorded"}});
             answer({{"save", self->lastSave_}});
         });
 }

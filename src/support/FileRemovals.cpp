@@ -22,6 +22,8 @@ bool saysNothingIsThere(const Error& error) {
 
 }  // namespace
 
+bool FileRemovals::isSamePath(const std::string& path, const std::string& other) { return keyOf(path) == keyOf(other); }
+
 void FileRemovals::remove(std::string path, std::optional<std::uint64_t> claim, Completion completion,
                           std::optional<UserID> user) {
     const std::string key = keyOf(path);

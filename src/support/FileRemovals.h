@@ -31,6 +31,9 @@ public:
     FileRemovals(Log& log, FileSystem& fileSystem, GlobalQueue& background)
         : log_(log), fileSystem_(fileSystem), background_(background) {}
 
+    /// Whether both name the same place: files are addressed with a doubled slash here and a single one there.
+    static bool isSamePath(const std::string& path, const std::string& other);
+
     /// Removes what is at `path`, on the background queue, and completes there: with none when nothing was there, or
     /// when a claim later than `claim` is on the path at that moment.
     /// With `user` given the file may be anywhere, and is removed with that user's rights.

@@ -42,6 +42,7 @@ public:
     /// The process dies: connection, window and process are gone.
     void die();
     bool isAlive() const { return process_ != nullptr; }
+    ProcessID pid() const { return pid_; }
     /// A new process of the same application, with another number and the same window.
     void startAgain(ProcessID pid);
 

@@ -10,12 +10,13 @@ namespace lumacast {
 /// the time.
 class SimulatedDaemon {
 public:
-    explicit SimulatedDaemon(std::uint64_t seed) : world(seed) {
+    /// `devices`, when given, says whether there is a microphone.
+    explicit SimulatedDaemon(std::uint64_t seed, const CaptureDevices* devices = nullptr) : world(seed) {
         world.fakes.preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
         world.fakes.displayCapture.setAutomatic(true);
         world.fakes.displayCapture.setPlanes(1 << 30);  // movies in memory keep their pictures
         if (std::getenv("LC_VERBOSE")) world.fakes.log.setVerbose(true);
-        process = std::make_unique<Process>(world.fakes.platform());
+        process = std::make_unique<Process>(world.fakes.platform(), LCRecordingManager::SessionMaker{}, devices);
         world.scheduler.mainQueue().sync([this] { process->start(); });
     }
     ~SimulatedDaemon() { world.scheduler.endWorld(); }

@@ -264,6 +264,29 @@ TEST_F(AppAudioTap, ATapThatStalledIsDisposedOfWhenItIsReplaced) {
     EXPECT_EQ(fakes_.audioInputQueues.queues().size(), 1u);
 }
 
+TEST_F(AppAudioTap, AReplacedTapThatIsNeverFilledEndsWithTheNextStop) {
+    start();
+    screenHasBegun();
+    const std::weak_ptr<AudioRecorderState> recorder = manager_->audioRecorderQueue();
+    start(ProcessID{501});
+    manager_->stopAllCapture();
+    EXPECT_TRUE(recorder.expired());
+    settle();
+    EXPECT_TRUE(fakes_.audioInputQueues.queues().empty());
+}
+
+TEST_F(AppAudioTap, ATapThatRefusesToStopEndsWithTheNextStop) {
+    start();
+    const std::weak_ptr<AudioRecorderState> recorder = manager_->audioRecorderQueue();
+    fakes_.faults.failNext("AudioInputQueue.stop");
+    manager_->stopAppAudioCapture();
+    EXPECT_FALSE(recorder.expired());
+    EXPECT_TRUE(queue()->isRunning());
+    EXPECT_FALSE(manager_->audioRecorderQueue());
+    manager_->stopAppAudioCapture();
+    EXPECT_TRUE(recorder.expired());
+}
+
 TEST_F(AppAudioTap, TheDidStartHandlerIsNotCalledForATapThatWasStopped) {
     manager_->startAppAudioCaptureForProcessID(kPlayer, keep(), [this] { ++didStart_; });
     manager_->stopAppAudioCapture();

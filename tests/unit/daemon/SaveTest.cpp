@@ -146,6 +146,32 @@ TEST_F(Save, TheMovieOfALaterRecordingWithTheSameNameStays) {
     EXPECT_NEAR(fakes_.fileSystem.movie(movie.path())->duration().seconds(), 2, 0.2);
 }
 
+TEST_F(Save, AMovieThatIsBeingRecordedIsRefusedAndGoesOn) {
+    URL movie;
+    const auto client = makeStopped(movie);
+    client->start();
+    settle();
+    advance(std::chrono::seconds(2));
+    const auto asked = client->ask(DaemonMessage::SaveVideoToCameraRoll, {movie});
+    // The same file under another name.
+    const std::string path = movie.path();
+    const auto doubled = client->ask(DaemonMessage::SaveVideoToCameraRoll,
+                                     {URL::file(path.substr(0, path.rfind('/')) + "//Player.mp4")});
+    EXPECT_TRUE(command("save " + movie.text()).find("error"));
+    settle();
+    EXPECT_EQ(asked->code(), -5812);
+    EXPECT_EQ(doubled->code(), -5812);
+    EXPECT_TRUE(fakes_.photoLibrary.assets().empty());
+    const auto stopped = client->ask(DaemonMessage::StopRecording);
+    settle();
+    ASSERT_EQ(stopped->answers, 1);
+    ASSERT_TRUE(fakes_.fileSystem.movie(path));
+    EXPECT_NEAR(fakes_.fileSystem.movie(path)->duration().seconds(), 2, 0.2);
+    const auto saved = client->ask(DaemonMessage::SaveVideoToCameraRoll, {movie});
+    settle();
+    EXPECT_EQ(saved->code(), 0);
+}
+
 TEST_F(Save, TwoSavesOfOneSecondAreAnsweredBothAndRemoveBothMovies) {
     URL movie;
     const auto client = makeStopped(movie);
