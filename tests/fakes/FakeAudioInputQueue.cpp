@@ -192,21 +192,20 @@ Task FakeAudioInputQueue::handOverLocked(AudioQueueBufferRef buffer, const Audio
 }
 
 void FakeAudioInputQueue::hear(std::uint32_t frames) {
+    std::vector<Task> tasks;
+    fill(frames, tasks);
+    for (Task& task : tasks) lane_->async(std::move(task));
+}
+
+void FakeAudioInputQueue::fill(std::uint32_t frames, std::vector<Task>& tasks) {
+    const std::lock_guard lock(mutex_);
+    if (!running_ || !clock_ || !clock_->isRunning()) return;
     std::uint8_t byte = 0;
     {
-        const std::lock_guard lock(mutex_);
         const std::lock_guard settingsLock(settings_->mutex);
         const auto playing = settings_->playing.find(pid_);
         if (playing != settings_->playing.end()) byte = playing->second;
     }
-    std::vector<Task> tasks;
-    fill(frames, byte, tasks);
-    for (Task& task : tasks) lane_->async(std::move(task));
-}
-
-void FakeAudioInputQueue::fill(std::uint32_t frames, std::uint8_t byte, std::vector<Task>& tasks) {
-    const std::lock_guard lock(mutex_);
-    if (!running_ || !clock_ || !clock_->isRunning()) return;
     const std::int64_t now = clock_->now().value;
     while (frames > 0 && !enqueued_.empty()) {
         AudioQueueBuffer& buffer = *enqueued_.front();

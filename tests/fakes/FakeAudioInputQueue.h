@@ -71,7 +71,7 @@ private:
     [[nodiscard]] Task handOverLocked(AudioQueueBufferRef buffer, const AudioTimeStamp& start, std::uint32_t packets,
                                       std::vector<AudioPacketDescription> descriptions);
     /// Fills buffers; what hands them over is for the lane.
-    void fill(std::uint32_t frames, std::uint8_t byte, std::vector<Task>& tasks);
+    void fill(std::uint32_t frames, std::vector<Task>& tasks);
     void tellRunning();
 
     const std::shared_ptr<FakeSoundSettings> settings_;

@@ -297,8 +297,11 @@ private:
             EXPECT_EQ(path.find("LCLuma_Final"), std::string::npos) << path << " is left of a save";
         judgeMovies();
         if (faulty_) return;
+        // One that could not be mixed is saved as it is, whatever that is.
         for (const auto& asset : fakes().photoLibrary.assets())
-            EXPECT_TRUE(asset.content && asset.content->finished) << asset.movie.text();
+            EXPECT_TRUE(asset.movie.text().find("LCLuma_Final") == std::string::npos ||
+                        (asset.content && asset.content->finished))
+                << asset.movie.text();
     }
 
     const Microphone microphone_;
