@@ -77,7 +77,7 @@ void ProcessTap::took(const ServerListing* listing) {
         return owner_->owns(client, identity);
     });
     judge(*listing, wanted);
-    open(wanted);
+    open(listing->isPipeWire ? TappedStream::Account::AtEachPiece : TappedStream::Account::AtAnyTime, wanted);
     if (connected_->isStale) lookSoon();
 }
 
@@ -116,7 +116,7 @@ void ProcessTap::judge(const ServerListing& listing, const std::vector<ListedPla
     });
 }
 
-void ProcessTap::open(const std::vector<ListedPlayback>& wanted) {
+void ProcessTap::open(TappedStream::Account account, const std::vector<ListedPlayback>& wanted) {
     auto& streams = connected_->streams;
     const auto now = steady_clock::now();
     for (const ListedPlayback& playback : wanted) {
@@ -128,7 +128,7 @@ void ProcessTap::open(const std::vector<ListedPlayback>& wanted) {
             connected_->retry.start(kSlowly);
             continue;
         }
-        streams.push_back(std::make_unique<TappedStream>(connected_->server, playback, mix_, [this] { lookSoon(); }));
+        streams.push_back(std::make_unique<TappedStream>(connected_->server, playback, account, mix_, [this] { lookSoon(); }));
         if (streams.back()->hasEnded()) lookSoon();
     }
 }

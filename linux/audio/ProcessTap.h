@@ -51,7 +51,7 @@ private:
     void lookSoon();
     void took(const ServerListing* listing);
     void judge(const ServerListing& listing, const std::vector<ListedPlayback>& wanted);
-    void open(const std::vector<ListedPlayback>& wanted);
+    void open(TappedStream::Account account, const std::vector<ListedPlayback>& wanted);
 
     const std::shared_ptr<TapOwner> owner_;
     const std::shared_ptr<TapMix> mix_;

@@ -20,13 +20,16 @@ public:
     Piece place(std::int64_t estimate, std::int64_t frames);
 
 private:
-    /// Beyond this it is an interruption, within it jitter.
+    /// Beyond so many seconds it is an interruption, within it jitter.
     static constexpr double kInterruption = 0.08;
-    /// A drift is noticed from here on.
-    static constexpr double kTolerance = 0.002;
+    /// The first accounts of a stream are rough: so many pieces are laid where they are said to belong.
+    static constexpr int kSettling = 10;
+    /// In seconds: a drift is corrected from here on, until it is small again.
+    static constexpr double kTolerance = 0.005, kGoodEnough = 0.001;
 
     const double rate_;
-    bool begun_ = false;
+    int placed_ = 0;  ///< pieces, up to kSettling
+    bool isCorrecting_ = false;
     std::int64_t next_ = 0;
     double smoothedError_ = 0;
     int strayed_ = 0;

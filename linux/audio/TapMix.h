@@ -32,7 +32,7 @@ private:
 class TapMix final {
 public:
     /// Sound is read this long after it was heard, at first and at most.
-    static constexpr std::int64_t kFirstDelay = 40'000'000, kLongestDelay = 500'000'000;
+    static constexpr std::int64_t kFirstDelay = 60'000'000, kLongestDelay = 500'000'000;
 
     TapMix(double rate, std::uint32_t channels, HostTime start);
 

@@ -31,10 +31,8 @@ const Listed* find(const std::vector<Listed>& list, std::uint32_t index) {
 
 /// The pid that the kernel gave PipeWire for our own connection: its PulseAudio service.
 std::optional<std::int32_t> pidOfService(const ServerListing& listing) {
-    for (const ListedClient& client : listing.clients)
-        if (client.objectId ? *client.objectId == listing.ownClient : client.index == listing.ownClient)
-            return client.kernelPid;
-    return std::nullopt;
+    const ListedClient* const own = find(listing.clients, listing.ownClient);
+    return own ? own->kernelPid : std::nullopt;
 }
 
 }  // namespace
@@ -49,7 +47,6 @@ ListedClient readClient(std::uint32_t index,
     client.index = index;
     client.kernelPid = readPid(limited("pipewire.sec.pid"));
     client.claimedPid = readPid(limited("application.process.id"));
-    client.objectId = readNumber<std::uint32_t>(limited("object.id"));
     client.binary = limited("application.process.binary").value_or("");
     client.machine = limited("application.process.machine_id").value_or("");
     // PulseAudio names the peer, PipeWire the kind of socket. Where neither is said it is not a protocol of theirs.
@@ -90,6 +87,10 @@ std::vector<ListedPlayback> selectPlaybacks(
     }
     std::sort(selected.begin(), selected.end(), [](const auto& a, const auto& b) { return a.index < b.index; });
     if (selected.size() > kMostTapped) selected.resize(kMostTapped);
+    // PipeWire gives a stream of one channel two, as its output has, and would add them up for us.
+    if (listing.isPipeWire)
+        for (ListedPlayback& playback : selected)
+            if (playback.positions.size() == 1) playback.positions = {kFrontLeft, kFrontRight};
     return selected;
 }
 

@@ -21,6 +21,9 @@ inline constexpr std::size_t kMostTapped = 16;
 inline constexpr std::size_t kMostPropertyBytes = 256;
 inline constexpr std::size_t kMostChannels = 32;
 
+/// Positions of channels, in the servers' numbering.
+inline constexpr std::int32_t kFrontLeft = 1, kFrontRight = 2;
+
 /// Whose process a client of the server is.
 struct ClientIdentity {
     ProcessID pid{0};
@@ -36,7 +39,6 @@ struct ListedClient {
     std::uint32_t index = kNoIndex;
     std::optional<std::int32_t> kernelPid;   ///< of whoever holds the connection to PipeWire
     std::optional<std::int32_t> claimedPid;
-    std::optional<std::uint32_t> objectId;   ///< PipeWire's other number of it
     std::string binary, machine;
     bool isRemote = false;                   ///< not over a local socket: its numbers are another machine's
 };
@@ -75,7 +77,8 @@ struct ServerListing {
 /// client says of itself is looked at. With PulseAudio there is nothing else.
 std::optional<ClientIdentity> identityOf(const ServerListing& listing, const ListedClient& client);
 
-/// The streams to be tapped: those whose client `belongs`, at most kMostTapped, oldest first.
+/// The streams to be tapped: those whose client `belongs`, at most kMostTapped, oldest first, with the channels that are
+/// to be recorded.
 std::vector<ListedPlayback> selectPlaybacks(const ServerListing& listing,
                                             const std::function<bool(const ListedClient&, const ClientIdentity&)>& belongs);
 

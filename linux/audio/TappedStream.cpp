@@ -13,6 +13,10 @@ namespace {
 constexpr double kFragmentSeconds = 0.02;
 /// What the server may keep for us when we are late; more is lost.
 constexpr double kMostKeptSeconds = 1;
+/// Without sound for so many nanoseconds it was interrupted.
+constexpr std::int64_t kInterruption = 60'000'000;
+/// In microseconds; what a server says beyond it is nonsense.
+constexpr pa_usec_t kLongestLatency = 10'000'000;
 
 std::vector<Side> sidesOf(const std::vector<std::int32_t>& positions) {
     std::vector<Side> sides;
@@ -39,28 +43,28 @@ std::vector<Side> sidesOf(const std::vector<std::int32_t>& positions) {
 
 }  // namespace
 
-TappedStream::TappedStream(const PulseServer& server, const ListedPlayback& playback, std::shared_ptr<TapMix> mix,
-                           std::function<void()> changed)
+TappedStream::TappedStream(const PulseServer& server, const ListedPlayback& playback, Account account,
+                           std::shared_ptr<TapMix> mix, std::function<void()> changed)
     : playback_(playback),
+      account_(account),
       mix_(std::move(mix)),
       changed_(std::move(changed)),
       mixDown_(sidesOf(playback.positions), mix_->channels()),
       lane_(mix_->addLane()),
       position_(mix_->rate()) {
-    pa_sample_spec format{};
-    format.format = PA_SAMPLE_FLOAT32NE;
-    format.rate = static_cast<std::uint32_t>(std::lround(mix_->rate()));
-    format.channels = static_cast<std::uint8_t>(playback_.positions.size());
+    format_.format = PA_SAMPLE_FLOAT32NE;
+    format_.rate = static_cast<std::uint32_t>(std::lround(mix_->rate()));
+    format_.channels = static_cast<std::uint8_t>(playback_.positions.size());
     // The stream's own channels in its own order: the server mixes nothing down.
     pa_channel_map map{};
-    map.channels = format.channels;
+    map.channels = format_.channels;
     for (std::uint8_t channel = 0; channel < map.channels; ++channel)
         map.map[channel] = static_cast<pa_channel_position_t>(playback_.positions[channel]);
     const PropertyListHandle properties(pa_proplist_new());
     // PipeWire: this stream or none, never another one in its place, from the beginning and later.
     pa_proplist_sets(properties.get(), "node.dont-reconnect", "true");
     pa_proplist_sets(properties.get(), "node.dont-fallback", "true");
-    stream_.reset(pa_stream_new_with_proplist(&server.context, "tap", &format, &map, properties.get()));
+    stream_.reset(pa_stream_new_with_proplist(&server.context, "tap", &format_, &map, properties.get()));
     if (!stream_ || pa_stream_set_monitor_stream(stream_.get(), playback_.index) < 0) {
         end();
         return;
@@ -69,15 +73,17 @@ TappedStream::TappedStream(const PulseServer& server, const ListedPlayback& play
         stream_.get(), [](pa_stream*, void* self) { static_cast<TappedStream*>(self)->stateChanged(); }, this);
     pa_stream_set_read_callback(
         stream_.get(), [](pa_stream*, std::size_t, void* self) { static_cast<TappedStream*>(self)->hear(); }, this);
+    pa_stream_set_latency_update_callback(
+        stream_.get(), [](pa_stream*, void* self) { static_cast<TappedStream*>(self)->timingCame(); }, this);
     // Where it hangs now nobody has looked at.
     pa_stream_set_moved_callback(
         stream_.get(), [](pa_stream*, void* self) { static_cast<TappedStream*>(self)->distrust(); }, this);
     pa_buffer_attr buffer{};
-    buffer.maxlength = static_cast<std::uint32_t>(pa_usec_to_bytes(static_cast<pa_usec_t>(kMostKeptSeconds * 1e6), &format));
-    buffer.fragsize = static_cast<std::uint32_t>(pa_usec_to_bytes(static_cast<pa_usec_t>(kFragmentSeconds * 1e6), &format));
+    buffer.maxlength = static_cast<std::uint32_t>(pa_usec_to_bytes(static_cast<pa_usec_t>(kMostKeptSeconds * 1e6), &format_));
+    buffer.fragsize = static_cast<std::uint32_t>(pa_usec_to_bytes(static_cast<pa_usec_t>(kFragmentSeconds * 1e6), &format_));
     buffer.tlength = buffer.prebuf = buffer.minreq = static_cast<std::uint32_t>(-1);
     constexpr int kFlags = PA_STREAM_DONT_MOVE | PA_STREAM_ADJUST_LATENCY | PA_STREAM_AUTO_TIMING_UPDATE |
-                           PA_STREAM_INTERPOLATE_TIMING | PA_STREAM_DONT_INHIBIT_AUTO_SUSPEND;
+                           PA_STREAM_DONT_INHIBIT_AUTO_SUSPEND;
     if (pa_stream_connect_record(stream_.get(), nullptr, &buffer, static_cast<pa_stream_flags_t>(kFlags)) < 0) end();
 }
 
@@ -104,11 +110,6 @@ void TappedStream::stateChanged() {
     if (state == PA_STREAM_READY) {
         state_ = State::Ready;
         readySince_ = std::chrono::steady_clock::now();
-        // So that the first sound can be placed. It waits in the library until then.
-        if (pa_operation* const operation = pa_stream_update_timing_info(stream_.get(), [](pa_stream*, int, void* self) {
-                static_cast<TappedStream*>(self)->hear();
-            }, this))
-            pa_operation_unref(operation);
         changed_();
     } else if (!PA_STREAM_IS_GOOD(state)) {
         end();
@@ -116,26 +117,76 @@ void TappedStream::stateChanged() {
     }
 }
 
+void TappedStream::took(HostTime origin) {
+    const HostTime now = LinuxClock::currentHostTime();
+    if (account_ == Account::AtAnyTime) origin_.forget();
+    origin_.take(now, origin);
+    zero_ = *origin_.origin();
+}
+
+void TappedStream::askWhen() {
+    isAsking_ = true;
+    if (pa_operation* const operation = pa_stream_update_timing_info(
+            stream_.get(),
+            [](pa_stream*, int success, void* self) {
+                if (success == 0) static_cast<TappedStream*>(self)->isAsking_ = false;
+            },
+            this))
+        pa_operation_unref(operation);
+    else
+        isAsking_ = false;
+}
+
+void TappedStream::timingCame() {
+    isAsking_ = false;
+    const pa_timing_info* const timing = pa_stream_get_timing_info(stream_.get());
+    if (!timing || timing->write_index_corrupt || timing->write_index < 0) return;
+    // At that moment of wall time as many bytes had been written as the server says, and the last of them was heard
+    // the source's latency before, or the output's after. The library's own estimate is smoothed: it takes many
+    // seconds to come near.
+    timeval wallTime{};
+    const std::int64_t age = static_cast<std::int64_t>(pa_timeval_diff(pa_gettimeofday(&wallTime), &timing->timestamp));
+    const auto limited = [](pa_usec_t value) { return static_cast<std::int64_t>(std::min(value, kLongestLatency)); };
+    const auto written =
+        static_cast<std::int64_t>(pa_bytes_to_usec(static_cast<std::uint64_t>(timing->write_index), &format_));
+    latency_ = limited(timing->source_usec) - limited(timing->sink_usec);
+    const std::int64_t since = std::min<std::int64_t>(age, 60'000'000) + written + latency_;
+    took(HostTime{LinuxClock::currentHostTime().nanoseconds - since * 1000});
+    takeIn();
+}
+
 void TappedStream::hear() {
-    if (!isReady()) return;
+    const HostTime now = LinuxClock::currentHostTime();
+    // After an interruption nobody knows when this was heard. It waits in the library for the answer.
+    const bool isInterrupted = now.nanoseconds - lastHeard_.nanoseconds > kInterruption;
+    lastHeard_ = now;
+    if (isInterrupted && !isAsking_) origin_.forget();
+    if (!origin_.origin() && !isAsking_) askWhen();
+    if (!isAsking_) takeIn();
+}
+
+void TappedStream::takeIn() {
+    if (!isReady() || !origin_.origin() || pa_stream_readable_size(stream_.get()) == 0) return;
+    if (const pa_timing_info* const timing = pa_stream_get_timing_info(stream_.get());
+        account_ == Account::AtEachPiece && timing && timing->read_index >= 0) {
+        const auto arrived = static_cast<std::uint64_t>(timing->read_index) + pa_stream_readable_size(stream_.get());
+        const auto since = static_cast<std::int64_t>(pa_bytes_to_usec(arrived, &format_)) + latency_;
+        took(HostTime{LinuxClock::currentHostTime().nanoseconds - since * 1000});
+    }
     while (true) {
-        // When the first frame that was not taken was heard: so long ago, or in so long.
-        pa_usec_t latency = 0;
-        int isAhead = 0;
-        if (pa_stream_get_latency(stream_.get(), &latency, &isAhead) < 0) return;
+        const pa_timing_info* const timing = pa_stream_get_timing_info(stream_.get());
         const void* data = nullptr;
         std::size_t bytes = 0;
-        if (pa_stream_peek(stream_.get(), &data, &bytes) < 0 || bytes == 0) return;
-        const auto away = static_cast<std::int64_t>(std::min<pa_usec_t>(latency, 3'600'000'000u)) * 1000;
-        const HostTime now = LinuxClock::currentHostTime();
-        const HostTime heard{now.nanoseconds + (isAhead ? away : -away)};
-        const std::size_t frameBytes = playback_.positions.size() * sizeof(float);
-        const auto frames = static_cast<std::int64_t>(bytes / frameBytes);
-        const auto piece = position_.place(mix_->frameAt(heard), frames);
+        if (!timing || timing->read_index < 0 || pa_stream_peek(stream_.get(), &data, &bytes) < 0 || bytes == 0) return;
+        const auto read = static_cast<std::int64_t>(
+            pa_bytes_to_usec(static_cast<std::uint64_t>(timing->read_index), &format_));
+        const std::size_t inputs = format_.channels;
+        const auto frames = static_cast<std::int64_t>(bytes / (inputs * sizeof(float)));
+        const auto piece = position_.place(mix_->frameAt(HostTime{zero_.nanoseconds + read * 1000}), frames);
         // Without data it is a hole: time passes, and there is silence.
         if (data) {
-            mixDown_.mix({static_cast<const float*>(data), static_cast<std::size_t>(frames) * playback_.positions.size()},
-                         piece.frames, mixed_);
+            mixDown_.mix({static_cast<const float*>(data), static_cast<std::size_t>(frames) * inputs}, piece.frames,
+                         mixed_);
             mix_->write(*lane_, piece.frame, mixed_);
         }
         pa_stream_drop(stream_.get());

@@ -9,6 +9,7 @@
 
 #include "linux/audio/MixDown.h"
 #include "linux/audio/PulseConnection.h"
+#include "linux/audio/StreamOrigin.h"
 #include "linux/audio/StreamPosition.h"
 #include "linux/audio/TapMix.h"
 #include "linux/audio/TapSelection.h"
@@ -19,10 +20,14 @@ namespace lumacast::sound {
 /// trust(). Belongs to the sound thread.
 class TappedStream final {
 public:
+    /// What the server's account of the time is worth. PulseAudio knows at any time what was heard. PipeWire counts only
+    /// what it has delivered, in pieces of many milliseconds: it is right when one has just come, and late otherwise.
+    enum class Account : std::uint8_t { AtAnyTime, AtEachPiece };
+
     /// `changed` is told when the stream has become ready and when it has ended by itself; it may not destroy the
     /// stream.
-    TappedStream(const PulseServer& server, const ListedPlayback& playback, std::shared_ptr<TapMix> mix,
-                 std::function<void()> changed);
+    TappedStream(const PulseServer& server, const ListedPlayback& playback, Account account,
+                 std::shared_ptr<TapMix> mix, std::function<void()> changed);
     /// What was heard up to now and is trusted is still read.
     ~TappedStream();
     TappedStream(const TappedStream&) = delete;
@@ -44,9 +49,14 @@ private:
 
     void stateChanged();
     void end();
+    void askWhen();
+    void timingCame();
+    void took(HostTime origin);
     void hear();
+    void takeIn();
 
     const ListedPlayback playback_;
+    const Account account_;
     const std::shared_ptr<TapMix> mix_;
     const std::function<void()> changed_;
     const MixDown mixDown_;
@@ -54,6 +64,12 @@ private:
     StreamPosition position_;
     State state_ = State::Connecting;
     std::chrono::steady_clock::time_point readySince_;
+    pa_sample_spec format_{};
+    StreamOrigin origin_;
+    HostTime zero_;            ///< when the recording's first frame was heard, as far as we know
+    std::int64_t latency_ = 0; ///< in microseconds: of what has come, by the server's last account
+    HostTime lastHeard_;   ///< when sound came last
+    bool isAsking_ = false;
     std::vector<float> mixed_;
     StreamHandle stream_;
 };
