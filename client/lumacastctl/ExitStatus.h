@@ -10,6 +10,8 @@ enum ExitStatus : int {
     kNoAnswer = 1,
     kWrongUsage = 2,
     kProblemsFound = 3,
+    kNotSaved = 4,
+    kLeftToTheDaemon = 5,
 };
 
 struct ExitStatusRow {
@@ -21,10 +23,13 @@ struct ExitStatusRow {
 inline constexpr std::array kExitStatuses{
     ExitStatusRow{kGood, "all is well; or a watch was ended with Ctrl-C (SIGINT) or SIGTERM"},
     ExitStatusRow{kNoAnswer,
-                  "the daemon isn't running, does not answer, or ended during a watch (status, storage), or the output "
-                  "could not be written"},
+                  "the daemon isn't running, does not answer, or ended during a watch or a save (status, storage, save), "
+                  "or the output could not be written"},
     ExitStatusRow{kWrongUsage, "wrong usage"},
     ExitStatusRow{kProblemsFound, "the doctor found problems; warnings alone are none"},
+    ExitStatusRow{kNotSaved, "the movie could not be saved"},
+    ExitStatusRow{kLeftToTheDaemon,
+                  "Ctrl-C (SIGINT) or SIGTERM came before the daemon had saved the movie; it goes on"},
 };
 
 /// The table as --help shows it.

@@ -14,6 +14,7 @@
 
 #include "client/lumacastctl/ExitStatus.h"
 #include "client/lumacastctl/doctor/Doctor.h"
+#include "client/lumacastctl/save/SaveCommand.h"
 #include "client/lumacastctl/status/StatusCommand.h"
 #include "client/lumacastctl/storage/StorageCommand.h"
 #include "linux/system/IniFile.h"
@@ -37,10 +38,14 @@ std::string whyNoPid(const std::string& text) {
 /// For a watch: each block was written whole before, so there is nothing to end but the process.
 extern "C" void endWatch(int) { ::_exit(kGood); }
 
-int runWatch(const std::string& directory, Form form) {
+void onEndSignals(void (*handler)(int)) {
     struct sigaction action {};
-    action.sa_handler = endWatch;
+    action.sa_handler = handler;
     for (const int signal : {SIGINT, SIGTERM}) ::sigaction(signal, &action, nullptr);
+}
+
+int runWatch(const std::string& directory, Form form) {
+    onEndSignals(endWatch);
     // A block, short enough, is one write.
     std::setvbuf(stdout, nullptr, _IOFBF, 1 << 16);
     auto next = std::chrono::steady_clock::now();
@@ -52,6 +57,29 @@ int runWatch(const std::string& directory, Form form) {
     };
     const Screen screen = ::isatty(STDOUT_FILENO) == 1 ? Screen::Terminal : Screen::Plain;
     return watchStatus(directory, form, screen, stdout, stderr, nextRound);
+}
+
+extern "C" void leaveSave(int) {
+    static constexpr char kText[] =
+        "lumacastctl: the daemon goes on saving the movie; `lumacastctl status --json` tells how far it is.\n";
+    (void)!::write(STDERR_FILENO, kText, sizeof kText - 1);
+    ::_exit(kLeftToTheDaemon);
+}
+
+/// The line with the bar stays, and ends.
+extern "C" void leaveSaveOnTerminal(int signal) {
+    (void)!::write(STDERR_FILENO, "\n", 1);
+    leaveSave(signal);
+}
+
+int runSave(const std::string& directory, const std::string& file, Form form) {
+    const Screen screen = ::isatty(STDERR_FILENO) == 1 ? Screen::Terminal : Screen::Plain;
+    const auto begun = [screen] { onEndSignals(screen == Screen::Terminal ? leaveSaveOnTerminal : leaveSave); };
+    const auto nextRound = [] {
+        std::this_thread::sleep_for(std::chrono::milliseconds(200));
+        return true;
+    };
+    return saveMovie(directory, moviePath(file), form, screen, stdout, stderr, begun, nextRound);
 }
 
 int runDoctor(const IdentityQuestion& question) {
@@ -103,6 +131,13 @@ int main(int argc, char** argv) {
     std::int32_t urgency = 0;
     purge->add_option("URGENCY", urgency, "How short space is: 1, 2 or 3")->required()->check(CLI::Range(1, 1000));
 
+    CLI::App* save = app.add_subcommand(
+        "save", "Save a movie to the Videos folder, its sounds mixed into one; the file that is given is removed");
+    save->footer(exitStatuses);
+    std::string movie;
+    save->add_option("FILE", movie, "The movie")->required();
+    save->add_flag("--json", json, "Answer lines of JSON");
+
     try {
         app.parse(argc, argv);
     } catch (const CLI::ParseError& error) {
@@ -122,6 +157,8 @@ int main(int argc, char** argv) {
                                                        : StoragePart::All;
         result = purge->parsed() ? purgeStorage(directory, urgency, form, stdout, stderr)
                                  : showStorage(directory, part, form, stdout, stderr);
+    } else if (save->parsed()) {
+        result = runSave(LinuxEnvironment::ofThisProcess().runtimeDirectory, movie, json ? Form::Json : Form::Text);
     } else {
         IdentityQuestion question;
         if (byProgram->count() > 0) question.executable = executable;

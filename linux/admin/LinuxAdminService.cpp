@@ -28,7 +28,8 @@ namespace {
 using Moment = std::chrono::steady_clock::time_point;
 
 constexpr std::size_t kMaximumPeers = 8;
-constexpr std::size_t kMaximumRequest = 128;
+/// A command with a path of 4096 bytes, each written as three.
+constexpr std::size_t kMaximumRequest = 16 * 1024;
 
 using Commands = std::map<std::string, AdminCommand, std::less<>>;
 

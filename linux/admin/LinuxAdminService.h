@@ -19,7 +19,7 @@ namespace lumacast {
 /// connection is closed. A command's name, with its arguments behind it, is answered by the command, `status` by
 /// the whole snapshot, any other word by the snapshot's entry of that name; what can't be answered is {"error":
 /// "..."}. Only the daemon's own user and root are heard (by the kernel's word). At most 8 peers at a time, a line
-/// of at most 128 bytes, and a limit for every wait; one thread serves them all and never holds the daemon up.
+/// of at most 16 KiB, and a limit for every wait; one thread serves them all and never holds the daemon up.
 class LinuxAdminService final : public AdminService {
 public:
     struct Limits {

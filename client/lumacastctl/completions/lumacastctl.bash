@@ -7,7 +7,7 @@ _lumacastctl() {
         given=${COMP_WORDS[i]}
         case $given in
             -*) ;;
-            status | doctor | storage) [ -z "$command" ] && command=$given ;;
+            status | doctor | storage | save) [ -z "$command" ] && command=$given ;;
             list | purgeable | purge) [ "$command" = storage ] && [ -z "$part" ] && part=$given ;;
         esac
     done
@@ -15,17 +15,23 @@ _lumacastctl() {
     case $command:$before in
         doctor:--exe)
             compopt -o filenames 2>/dev/null
-            COMPREPLY=($(compgen -f -- "$word"))
+            mapfile -t COMPREPLY < <(compgen -f -- "$word")
             return ;;
         doctor:--pid)
             COMPREPLY=($(compgen -W "$(command ps -eo pid= 2>/dev/null)" -- "$word"))
             return ;;
     esac
+    if [ "$command" = save ] && [[ $word != -* ]] && [ -n "$word" ]; then
+        compopt -o filenames 2>/dev/null
+        mapfile -t COMPREPLY < <(compgen -f -- "$word")
+        return
+    fi
     local words
     case $command:$part in
-        :) words='status doctor storage -h --help' ;;
+        :) words='status doctor storage save -h --help' ;;
         status:) words='--json --watch -h --help' ;;
         doctor:) words='--pid --exe -h --help' ;;
+        save:) words='--json -h --help' ;;
         storage:) words='list purgeable purge --json -h --help' ;;
         storage:purge) words='1 2 3 --json -h --help' ;;
         storage:*) words='--json -h --help' ;;

@@ -6,6 +6,10 @@ complete -c lumacastctl -s h -l help -d 'Print help'
 complete -c lumacastctl -n __fish_use_subcommand -a status -d 'Show the applications and the running recording'
 complete -c lumacastctl -n __fish_use_subcommand -a doctor -d 'Look at all that recording takes'
 complete -c lumacastctl -n __fish_use_subcommand -a storage -d 'Show the temporary movies, or have old ones deleted'
+complete -c lumacastctl -n __fish_use_subcommand -a save -d 'Save a movie to the Videos folder'
+
+complete -c lumacastctl -n '__fish_seen_subcommand_from save' -F
+complete -c lumacastctl -n '__fish_seen_subcommand_from save' -l json -d 'Answer lines of JSON'
 
 complete -c lumacastctl -n '__fish_seen_subcommand_from status' -l json -d 'Answer one line of JSON'
 complete -c lumacastctl -n '__fish_seen_subcommand_from status' -l watch -d 'Show the running recordings, anew each second'

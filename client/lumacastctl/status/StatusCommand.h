@@ -16,9 +16,6 @@ inline constexpr std::chrono::seconds kStatusLimit{4};
 int showStatus(const std::string& runtimeDirectory, Form form, std::FILE* out, std::FILE* complaints,
                std::chrono::milliseconds limit = kStatusLimit);
 
-/// A terminal shows one block, always the newest; anything else gets block after block, without escape codes.
-enum class Screen { Terminal, Plain };
-
 /// `lumacastctl status --watch`: a block of the running recordings, each in one write, then another whenever
 /// `nextRound` returns true. Answers kGood when that returns false, kNoAnswer once the daemon has gone (`complaints`
 /// gets why) or `out` takes no more. A daemon that is busy is waited for: its block says so.

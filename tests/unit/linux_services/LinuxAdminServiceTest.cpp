@@ -99,8 +99,8 @@ TEST(LinuxAdminService, ALineMayComeInPiecesAndWithMoreBehindIt) {
 
 TEST(LinuxAdminService, ALineTooLongIsRefused) {
     RunningDaemon daemon;
-    EXPECT_EQ(daemon.converse(std::string(129, 'x')), "{\"error\":\"the request is too long\"}\n");
-    EXPECT_EQ(daemon.converse(std::string(128, 'x') + "\n"), "{\"error\":\"unknown request\"}\n");
+    EXPECT_EQ(daemon.converse(std::string(16 * 1024 + 1, 'x')), "{\"error\":\"the request is too long\"}\n");
+    EXPECT_EQ(daemon.converse(std::string(16 * 1024, 'x') + "\n"), "{\"error\":\"unknown request\"}\n");
     EXPECT_EQ(daemon.ask("status"), kStatus);
 }
 

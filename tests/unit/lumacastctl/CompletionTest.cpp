@@ -83,8 +83,9 @@ private:
 
 TEST_F(Completion, TheHelpIsReadAsItStands) {
     const auto all = helps();
-    EXPECT_EQ(all.size(), 7u);
-    EXPECT_THAT(all.at({}), UnorderedElementsAre("-h", "--help", "status", "doctor", "storage"));
+    EXPECT_EQ(all.size(), 8u);
+    EXPECT_THAT(all.at({}), UnorderedElementsAre("-h", "--help", "status", "doctor", "storage", "save"));
+    EXPECT_THAT(all.at({"save"}), UnorderedElementsAre("-h", "--help", "--json"));
     EXPECT_THAT(all.at({"status"}), UnorderedElementsAre("-h", "--help", "--json", "--watch"));
     EXPECT_THAT(all.at({"storage"}), UnorderedElementsAre("-h", "--help", "--json", "list", "purgeable", "purge"));
 }
@@ -131,6 +132,9 @@ TEST_F(Completion, BashCompletesBegunWordsAndValues) {
     EXPECT_THAT(bashOffers({"storage", "--json", "purg"}), UnorderedElementsAre("purgeable", "purge"));
     EXPECT_THAT(bashOffers({"storage", "purge", "3"}), ElementsAre("3"));
     EXPECT_THAT(bashOffers({"nonsense", "x"}), ElementsAre());
+    scratch_.write("movies/a movie.mp4", "");
+    EXPECT_THAT(bashOffers({"save", scratch_.path("movies/a")}), ElementsAre(scratch_.path("movies/a movie.mp4")));
+    EXPECT_THAT(bashOffers({"save", "--j"}), ElementsAre("--json"));
     scratch_.write("programs/player", "");
     EXPECT_THAT(bashOffers({"doctor", "--exe", scratch_.path("programs/pl")}),
                 ElementsAre(scratch_.path("programs/player")));

@@ -48,10 +48,10 @@ protected:
         return finish(start(arguments, output), output.empty());
     }
 
-    /// Starts it, with its output into a file (or a device, when one is named).
-    pid_t start(std::vector<std::string> arguments, const std::string& output = {}) {
+    /// Starts it, with its output and its complaints into files (or devices, when they are named).
+    pid_t start(std::vector<std::string> arguments, const std::string& output = {}, const std::string& device = {}) {
         const std::string out = output.empty() ? scratch_.path("out") : output;
-        const std::string complaints = scratch_.path("complaints");
+        const std::string complaints = device.empty() ? scratch_.path("complaints") : device;
         arguments.insert(arguments.begin(), kTool);
         std::vector<char*> words, variables;
         for (std::string& word : arguments) words.push_back(word.data());

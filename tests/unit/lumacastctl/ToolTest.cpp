@@ -74,6 +74,9 @@ TEST_F(Tool, TellsWrongUsageFromEverythingElse) {
                                                       {"storage", "purge", "-3"},
                                                       {"storage", "purge", "much"},
                                                       {"storage", "purge", "3", "4"},
+                                                      {"save"},
+                                                      {"save", "a.mp4", "b.mp4"},
+                                                      {"save", "--watch", "a.mp4"},
                                                       {"doctor", "--pid", "0"},
                                                       {"doctor", "--pid", "-4"},
                                                       {"doctor", "--pid", "many"},
@@ -93,7 +96,8 @@ TEST_F(Tool, DocumentsItsExitStatuses) {
         EXPECT_THAT(readme, HasSubstr("| " + std::to_string(row.status) + " | " + row.meaning + " |\n"));
     for (const std::vector<std::string>& arguments :
          {std::vector<std::string>{"--help"}, {"status", "--help"}, {"doctor", "--help"}, {"storage", "--help"},
-          {"storage", "list", "--help"}, {"storage", "purgeable", "--help"}, {"storage", "purge", "--help"}}) {
+          {"save", "--help"}, {"storage", "list", "--help"}, {"storage", "purgeable", "--help"},
+          {"storage", "purge", "--help"}}) {
         const Outcome result = run(arguments);
         EXPECT_EQ(result.status, 0);
         EXPECT_THAT(result.out, HasSubstr(exitStatusText() + "\n"));
