@@ -34,6 +34,10 @@ std::optional<Error> discardAnswer(const Error* error, const Array&) {
     return error ? std::optional(*error) : std::nullopt;
 }
 
+std::optional<Error> saveAnswer(const Error* error, const Array& values) {
+    return error ? std::optional(*error) : errorIn(values[0]);
+}
+
 StateAnswer stateAnswer(const Error* error, const Array& values) {
     if (error) return {std::nullopt, *error};
     const Dictionary* state = values[0].as<Dictionary>();
@@ -95,6 +99,10 @@ void Recorder::discard(std::function<void(std::optional<Error>)> answered) {
     link_->ask(DaemonMessage::DiscardRecording, {}, read(discardAnswer, std::move(answered)));
 }
 
+void Recorder::save(const URL& movie, std::function<void(std::optional<Error>)> answered) {
+    link_->ask(DaemonMessage::SaveVideoToCameraRoll, {movie}, read(saveAnswer, std::move(answered)));
+}
+
 void Recorder::state(std::function<void(StateAnswer)> answered) {
     link_->ask(DaemonMessage::SynchronousGetCurrentState, {}, read(stateAnswer, std::move(answered)));
 }
@@ -146,6 +154,10 @@ StopAnswer Recorder::stopWithClipAndWait(double fromStart, double fromEnd, std::
 
 std::optional<Error> Recorder::discardAndWait(std::chrono::milliseconds limit) {
     return waitFor(*link_, limit, discardAnswer, [&](auto answered) { discard(std::move(answered)); });
+}
+
+std::optional<Error> Recorder::saveAndWait(const URL& movie, std::chrono::milliseconds limit) {
+    return waitFor(*link_, limit, saveAnswer, [&](auto answered) { save(movie, std::move(answered)); });
 }
 
 StateAnswer Recorder::stateAndWait(std::chrono::milliseconds limit) {

@@ -42,7 +42,7 @@ inline constexpr std::chrono::milliseconds kPatience = std::chrono::seconds(60);
 ///
 /// Movies: the file that a StopAnswer names stays until the application's next start (a clip: until its next clip), its
 /// discard() (not a clip), or a day has passed; or until the device runs out of space (below 100 MB free, or by the
-/// administrator's purge). Copy it or open it before; an opened file stays readable.
+/// administrator's purge). Copy it, open it or have it saved before; an opened file stays readable.
 ///
 /// Destroying the recorder ends a running recording and throws it away, answers what is pending with Closed and waits
 /// for the handler that is running. From within a handler it does all that but the waiting. No handler runs after it.
@@ -67,6 +67,13 @@ public:
     void stopWithClip(double fromStart, double fromEnd, std::function<void(StopAnswer)> answered);
     /// Deletes the last movie, but not a clip of it. Not answered while recording.
     void discard(std::function<void(std::optional<Error>)> answered);
+    /// Saves a finished movie to the user's library (the folder Lumacast in the Videos folder), its sound tracks mixed
+    /// into one; where that can't be done, as it is. The movie is the daemon's own (a StopAnswer's) or a file that the
+    /// user may read and remove. The file is removed, also after a failure: afterwards the copy in the library is all
+    /// there is. Answered with none once it is in the library; FailedToSave when it is not (for a file that the user may
+    /// not touch nothing was removed), or a connection error. Takes as long as encoding the movie anew, and goes on when
+    /// the connection ends.
+    void save(const URL& movie, std::function<void(std::optional<Error>)> answered);
     /// The application's state as the daemon has it; see RecordingState. It comes after the effect of all that was
     /// asked before.
     void state(std::function<void(StateAnswer)> answered);
@@ -101,6 +108,7 @@ public:
     StopAnswer stopAndWait(std::chrono::milliseconds limit = kPatience);
     StopAnswer stopWithClipAndWait(double fromStart, double fromEnd, std::chrono::milliseconds limit = kPatience);
     std::optional<Error> discardAndWait(std::chrono::milliseconds limit = kPatience);
+    std::optional<Error> saveAndWait(const URL& movie, std::chrono::milliseconds limit = kNoLimit);
     StateAnswer stateAndWait(std::chrono::milliseconds limit = kNoLimit);
 
     /// "$XDG_RUNTIME_DIR/lumacast", or "/run/user/UID/lumacast" without that variable.

@@ -42,25 +42,31 @@ protected:
 struct Questions {
     Answers<StartAnswer> start;
     Answers<StopAnswer> stop, clip;
-    Answers<std::optional<Error>> discard;
+    Answers<std::optional<Error>> save, discard;
     Answers<StateAnswer> state;
 
     void askAll(Recorder& recorder) {
         recorder.start({}, start.handler());
         recorder.stop(stop.handler());
         recorder.stopWithClip(1, 1, clip.handler());
+        recorder.save(URL::file("/m.mp4"), save.handler());
         recorder.discard(discard.handler());
         recorder.state(state.handler());
     }
-    int total() const { return start.total() + stop.total() + clip.total() + discard.total() + state.total(); }
+    static constexpr int kAll = 6;
+    int total() const {
+        return start.total() + stop.total() + clip.total() + save.total() + discard.total() + state.total();
+    }
     bool eachOnce() const {
-        return start.eachOnce() && stop.eachOnce() && clip.eachOnce() && discard.eachOnce() && state.eachOnce();
+        return start.eachOnce() && stop.eachOnce() && clip.eachOnce() && save.eachOnce() && discard.eachOnce() &&
+               state.eachOnce();
     }
     void expectAll(const std::string& key) const {
         EXPECT_TRUE(eachOnce());
         EXPECT_EQ(keyIn(start.last().error), key);
         EXPECT_EQ(keyIn(stop.last().error), key);
         EXPECT_EQ(keyIn(clip.last().error), key);
+        EXPECT_EQ(keyIn(save.last()), key);
         EXPECT_EQ(keyIn(discard.last()), key);
         EXPECT_EQ(keyIn(state.last().error), key);
     }
@@ -69,11 +75,14 @@ struct Questions {
 TEST_F(ClientAnswers, OfAnIdleServiceComeWithTheirValues) {
     const Error declined(std::string(kRecordingErrorDomain), -5801,
                          {{std::string(kLocalizedDescriptionKey), "The user said no."}});
-    const auto daemon = service([&](DaemonMessage message, const Array&, const IpcReply& reply) {
+    const Error failed(std::string(kRecordingErrorDomain), -5812);
+    const auto daemon = service([&](DaemonMessage message, const Array& arguments, const IpcReply& reply) {
         switch (message) {
             case DaemonMessage::StartRecording: return reply({Value(declined), true, false});
             case DaemonMessage::StopRecording: return reply({URL::file("/m.mp4"), Value()});
             case DaemonMessage::StopRecordingWithClipDurations: return reply({Value(), Value(declined)});
+            case DaemonMessage::SaveVideoToCameraRoll:
+                return reply({arguments[0] == Value(URL::file("/m.mp4")) ? Value() : Value(failed)});
             case DaemonMessage::DiscardRecording: return reply({});
             case DaemonMessage::SynchronousGetCurrentState:
                 return reply({Dictionary{{"isRecording", true}, {"broadcastURL", URL("https://x")}}});
@@ -89,6 +98,8 @@ TEST_F(ClientAnswers, OfAnIdleServiceComeWithTheirValues) {
     EXPECT_FALSE(start.cameraRecording);
     EXPECT_EQ(recorder.stopAndWait().movie, URL::file("/m.mp4"));
     EXPECT_EQ(keyIn(recorder.stopWithClipAndWait(1, 2).error), "RECORDING_ERROR_USER_DECLINED");
+    EXPECT_EQ(recorder.saveAndWait(URL::file("/m.mp4")), std::nullopt);
+    EXPECT_EQ(keyIn(recorder.saveAndWait(URL::file("/other.mp4"))), "RECORDING_ERROR_FAILED_TO_SAVE");
     EXPECT_EQ(recorder.discardAndWait(), std::nullopt);
     const StateAnswer state = recorder.stateAndWait();
     ASSERT_TRUE(state.state);
@@ -97,10 +108,11 @@ TEST_F(ClientAnswers, OfAnIdleServiceComeWithTheirValues) {
     EXPECT_EQ(client::recordingState(*state.state).broadcastURL, URL("https://x"));
 
     const auto received = daemon->received();
-    ASSERT_EQ(received.size(), 5u);
+    ASSERT_EQ(received.size(), 7u);
     EXPECT_EQ(received[0].arguments, (Array{Array{std::uint64_t{7}}, Array{64.0, 48.0}, false, true, false, false,
                                             false, Value()}));
     EXPECT_EQ(received[2].arguments, (Array{1.0, 2.0}));
+    EXPECT_EQ(received[3].arguments, (Array{URL::file("/m.mp4")}));
 }
 
 TEST_F(ClientAnswers, ComeOnceWhenTheDaemonIsKilled) {
@@ -115,7 +127,7 @@ TEST_F(ClientAnswers, ComeOnceWhenTheDaemonIsKilled) {
     EXPECT_EQ(daemon.readLine(), "synchronousGetCurrentState:");
     EXPECT_EQ(questions.total(), 0);
     ::kill(daemon.pid(), SIGKILL);
-    ASSERT_TRUE(waitUntil([&] { return questions.total() >= 5 && comings.all().size() == 2; }));
+    ASSERT_TRUE(waitUntil([&] { return questions.total() >= Questions::kAll && comings.all().size() == 2; }));
     questions.expectAll("CONNECTION_ERROR_LOST");
     EXPECT_THAT(comings.all(), ElementsAre("connected", "disconnected"));
 }
@@ -125,7 +137,7 @@ TEST_F(ClientAnswers, ComeOnceWhenNobodyListens) {
     Recorder recorder(comings.events(), runtime());
     Questions questions;
     questions.askAll(recorder);
-    ASSERT_TRUE(waitUntil([&] { return questions.total() >= 5 && !comings.all().empty(); }));
+    ASSERT_TRUE(waitUntil([&] { return questions.total() >= Questions::kAll && !comings.all().empty(); }));
     questions.expectAll("CONNECTION_ERROR_NOT_REACHED");
     EXPECT_THAT(comings.all(), ElementsAre("disconnected"));
 }
@@ -140,7 +152,7 @@ TEST_F(ClientAnswers, ComeOnceWhenTheSocketIsOneThatNobodyServesAnyMore) {
     Recorder recorder({}, runtime());
     Questions questions;
     questions.askAll(recorder);
-    ASSERT_TRUE(waitUntil([&] { return questions.total() >= 5; }));
+    ASSERT_TRUE(waitUntil([&] { return questions.total() >= Questions::kAll; }));
     questions.expectAll("CONNECTION_ERROR_NOT_REACHED");
 }
 
@@ -150,7 +162,7 @@ TEST_F(ClientAnswers, ComeOnceBeforeTheRecorderIsGone) {
     {
         Recorder recorder({}, runtime());
         questions.askAll(recorder);
-        ASSERT_TRUE(waitUntil([&] { return daemon->received().size() == 5; }));
+        ASSERT_TRUE(waitUntil([&] { return daemon->received().size() == Questions::kAll; }));
         EXPECT_EQ(questions.total(), 0);
     }
     questions.expectAll("CONNECTION_ERROR_CLOSED");
@@ -280,6 +292,7 @@ TEST_F(ClientAnswers, ThatDoNotComeEndACallThatWaits) {
     constexpr std::chrono::milliseconds kSoon{30};
     EXPECT_EQ(keyIn(recorder.stopAndWait(kSoon).error), "CONNECTION_ERROR_NO_ANSWER");
     EXPECT_EQ(keyIn(recorder.stopWithClipAndWait(1, 1, kSoon).error), "CONNECTION_ERROR_NO_ANSWER");
+    EXPECT_EQ(keyIn(recorder.saveAndWait(URL::file("/m.mp4"), kSoon)), "CONNECTION_ERROR_NO_ANSWER");
     EXPECT_EQ(keyIn(recorder.discardAndWait(kSoon)), "CONNECTION_ERROR_NO_ANSWER");
     EXPECT_EQ(keyIn(recorder.startAndWait({}, kSoon).error), "CONNECTION_ERROR_NO_ANSWER");
     EXPECT_EQ(keyIn(recorder.stateAndWait(kSoon).error), "CONNECTION_ERROR_NO_ANSWER");
