@@ -60,6 +60,12 @@ private:
                                        {"sample_rate", track.sampleRate},
                                        {"channels", track.channels},
                                        {"duration_s", seconds(track.duration)}});
+        const auto count = [this](const char* kind, std::size_t tracks, std::optional<std::size_t> wanted) {
+            if (wanted && tracks != *wanted)
+                find("tracks", std::to_string(tracks) + " of " + kind + ", " + std::to_string(*wanted) + " wanted");
+        };
+        count("video", reader_.videoTracks().size(), options_.videoTracks);
+        count("sound", reader_.audioTracks().size(), options_.audioTracks);
         if (options_.leastSeconds && length < *options_.leastSeconds)
             find("duration",
                  std::to_string(length) + " s, at least " + std::to_string(*options_.leastSeconds) + " wanted");

@@ -21,6 +21,7 @@ struct MovieCheckOptions {
     int turnedDegrees = 0;     ///< how far clockwise the pictures were turned
     FrameExpectation frames;
     std::optional<double> leastSeconds, mostSeconds;
+    std::optional<std::size_t> videoTracks, audioTracks;  ///< how many there are
     std::size_t audioTrack = 0;
     std::vector<double> tones;    ///< each heard from beginning to end
     std::vector<double> noTones;  ///< none of them heard anywhere

@@ -58,6 +58,8 @@ int main(int argc, char** argv) {
     app.add_flag("--unfinished", options.unfinished, "the recording was cut off: don't judge the box structure");
     app.add_option("--min-seconds", options.leastSeconds, "shortest duration");
     app.add_option("--max-seconds", options.mostSeconds, "longest duration");
+    app.add_option("--video-tracks", options.videoTracks, "how many video tracks there are");
+    app.add_option("--audio-tracks", options.audioTracks, "how many sound tracks there are");
     app.add_option("--audio-track", options.audioTrack, "which audio track the following look at, 0 is the first");
     app.add_option("--tone", options.tones, "frequency heard from beginning to end");
     app.add_option("--no-tone", options.noTones, "frequency heard nowhere");

@@ -54,7 +54,8 @@ protected:
 TEST_F(CheckMovie, PassesAGoodMovieAndReportsIt) {
     const std::string sheet = folder_.file("sheet.png");
     EXPECT_EQ(run({"--frames-log", log_, "--expect-all", "--expect", "100-129", "--max-hole-ms", "34", "--tone", "440",
-                   "--no-tone", "880", "--min-seconds", "0.9", "--max-seconds", "1.1", "--contact-sheet", sheet}),
+                   "--no-tone", "880", "--video-tracks", "1", "--audio-tracks", "1", "--min-seconds", "0.9",
+                   "--max-seconds", "1.1", "--contact-sheet", sheet}),
               0)
         << errors_;
     EXPECT_EQ(errors_, "");
@@ -90,6 +91,8 @@ TEST_F(CheckMovie, FailsWhenAForbiddenFrameIsThereOrTheWrongToneIsHeard) {
     EXPECT_EQ(run({"--turned", "90"}), 1);
     EXPECT_EQ(run({"--turned", "90", "--allow-unreadable", "30"}), 0) << errors_;
     EXPECT_EQ(run({"--audio-track", "1", "--tone", "440"}), 1);
+    EXPECT_EQ(run({"--video-tracks", "2"}), 1);
+    EXPECT_EQ(run({"--audio-tracks", "0"}), 1);
 }
 
 TEST_F(CheckMovie, FailsOnAFileThatIsCutOffOrMissing) {
