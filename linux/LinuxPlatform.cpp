@@ -73,6 +73,7 @@ public:
                 .serviceUnavailable = endUnreachable}),
           soundServer_(std::make_shared<sound::PulseConnection>()),
           audioInputQueues_(soundServer_, clock_, [this](ProcessID pid) { return applicationOf(pid); }),
+          deviceCapture_(soundServer_, clock_, scheduler_),
           movieFiles_(std::make_shared<media::PosixMovieFiles>(environment.root + std::string(kDeviceTemporaryDirectory))),
           writers_(clock_, movieFiles_),
           exporters_(movieFiles_),
@@ -140,8 +141,8 @@ private:
     LinuxIpc ipc_;
     const std::shared_ptr<sound::PulseConnection> soundServer_;
     LinuxAudioInputQueues audioInputQueues_;
-    const std::shared_ptr<media::MovieFiles> movieFiles_;
     LinuxDeviceCapture deviceCapture_;
+    const std::shared_ptr<media::MovieFiles> movieFiles_;
     LinuxContainerWriters writers_;
     LinuxMovieExporters exporters_;
     LinuxPhotoLibrary photoLibrary_;

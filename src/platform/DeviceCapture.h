@@ -45,9 +45,11 @@ public:
     virtual void observeValueForKeyPath(std::string_view keyPath) = 0;
 };
 
-/// Captures from its inputs to its outputs while it runs. Samples of an audio output are 16-bit PCM, stamped with the
-/// capture clock that is current when the session is started; what is heard while that clock stands still is thrown
-/// away. A device that goes away, or is taken by a stream of higher priority, gives no samples until it is back.
+/// Captures from its inputs to its outputs while it runs. Samples of an audio output are linear PCM, 44100 Hz, one
+/// channel of 16-bit big-endian integers, a few hundredths of a second each, and stamped with the capture clock that is
+/// current when the session is started, each not before the end of the one before; what is heard while that clock
+/// stands still is thrown away, and so is what finds a delegate a second or more behind. A device that goes away, or is
+/// taken by a stream of higher priority, gives no samples until it is back.
 ///
 /// Callable from any lane; waits for nobody. Samples and changes never come inline from an operation. Destroying a
 /// session stops it.
@@ -104,7 +106,8 @@ public:
     /// False for a category or an option that is not known.
     virtual bool setCategory(std::string_view category, std::uint32_t options) = 0;
     /// `handler` is called on a lane of the platform when the audio of this process is interrupted (the device it
-    /// records from is suspended, or taken by a stream of a higher-priority role) and when that is over.
+    /// records from is suspended, taken by a stream of a higher-priority role, or has gone after it was heard) and when
+    /// that is over: when sound comes again, or nothing records any more. The two come in turns.
     [[nodiscard]] virtual std::unique_ptr<Registration> observeInterruptions(InterruptionHandler handler) = 0;
 };
 
@@ -113,7 +116,7 @@ class DeviceCapture {
 public:
     virtual ~DeviceCapture() = default;
     virtual std::shared_ptr<DeviceCaptureSession> makeSession() = 0;
-    /// The default microphone; null where there is none.
+    /// The default microphone, whichever that is while a session runs; null where it is known that there is none.
     virtual std::shared_ptr<CaptureInput> defaultAudioInput() = 0;
     virtual std::shared_ptr<CaptureOutput> makeAudioDataOutput() = 0;
     /// The one of this process.
