@@ -14,7 +14,7 @@ using std::chrono::milliseconds;
 
 constexpr milliseconds kRetry{300}, kWatch{500};
 /// More than one, so that a sound thread that was late itself finds no silence.
-constexpr int kSilentWatches = 3;
+constexpr int kSilentWatches = 6;
 
 }  // namespace
 

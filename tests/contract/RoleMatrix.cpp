@@ -11,7 +11,8 @@ namespace lumacast {
 std::vector<std::string> platformRoles() {
     return {"Scheduler",  "Clock",       "Ipc",         "Bundles",    "RenderServer", "AppStateMonitor",
             "DisplayCapture", "DisplayCloneControl", "ContainerWriter", "MovieExporter", "FileSystem", "Preferences",
-            "DeviceInfo", "Telemetry",   "KeepAlive",   "LogSink",    "AdminService", "StoragePurgeService", "PhotoLibrary"};
+            "DeviceInfo", "Telemetry",   "KeepAlive",   "LogSink",    "AdminService", "StoragePurgeService", "PhotoLibrary",
+            "DeviceCapture"};
 }
 
 RoleMatrix::RoleMatrix(std::vector<std::string> roles, const std::vector<ContractOutcome>& outcomes)

@@ -57,7 +57,7 @@ public:
     }
     bool canAddInput(const std::shared_ptr<CaptureInput>& input) const override {
         const std::lock_guard lock(mutex_);
-        return accepts && input && inputs_.empty();
+        return accepts && dynamic_cast<const FakeCaptureInput*>(input.get()) && inputs_.empty();
     }
     void addInput(const std::shared_ptr<CaptureInput>& input) override {
         if (!canAddInput(input)) return;
@@ -70,7 +70,7 @@ public:
     }
     bool canAddOutput(const std::shared_ptr<CaptureOutput>& output) const override {
         const std::lock_guard lock(mutex_);
-        return accepts && output && outputs_.empty();
+        return accepts && dynamic_cast<const FakeCaptureOutput*>(output.get()) && outputs_.empty();
     }
     void addOutput(const std::shared_ptr<CaptureOutput>& output) override {
         if (!canAddOutput(output)) return;
