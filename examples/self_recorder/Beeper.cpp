@@ -41,7 +41,7 @@ struct Beeper::Lock {
     pa_threaded_mainloop* loop;
 };
 
-Beeper::Beeper(double frequency) : frequency_(frequency), loop_(pa_threaded_mainloop_new()) {
+Beeper::Beeper(double frequency, bool steady) : frequency_(frequency), steady_(steady), loop_(pa_threaded_mainloop_new()) {
     if (!loop_ || pa_threaded_mainloop_start(loop_.get()) < 0) {
         loop_.reset();
         complain("no thread for the sound");
@@ -185,7 +185,11 @@ void Beeper::placeTones(std::int64_t frames) {
 }
 
 void Beeper::render(float* samples, std::int64_t frames) const {
-    std::fill_n(samples, frames * kChannels, 0.0F);
+    for (std::int64_t frame = 0; frame < frames; ++frame) {
+        const double turns = std::fmod(frequency_ * static_cast<double>(written_ + frame) / kRate, 1.0);
+        const float value = steady_ ? kAmplitude * static_cast<float>(std::sin(2 * std::numbers::pi * turns)) : 0.0F;
+        std::fill_n(samples + frame * kChannels, kChannels, value);
+    }
     for (const std::int64_t begin : begins_) {
         const std::int64_t first = std::max<std::int64_t>(0, begin - written_);
         const std::int64_t end = std::min(frames, begin + kToneFrames - written_);

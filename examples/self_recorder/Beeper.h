@@ -20,7 +20,8 @@ class CommandTable;
 /// destructor, which waits for its own thread.
 class Beeper final {
 public:
-    explicit Beeper(double frequency);
+    /// A `steady` one hums at its frequency all the time instead; nothing is to be played at any moment then.
+    explicit Beeper(double frequency, bool steady = false);
     ~Beeper();
     Beeper(const Beeper&) = delete;
     Beeper& operator=(const Beeper&) = delete;
@@ -57,6 +58,7 @@ private:
     void complain(const char* what);
 
     const double frequency_;
+    const bool steady_;
     std::unique_ptr<pa_threaded_mainloop, FreeLoop> loop_;
     pa_context* context_ = nullptr;
     pa_stream* stream_ = nullptr;

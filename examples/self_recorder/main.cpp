@@ -32,7 +32,7 @@ int main(int argc, char** argv) {
     example::Painter::Options painting;
     std::string size = "640x360", name = "self recorder";
     bool part = false;
-    double beepFrequency = 1000;
+    double beepFrequency = 1000, tone = 0;
     options.add_option("--fps", painting.framesPerSecond, "frames per second")->check(CLI::Range(1, 240));
     options.add_option("--size", size, "size of the window, WxH");
     options.add_option("--name", name, "title and class of the window");
@@ -43,6 +43,7 @@ int main(int argc, char** argv) {
                        "mark every so many frames with a white border, and beep when they are shown")
         ->check(CLI::Range(10, 1'000'000));
     options.add_option("--beep-frequency", beepFrequency, "of the beeps, in Hz")->check(CLI::Range(100, 10'000));
+    options.add_option("--tone", tone, "hum a steady tone of so many Hz")->check(CLI::Range(100, 10'000));
     options.add_flag("--part", part, "move only a small part of the scene");
     example::CommandTable commands;
     const auto run = [&] {
@@ -55,7 +56,8 @@ int main(int argc, char** argv) {
         example::Loop loop;
         example::SceneWindow window(width, height, name);
         if (!window.error().empty()) return fail(window.error());
-        std::optional<example::Beeper> beeper;
+        std::optional<example::Beeper> beeper, hum;
+        if (tone > 0) hum.emplace(tone, true);
         if (painting.markEvery > 0) beeper.emplace(beepFrequency);
         painting.onMark = [&beeper](std::int64_t hostTime) { beeper->playAt(hostTime); };
         example::Painter painter(loop, window, painting);

@@ -67,6 +67,8 @@ public:
     World(const World&) = delete;
     World& operator=(const World&) = delete;
 
+    /// One more variable for every process that is started from now on, "NAME=value".
+    void addVariable(const std::string& variable) { environment_.push_back(variable); }
     /// Starts the daemon and waits for its sockets. `variables` are its alone.
     void startDaemon(const std::vector<std::string>& variables = {});
     checkers::Child& daemon() { return *daemon_; }
