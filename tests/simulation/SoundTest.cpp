@@ -260,8 +260,11 @@ private:
                 std::set<std::uint8_t> allowed{player.tone, kSilence};
                 if (player.askedForOthers)
                     for (const Player& other : players_) allowed.insert(other.tone);
-                for (std::size_t i = 1; i < movie.tracks.size(); ++i)
-                    judgeTrack(movie.tracks[i], i == 1 ? allowed : std::set<std::uint8_t>{kVoice, kSilence}, false);
+                // A finished movie has no track of an application that was not tapped at all.
+                for (std::size_t i = 1; i < movie.tracks.size(); ++i) {
+                    const bool isVoice = i == 2 || soundOf(movie.tracks[i], kVoice) > 0;
+                    judgeTrack(movie.tracks[i], isVoice ? std::set<std::uint8_t>{kVoice, kSilence} : allowed, false);
+                }
                 if (movie.tracks.size() < 3) continue;
                 tally_.heard += soundOf(movie.tracks[1], player.tone) > 0 ? 1 : 0;
                 tally_.voices += soundOf(movie.tracks[2], kVoice) > 0 ? 1 : 0;
