@@ -17,6 +17,7 @@ constexpr std::array kTargets{
     Target{"manifest", manifest},
     Target{"messages", messages},
     Target{"preferences", preferences},
+    Target{"sound_server", soundServer},
     Target{"strings_table", stringsTable},
     Target{"values", values},
 };

@@ -29,6 +29,7 @@ void frames(Bytes input);
 void manifest(Bytes input);
 void messages(Bytes input);
 void preferences(Bytes input);
+void soundServer(Bytes input);
 void stringsTable(Bytes input);
 void values(Bytes input);
 

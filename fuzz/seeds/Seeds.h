@@ -12,6 +12,7 @@ void writeSeed(const std::filesystem::path& corpora, const std::string& target, 
 
 void writeFrameSeeds(const std::filesystem::path& corpora);
 void writeMessageSeeds(const std::filesystem::path& corpora);
+void writeSoundServerSeeds(const std::filesystem::path& corpora);
 void writeValueSeeds(const std::filesystem::path& corpora);
 
 }  // namespace lumacast::fuzz

@@ -15,6 +15,7 @@ int main(int argc, char** argv) {
     try {
         lumacast::fuzz::writeFrameSeeds(argv[1]);
         lumacast::fuzz::writeMessageSeeds(argv[1]);
+        lumacast::fuzz::writeSoundServerSeeds(argv[1]);
         lumacast::fuzz::writeValueSeeds(argv[1]);
     } catch (const std::exception& error) {
         std::fprintf(stderr, "fuzz_seeds: %s\n", error.what());

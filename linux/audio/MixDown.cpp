@@ -1,5 +1,7 @@
 #include "linux/audio/MixDown.h"
 
+#include <pulse/channelmap.h>
+
 #include <algorithm>
 
 namespace lumacast::sound {
@@ -16,6 +18,29 @@ float weightOf(Side side, Side output) {
 }
 
 }  // namespace
+
+std::vector<Side> sidesOf(const std::vector<std::int32_t>& positions) {
+    std::vector<Side> sides;
+    for (const std::int32_t position : positions) {
+        switch (position) {
+            case PA_CHANNEL_POSITION_FRONT_LEFT:
+            case PA_CHANNEL_POSITION_REAR_LEFT:
+            case PA_CHANNEL_POSITION_FRONT_LEFT_OF_CENTER:
+            case PA_CHANNEL_POSITION_SIDE_LEFT:
+            case PA_CHANNEL_POSITION_TOP_FRONT_LEFT:
+            case PA_CHANNEL_POSITION_TOP_REAR_LEFT: sides.push_back(Side::Left); break;
+            case PA_CHANNEL_POSITION_FRONT_RIGHT:
+            case PA_CHANNEL_POSITION_REAR_RIGHT:
+            case PA_CHANNEL_POSITION_FRONT_RIGHT_OF_CENTER:
+            case PA_CHANNEL_POSITION_SIDE_RIGHT:
+            case PA_CHANNEL_POSITION_TOP_FRONT_RIGHT:
+            case PA_CHANNEL_POSITION_TOP_REAR_RIGHT: sides.push_back(Side::Right); break;
+            case PA_CHANNEL_POSITION_LFE: sides.push_back(Side::None); break;
+            default: sides.push_back(Side::Middle);
+        }
+    }
+    return sides;
+}
 
 MixDown::MixDown(const std::vector<Side>& sides, std::uint32_t channels)
     : inputs_(sides.size()), outputs_(channels), weights_(sides.size() * channels) {

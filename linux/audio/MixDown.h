@@ -10,6 +10,9 @@ namespace lumacast::sound {
 /// Where a channel is heard.
 enum class Side : std::uint8_t { Left, Right, Middle, None };
 
+/// Where channels at these positions (in the servers' numbering) are heard.
+std::vector<Side> sidesOf(const std::vector<std::int32_t>& positions);
+
 /// Mixes a stream's channels down to one or two: to one, the average of all that are heard somewhere; to two, each side
 /// the average of its own and, weighted less, of the middle. Never louder than the loudest channel. A value.
 class MixDown final {

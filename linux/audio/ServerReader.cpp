@@ -4,6 +4,23 @@
 
 namespace lumacast::sound {
 
+ListedClient listedClient(const pa_client_info& info) {
+    return readClient(info.index, [&info](std::string_view name) -> std::optional<std::string_view> {
+        const char* const text = info.proplist ? pa_proplist_gets(info.proplist, std::string(name).c_str()) : nullptr;
+        return text ? std::optional<std::string_view>(text) : std::nullopt;
+    });
+}
+
+ListedPlayback listedPlayback(const pa_sink_input_info& info) {
+    const bool isUsable =
+        pa_channel_map_valid(&info.channel_map) != 0 && info.channel_map.channels == info.sample_spec.channels;
+    ListedPlayback playback{info.index, info.client, info.sink, {}};
+    if (isUsable)
+        for (std::uint8_t channel = 0; channel < info.channel_map.channels; ++channel)
+            playback.positions.push_back(static_cast<std::int32_t>(info.channel_map.map[channel]));
+    return playback;
+}
+
 void ServerReader::start() {
     listing_ = {};
     listing_.ownClient = pa_context_get_index(&context_);
@@ -43,12 +60,7 @@ void ServerReader::takeServer(pa_context*, const pa_server_info* info, void* sel
 void ServerReader::takeClient(pa_context*, const pa_client_info* info, int end, void* self) {
     auto& reader = *static_cast<ServerReader*>(self);
     if (end != 0) return reader.answered(end > 0);
-    if (!info || reader.listing_.clients.size() >= kMostListed) return;
-    reader.listing_.clients.push_back(
-        readClient(info->index, [info](std::string_view name) -> std::optional<std::string_view> {
-            const char* const text = info->proplist ? pa_proplist_gets(info->proplist, std::string(name).c_str()) : nullptr;
-            return text ? std::optional<std::string_view>(text) : std::nullopt;
-        }));
+    if (info && reader.listing_.clients.size() < kMostListed) reader.listing_.clients.push_back(listedClient(*info));
 }
 
 void ServerReader::takeSink(pa_context*, const pa_sink_info* info, int end, void* self) {
@@ -61,13 +73,8 @@ void ServerReader::takeSink(pa_context*, const pa_sink_info* info, int end, void
 void ServerReader::takePlayback(pa_context*, const pa_sink_input_info* info, int end, void* self) {
     auto& reader = *static_cast<ServerReader*>(self);
     if (end != 0) return reader.answered(end > 0);
-    if (!info || reader.listing_.playbacks.size() >= kMostListed) return;
-    const bool isUsable = pa_channel_map_valid(&info->channel_map) != 0 && info->channel_map.channels == info->sample_spec.channels;
-    ListedPlayback playback{info->index, info->client, info->sink, {}};
-    if (isUsable)
-        for (std::uint8_t channel = 0; channel < info->channel_map.channels; ++channel)
-            playback.positions.push_back(static_cast<std::int32_t>(info->channel_map.map[channel]));
-    reader.listing_.playbacks.push_back(std::move(playback));
+    if (info && reader.listing_.playbacks.size() < kMostListed)
+        reader.listing_.playbacks.push_back(listedPlayback(*info));
 }
 
 void ServerReader::takeRecording(pa_context*, const pa_source_output_info* info, int end, void* self) {

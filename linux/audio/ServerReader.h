@@ -9,6 +9,11 @@
 
 namespace lumacast::sound {
 
+/// What is taken from what the server says of one client, and of one stream that is played. Strangers write it: any
+/// properties, names and channels.
+ListedClient listedClient(const pa_client_info& info);
+ListedPlayback listedPlayback(const pa_sink_input_info& info);
+
 /// Reads the server's lists, one reading at a time. Belongs to the sound thread; destroying it ends a reading.
 class ServerReader final {
 public:

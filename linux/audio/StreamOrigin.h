@@ -8,6 +8,20 @@
 
 namespace lumacast::sound {
 
+/// What a server said of a recording at one moment.
+struct StreamAccount {
+    HostTime now;              ///< the moment at which it is looked at
+    std::uint64_t age = 0;     ///< how long before that it was said; microseconds, as the following
+    std::int64_t frames = 0;   ///< that had been counted by then; more than are ever recorded is taken for nonsense
+    std::uint64_t latency = 0; ///< how long before that the last of them had been heard
+    std::uint64_t delay = 0;   ///< how long after that the last of them is heard
+};
+
+/// When the recording's first frame was heard, by that account; whatever it says, within some years of now.
+HostTime originBy(const StreamAccount& account, double rate);
+/// When frame `frame` is heard of a stream with that origin, under the same limits.
+HostTime momentOf(HostTime origin, std::int64_t frame, double rate);
+
 /// Keeps the moment at which the first frame of a stream was heard. Each account of it may be late, by how long the
 /// answer took and by how much was heard but not counted yet, and none is early: so the earliest one of the last
 /// seconds is the best. Not thread-safe.

@@ -27,7 +27,7 @@ std::int64_t TapMix::frameAt(HostTime moment) const {
 }
 
 std::shared_ptr<SoundLane> TapMix::addLane() {
-    auto lane = std::make_shared<SoundLane>(channels_, laneFrames_);
+    auto lane = std::make_shared<SoundLane>(laneFrames_);
     const std::lock_guard lock(mutex_);
     lanes_.push_back(lane);
     return lane;

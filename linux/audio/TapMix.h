@@ -14,11 +14,10 @@ namespace lumacast::sound {
 /// The last second or so of one stream, by frame number. What was not written is silence. Not thread-safe: the mix's.
 class SoundLane final {
 public:
-    SoundLane(std::uint32_t channels, std::size_t capacityFrames) : channels_(channels), frames_(capacityFrames) {}
+    explicit SoundLane(std::size_t capacityFrames) : frames_(capacityFrames) {}
 
 private:
     friend class TapMix;
-    const std::uint32_t channels_;
     const std::size_t frames_;
     std::vector<float> samples_;  ///< empty until something is written
     std::int64_t begin_ = 0, end_ = 0;  ///< frames that may be other than silence

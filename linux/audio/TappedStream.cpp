@@ -15,32 +15,6 @@ constexpr double kFragmentSeconds = 0.02;
 constexpr double kMostKeptSeconds = 1;
 /// Without sound for so many nanoseconds it was interrupted.
 constexpr std::int64_t kInterruption = 60'000'000;
-/// In microseconds; what a server says beyond it is nonsense.
-constexpr pa_usec_t kLongestLatency = 10'000'000;
-
-std::vector<Side> sidesOf(const std::vector<std::int32_t>& positions) {
-    std::vector<Side> sides;
-    for (const std::int32_t position : positions) {
-        switch (position) {
-            case PA_CHANNEL_POSITION_FRONT_LEFT:
-            case PA_CHANNEL_POSITION_REAR_LEFT:
-            case PA_CHANNEL_POSITION_FRONT_LEFT_OF_CENTER:
-            case PA_CHANNEL_POSITION_SIDE_LEFT:
-            case PA_CHANNEL_POSITION_TOP_FRONT_LEFT:
-            case PA_CHANNEL_POSITION_TOP_REAR_LEFT: sides.push_back(Side::Left); break;
-            case PA_CHANNEL_POSITION_FRONT_RIGHT:
-            case PA_CHANNEL_POSITION_REAR_RIGHT:
-            case PA_CHANNEL_POSITION_FRONT_RIGHT_OF_CENTER:
-            case PA_CHANNEL_POSITION_SIDE_RIGHT:
-            case PA_CHANNEL_POSITION_TOP_FRONT_RIGHT:
-            case PA_CHANNEL_POSITION_TOP_REAR_RIGHT: sides.push_back(Side::Right); break;
-            case PA_CHANNEL_POSITION_LFE: sides.push_back(Side::None); break;
-            default: sides.push_back(Side::Middle);
-        }
-    }
-    return sides;
-}
-
 }  // namespace
 
 TappedStream::TappedStream(const PulseServer& server, const ListedPlayback& playback, Account account,
@@ -117,11 +91,9 @@ void TappedStream::stateChanged() {
     }
 }
 
-void TappedStream::took(HostTime origin) {
-    const HostTime now = LinuxClock::currentHostTime();
+void TappedStream::took(const StreamAccount& account) {
     if (account_ == Account::AtAnyTime) origin_.forget();
-    origin_.take(now, origin);
-    zero_ = *origin_.origin();
+    origin_.take(account.now, originBy(account, format_.rate));
 }
 
 void TappedStream::askWhen() {
@@ -145,13 +117,13 @@ void TappedStream::timingCame() {
     // the source's latency before, or the output's after. The library's own estimate is smoothed: it takes many
     // seconds to come near.
     timeval wallTime{};
-    const std::int64_t age = static_cast<std::int64_t>(pa_timeval_diff(pa_gettimeofday(&wallTime), &timing->timestamp));
-    const auto limited = [](pa_usec_t value) { return static_cast<std::int64_t>(std::min(value, kLongestLatency)); };
-    const auto written =
-        static_cast<std::int64_t>(pa_bytes_to_usec(static_cast<std::uint64_t>(timing->write_index), &format_));
-    latency_ = limited(timing->source_usec) - limited(timing->sink_usec);
-    const std::int64_t since = std::min<std::int64_t>(age, 60'000'000) + written + latency_;
-    took(HostTime{LinuxClock::currentHostTime().nanoseconds - since * 1000});
+    StreamAccount account;
+    account.now = LinuxClock::currentHostTime();
+    account.age = pa_timeval_diff(pa_gettimeofday(&wallTime), &timing->timestamp);
+    account.frames = timing->write_index / static_cast<std::int64_t>(pa_frame_size(&format_));
+    account.latency = latency_ = timing->source_usec;
+    account.delay = delay_ = timing->sink_usec;
+    took(account);
     takeIn();
 }
 
@@ -167,22 +139,21 @@ void TappedStream::hear() {
 
 void TappedStream::takeIn() {
     if (!isReady() || !origin_.origin() || pa_stream_readable_size(stream_.get()) == 0) return;
+    const auto frameBytes = static_cast<std::int64_t>(pa_frame_size(&format_));
     if (const pa_timing_info* const timing = pa_stream_get_timing_info(stream_.get());
-        account_ == Account::AtEachPiece && timing && timing->read_index >= 0) {
-        const auto arrived = static_cast<std::uint64_t>(timing->read_index) + pa_stream_readable_size(stream_.get());
-        const auto since = static_cast<std::int64_t>(pa_bytes_to_usec(arrived, &format_)) + latency_;
-        took(HostTime{LinuxClock::currentHostTime().nanoseconds - since * 1000});
+        account_ == Account::AtEachPiece && timing) {
+        const auto waiting = static_cast<std::int64_t>(pa_stream_readable_size(stream_.get()));
+        took({LinuxClock::currentHostTime(), 0, timing->read_index / frameBytes + waiting / frameBytes, latency_, delay_});
     }
     while (true) {
         const pa_timing_info* const timing = pa_stream_get_timing_info(stream_.get());
         const void* data = nullptr;
         std::size_t bytes = 0;
-        if (!timing || timing->read_index < 0 || pa_stream_peek(stream_.get(), &data, &bytes) < 0 || bytes == 0) return;
-        const auto read = static_cast<std::int64_t>(
-            pa_bytes_to_usec(static_cast<std::uint64_t>(timing->read_index), &format_));
+        if (!timing || pa_stream_peek(stream_.get(), &data, &bytes) < 0 || bytes == 0) return;
+        const HostTime heard = momentOf(*origin_.origin(), timing->read_index / frameBytes, format_.rate);
         const std::size_t inputs = format_.channels;
-        const auto frames = static_cast<std::int64_t>(bytes / (inputs * sizeof(float)));
-        const auto piece = position_.place(mix_->frameAt(HostTime{zero_.nanoseconds + read * 1000}), frames);
+        const auto frames = static_cast<std::int64_t>(bytes) / frameBytes;
+        const auto piece = position_.place(mix_->frameAt(heard), frames);
         // Without data it is a hole: time passes, and there is silence.
         if (data) {
             mixDown_.mix({static_cast<const float*>(data), static_cast<std::size_t>(frames) * inputs}, piece.frames,

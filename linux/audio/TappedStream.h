@@ -51,7 +51,7 @@ private:
     void end();
     void askWhen();
     void timingCame();
-    void took(HostTime origin);
+    void took(const StreamAccount& account);
     void hear();
     void takeIn();
 
@@ -66,8 +66,7 @@ private:
     std::chrono::steady_clock::time_point readySince_;
     pa_sample_spec format_{};
     StreamOrigin origin_;
-    HostTime zero_;            ///< when the recording's first frame was heard, as far as we know
-    std::int64_t latency_ = 0; ///< in microseconds: of what has come, by the server's last account
+    std::uint64_t latency_ = 0, delay_ = 0;  ///< by the server's last account
     HostTime lastHeard_;   ///< when sound came last
     bool isAsking_ = false;
     std::vector<float> mixed_;
