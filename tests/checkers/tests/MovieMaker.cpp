@@ -34,17 +34,27 @@ public:
         file_.reset(raw);
         if (!file_) return "no MP4 muxer";
         if (!addVideo(plan)) return error_;
-        if (plan.soundSeconds > 0 && !addSound()) return error_;
+        if (plan.soundSeconds > 0) {
+            if (!addSound(plan.sound)) return error_;
+            for (const auto& sound : plan.moreSounds)
+                if (!addSound(sound)) return error_;
+        }
         if (!good(avio_open(&file_->pb, path.c_str(), AVIO_FLAG_WRITE), "file")) return error_;
         if (!good(avformat_write_header(file_.get(), nullptr), "header")) return error_;
         for (const PlannedPicture& picture : plan.pictures) encodePicture(plan, picture);
         encode(*video_, *videoStream_, nullptr);
-        if (sound_) encodeSound(plan);
+        for (const SoundTrack& track : sounds_) encodeSound(track, plan.soundSeconds);
         good(av_write_trailer(file_.get()), "trailer");
         return error_;
     }
 
 private:
+    struct SoundTrack {
+        AvOwned<AVCodecContext> encoder;
+        AVStream* stream = nullptr;
+        std::function<float(double seconds)> sound;
+    };
+
     bool good(int status, const char* what) {
         if (status < 0 && error_.empty()) error_ = std::string(what) + ": " + avErrorText(status);
         return error_.empty();
@@ -86,16 +96,17 @@ private:
         return videoStream_ != nullptr && scaler_ != nullptr;
     }
 
-    bool addSound() {
-        sound_ = makeEncoder("aac");
-        if (!sound_) return false;
-        sound_->sample_fmt = AV_SAMPLE_FMT_FLTP;
-        sound_->sample_rate = kSampleRate;
-        sound_->time_base = {1, kSampleRate};
-        sound_->bit_rate = 96'000;
-        sound_->ch_layout = AV_CHANNEL_LAYOUT_STEREO;
-        soundStream_ = open(*sound_, nullptr);
-        return soundStream_ != nullptr;
+    bool addSound(const std::function<float(double seconds)>& sound) {
+        SoundTrack track{makeEncoder("aac"), nullptr, sound};
+        if (!track.encoder) return false;
+        track.encoder->sample_fmt = AV_SAMPLE_FMT_FLTP;
+        track.encoder->sample_rate = kSampleRate;
+        track.encoder->time_base = {1, kSampleRate};
+        track.encoder->bit_rate = 96'000;
+        track.encoder->ch_layout = AV_CHANNEL_LAYOUT_STEREO;
+        track.stream = open(*track.encoder, nullptr);
+        sounds_.push_back(std::move(track));
+        return sounds_.back().stream != nullptr;
     }
 
     void encodePicture(const MoviePlan& plan, const PlannedPicture& picture) {
@@ -113,24 +124,24 @@ private:
         encode(*video_, *videoStream_, frame.get());
     }
 
-    void encodeSound(const MoviePlan& plan) {
-        const auto total = static_cast<std::int64_t>(plan.soundSeconds * kSampleRate);
-        for (std::int64_t start = 0; start < total; start += sound_->frame_size) {
+    void encodeSound(const SoundTrack& track, double seconds) {
+        const auto total = static_cast<std::int64_t>(seconds * kSampleRate);
+        for (std::int64_t start = 0; start < total; start += track.encoder->frame_size) {
             const AvOwned<AVFrame> frame(av_frame_alloc());
             frame->format = AV_SAMPLE_FMT_FLTP;
-            frame->ch_layout = sound_->ch_layout;
+            frame->ch_layout = track.encoder->ch_layout;
             frame->sample_rate = kSampleRate;
-            frame->nb_samples = static_cast<int>(std::min<std::int64_t>(sound_->frame_size, total - start));
+            frame->nb_samples = static_cast<int>(std::min<std::int64_t>(track.encoder->frame_size, total - start));
             frame->pts = start;
             if (!good(av_frame_get_buffer(frame.get(), 0), "block")) return;
             for (int place = 0; place < frame->nb_samples; ++place) {
-                const float value = plan.sound(static_cast<double>(start + place) / kSampleRate);
+                const float value = track.sound(static_cast<double>(start + place) / kSampleRate);
                 for (int channel = 0; channel < 2; ++channel)
                     reinterpret_cast<float*>(frame->extended_data[channel])[place] = value;
             }
-            encode(*sound_, *soundStream_, frame.get());
+            encode(*track.encoder, *track.stream, frame.get());
         }
-        encode(*sound_, *soundStream_, nullptr);
+        encode(*track.encoder, *track.stream, nullptr);
     }
 
     void encode(AVCodecContext& encoder, const AVStream& stream, const AVFrame* frame) {
@@ -146,10 +157,10 @@ private:
     }
 
     std::unique_ptr<AVFormatContext, OutputFree> file_;
-    AvOwned<AVCodecContext> video_, sound_;
+    AvOwned<AVCodecContext> video_;
+    std::vector<SoundTrack> sounds_;
     AvOwned<SwsContext> scaler_;
     AVStream* videoStream_ = nullptr;
-    AVStream* soundStream_ = nullptr;
     std::string error_;
 };
 

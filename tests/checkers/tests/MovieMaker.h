@@ -28,6 +28,7 @@ struct MoviePlan {
     std::vector<PlannedPicture> pictures;
     double soundSeconds = 0;                     ///< no audio track when 0
     std::function<float(double seconds)> sound;  ///< amplitude up to 1
+    std::vector<std::function<float(double seconds)>> moreSounds;  ///< of further audio tracks
 };
 
 /// Consecutive numbers from `first`, at a steady rate from time zero.

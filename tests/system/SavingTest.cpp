@@ -1,0 +1,436 @@
+// Finished movies saved to the user's library by the real daemon, asked over its sockets.
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <mutex>
+#include <set>
+#include <thread>
+
+#include "tests/checkers/ToneChecker.h"
+#include "tests/checkers/check_movie/MovieCheck.h"
+#include "tests/checkers/tests/TestFolder.h"
+#include "tests/client/Heard.h"
+#include "tests/contract/SmallDisk.h"
+#include "tests/system/SavingWorld.h"
+
+namespace lumacast::test {
+namespace {
+
+namespace fs = std::filesystem;
+using checkers::bytesOf;
+using ::testing::Each;
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+
+constexpr std::int64_t kFailedToSave = -5812;
+constexpr char kNotMixed[] = "Error Mixing video Audio tracks";
+/// A user who owns nothing, and whose home is not there.
+constexpr uid_t kNobody = 65534;
+
+/// A save is answered once the removals are asked for.
+bool becomesGone(const std::string& path) {
+    return waitUntil([&] { return !fs::exists(path); });
+}
+
+/// One picture track with every frame, one sound track with all of these tones and none of the others.
+void expectMixed(const std::string& movie, const std::vector<double>& heard, const std::vector<double>& notHeard) {
+    expectAllFrames(movie);
+    checkers::MovieCheckOptions options;
+    options.movie = movie;
+    options.videoTracks = 1;
+    options.audioTracks = 1;
+    options.tones = heard;
+    options.noTones = notHeard;
+    for (const auto& finding : checkers::checkMovie(options).findings) ADD_FAILURE() << finding;
+}
+
+TEST(Saving, AMovieWithTwoSoundTracksHasBothInOneAfterwards) {
+    SavingWorld world;
+    world.startDaemon();
+    const std::string movie = world.makeMovie("two.mp4", {440, 880});
+    EXPECT_EQ(world.save(movie), 0) << world.daemonLog();
+    const std::string saved = world.onlySaved();
+    EXPECT_THAT(saved, HasSubstr("/videos/Lumacast/Recording 20"));
+    expectMixed(saved, {440, 880}, {1500});
+    EXPECT_TRUE(becomesGone(movie)) << "the library's is all there is";
+    EXPECT_TRUE(waitUntil([&] { return world.temporaryFiles().empty(); }));
+    EXPECT_EQ(world.countInLog(kNotMixed), 0u);
+    EXPECT_EQ(world.countInLog("Video saved to camera roll successful"), 1u);
+}
+
+TEST(Saving, AMovieWithOneSoundTrackKeepsIt) {
+    SavingWorld world;
+    world.startDaemon();
+    EXPECT_EQ(world.save(world.makeMovie("one.mp4", {440})), 0);
+    expectMixed(world.onlySaved(), {440}, {880});
+    EXPECT_EQ(world.countInLog(kNotMixed), 0u);
+}
+
+TEST(Saving, AMovieWithoutSoundStaysWithoutSound) {
+    SavingWorld world;
+    world.startDaemon();
+    EXPECT_EQ(world.save(world.makeMovie("none.mp4", {})), 0);
+    const std::string saved = world.onlySaved();
+    expectAllFrames(saved);
+    EXPECT_THAT(checkers::MovieReader(saved).audioTracks(), IsEmpty());
+    EXPECT_EQ(world.countInLog(kNotMixed), 0u);
+}
+
+TEST(Saving, AMovieThatCantBeDecodedIsSavedAsItIs) {
+    SavingWorld world;
+    world.startDaemon();
+    const std::string damaged = world.makeMovie("damaged.mp4", {440, 880});
+    std::vector<char> bytes = bytesOf(damaged);
+    for (std::size_t i = bytes.size() / 4; i < bytes.size() / 2; ++i) bytes[i] = static_cast<char>(i * 37);
+    checkers::writeBytes(damaged, bytes);
+    const std::string cutOff = world.path("movies/cut.mp4"), text = world.path("movies/text.mp4");
+    checkers::writeBytes(cutOff, {bytes.begin(), bytes.begin() + static_cast<std::ptrdiff_t>(bytes.size() / 2)});
+    std::ofstream(text) << "no movie at all";
+
+    std::size_t failures = 0;
+    for (const std::string& movie : {damaged, cutOff, text}) {
+        SCOPED_TRACE(movie);
+        const std::vector<char> before = bytesOf(movie);
+        EXPECT_EQ(world.save(movie), 0);
+        EXPECT_TRUE(bytesOf(world.onlySaved()) == before) << "not a byte is lost";
+        EXPECT_EQ(world.countInLog(kNotMixed), ++failures);
+        EXPECT_TRUE(becomesGone(movie));
+        EXPECT_TRUE(waitUntil([&] { return world.temporaryFiles().empty(); }));
+        fs::remove(world.onlySaved());
+    }
+}
+
+TEST(Saving, AMovieThatIsNotThereFailsAndNothingIsRemoved) {
+    SavingWorld world;
+    world.startDaemon();
+    const std::string other = world.makeMovie("other.mp4", {});
+    std::ofstream(world.temporaryDirectory() + "/Other.mp4") << "x";
+    EXPECT_EQ(world.save(world.path("movies/nothing.mp4")), kFailedToSave);
+    EXPECT_EQ(world.save(world.moviePath()), kFailedToSave) << "nothing was recorded";
+    EXPECT_THAT(world.library(), IsEmpty());
+    EXPECT_TRUE(fs::exists(other));
+    EXPECT_THAT(world.temporaryFiles(), ElementsAre("Other.mp4"));
+}
+
+TEST(Saving, TwoMoviesInTheSameSecondAreBothSaved) {
+    // Both are mixed into a file named for the second. The library's disk does not answer, so that the first one's is
+    // still there when the second is mixed: that one fails, and is saved as it is.
+    SavingWorld world;
+    std::vector<std::string> variables{"LC_DISK=" + world.path("videos")};
+    for (const auto& variable : world.troubledDisk()) variables.push_back(variable);
+    world.startDaemon(variables);
+    const std::string first = world.makeMovie("first.mp4", {440, 880}), second = world.makeMovie("second.mp4", {660});
+    const std::string copies = world.path("copies");
+    fs::copy(world.path("movies"), copies);
+    bool hasMet = false;
+    for (int attempt = 0; attempt < 10 && !hasMet; ++attempt) {
+        for (const char* name : {"first.mp4", "second.mp4"})
+            fs::copy_file(copies + "/" + name, world.path("movies/") + name, fs::copy_options::skip_existing);
+        const std::size_t failedBefore = world.countInLog(kNotMixed);
+        world.setDiskStalled(true);
+        Answers<std::optional<Error>> answers;
+        world.recorder().save(URL::file(first), answers.handler(0));
+        world.recorder().save(URL::file(second), answers.handler(1));
+        const auto bothMixed = [&] {
+            const auto states = world.saveStates();
+            return states.size() >= 2 && states[states.size() - 1] == "adding" && states[states.size() - 2] == "adding";
+        };
+        ASSERT_TRUE(waitUntil(bothMixed, kPatience)) << world.daemonLog();
+        EXPECT_EQ(answers.total(), 0);
+        hasMet = world.countInLog(kNotMixed) > failedBefore;
+        EXPECT_EQ(world.temporaryFiles().size(), hasMet ? 1u : 2u);
+        world.setDiskStalled(false);
+        ASSERT_TRUE(waitUntil([&] { return answers.total() == 2; }));
+        EXPECT_TRUE(answers.eachOnce());
+        EXPECT_FALSE(answers.last());
+        EXPECT_TRUE(becomesGone(first));
+        EXPECT_TRUE(becomesGone(second));
+        EXPECT_TRUE(waitUntil([&] { return world.temporaryFiles().empty(); }));
+        const auto saved = world.library();
+        ASSERT_EQ(saved.size(), 2u);
+        std::set<std::size_t> tracks;
+        for (const std::string& movie : saved) {
+            expectAllFrames(movie);
+            const bool isFirst = checkers::MovieReader(movie).readSound(0).has_value() &&
+                                 checkers::checkToneAbsent(*checkers::MovieReader(movie).readSound(0), 660, -60,
+                                                           {std::chrono::milliseconds(100), std::chrono::seconds(1)})
+                                     .empty();
+            tracks.insert(isFirst ? 1 : 2);
+        }
+        EXPECT_THAT(tracks, ElementsAre(1, 2)) << "each of them once";
+        for (const std::string& movie : saved) fs::remove(movie);
+    }
+    EXPECT_TRUE(hasMet) << "never in the same second";
+}
+
+TEST(Saving, AFullLibraryIsAnErrorAndLeavesNoHalfMovie) {
+    SavingWorld world;
+    constexpr std::size_t kRoom = 16 * 1024;
+    const auto body = [&](const std::function<void()>& makeRoom) {
+        const std::string movie = world.makeMovie("large.mp4", {440, 880});
+        ASSERT_GT(fs::file_size(movie), 2 * kRoom);
+        EXPECT_EQ(world.save(movie), kFailedToSave) << world.daemonLog();
+        EXPECT_EQ(world.countInLog("Video saved to camera roll failed"), 1u);
+        EXPECT_THAT(world.library(), IsEmpty());
+        EXPECT_TRUE(becomesGone(movie)) << "deliberately: a save removes what it was given";
+        EXPECT_TRUE(waitUntil([&] { return world.temporaryFiles().empty(); }));
+        const auto saves = world.status()["saves"];
+        EXPECT_EQ(saves[0]["state"], "failed");
+        EXPECT_FALSE(saves[0]["error"].get<std::string>().empty());
+        makeRoom();
+        EXPECT_EQ(world.save(world.makeMovie("next.mp4", {440, 880})), 0) << world.daemonLog();
+        expectMixed(world.onlySaved(), {440, 880}, {});
+    };
+    const bool isMounted = withSmallDisk(world.path("videos"), std::to_string(kRoom), [&] {
+        world.startDaemon();
+        body([&] {
+            EXPECT_EQ(::mount("tmpfs", world.path("videos").c_str(), "tmpfs", MS_REMOUNT, "size=64m"), 0);
+        });
+        world.endDaemon(SIGTERM);
+    });
+    if (isMounted) return;
+    // Where nothing may be mounted, the daemon's files can't grow.
+    {
+        const SmallFilesOnly small(kRoom);
+        world.startDaemon();
+    }
+    body([&] {
+        const rlimit wide{RLIM_INFINITY, RLIM_INFINITY};
+        EXPECT_EQ(::prlimit(world.daemon().pid(), RLIMIT_FSIZE, &wide, nullptr), 0);
+    });
+}
+
+TEST(Saving, AFullTemporaryDirectoryMeansThatAMovieIsSavedAsItIs) {
+    SavingWorld world;
+    world.startDaemon(world.troubledDisk());
+    world.setDiskQuotaUsedUp(true);
+    const std::string movie = world.makeMovie("two.mp4", {440, 880});
+    const std::vector<char> before = bytesOf(movie);
+    EXPECT_EQ(world.save(movie), 0);
+    EXPECT_TRUE(bytesOf(world.onlySaved()) == before);
+    EXPECT_EQ(world.countInLog(kNotMixed), 1u);
+    EXPECT_TRUE(becomesGone(movie));
+    EXPECT_TRUE(waitUntil([&] { return world.temporaryFiles().empty(); })) << "no half movie";
+}
+
+/// Asks as another user, from a thread that has become that one; the error's code.
+std::int64_t saveAsUser(const SavingWorld& world, uid_t user, const std::string& movie) {
+    std::int64_t code = 0;
+    std::thread([&] {
+        // The thread's alone: the system call, not the library's function. What the recorder starts inherits it.
+        if (::syscall(SYS_setresuid, user, user, user) != 0) {
+            ADD_FAILURE() << "can't become another user";
+            return;
+        }
+        client::Recorder recorder({}, world.path("run/lumacast"));
+        const auto error = recorder.saveAndWait(URL::file(movie), kPatience);
+        code = error ? error->code() : 0;
+    }).join();
+    return code;
+}
+
+TEST(Saving, APathThatTheUserMayNotTouchIsRefusedAndNothingIsRemoved) {
+    SavingWorld world;
+    world.startDaemon();
+    const std::string refusals = "may not read and remove it";
+    if (::geteuid() != 0) {
+        // Every user may read this file, and only the administrator remove it.
+        EXPECT_EQ(world.save("/etc/passwd"), kFailedToSave);
+        EXPECT_EQ(world.countInLog(refusals), 1u);
+        EXPECT_TRUE(fs::exists("/etc/passwd"));
+        return;
+    }
+    // As the administrator sets it up who offers the daemon to every user.
+    for (const char* folder : {"", "run", "run/lumacast", "state", "state/lumacast", "movies"})
+        fs::permissions(world.path(folder), fs::perms(0711));
+    fs::permissions(world.path("run/lumacast/com.orvane.lumacastd.sock"), fs::perms(0777));
+
+    const std::string secret = world.makeMovie("secret.mp4", {440}), readable = world.makeMovie("readable.mp4", {440});
+    fs::permissions(secret, fs::perms(0600));
+    fs::permissions(readable, fs::perms(0644));
+    const std::string shared = world.path("shared"), kept = shared + "/kept.mp4", link = shared + "/link.mp4";
+    fs::create_directory(shared);
+    fs::permissions(shared, fs::perms(01777));
+    fs::copy_file(readable, kept);
+    fs::create_symlink(secret, link);
+    EXPECT_EQ(::lchown(link.c_str(), kNobody, kNobody), 0);
+    const std::string inside = world.temporaryDirectory() + "/../secret.mp4";
+    fs::copy_file(secret, inside);
+    std::size_t refused = 0;
+    const std::string pipe = shared + "/pipe.mp4";
+    EXPECT_EQ(::mkfifo(pipe.c_str(), 0600), 0);
+    EXPECT_EQ(::chown(pipe.c_str(), kNobody, kNobody), 0);
+    for (const std::string& path : {secret, readable, kept, link, inside, pipe, world.path("movies")}) {
+        SCOPED_TRACE(path);
+        EXPECT_EQ(saveAsUser(world, kNobody, path), kFailedToSave);
+        EXPECT_EQ(world.countInLog(refusals), ++refused) << world.daemonLog();
+        EXPECT_TRUE(fs::exists(path));
+    }
+    EXPECT_THAT(world.library(), IsEmpty());
+    EXPECT_THAT(world.saveStates(), IsEmpty()) << "none was begun";
+
+    // One of their own is taken; with a home that is not there it can't be saved, and goes as after every failure.
+    const std::string own = shared + "/own.mp4";
+    fs::copy_file(readable, own);
+    EXPECT_EQ(::chown(own.c_str(), kNobody, kNobody), 0);
+    EXPECT_EQ(saveAsUser(world, kNobody, own), kFailedToSave);
+    EXPECT_EQ(world.countInLog(refusals), refused);
+    EXPECT_THAT(world.saveStates(), ElementsAre("failed"));
+    EXPECT_TRUE(becomesGone(own));
+}
+
+struct Tool {
+    int status = -1;
+    std::string out, complaints;
+};
+
+Tool lumacastctl(const World& world, std::vector<std::string> arguments) {
+    arguments.insert(arguments.begin(), LC_CTL);
+    Tool result;
+    {
+        checkers::Child child(arguments, world.environment(), world.path("tool.log"));
+        result.out = child.readAll();
+        result.status = child.wait();
+    }
+    const auto complaints = bytesOf(world.path("tool.log"));
+    result.complaints.assign(complaints.begin(), complaints.end());
+    return result;
+}
+
+TEST(Saving, TheToolSavesARecordingAndSaysWhereItIs) {
+    SavingWorld world;
+    world.startDaemon();
+    const auto application = world.application({"--size", "320x180", "--fps", "10"});
+    ASSERT_TRUE(application->waitForFrame(1));
+    const std::uint32_t first = application->askForFrame("start");
+    ASSERT_TRUE(application->waitForFrame(first + 10));
+    const std::uint32_t last = application->askForFrame("frame");
+    const std::string recorded = application->stop();
+    const Tool result = lumacastctl(world, {"save", recorded});
+    EXPECT_EQ(result.status, 0) << result.complaints;
+    EXPECT_EQ(result.out, world.onlySaved() + "\n");
+    EXPECT_THAT(result.complaints, HasSubstr("mixing: "));
+    std::set<std::uint32_t> shown;
+    for (const auto& picture : picturesOf(world.onlySaved()))
+        if (picture.number) shown.insert(*picture.number);
+    for (std::uint32_t number = first + 1; number < last; ++number) EXPECT_TRUE(shown.contains(number)) << number;
+    EXPECT_TRUE(becomesGone(recorded));
+    const Tool again = lumacastctl(world, {"save", recorded});
+    EXPECT_EQ(again.status, 4);
+    EXPECT_THAT(again.complaints, HasSubstr("is not saved: "));
+}
+
+/// Saves copies of a movie one after the other, as long as this lives: there is always one being mixed, but for the
+/// moments between two. The last one is left to the daemon.
+class EndlessSaving final {
+public:
+    EndlessSaving(SavingWorld& world, const std::string& movie) : state_(std::make_shared<State>(world, movie)) {
+        State::next(state_);
+    }
+    ~EndlessSaving() {
+        const std::lock_guard lock(state_->mutex);
+        state_->isOver = true;
+    }
+    EndlessSaving(const EndlessSaving&) = delete;
+    EndlessSaving& operator=(const EndlessSaving&) = delete;
+
+    int saved() const {
+        const std::lock_guard lock(state_->mutex);
+        return state_->saved;
+    }
+
+private:
+    struct State {
+        State(SavingWorld& itsWorld, std::string itsMovie) : world(itsWorld), movie(std::move(itsMovie)) {}
+
+        static void next(const std::shared_ptr<State>& state) {
+            const std::lock_guard lock(state->mutex);
+            if (state->isOver) return;
+            const std::string copy = state->world.path("movies/copy " + std::to_string(++state->begun) + ".mp4");
+            fs::copy_file(state->movie, copy);
+            state->world.recorder().save(URL::file(copy), [state](const std::optional<Error>& error) {
+                {
+                    const std::lock_guard inner(state->mutex);
+                    if (state->isOver) return;
+                    EXPECT_FALSE(error);
+                    ++state->saved;
+                }
+                next(state);
+            });
+        }
+
+        SavingWorld& world;
+        const std::string movie;
+        std::mutex mutex;
+        bool isOver = false;
+        int begun = 0, saved = 0;
+    };
+
+    const std::shared_ptr<State> state_;
+};
+
+TEST(Saving, ARecordingLosesNoFrameWhileMoviesAreMixed) {
+#ifdef LC_SANITIZED
+    const std::vector<std::string> moving{"--size", "320x180", "--fps", "6"};
+    constexpr std::uint32_t kStretch = 18;
+#else
+    const std::vector<std::string> moving{"--size", "640x360", "--fps", "30"};
+    constexpr std::uint32_t kStretch = 120;
+#endif
+    // A machine that is busy with somebody else's work loses frames for that alone: then once more.
+    constexpr int kAttempts = 5;
+    SavingWorld world;
+    world.startDaemon();
+    checkers::MoviePlan plan;
+    plan.width = 1280;
+    plan.height = 720;
+    plan.halfSize = false;
+    plan.bitRate = 3'000'000;
+    plan.pictures = checkers::steadyPictures(1, 60, 30);
+    plan.soundSeconds = 2;
+    plan.sound = tone(440);
+    plan.moreSounds = {tone(880)};
+    const std::string movie = world.path("source.mp4");
+    ASSERT_EQ(checkers::makeMovie(plan, movie), "");
+
+    const auto application = world.application(moving);
+    ASSERT_TRUE(application->waitForFrame(3));
+    EndlessSaving saving(world, movie);
+    std::vector<checkers::FrameFinding> findings;
+    for (int attempt = 1; attempt <= kAttempts; ++attempt) {
+        std::size_t looks = 0, mixing = 0;
+        const std::uint32_t first = application->askForFrame("start");
+        for (std::uint32_t shown = first; shown < first + kStretch; shown = application->askForFrame("frame")) {
+            ASSERT_TRUE(application->waitForFrame(shown + 3));
+            const auto states = world.saveStates();
+            ++looks;
+            if (!states.empty() && states.back() == "mixing") ++mixing;
+        }
+        const std::uint32_t last = application->askForFrame("frame");
+        const std::string recorded = application->stop();
+        ASSERT_FALSE(recorded.empty());
+        checkers::FrameExpectation expectation;
+        for (std::uint32_t number = first + 1; number < last; ++number) expectation.expected.insert(number);
+        expectation.allowedRepeats = 2;
+        const auto report = checkers::checkFrameNumbers(picturesOf(recorded), expectation);
+        std::printf("%zu frames, %zu missing; %zu of %zu looks saw a movie being mixed\n", report.pictures,
+                    report.missing.size(), mixing, looks);
+        EXPECT_GE(mixing * 10, looks * 6) << "too little was mixed for this to say anything";
+        findings = report.findings;
+        if (findings.empty()) break;
+    }
+    for (const auto& finding : findings) ADD_FAILURE() << finding.text;
+    std::printf("%d movies were saved meanwhile\n", saving.saved());
+    EXPECT_EQ(world.countInLog(kNotMixed), 0u);
+}
+
+}  // namespace
+}  // namespace lumacast::test
