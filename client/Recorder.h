@@ -70,9 +70,9 @@ public:
     /// Saves a finished movie to the user's library (the folder Lumacast in the Videos folder), its sound tracks mixed
     /// into one; where that can't be done, as it is. The movie is the daemon's own (a StopAnswer's) or a file that the
     /// user may read and remove. The file is removed, also after a failure: afterwards the copy in the library is all
-    /// there is. Answered with none once it is in the library; FailedToSave when it is not (for a file that the user may
-    /// not touch nothing was removed), or a connection error. Takes as long as encoding the movie anew, and goes on when
-    /// the connection ends.
+    /// there is. Answered with none once it is in the library; FailedToSave when it is not (a file that the user may not
+    /// touch, or that is being recorded, stays), or a connection error. Takes as long as encoding the movie anew, and
+    /// goes on when the connection ends.
     void save(const URL& movie, std::function<void(std::optional<Error>)> answered);
     /// The application's state as the daemon has it; see RecordingState. It comes after the effect of all that was
     /// asked before.

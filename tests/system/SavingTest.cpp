@@ -148,7 +148,7 @@ TEST(Saving, TwoMoviesInTheSameSecondAreBothSaved) {
         hasMet = world.countInLog(kNotMixed) > failedBefore;
         EXPECT_EQ(world.temporaryFiles().size(), hasMet ? 1u : 2u);
         world.setDiskStalled(false);
-        ASSERT_TRUE(waitUntil([&] { return answers.total() == 2; }));
+        ASSERT_TRUE(waitUntil([&] { return answers.total() == 2; }, kPatience));
         EXPECT_TRUE(answers.eachOnce());
         EXPECT_FALSE(answers.last());
         EXPECT_TRUE(becomesGone(first));
@@ -326,6 +326,58 @@ TEST(Saving, TheToolSavesARecordingAndSaysWhereItIs) {
     const Tool again = lumacastctl(world, {"save", recorded});
     EXPECT_EQ(again.status, 4);
     EXPECT_THAT(again.complaints, HasSubstr("is not saved: "));
+}
+
+TEST(Saving, AMovieThatIsBeingRecordedIsRefusedAndTheRecordingGoesOn) {
+    SavingWorld world;
+    world.startDaemon();
+    const auto application = world.application({"--size", "320x180", "--fps", "10"});
+    ASSERT_TRUE(application->waitForFrame(1));
+    const std::uint32_t first = application->askForFrame("start");
+    ASSERT_TRUE(world.waitForElapsed(0.5));
+    EXPECT_EQ(world.save(world.moviePath()), kFailedToSave);
+    const Tool tool = lumacastctl(world, {"save", world.moviePath()});
+    EXPECT_EQ(tool.status, 4);
+    EXPECT_THAT(tool.complaints, HasSubstr("it is being recorded"));
+    ASSERT_TRUE(application->waitForFrame(first + 15));
+    const std::string recorded = application->stop();
+    EXPECT_GE(picturesOf(recorded).size(), 10u);
+    EXPECT_THAT(world.library(), IsEmpty());
+}
+
+TEST(Saving, AMovieWhosePlaceANewerRecordingHasTakenIsGoneAndTheNewerOneStaysWhole) {
+    SavingWorld world;
+    world.startDaemon();
+    // One that takes a while, so that the other waits.
+    checkers::MoviePlan plan;
+    plan.width = 1280;
+    plan.height = 720;
+    plan.halfSize = false;
+    plan.pictures = checkers::steadyPictures(1, 45, 30);
+    const std::string before = world.path("movies/before.mp4");
+    ASSERT_EQ(checkers::makeMovie(plan, before), "");
+    const auto application = world.application({"--size", "320x180", "--fps", "10"});
+    ASSERT_TRUE(application->waitForFrame(1));
+    std::uint32_t first = application->askForFrame("start");
+    ASSERT_TRUE(application->waitForFrame(first + 5));
+    const std::string recorded = application->stop();
+
+    Answers<std::optional<Error>> answers;
+    world.recorder().save(URL::file(before), answers.handler(0));
+    world.recorder().save(URL::file(recorded), answers.handler(1));
+    EXPECT_FALSE(world.recorder().stateAndWait().error);  // both have come to the daemon
+    first = application->askForFrame("start");
+    EXPECT_EQ(answers.total(), 0);
+    ASSERT_TRUE(waitUntil([&] { return answers.total() == 2; }, kPatience));
+    EXPECT_THAT(world.saveStates(), ElementsAre("saved", "failed"));
+    ASSERT_TRUE(application->waitForFrame(first + 10));
+    const std::uint32_t last = application->askForFrame("frame");
+    std::set<std::uint32_t> shown;
+    for (const auto& picture : picturesOf(application->stop()))
+        if (picture.number) shown.insert(*picture.number);
+    EXPECT_TRUE(shown.contains(first + 1));
+    EXPECT_TRUE(shown.contains(last - 1));
+    EXPECT_EQ(world.library().size(), 1u);
 }
 
 /// Saves copies of a movie one after the other, as long as this lives: there is always one being mixed, but for the
