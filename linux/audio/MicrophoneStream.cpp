@@ -142,8 +142,10 @@ void MicrophoneStream::hear() {
         const auto read =
             static_cast<std::int64_t>(pa_bytes_to_usec(static_cast<std::uint64_t>(timing->read_index), &format_));
         const auto frames = static_cast<std::int64_t>(bytes / pa_frame_size(&format_));
-        const auto piece =
-            position_.place(timeline_.frameAt(HostTime{zero_.nanoseconds + read * 1000}), frames);
+        // Nothing is heard before it comes, whatever the server says.
+        const std::int64_t heard = std::min(timeline_.frameAt(HostTime{zero_.nanoseconds + read * 1000}),
+                                            timeline_.frameAt(now) - frames);
+        const auto piece = position_.place(heard, frames);
         // Without data it is a hole: time passes, and there is silence.
         if (data)
             mixDown_.mix({static_cast<const float*>(data), static_cast<std::size_t>(frames) * format_.channels},

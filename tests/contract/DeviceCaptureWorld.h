@@ -5,6 +5,8 @@
 #include <bit>
 #include <cstdint>
 #include <cstdio>
+#include <filesystem>
+#include <map>
 #include <memory>
 #include <mutex>
 #include <span>
@@ -19,6 +21,7 @@
 #include "support/ThreadScheduler.h"
 #include "tests/checkers/ToneChecker.h"
 #include "tests/contract/MediaWorld.h"
+#include "tests/contract/PipedMicrophone.h"
 #include "tests/fakes/ThreadLoop.h"
 #include "tests/sound/PrivateSoundServer.h"
 
@@ -154,7 +157,7 @@ public:
     /// What the server's tool answers to a command; nothing when it failed.
     std::string control(const std::string& command) const {
         const std::string line =
-            "env -u DISPLAY PULSE_SERVER='" + server_->address() + "' LC_ALL=C pactl " + command + " 2>/dev/null";
+            "env -u DISPLAY PULSE_SERVER='" + server_->address() + "' LC_ALL=C pactl " + command;
         std::string answer;
         FILE* const pipe = ::popen(line.c_str(), "r");
         if (!pipe) return {};
@@ -163,13 +166,27 @@ public:
         return ::pclose(pipe) == 0 ? answer : "";
     }
     bool does(const std::string& command) const { return !control(command + " && echo done").empty(); }
-    /// A microphone that hears a tone: a room of its own in which it is played. Whether it is there.
-    bool addMicrophone(const std::string& name, int frequency) const {
-        const std::string room = name + "_room";
-        return does("load-module module-null-sink sink_name=" + room + " rate=48000 norewinds=1") &&
-               does("load-module module-sine sink=" + room + " frequency=" + std::to_string(frequency)) &&
-               does("load-module module-remap-source source_name=" + name + " master=" + room + ".monitor") &&
-               does("set-default-source " + name);
+    /// A microphone in a room of its own, in which nothing is heard at first; it becomes the default. Null when that
+    /// failed. After a restart of the server it can be added again.
+    PipedMicrophone* addMicrophone(const std::string& name) {
+        auto& room = rooms_[name];
+        const std::string pipe = directory_.file(name);
+        if (!room) room = std::make_unique<PipedMicrophone>();
+        std::filesystem::remove(pipe);
+        const bool isThere = does("load-module module-pipe-source source_name=" + name + " file=" + pipe +
+                                  " format=s16le rate=" + std::to_string(PipedMicrophone::kRate) +
+                                  " channels=" + std::to_string(PipedMicrophone::kChannels)) &&
+                             choose(name);
+        if (!isThere) return nullptr;
+        room->connect(pipe);
+        return room.get();
+    }
+    bool choose(const std::string& source) const { return does("set-default-source " + source); }
+    /// An application that plays a tone.
+    std::unique_ptr<test::TonePlayer> play(int frequency) const {
+        auto player = std::make_unique<test::TonePlayer>(server_->address());
+        if (!player->isReady() || !player->tell("play tone " + std::to_string(frequency) + " 0.5 2")) return nullptr;
+        return player;
     }
     /// A call that records from the microphone, for as long as the object lives.
     std::unique_ptr<test::SoundProcess> call(const std::string& microphone, const std::string& role = "phone") const {
@@ -177,10 +194,14 @@ public:
             std::vector<std::string>{"parec", "-d", microphone, "--property=media.role=" + role, "/dev/null"},
             std::vector<std::string>{"PULSE_SERVER=" + server_->address(), "DISPLAY"});
     }
-    /// How many streams record now, by the server's account.
-    std::size_t recordings() const {
-        const std::string list = control("list short source-outputs");
-        return static_cast<std::size_t>(std::count(list.begin(), list.end(), '\n'));
+    static constexpr const char* kOurs = "media.name = \"microphone\"";
+    static constexpr const char* kCalls = "application.name = \"parec\"";
+    /// How many streams with this property record now, by the server's account.
+    std::size_t recordings(const std::string& line = kOurs) const {
+        const std::string list = control("list source-outputs");
+        std::size_t count = 0;
+        for (std::size_t at = list.find(line); at != std::string::npos; at = list.find(line, at + 1)) ++count;
+        return count;
     }
 
 private:
@@ -191,6 +212,8 @@ private:
     }
 
     const std::unique_ptr<test::SoundServer> server_;
+    const OwnDirectory directory_;
+    std::map<std::string, std::unique_ptr<PipedMicrophone>> rooms_;
     LinuxClock clock_;
     ThreadScheduler scheduler_{std::make_shared<ThreadLoop>()};
     const std::shared_ptr<sound::PulseConnection> connection_;
