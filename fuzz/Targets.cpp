@@ -16,6 +16,7 @@ constexpr std::array kTargets{
     Target{"frames", frames},
     Target{"manifest", manifest},
     Target{"messages", messages},
+    Target{"movies", movies},
     Target{"preferences", preferences},
     Target{"sound_server", soundServer},
     Target{"strings_table", stringsTable},

@@ -28,6 +28,7 @@ void deviceInfo(Bytes input);
 void frames(Bytes input);
 void manifest(Bytes input);
 void messages(Bytes input);
+void movies(Bytes input);
 void preferences(Bytes input);
 void soundServer(Bytes input);
 void stringsTable(Bytes input);
