@@ -92,6 +92,7 @@ std::int32_t TapCore::freeBuffer(const AudioQueueBufferRef& buffer) {
     Allocated* const found = findLocked(buffer);
     if (!found) return AudioStatus::kBadBuffer;
     std::erase(enqueued_, buffer);
+    std::erase_if(filled_, [&buffer](const Filled& one) { return one.buffer == buffer; });
     allocated_.erase(allocated_.begin() + (found - allocated_.data()));
     return AudioStatus::kSuccess;
 }
@@ -141,7 +142,9 @@ void TapCore::stopLocked() {
     running_ = false;
     ++run_;
     ++changesToTell_;
-    if (!enqueued_.empty()) enqueued_.front()->byteSize = 0;
+    // What was filled and not handed over is still enqueued.
+    for (; !filled_.empty(); filled_.pop_back()) enqueued_.push_front(std::move(filled_.back().buffer));
+    for (const AudioQueueBufferRef& buffer : enqueued_) buffer->byteSize = 0;
     closeTapLocked();
     changed_.notify_all();
 }
@@ -179,7 +182,9 @@ void TapCore::run() {
             changed_.wait(lock);
         } else {
             rest(lock);
-            if (running_ && !disposed_ && changesToTell_ == 0) handOver(lock, fillLocked());
+            if (!running_ || disposed_ || changesToTell_ > 0) continue;
+            fillLocked();
+            handOver(lock);
         }
     }
 }
@@ -212,14 +217,13 @@ bool TapCore::isDryLocked(HostTime now) const {
     return enqueued_.empty() && drySince_ && now.nanoseconds - drySince_->nanoseconds >= kDryNanoseconds;
 }
 
-std::vector<TapCore::Filled> TapCore::fillLocked() {
-    std::vector<Filled> filled;
+void TapCore::fillLocked() {
     const HostTime now = LinuxClock::currentHostTime();
     if (enqueued_.empty()) {
         if (!drySince_) drySince_ = now;
         if (isDryLocked(now)) closeTapLocked();
         mix_->skipTo(mix_->position() + mix_->readable(now));
-        return filled;
+        return;
     }
     if (drySince_ && now.nanoseconds - drySince_->nanoseconds >= kDryNanoseconds) {
         // What passed meanwhile is gone. Without a thread for the server it stays silent until the next dry second.
@@ -244,13 +248,12 @@ std::vector<TapCore::Filled> TapCore::fillLocked() {
         for (std::int64_t done = 0; done < frames; done += step) {
             const auto part = static_cast<std::size_t>(std::min(step, frames - done)) * format_.channelsPerFrame;
             const auto skipped = static_cast<std::size_t>(done) * format_.channelsPerFrame;
-            keepLocked(first + done, std::span<const float>(samples_).subspan(skipped, part), filled);
+            keepLocked(first + done, std::span<const float>(samples_).subspan(skipped, part));
         }
     }
-    return filled;
 }
 
-void TapCore::keepLocked(std::int64_t frame, std::span<const float> samples, std::vector<Filled>& filled) {
+void TapCore::keepLocked(std::int64_t frame, std::span<const float> samples) {
     const std::uint32_t channels = format_.channelsPerFrame;
     while (!samples.empty() && !enqueued_.empty()) {
         AudioQueueBuffer& buffer = *enqueued_.front();
@@ -267,8 +270,7 @@ void TapCore::keepLocked(std::int64_t frame, std::span<const float> samples, std
         samples = samples.subspan(frames * channels);
         frame += static_cast<std::int64_t>(frames);
         if (!isToBeHandedOverLocked(buffer)) continue;
-        if (Allocated* const found = findLocked(enqueued_.front())) found->isEnqueued = false;
-        filled.push_back({std::move(enqueued_.front()), firstStamp_});
+        filled_.push_back({std::move(enqueued_.front()), firstStamp_});
         enqueued_.pop_front();
     }
 }
@@ -279,14 +281,17 @@ bool TapCore::isToBeHandedOverLocked(const AudioQueueBuffer& buffer) const {
     return buffer.byteSize / format_.bytesPerFrame >= format_.sampleRate * kPieceSeconds;
 }
 
-void TapCore::handOver(Lock& lock, std::vector<Filled> filled) {
-    const auto run = run_;
-    for (const Filled& one : filled) {
-        if (run_ != run) return;  // stopped meanwhile
-        if (!findLocked(one.buffer)) continue;  // freed meanwhile
+void TapCore::handOver(Lock& lock) {
+    while (!filled_.empty()) {
+        const Filled one = std::move(filled_.front());
+        filled_.pop_front();
+        Allocated* const found = findLocked(one.buffer);
+        if (!found) continue;  // freed meanwhile
+        found->isEnqueued = false;
         const auto callback = callback_;
+        const std::uint32_t packets = one.buffer->byteSize / format_.bytesPerFrame;
         lock.unlock();
-        if (*callback) (*callback)(one.buffer, one.start, one.buffer->byteSize / format_.bytesPerFrame, {});
+        if (*callback) (*callback)(one.buffer, one.start, packets, {});
         lock.lock();
     }
 }

@@ -62,10 +62,10 @@ private:
     void tellRunning(Lock& lock);
     void rest(Lock& lock);
     bool isDryLocked(HostTime now) const;
-    std::vector<Filled> fillLocked();
-    void keepLocked(std::int64_t frame, std::span<const float> samples, std::vector<Filled>& filled);
+    void fillLocked();
+    void keepLocked(std::int64_t frame, std::span<const float> samples);
     bool isToBeHandedOverLocked(const AudioQueueBuffer& buffer) const;
-    void handOver(Lock& lock, std::vector<Filled> filled);
+    void handOver(Lock& lock);
 
     const TapServices services_;
     const AudioFormat format_;
@@ -77,6 +77,7 @@ private:
     std::shared_ptr<sound::TapOwner> owner_;
     std::vector<Allocated> allocated_;
     std::deque<AudioQueueBufferRef> enqueued_;
+    std::deque<Filled> filled_;    ///< to be handed over; still the queue's
     bool hasThread_ = false, running_ = false, disposed_ = false, cameBack_ = false;
     int changesToTell_ = 0;        ///< of running, to the listener
     std::uint64_t run_ = 0;        ///< counts starts and stops

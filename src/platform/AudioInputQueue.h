@@ -100,8 +100,8 @@ public:
 
     /// Starts at once; within 100 ms the queue runs, sound server or not. Nothing when it was started before.
     virtual std::int32_t start() = 0;
-    /// Stops at once: no callback begins after the return; one in progress may still be running. What is half filled is
-    /// thrown away. Nothing when it is not running.
+    /// Stops at once: no callback begins after the return; one in progress may still be running. What was filled and not
+    /// handed over yet is thrown away; the buffers stay enqueued. Nothing when it is not running.
     virtual std::int32_t stop() = 0;
     /// Stops, lets go of all buffers, of the callback and of the listener. Every operation answers kDisposed then.
     virtual std::int32_t dispose() = 0;

@@ -22,7 +22,10 @@ std::optional<AudioFormat> completed(AudioFormat format) {
         format.channelsPerFrame < 1 || format.channelsPerFrame > 2 ||
         (isFloat ? bits != 32 : bits != 16 && bits != 24 && bits != 32))
         return std::nullopt;
-    if (!isFloat && (format.formatFlags & AudioFormat::kFlagSignedInteger) == 0) return std::nullopt;
+    constexpr std::uint32_t kKnownFlags = AudioFormat::kFlagFloat | AudioFormat::kFlagBigEndian |
+                                          AudioFormat::kFlagSignedInteger | AudioFormat::kFlagPacked;
+    const bool isInteger = (format.formatFlags & AudioFormat::kFlagSignedInteger) != 0;
+    if ((format.formatFlags & ~kKnownFlags) != 0 || isFloat == isInteger) return std::nullopt;
     const std::uint32_t frame = bits / 8 * format.channelsPerFrame;
     if (format.framesPerPacket == 0) format.framesPerPacket = 1;
     if (format.bytesPerFrame == 0) format.bytesPerFrame = frame;
@@ -86,7 +89,8 @@ std::int32_t FakeAudioInputQueue::enqueueBuffer(const AudioQueueBufferRef& buffe
     const std::lock_guard lock(mutex_);
     if (const std::int32_t status = checkLocked("enqueueBuffer")) return status;
     if (!buffer || std::find(allocated_.begin(), allocated_.end(), buffer) == allocated_.end() ||
-        std::find(enqueued_.begin(), enqueued_.end(), buffer) != enqueued_.end())
+        std::find(enqueued_.begin(), enqueued_.end(), buffer) != enqueued_.end() ||
+        std::find(filled_.begin(), filled_.end(), buffer) != filled_.end())
         return AudioStatus::kBadBuffer;
     if (std::find(handedOver_.begin(), handedOver_.end(), buffer.get()) != handedOver_.end()) cameBack_ = true;
     buffer->byteSize = 0;
@@ -100,6 +104,7 @@ std::int32_t FakeAudioInputQueue::freeBuffer(const AudioQueueBufferRef& buffer) 
     const auto found = std::find(allocated_.begin(), allocated_.end(), buffer);
     if (!buffer || found == allocated_.end()) return AudioStatus::kBadBuffer;
     std::erase(enqueued_, buffer);
+    std::erase(filled_, buffer);
     allocated_.erase(found);
     return AudioStatus::kSuccess;
 }
@@ -152,7 +157,9 @@ std::int32_t FakeAudioInputQueue::stop() {
         if (!running_) return AudioStatus::kSuccess;
         running_ = false;
         ++run_;
-        if (!enqueued_.empty()) enqueued_.front()->byteSize = 0;
+        enqueued_.insert(enqueued_.begin(), filled_.begin(), filled_.end());
+        filled_.clear();
+        for (const AudioQueueBufferRef& buffer : enqueued_) buffer->byteSize = 0;
     }
     tellRunning();
     return AudioStatus::kSuccess;
@@ -171,12 +178,13 @@ std::int32_t FakeAudioInputQueue::dispose() {
     std::swap(listener_, listener);
     std::swap(allocated_, buffers);
     enqueued_.clear();
+    filled_.clear();
     return AudioStatus::kSuccess;
 }
 
 Task FakeAudioInputQueue::handOverLocked(AudioQueueBufferRef buffer, const AudioTimeStamp& start, std::uint32_t packets,
                                          std::vector<AudioPacketDescription> descriptions) {
-    handedOver_.push_back(buffer.get());
+    filled_.push_back(buffer);
     return [weak = weak_from_this(), run = run_, buffer = std::move(buffer), start, packets,
                   descriptions = std::move(descriptions)] {
         const auto self = weak.lock();
@@ -184,7 +192,9 @@ Task FakeAudioInputQueue::handOverLocked(AudioQueueBufferRef buffer, const Audio
         InputCallback callback;
         {
             const std::lock_guard lock(self->mutex_);
-            if (self->run_ != run) return;
+            // Stopped or freed meanwhile.
+            if (self->run_ != run || std::erase(self->filled_, buffer) == 0) return;
+            self->handedOver_.push_back(buffer.get());
             callback = self->callback_;
         }
         if (callback) callback(buffer, start, packets, descriptions);
@@ -207,7 +217,11 @@ void FakeAudioInputQueue::fill(std::uint32_t frames, std::vector<Task>& tasks) {
         if (playing != settings_->playing.end()) byte = playing->second;
     }
     const std::int64_t now = clock_->now().value;
-    while (frames > 0 && !enqueued_.empty()) {
+    while (frames > 0) {
+        if (enqueued_.empty()) {
+            samples_ += frames;
+            return;
+        }
         AudioQueueBuffer& buffer = *enqueued_.front();
         const auto room = static_cast<std::uint32_t>(buffer.bytes.size() - buffer.byteSize) / format_.bytesPerFrame;
         const std::uint32_t part = std::min(frames, room);

@@ -90,6 +90,7 @@ private:
     std::vector<AudioQueueBufferRef> allocated_;
     std::vector<const AudioQueueBuffer*> handedOver_;
     std::deque<AudioQueueBufferRef> enqueued_;
+    std::deque<AudioQueueBufferRef> filled_;  ///< submitted to the lane, and still the queue's
 };
 
 /// A failing call ("AudioInputQueues.makeInputQueue") makes a queue that refuses everything with kNoResources.
