@@ -7,6 +7,7 @@
 #include <cstdio>
 #include <functional>
 #include <map>
+#include <utility>
 
 #include "linux/audio/LinuxAudioInputQueues.h"
 #include "linux/system/LinuxClock.h"
@@ -327,6 +328,54 @@ TEST_P(AudioTapTest, WithoutAQueueThereIsNoThread) {
         EXPECT_TRUE(connection_->hasThread());
     }
     EXPECT_TRUE(eventually([this] { return !connection_->hasThread(); }));
+}
+
+TEST_P(AudioTapTest, AQueueWithoutABufferForASecondGivesItsStreamBackAndTheNextBufferBringsItBack) {
+    const auto one = play(kOwn);
+    struct Heard {
+        std::mutex mutex;
+        std::vector<AudioQueueBufferRef> buffers;
+        bool isLoud = false;
+    };
+    const auto heard = std::make_shared<Heard>();
+    const auto made = queues_.makeInputQueue(
+        test::recorderFormat(),
+        [heard](const AudioQueueBufferRef& buffer, const AudioTimeStamp&, std::uint32_t, auto) {
+            const std::lock_guard lock(heard->mutex);
+            for (std::uint32_t byte = 0; byte < buffer->byteSize; ++byte)
+                if (buffer->bytes[byte] != 0) heard->isLoud = true;
+            heard->buffers.push_back(buffer);
+        },
+        AudioInputQueues::kCaptureProcessOutput);
+    AudioInputQueue& queue = *made.queue;
+    ASSERT_EQ(queue.setProcessTap(one->pid()), AudioStatus::kSuccess);
+    AudioQueueBufferRef buffer;
+    ASSERT_EQ(queue.allocateBuffer(8820, buffer), AudioStatus::kSuccess);
+    ASSERT_EQ(queue.enqueueBuffer(buffer), AudioStatus::kSuccess);
+    ASSERT_EQ(queue.start(), AudioStatus::kSuccess);
+    EXPECT_TRUE(connection_->hasThread());
+    EXPECT_TRUE(eventually([&] { return !connection_->hasThread(); })) << "nobody is tapped";
+    {
+        const std::lock_guard lock(heard->mutex);
+        heard->isLoud = false;
+    }
+    // Whoever gives it back each time hears the process again.
+    EXPECT_TRUE(eventually([&] {
+        const std::lock_guard lock(heard->mutex);
+        for (const auto& each : std::exchange(heard->buffers, {})) queue.enqueueBuffer(each);
+        return heard->isLoud;
+    }));
+    queue.dispose();
+}
+
+TEST_P(AudioTapTest, AProcessThatHasEndedIsNone) {
+    ProcessID gone{0};
+    {
+        TonePlayer one(server_->address());
+        gone = one.pid();
+    }
+    const auto made = queues_.makeInputQueue(test::recorderFormat(), {}, AudioInputQueues::kCaptureProcessOutput);
+    EXPECT_EQ(made.queue->setProcessTap(gone), AudioStatus::kNoSuchProcess);
 }
 
 std::string nameOfServer(const ::testing::TestParamInfo<Maker>& info) { return info.index == 0 ? "PulseAudio" : "PipeWire"; }
