@@ -2,6 +2,8 @@
 
 #include <strings.h>
 
+#include <string_view>
+
 namespace lumacast::sound {
 
 namespace {
@@ -43,6 +45,8 @@ void MicrophoneReader::answered(bool succeeded) {
 void MicrophoneReader::takeServer(pa_context*, const pa_server_info* info, void* self) {
     auto& reader = *static_cast<MicrophoneReader*>(self);
     if (info && info->default_source_name) reader.microphone_.name = info->default_source_name;
+    reader.microphone_.isPipeWire =
+        info && info->server_name && std::string_view(info->server_name).find("PipeWire") != std::string_view::npos;
     reader.answered(info != nullptr);
 }
 

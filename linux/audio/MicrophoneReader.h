@@ -18,6 +18,7 @@ struct ListedMicrophone {
     pa_channel_map channels{};
     /// Whether a stream of a higher-priority role (a telephone call's) records from it.
     bool isTaken = false;
+    bool isPipeWire = false;  ///< the server
 };
 
 /// One reading at a time. Belongs to the sound thread; destroying it ends a reading.

