@@ -268,6 +268,14 @@ TEST_P(MicrophoneTest, NothingIsLeftAtTheServerAfterTheStop) {
     EXPECT_TRUE(eventually([&] { return !world_.connection().hasThread(); }));
 }
 
+TEST_P(MicrophoneTest, DestroyingASessionLetsGoOfTheMicrophone) {
+    auto listened = listen();
+    ASSERT_TRUE(hears(listened));
+    listened.session.reset();
+    EXPECT_TRUE(eventually([&] { return world_.recordings() == 0; }));
+    EXPECT_TRUE(eventually([&] { return !world_.connection().hasThread(); }));
+}
+
 TEST_P(MicrophoneTest, AServerThatDiesIsAnInterruptionUntilAnotherHears) {
     const Interruptions interruptions(world_.devices().sharedAudioSession());
     const auto listened = listen();
