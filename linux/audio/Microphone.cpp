@@ -66,6 +66,7 @@ void Microphone::decide(const ListedMicrophone* microphone) {
         session_->again.start(isOutdated ? milliseconds(0) : kRetry);
         return;
     }
+    session_->isUndecided = microphone->isUndecided;
     if (microphone->isTaken) {
         closeStream();
         setInterrupted(true);
@@ -95,6 +96,7 @@ void Microphone::look() {
 
 void Microphone::watch() {
     session_->watch.start(kWatch);
+    if (session_->isUndecided) read();
     if (++silentWatches_ >= kSilentWatches && wasHeard_) setInterrupted(true);
 }
 

@@ -42,7 +42,8 @@ private:
         PulseTimer again;  ///< to look at the stream outside of its calls, or once more after a failure
         PulseTimer watch;
         std::unique_ptr<MicrophoneStream> stream;
-        bool isOutdated = false;  ///< something changed while the reader read
+        bool isOutdated = false;   ///< something changed while the reader read
+        bool isUndecided = false;  ///< the last reading was, and nothing tells when that has changed
     };
 
     void read();

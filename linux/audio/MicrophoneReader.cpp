@@ -64,7 +64,10 @@ void MicrophoneReader::takeRecording(pa_context*, const pa_source_output_info* i
     auto& reader = *static_cast<MicrophoneReader*>(self);
     if (end != 0) return reader.answered(end > 0);
     // One that is corked holds on to the microphone, but leaves it to others.
-    if (info && info->source == reader.microphone_.index && info->corked == 0 && isOfHigherPriority(info->proplist))
+    if (!info || info->corked != 0 || !isOfHigherPriority(info->proplist)) return;
+    if (info->source == PA_INVALID_INDEX)
+        reader.microphone_.isUndecided = true;
+    else if (info->source == reader.microphone_.index)
         reader.microphone_.isTaken = true;
 }
 

@@ -18,6 +18,8 @@ struct ListedMicrophone {
     pa_channel_map channels{};
     /// Whether a stream of a higher-priority role (a telephone call's) records from it.
     bool isTaken = false;
+    /// Whether such a stream is about to record from somewhere: PipeWire says only later from where.
+    bool isUndecided = false;
     bool isPipeWire = false;  ///< the server
 };
 
