@@ -536,7 +536,7 @@ TEST_P(AudioInputQueueContract, ReleasingTheLastReferenceDisposesOfItAlsoWithinI
         EXPECT_TRUE(eventually([&] { return recorded.isCallbackLetGo(); }));
     }
     Recorded recorded(queues(), [](Recorded& self, const AudioQueueBufferRef&) { self.queue.reset(); });
-    recorded.enqueue(10, 882);
+    recorded.enqueue(1, 882);
     const std::weak_ptr<AudioInputQueue> weak = recorded.queue;
     ASSERT_EQ(weak.lock()->start(), kSuccess);
     EXPECT_TRUE(eventually([&] { return weak.expired() && recorded.isCallbackLetGo(); }));

@@ -5,8 +5,10 @@
 
 #include <chrono>
 #include <functional>
+#include <future>
 #include <memory>
 #include <thread>
+#include <vector>
 
 #include "linux/audio/LinuxAudioInputQueues.h"
 #include "linux/system/LinuxClock.h"
@@ -53,7 +55,14 @@ public:
     void passTime() override {
         clock_.advance(std::chrono::milliseconds(20));
         queues_.hear(882);
-        std::this_thread::sleep_for(std::chrono::microseconds(200));  // let the lanes work
+        // Until the lanes have done what they had to do, as they would in 20 ms; a callback that waits for the test ends that.
+        std::vector<std::future<void>> ends;
+        for (const auto& queue : queues_.queues()) {
+            const auto end = std::make_shared<std::promise<void>>();
+            ends.push_back(end->get_future());
+            queue->lane().async([end] { end->set_value(); });
+        }
+        for (const auto& end : ends) end.wait_for(std::chrono::milliseconds(100));
     }
 
 private:
