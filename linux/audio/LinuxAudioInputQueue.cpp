@@ -191,10 +191,11 @@ void TapCore::run() {
 
 void TapCore::tellRunning(Lock& lock) {
     --changesToTell_;
-    const auto listener = listener_;
+    auto listener = listener_;
     if (!listener) return;
     lock.unlock();
     (*listener)();
+    listener.reset();  // the same
     lock.lock();
 }
 
@@ -288,10 +289,11 @@ void TapCore::handOver(Lock& lock) {
         Allocated* const found = findLocked(one.buffer);
         if (!found) continue;  // freed meanwhile
         found->isEnqueued = false;
-        const auto callback = callback_;
+        auto callback = callback_;
         const std::uint32_t packets = one.buffer->byteSize / format_.bytesPerFrame;
         lock.unlock();
         if (*callback) (*callback)(one.buffer, one.start, packets, {});
+        callback.reset();  // the last reference may be what owns the queue, whose end needs the lock
         lock.lock();
     }
 }

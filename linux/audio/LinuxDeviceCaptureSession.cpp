@@ -110,6 +110,8 @@ LinuxDeviceCaptureSession::Opening LinuxDeviceCaptureSession::updateLocked() {
         return {};
     }
     ++openings_;
+    // Before the microphone is told that its server has gone: a stop is no interruption.
+    if (opening_.part) opening_.part->close();
     services_.connection->detach(opening_.microphone);
     return std::exchange(opening_, {});
 }

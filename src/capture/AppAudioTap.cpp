@@ -171,10 +171,18 @@ void LCCaptureManager::fillGapAfterResume() {
     if (silence && handler) handler(silence);
 }
 
-void LCCaptureManager::stopTap() {
-    // Its buffers may never be filled once the recording's clock stands.
+LCCaptureManager::~LCCaptureManager() {
+    disposeOfFormerTaps();
+    if (const auto recorder = audioRecorderQueue()) recorder->queue->dispose();
+}
+
+void LCCaptureManager::disposeOfFormerTaps() {
     for (const auto& weak : std::exchange(formerTaps_, {}))
         if (const auto former = weak.lock()) former->queue->dispose();
+}
+
+void LCCaptureManager::stopTap() {
+    disposeOfFormerTaps();  // their buffers may never be filled once the recording's clock stands
     const auto recorder = audioRecorderQueue();
     if (!recorder) return;
     AudioInputQueue& queue = *recorder->queue;

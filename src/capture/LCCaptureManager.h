@@ -50,8 +50,9 @@ struct AudioRecorderState {
 ///
 /// Lanes: starting, stopping and every buffer of the application's sound run on the audio capture queue, starting and
 /// stopping the microphone too; stops wait for it, and are legal on it. Microphone samples come on
-/// sessionSampleBufferQueue, interruptions on a lane of the platform. Handlers are called on the audio capture queue,
-/// the microphone's and camera's sample handlers on sessionSampleBufferQueue. What crosses lanes is atomic or behind a
+/// sessionSampleBufferQueue, interruptions and the microphone's start on lanes of the platform, where its did-start
+/// handler is called. The other handlers are called on the audio capture queue, the microphone's and camera's sample
+/// handlers on sessionSampleBufferQueue. What crosses lanes is atomic or behind a
 /// leaf lock. Nothing here waits for the sound server.
 class LCCaptureManager : public CaptureDevices,
                          public CaptureOutputDelegate,
@@ -64,6 +65,8 @@ public:
     /// `init`, and what `sharedManager` adds: watches the shared audio session, and makes it one that plays, records and
     /// mixes.
     static std::shared_ptr<LCCaptureManager> init(const Platform& platform);
+    /// Ends its taps: a tap's queue and its record keep each other.
+    ~LCCaptureManager() override;
 
     /// `+audioDispatchQueue` — the audio capture queue.
     const std::shared_ptr<SerialQueue>& audioDispatchQueue() const { return audioDispatchQueue_; }
@@ -184,6 +187,7 @@ private:
     // On the audio capture queue.
     void startTap(ProcessID pid, SampleHandler outputHandler, Handler didStartHandler);
     void stopTap();
+    void disposeOfFormerTaps();
     void handleInputBuffer(const std::shared_ptr<AudioRecorderState>& recorder, const AudioQueueBufferRef& buffer,
                            const AudioTimeStamp& start, std::uint32_t packetCount,
                            std::span<const AudioPacketDescription> descriptions);

@@ -145,7 +145,7 @@ void LCRecordingSession::checkAndStopAppAudioForPID(ProcessID pid) {
 
 void LCRecordingSession::beginCaptureWithoutTap() {
     // The tap that was stopped may have been about to start the source.
-    if (screenCaptureController() && !startIsPending_ && !paused_) beginCapture();
+    if (isRecording() && screenCaptureController() && !startIsPending_ && !paused_) beginCapture();
 }
 
 void LCRecordingSession::updateBundleIdForFirstForegroundApp() {

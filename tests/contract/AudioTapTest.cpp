@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cstdio>
+#include <filesystem>
 #include <functional>
 #include <map>
 #include <utility>
@@ -328,6 +329,33 @@ TEST_P(AudioTapTest, WithoutAQueueThereIsNoThread) {
         EXPECT_TRUE(connection_->hasThread());
     }
     EXPECT_TRUE(eventually([this] { return !connection_->hasThread(); }));
+}
+
+TEST_P(AudioTapTest, ACallbackThatOwnsItsQueueEndsItWithoutATrace) {
+    const auto threads = [] {
+        const std::filesystem::directory_iterator tasks("/proc/self/task");
+        return std::distance(begin(tasks), end(tasks));
+    };
+    const auto before = threads();
+    struct Owner {
+        std::shared_ptr<AudioInputQueue> queue;
+    };
+    auto owner = std::make_shared<Owner>();
+    owner->queue = queues_
+                       .makeInputQueue(
+                           test::recorderFormat(),
+                           [owner](const AudioQueueBufferRef&, const AudioTimeStamp&, std::uint32_t, auto) {
+                               owner->queue->dispose();
+                           },
+                           AudioInputQueues::kCaptureProcessOutput)
+                       .queue;
+    AudioQueueBufferRef buffer;
+    ASSERT_EQ(owner->queue->allocateBuffer(882 * 2, buffer), AudioStatus::kSuccess);
+    ASSERT_EQ(owner->queue->enqueueBuffer(buffer), AudioStatus::kSuccess);
+    ASSERT_EQ(owner->queue->start(), AudioStatus::kSuccess);
+    const std::weak_ptr<Owner> weak = owner;
+    owner.reset();
+    EXPECT_TRUE(eventually([&] { return weak.expired() && threads() <= before; })) << threads() << " threads, " << before;
 }
 
 TEST_P(AudioTapTest, AQueueWithoutABufferForASecondGivesItsStreamBackAndTheNextBufferBringsItBack) {

@@ -185,6 +185,7 @@ TEST_F(TapThreads, TheManagerMayGoWhileItsTapIsRunning) {
         for (const auto& queue : fakes_->audioInputQueues.queues()) queue->lane().sync([] {});
         lane->sync([] {});  // the last task that knows `taken`
     }
+    EXPECT_TRUE(waitFor([&] { return fakes_->audioInputQueues.queues().empty(); })) << "a tap is left";
 }
 
 }  // namespace
