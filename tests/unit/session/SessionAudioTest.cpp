@@ -165,7 +165,13 @@ TEST_F(SessionAudio, TurningTheMicrophoneOnMakesATapOnlyForARunningSystemRecordi
     EXPECT_EQ(logged("starting mic capture"), 0u) << "it does not record";
     session_->setMicrophoneEnabled(false);
     start();
-    onRequestLane([&] { session_->setMicrophoneEnabled(true); });
+    onRequestLane([&] { session_->setMicrophoneEnabled(false); });
+    settle();
+    EXPECT_EQ(logged("starting mic capture"), 0u) << "off";
+    onRequestLane([&] {
+        session_->setMicrophoneEnabled(true);
+        EXPECT_FALSE(session_->haveMicTap()) << "only once it runs";
+    });
     settle();
     EXPECT_EQ(logged("starting mic capture"), 1u);
     EXPECT_TRUE(session_->haveMicTap());
@@ -175,12 +181,18 @@ TEST_F(SessionAudio, TurningTheMicrophoneOnMakesATapOnlyForARunningSystemRecordi
 }
 
 TEST_F(SessionAudio, WhatIsHeardInAPauseIsDroppedAndNotCountedUntilARetarget) {
+    session_->setMicrophoneEnabled(true);
     startTapped();
     session_->setPaused(true);
+    delegate_->durations.clear();
     hear();
     EXPECT_TRUE(track(1).empty());
     EXPECT_EQ(metrics().appAudioFrameCount, 0);
-    EXPECT_FALSE(delegate_->durations.empty()) << "the time is told all the same";
+    EXPECT_EQ(delegate_->durations.size(), 1u) << "the time is told all the same";
+    speak();
+    EXPECT_TRUE(track(2).empty());
+    EXPECT_EQ(metrics().micFrameCount, 0);
+    EXPECT_EQ(delegate_->durations.size(), 2u);
     retarget(kEditor);
     hear();
     EXPECT_EQ(track(1).size(), 1u);
