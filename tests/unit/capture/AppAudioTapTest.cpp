@@ -54,6 +54,20 @@ TEST_F(AppAudioTap, EveryErrorOfAStartIsLoggedAndNoneEndsIt) {
     EXPECT_TRUE(manager_->audioRecorderQueue());
 }
 
+TEST_F(AppAudioTap, FailuresOfBuffersAndOfTheListenerAreNotLookedAt) {
+    fakes_.faults.failNext("AudioInputQueue.allocateBuffer", 3);
+    fakes_.faults.failNext("AudioInputQueue.enqueueBuffer");
+    fakes_.faults.failNext("AudioInputQueue.addIsRunningListener");
+    start();
+    EXPECT_EQ(fakes_.logSink.logged(),
+              (Lines{"LCRecordingManager: startAudioCapture: Created Audio Queue Input",
+                     "LCRecordingManager: startAudioCapture: Successfully set Audio Queue to PID",
+                     "LCRecordingManager: startAudioCapture: Successfully started Audio Queue Recording"}));
+    EXPECT_EQ(queue()->allocatedBuffers(), 7u);
+    EXPECT_EQ(didStart_, 0) << "nobody says that it runs";
+    EXPECT_TRUE(manager_->audioRecorderQueue()->isRunning);
+}
+
 TEST_F(AppAudioTap, AQueueThatCannotBeMadeIsStartedAndStoppedAllTheSame) {
     fakes_.faults.failNext("AudioInputQueues.makeInputQueue");
     start();
@@ -70,6 +84,21 @@ TEST_F(AppAudioTap, WithoutBytesPerPacketTheQueueSaysHowLargeItsPacketsAre) {
     fakes_.audioInputQueues.setMaximumPacketSize(1);
     start();
     EXPECT_EQ(queue()->bufferBytes(), 44100u);
+}
+
+TEST_F(AppAudioTap, BuffersOfTheSizeTheQueueSaidAreCappedTooAndAFailureToSayItIsNotLogged) {
+    fakes_.audioInputQueues.setMaximumPacketSize(4);
+    start();
+    EXPECT_EQ(queue()->bufferBytes(), 57344u);
+    manager_->stopAppAudioCapture();
+    fakes_.logSink.clear();
+    fakes_.faults.failNext("AudioInputQueue.maximumOutputPacketSize");
+    start();
+    EXPECT_EQ(queue()->allocatedBuffers(), 0u) << "of no bytes there is none";
+    EXPECT_EQ(fakes_.logSink.logged(),
+              (Lines{"LCRecordingManager: startAudioCapture: Created Audio Queue Input",
+                     "LCRecordingManager: startAudioCapture: Successfully set Audio Queue to PID",
+                     "LCRecordingManager: startAudioCapture: Successfully started Audio Queue Recording"}));
 }
 
 TEST_F(AppAudioTap, ABufferBecomesASampleAndGoesBackToTheQueue) {
@@ -111,6 +140,30 @@ TEST_F(AppAudioTap, ASampleThatCannotBeMadeIsCountedAndItsBufferGoesBack) {
     EXPECT_FALSE(manager_->lastAudioDate());
     EXPECT_EQ(manager_->audioRecorderQueue()->currentPacket, 50);
     EXPECT_EQ(queue()->enqueuedBuffers(), 10u);
+}
+
+TEST_F(AppAudioTap, OnlyTheCallbackLooksAtTheStartTime) {
+    start();
+    screenHasBegun();
+    manager_->audioDispatchQueue()->async([&] {
+        ASSERT_TRUE(queue()->deliver(Data(100, 1), 0));
+        queue()->lane().sync([] {});  // the callback has been
+        manager_->setCaptureStartTime(kInvalidMediaTime);
+    });
+    settle();
+    EXPECT_EQ(samples_.size(), 1u);
+    EXPECT_EQ(queue()->enqueuedBuffers(), 10u);
+}
+
+TEST_F(AppAudioTap, TheDateIsThereBeforeTheHandlerIsCalled) {
+    std::optional<Date> seen;
+    manager_->startAppAudioCaptureForProcessID(
+        kPlayer, [&](const SampleRef&) { seen = manager_->lastAudioDate(); }, {});
+    settle();
+    screenHasBegun();
+    hear();
+    ASSERT_TRUE(seen);
+    EXPECT_DOUBLE_EQ(seen->secondsSince1970, fakes_.clock.now().secondsSince1970 + 0.02);
 }
 
 TEST_F(AppAudioTap, UntilTheScreenHasBegunTheBuffersAreLostAndAfterTenTheTapStallsForGood) {
@@ -162,6 +215,49 @@ TEST_F(AppAudioTap, AResumeWithoutAnythingBeforeOrWithoutAGapInsertsNothing) {
     EXPECT_EQ(logged("gap since last audio tap, filling with empty sample buffer"), 0u);
 }
 
+TEST_F(AppAudioTap, AGapOfNoLengthIsNoGap) {
+    screenHasBegun();
+    manager_->setLastAudioDate(fakes_.clock.now());
+    resume();
+    hear();
+    EXPECT_EQ(samples_.size(), 1u);
+    EXPECT_FALSE(manager_->isResumed());
+    EXPECT_EQ(logged("gap since last audio tap, filling with empty sample buffer"), 0u);
+}
+
+TEST_F(AppAudioTap, AResumeCountsFromItsCallOn) {
+    manager_->resumeAppAudioCaptureForProcessID(kPlayer, keep());
+    EXPECT_TRUE(manager_->isResumed()) << "before the tap has been started";
+    settle();
+    hear();
+    EXPECT_TRUE(manager_->isResumed()) << "a buffer that is lost leaves it";
+}
+
+TEST_F(AppAudioTap, ABufferOfAReplacedTapLeavesTheGapToTheNewOne) {
+    start();
+    screenHasBegun();
+    const auto old = queue();
+    manager_->setLastAudioDate(Date{fakes_.clock.now().secondsSince1970 - 1});
+    resume(ProcessID{501});
+    ASSERT_TRUE(old->deliver(Data(100, 1), 0));
+    settle();
+    EXPECT_TRUE(samples_.empty());
+    EXPECT_TRUE(manager_->isResumed());
+    hear();
+    EXPECT_EQ(samples_.size(), 2u);
+}
+
+TEST_F(AppAudioTap, SilenceIsInTheFormatAskedForWhateverTheQueueDelivers) {
+    fakes_.audioInputQueues.setMaximumPacketSize(2);
+    screenHasBegun();
+    manager_->setLastAudioDate(Date{fakes_.clock.now().secondsSince1970 - 1});
+    resume();
+    hear();
+    ASSERT_EQ(samples_.size(), 2u);
+    EXPECT_EQ(samples_[0]->format().audio, manager_->audioBasicDescription());
+    EXPECT_EQ(samples_[1]->format().audio.bytesPerPacket, 0u);
+}
+
 TEST_F(AppAudioTap, TheSilenceComesBeforeTheLookAtTheRecorder) {
     start();
     screenHasBegun();
@@ -204,6 +300,19 @@ TEST_F(AppAudioTap, AStopThatFailsGoesOnToForgetTheTap) {
     }
     EXPECT_TRUE(samples_.empty());
     EXPECT_TRUE(recorder.expired()) << "released when its queue has run dry";
+}
+
+TEST_F(AppAudioTap, AStopThatFailsTakesTheListenerOffAllTheSame) {
+    // A queue that has not said that it runs still has its listener.
+    fakes_.faults.failNext("AudioInputQueue.start");
+    start();
+    const auto recorder = manager_->audioRecorderQueue();
+    ASSERT_TRUE(queue()->hasListener());
+    fakes_.faults.failNext("AudioInputQueue.stop");
+    manager_->stopAppAudioCapture();
+    EXPECT_FALSE(recorder->isRunning);
+    EXPECT_FALSE(queue()->hasListener());
+    EXPECT_EQ(didStart_, 0);
 }
 
 TEST_F(AppAudioTap, FailuresToFreeAndToDisposeAreLogged) {
@@ -262,6 +371,23 @@ TEST_F(AppAudioTap, ATapThatStalledIsDisposedOfWhenItIsReplaced) {
     start();
     EXPECT_TRUE(recorder.expired());
     EXPECT_EQ(fakes_.audioInputQueues.queues().size(), 1u);
+}
+
+TEST_F(AppAudioTap, ABufferThatTheQueueDoesNotTakeBackIsNotWaitedFor) {
+    start();
+    screenHasBegun();
+    const auto old = queue();
+    fakes_.faults.failNext("AudioInputQueue.enqueueBuffer");
+    fakes_.logSink.clear();
+    hear();
+    EXPECT_EQ(samples_.size(), 1u);
+    EXPECT_TRUE(fakes_.logSink.logged().empty());
+    start(ProcessID{501});
+    for (int i = 0; i < 9; ++i) {
+        EXPECT_TRUE(old->deliver(Data(100, 1), 0));
+        settle();
+    }
+    EXPECT_TRUE(old->isDisposed());
 }
 
 TEST_F(AppAudioTap, AReplacedTapThatIsNeverFilledEndsWithTheNextStop) {
@@ -327,6 +453,21 @@ TEST(SilentSample, OfAFormatWithoutFramesPerPacketThereIsNone) {
     EXPECT_EQ(makeSilentSample(format, 1, kZeroMediaTime)->data()->size(), 22050u) << "a byte a sample";
     EXPECT_FALSE(makeSilentSample(format, 0, kZeroMediaTime));
     EXPECT_FALSE(makeSilentSample(format, 601, kZeroMediaTime)) << "more than any interruption is worth";
+}
+
+TEST(SilentSample, IsCountedAt44100ASecondWhateverTheFormatsRateAndCutToWholeSamples) {
+    const AudioFormat format{.sampleRate = 48000,
+                             .formatID = kAudioFormatLinearPCM,
+                             .bytesPerPacket = 4,
+                             .framesPerPacket = 1,
+                             .bytesPerFrame = 2};
+    const auto silence = makeSilentSample(format, 2.99999 / 44100, MediaTime::make(7, 10));
+    ASSERT_TRUE(silence);
+    EXPECT_EQ(silence->sampleCount(), 2);
+    EXPECT_EQ(silence->data()->size(), 8u) << "as large as a packet is, not as a frame";
+    EXPECT_EQ(silence->duration().timescale, 44100);
+    EXPECT_EQ(compare(silence->presentationTime(), MediaTime::make(7, 10)), 0);
+    EXPECT_EQ(makeSilentSample(format, 1, kZeroMediaTime)->sampleCount(), 44100);
 }
 
 }  // namespace

@@ -79,6 +79,38 @@ TEST_F(Microphone, AStopLeavesTheSessionRunningAndANewStartIsToldAtOnce) {
     EXPECT_FALSE(manager_->micDidStartHandler());
 }
 
+TEST_F(Microphone, AStopForgetsNothingOfWhatWasHeard) {
+    startMicrophone();
+    speak(1000);
+    manager_->handleAudioSessionInterruption(1);
+    const auto date = manager_->lastMicAudioDate();
+    manager_->stopMicrophoneCapture();
+    EXPECT_TRUE(manager_->micInterrupted());
+    EXPECT_TRUE(date);
+    EXPECT_EQ(manager_->lastMicAudioDate(), date);
+    EXPECT_EQ(compare(manager_->micInterruptionPresentationTimeStamp(), MediaTime::make(1020, 1000)), 0);
+    EXPECT_TRUE(manager_->microphoneOutputHandler());
+    // A start without a handler keeps the one before.
+    manager_->startMicrophoneCaptureWithOutput({}, {});
+    settle();
+    samples_.clear();
+    manager_->setMicInterrupted(false);
+    speak(2000);
+    EXPECT_EQ(samples_.size(), 1u);
+}
+
+TEST_F(Microphone, OnlyTheKeyPathThatIsObservedTellsOfTheStart) {
+    manager_->setMicDidStartHandler([this] { ++didStart_; });
+    manager_->observeValueForKeyPath("isRunning");
+    EXPECT_EQ(didStart_, 0);
+    EXPECT_TRUE(manager_->micDidStartHandler());
+    manager_->observeValueForKeyPath("running");
+    EXPECT_EQ(didStart_, 1);
+    EXPECT_FALSE(manager_->micDidStartHandler());
+    manager_->observeValueForKeyPath("running");
+    EXPECT_EQ(didStart_, 1);
+}
+
 TEST_F(Microphone, StoppingEverythingGoesInOrderAndKeepsTheSessionObject) {
     startMicrophone();
     start();
@@ -149,6 +181,49 @@ TEST_F(Microphone, AnInterruptionBeforeAnySampleClearsTheFlagAndInsertsNothing) 
     speak(0);
     EXPECT_FALSE(manager_->micInterrupted());
     EXPECT_EQ(samples_.size(), 1u);
+}
+
+TEST_F(Microphone, AnInterruptionWithoutAGapClearsTheFlagAndInsertsNothing) {
+    startMicrophone();
+    for (const double ahead : {0.0, 1.0}) {
+        manager_->handleAudioSessionInterruption(1);
+        manager_->setLastMicAudioDate(Date{fakes_.clock.now().secondsSince1970 + ahead});
+        samples_.clear();
+        speak(0);
+        EXPECT_EQ(samples_.size(), 1u) << ahead;
+        EXPECT_FALSE(manager_->micInterrupted()) << ahead;
+    }
+    EXPECT_EQ(logged("gap since last mic tap, filling with empty sample buffer"), 0u);
+}
+
+TEST_F(Microphone, TheEndOfAnInterruptionChangesNothing) {
+    manager_->handleAudioSessionInterruption(0);
+    EXPECT_FALSE(manager_->micInterrupted());
+    manager_->handleAudioSessionInterruption(1);
+    manager_->handleAudioSessionInterruption(0);
+    EXPECT_TRUE(manager_->micInterrupted());
+}
+
+TEST_F(Microphone, WhereTheNextSampleBeginsIsNotedBeforeTheHandlerIsCalledAndAfterTheSilence) {
+    std::vector<std::pair<std::optional<Date>, MediaTime>> seen;
+    const auto handler = [&](const SampleRef&) {
+        EXPECT_TRUE(manager_->sessionSampleBufferQueue()->isCurrent());
+        seen.emplace_back(manager_->lastMicAudioDate(), manager_->micInterruptionPresentationTimeStamp());
+    };
+    manager_->startMicrophoneCaptureWithOutput(handler, {});
+    settle();
+    speak(1000);
+    manager_->handleAudioSessionInterruption(1);
+    const Date before{fakes_.clock.now().secondsSince1970 - 2}, after{fakes_.clock.now().secondsSince1970 + 0.02};
+    manager_->setLastMicAudioDate(before);
+    speak(3020);
+    ASSERT_EQ(seen.size(), 3u);
+    EXPECT_DOUBLE_EQ(seen[0].first->secondsSince1970, after.secondsSince1970);
+    EXPECT_EQ(compare(seen[0].second, MediaTime::make(1020, 1000)), 0);
+    EXPECT_EQ(seen[1].first, before) << "the silence changes nothing";
+    EXPECT_EQ(compare(seen[1].second, MediaTime::make(1020, 1000)), 0);
+    EXPECT_DOUBLE_EQ(seen[2].first->secondsSince1970, after.secondsSince1970);
+    EXPECT_EQ(compare(seen[2].second, MediaTime::make(3040, 1000)), 0);
 }
 
 TEST_F(Microphone, WithoutAHandlerTheInterruptionIsRemembered) {

@@ -297,6 +297,48 @@ TEST_F(SessionAudio, ARetargetBeforeTheTapRunsStartsTheScreenItself) {
     EXPECT_EQ(finish().url, URL::file(path_));
 }
 
+TEST_F(SessionAudio, ATapThatIsStoppedBeforeItRunsStartsTheScreenInItsPlace) {
+    session_->setFrontmostPIDForAudioTap(kPlayer);
+    fakes_.faults.failNext("AudioInputQueue.start");  // it never says that it runs
+    start();
+    ASSERT_EQ(logged("starting capture"), 0u);
+    onRequestLane([&] { session_->checkAndStopAppAudioForPID(kPlayer); });
+    EXPECT_FALSE(captureManager_->audioRecorderQueue());
+    EXPECT_TRUE(source()->isRunning());
+    onRequestLane([&] { session_->checkAndStopAppAudioForPID(kPlayer); });
+    retarget(kEditor);
+    EXPECT_EQ(logged("starting capture"), 1u) << "once";
+}
+
+TEST_F(SessionAudio, ARetargetInAPauseLeavesTheScreenAlone) {
+    session_->setFrontmostPIDForAudioTap(kPlayer);
+    fakes_.faults.failNext("AudioInputQueue.start");
+    start();
+    pause();
+    retarget(kEditor);
+    EXPECT_EQ(logged("starting capture"), 0u);
+    resume();
+    EXPECT_EQ(logged("starting capture"), 1u);
+    EXPECT_TRUE(source()->isRunning());
+    EXPECT_EQ(tap()->process(), kEditor);
+}
+
+TEST_F(SessionAudio, ARetargetWhileAStartIsPendingLeavesTheScreenToTheStart) {
+    session_->setFrontmostPIDForAudioTap(kPlayer);
+    fakes_.faults.failNext("AudioInputQueue.start");
+    start();
+    finish();
+    onRequestLane([&] {
+        session_->setRecording(true);
+        session_->startSessionWithHandler([] {});
+        session_->updateProcessIDForAudioCaptureWithPID(kEditor);
+        EXPECT_EQ(logged("starting capture"), 0u);
+    });
+    settle();
+    EXPECT_EQ(logged("starting capture"), 1u);
+    EXPECT_TRUE(source()->isRunning());
+}
+
 TEST_F(SessionAudio, TheSoundOfAProcessIsStoppedOnlyIfItIsThatProcesss) {
     startTapped();
     onRequestLane([&] { session_->checkAndStopAppAudioForPID(kEditor); });
