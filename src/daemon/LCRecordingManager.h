@@ -139,7 +139,7 @@ private:
     /// `saveVideoToCameraRoll:handler:` — has the movie's sound mixed, adds it to this user's library and removes its
     /// files. The handler is called once, on the request lane, with an error when it is not in the library. Refused, and
     /// left alone, is a movie that is neither a temporary file nor one that the user may read and remove, and one that
-    /// is still being recorded.
+    /// is still being recorded. Another user's own movie is not mixed.
     void saveVideoToCameraRoll(const std::optional<URL>& movie, UserID user, SaveHandler handler);
     /// On a global queue.
     bool isBeingRecorded(const URL& movie) const;

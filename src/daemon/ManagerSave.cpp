@@ -68,6 +68,15 @@ void LCRecordingManager::saveVideoToCameraRoll(const std::optional<URL>& movie, 
     save->claim = services_.tempStore.lastClaim();
     save->handler = std::move(handler);
     saves_.push_back(save);
+    // Mixing reads with this process's rights. Another user could put a link to what is not theirs in the movie's place
+    // meanwhile; the library reads with that user's.
+    if (!isTemporary && movie && user != platform_.fileSystem.user()) {
+        log_.line("a movie of user %u is saved without mixing", number(user));
+        platform_.scheduler.globalQueue(QueuePriority::Default).async([self = shared_from_this(), save] {
+            self->addToLibrary(save, std::nullopt, false);
+        });
+        return;
+    }
     // Opening the movie waits for the disk.
     platform_.scheduler.globalQueue(QueuePriority::Default).async([self = shared_from_this(), save] {
         LCAudioMixUtility mixer(self->platform_, self->services_.tempStore, self->services_.errors);
@@ -174,7 +183,7 @@ void LCRecordingManager::serveSaveCommand() {
             const std::uint64_t before = self->lastSave_;
             self->saveVideoToCameraRoll(movie, self->platform_.fileSystem.user(), {});
             if (self->lastSave_ == before)
-                return answer({{"error", "the movie is not there, it may not be read and removed, or it is being recorded"}});
+                return answer({{"error", "the movie can't be read and removed, or it is being recorded"}});
             answer({{"save", self->lastSave_}});
         });
 }

@@ -115,6 +115,26 @@ TEST_F(Save, AUsersOwnMovieElsewhereIsSavedAndRemovedAndNobodyElses) {
     EXPECT_EQ(fakes_.photoLibrary.assets()[0].movie, URL("file:///home/me/own.mp4"));
 }
 
+TEST_F(Save, AnotherUsersOwnMovieIsNotReadWithTheDaemonsRights) {
+    URL movie;
+    const auto client = makeStopped(movie);
+    constexpr UserID kOther{1001};
+    fakes_.ipc.setUser(ProcessID{500}, kOther);
+    fakes_.fileSystem.addUsersFile(kOther, "/home/me/own.mp4", 10);
+    bool wasOpened = false;
+    fakes_.movieExporters.setWhenOpened([&](const URL&) { wasOpened = true; });
+    const auto own = client->ask(DaemonMessage::SaveVideoToCameraRoll, {URL("file:///home/me/own.mp4")});
+    settle();
+    EXPECT_EQ(own->code(), 0);
+    EXPECT_FALSE(wasOpened);
+    EXPECT_EQ(fakes_.photoLibrary.assets().size(), 1u);
+    EXPECT_FALSE(fakes_.fileSystem.isThere("/home/me/own.mp4"));
+    // What was recorded here is.
+    client->ask(DaemonMessage::SaveVideoToCameraRoll, {movie});
+    settle();
+    EXPECT_TRUE(wasOpened);
+}
+
 TEST_F(Save, APathThatLeavesTheTemporaryDirectoryIsNoTemporaryFile) {
     URL movie;
     const auto client = makeStopped(movie);
