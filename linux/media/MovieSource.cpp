@@ -118,7 +118,10 @@ std::variant<std::unique_ptr<MovieSource>, Error> MovieSource::open(const std::s
 }
 
 std::int64_t MovieSource::duration() const {
-    return file_->duration > 0 ? av_rescale(file_->duration, kNanoseconds.den, AV_TIME_BASE) : 0;
+    // A header may say anything; what is longer than a year has no length that one could work with.
+    constexpr std::int64_t kLongest = 366LL * 24 * 3600 * AV_TIME_BASE;
+    if (file_->duration <= 0 || file_->duration > kLongest) return 0;
+    return av_rescale(file_->duration, kNanoseconds.den, AV_TIME_BASE);
 }
 
 bool MovieSource::declareTracks(mp4::MovieBoxWriter& movie, std::vector<mp4::TrackId>& ids) const {

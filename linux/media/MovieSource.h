@@ -32,7 +32,7 @@ public:
     /// An error for what is no movie, and for tracks that can't be copied: other codecs than ours.
     static std::variant<std::unique_ptr<MovieSource>, Error> open(const std::string& path);
 
-    /// Nanoseconds; 0 when the movie does not know.
+    /// Nanoseconds; 0 when the movie does not know, or says more than a year.
     std::int64_t duration() const;
     const std::vector<Track>& tracks() const { return tracks_; }
 
