@@ -64,6 +64,16 @@ double levelOf(const checkers::Sound& sound, double frequency) {
     return checkers::toneLevel(sound.samples, sound.rate, frequency);
 }
 
+/// Whether the application itself drew the marked picture of that moment more than half a frame time too late.
+bool wasDrawnLate(nanoseconds mark, const std::vector<checkers::NumberedPicture>& pictures,
+                  const checkers::FramesLog& drawn) {
+    const auto picture = std::find_if(pictures.begin(), pictures.end(), [&](const auto& one) { return one.time == mark; });
+    if (picture == pictures.end() || !picture->number) return false;
+    const auto frame = drawn.find(*picture->number);
+    if (frame == drawn.end() || frame == drawn.begin()) return false;
+    return frame->second.shown - std::prev(frame)->second.shown > nanoseconds(seconds(1)) * 3 / 2 / kFramesPerSecond;
+}
+
 enum class Kind { PulseAudio, PipeWire };
 
 class SoundOnServer : public ::testing::TestWithParam<Kind> {
@@ -144,16 +154,30 @@ TEST_P(SoundOnServer, IsInSyncFromEndToEndHoweverOftenTheRecordingIsPaused) {
     const std::string beeps = application->ask("beeps");
     const std::string movie = application->stop();
     const auto sound = soundOf(movie);
-    expectation.tolerance = kInSync;
+    expectation.tolerance = milliseconds(250);  // each has its partner; how close is judged below
     expectation.leastPairs = static_cast<std::size_t>(length / 0.67 * 0.7);
     const auto pictures = picturesOf(movie);
     const auto report = checkers::checkBeepsAtMarks(pictures, checkers::beepOnsets(sound, kBeep), expectation);
     for (const auto& finding : report.findings) ADD_FAILURE() << finding << " (" << beeps << ")";
     ASSERT_TRUE(report.drift.has_value());
-    std::printf("    %s: %zu beeps in %.0f s, the furthest %.1f ms from its picture, drift %.1f ms; %s\n",
-                server_->name().c_str(), report.pairs.size(), lengthOf(sound),
-                static_cast<double>(report.worst.count()) / 1e6, static_cast<double>(report.drift->count()) / 1e6,
-                beeps.c_str());
+    // A machine that stands still for a moment makes the application draw a mark late: by its own log, which is not the
+    // recording's doing. Those are counted, and must be few.
+    const auto drawn = application->framesLog();
+    std::size_t late = 0;
+    nanoseconds worst{};
+    for (const auto& pair : report.pairs) {
+        if (wasDrawnLate(pair.mark, pictures, drawn)) {
+            ++late;
+            continue;
+        }
+        if (std::chrono::abs(pair.late) > std::chrono::abs(worst)) worst = pair.late;
+        EXPECT_LE(std::chrono::abs(pair.late), kInSync) << "the beep at " << pair.mark.count() / 1'000'000 << " ms, " << beeps;
+    }
+    EXPECT_LE(late, report.pairs.size() / 10);
+    std::printf("    %s: %zu beeps in %.0f s, the furthest %.1f ms from its picture (without %zu that were drawn late), "
+                "drift %.1f ms; %s\n",
+                server_->name().c_str(), report.pairs.size(), lengthOf(sound), static_cast<double>(worst.count()) / 1e6,
+                late, static_cast<double>(report.drift->count()) / 1e6, beeps.c_str());
 #ifndef LC_SANITIZED
     EXPECT_LT(std::chrono::abs(*report.drift), kDrift);
 #endif
