@@ -1,5 +1,6 @@
 // The Linux port's platform: every role made of real services, in the order in which they need each other.
 
+#include <signal.h>
 #include <sysexits.h>
 #include <unistd.h>
 
@@ -166,6 +167,7 @@ std::unique_ptr<PlatformOwner> makePlatform() {
     keepMemoryFlat();
     allowDescriptors(kDescriptors);
     blockTerminationSignals();
+    ::signal(SIGXFSZ, SIG_IGN);  // a file that may not grow is an error to its writer, not the end of the process
     const LinuxEnvironment environment = LinuxEnvironment::ofThisProcess();
     if (const auto error = environment.prepareDirectories()) {
         std::fprintf(stderr, "lumacastd: the runtime and state directories can't be made: %s\n",

@@ -34,11 +34,13 @@ bool EncodingQueue::remove(const std::shared_ptr<LinuxMovieExport>& job) {
 
 void EncodingQueue::run() {
     pthread_setname_np(pthread_self(), "lc-mixing");
-    if (priority_ == EncodingPriority::Idle) runAtIdlePriority();
+    bool isIdle = false;
     std::unique_lock lock(mutex_);
     for (;;) {
         changed_.wait(lock, [this] { return stopping_ || !waiting_.empty(); });
         if (waiting_.empty()) return;
+        // Not before there is something to do: on a busy machine the end of the process would wait for it.
+        if (priority_ == EncodingPriority::Idle && !std::exchange(isIdle, true)) runAtIdlePriority();
         running_ = std::move(waiting_.front());
         waiting_.pop_front();
         auto job = running_;

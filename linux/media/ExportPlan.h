@@ -1,6 +1,7 @@
 #pragma once
 #include <atomic>
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <string>
 #include <variant>
@@ -12,6 +13,7 @@ namespace lumacast::media {
 /// What is exported from where to where.
 struct ExportPlan {
     std::string source;
+    std::shared_ptr<const void> sourceHeld;  ///< what keeps `source` the file that was opened
     std::string destination;
     std::optional<MediaTimeRange> range;  ///< none: all of it
     ExportPreset preset = ExportPreset::PassThrough;

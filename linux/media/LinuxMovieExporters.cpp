@@ -1,25 +1,42 @@
 #include "linux/media/LinuxMovieExporters.h"
 
+#include <fcntl.h>
+#include <sys/stat.h>
+
 #include <algorithm>
 #include <utility>
 
 #include "linux/media/EncodingQueue.h"
 #include "linux/media/LinuxMovieExport.h"
 #include "linux/media/MovieSource.h"
+#include "linux/system/FileDescriptor.h"
 
 namespace lumacast {
 
 namespace {
 
+/// A regular file, for reading; without waiting for anybody, as the opening of a pipe would.
+std::shared_ptr<const FileDescriptor> openRegular(const std::string& path) {
+    FileDescriptor file(::open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+    struct stat status = {};
+    if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) return nullptr;
+    return std::make_shared<const FileDescriptor>(std::move(file));
+}
+
+/// The movie that stood at its path when it was opened, whatever becomes of the path: it is read through its descriptor.
 class LinuxMovieAsset final : public MovieAsset {
 public:
-    explicit LinuxMovieAsset(const URL& url) : path_(url.path()) {
+    explicit LinuxMovieAsset(const URL& url) : file_(openRegular(url.path())) {
+        if (!file_) return;
+        path_ = "/proc/self/fd/" + std::to_string(file_->get());
         auto opened = media::MovieSource::open(path_);
         if (auto* const source = std::get_if<0>(&opened)) read(**source);
     }
     MediaTime duration() const override { return MediaTime::make(nanoseconds_, 1'000'000'000); }
     std::vector<std::int32_t> audioTracks() const override { return audioTracks_; }
+    /// Empty when it could not be opened; good for as long as `held()` is.
     const std::string& path() const { return path_; }
+    std::shared_ptr<const void> held() const { return file_; }
 
 private:
     void read(const media::MovieSource& source) {
@@ -29,7 +46,8 @@ private:
         }
     }
 
-    const std::string path_;
+    const std::shared_ptr<const FileDescriptor> file_;
+    std::string path_;
     std::int64_t nanoseconds_ = 0;
     std::vector<std::int32_t> audioTracks_;
 };
@@ -60,7 +78,10 @@ public:
     void exportAsynchronously(Completion completion) override {
         const auto* const movie = dynamic_cast<const LinuxMovieAsset*>(movie_.get());
         std::optional<Error> refusal;
-        if (movie) plan_.source = movie->path();
+        if (movie) {
+            plan_.source = movie->path();
+            plan_.sourceHeld = movie->held();
+        }
         if (!movie) refusal = media::systemError(EINVAL);
         const auto made = std::make_shared<LinuxMovieExport>(plan_, std::move(completion), exporters_.lane());
         {

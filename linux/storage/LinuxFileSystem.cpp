@@ -193,7 +193,12 @@ UserID LinuxFileSystem::user() const { return UserID{::geteuid()}; }
 bool LinuxFileSystem::userMayReadAndRemove(UserID user, const std::string& path) {
     const auto answer = ask<Done>([user, path, accounts = accounts_](const Place& place) -> std::variant<Done, int> {
         if (place.beforeEachQuestion) place.beforeEachQuestion();
-        const int error = performAs(number(user), accounts, [&] { return mayReadAndRemove(path, number(user)); });
+        const auto own = place.openDirectoryAgain();
+        struct stat ours = {};
+        if (const int* error = std::get_if<int>(&own)) return *error;
+        if (::fstat(std::get<FileDescriptor>(own).get(), &ours) != 0) return errno;
+        const int error =
+            performAs(number(user), accounts, [&] { return mayReadAndRemove(path, number(user), &ours); });
         if (error != 0) return error;
         return Done{};
     });

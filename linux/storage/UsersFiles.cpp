@@ -30,7 +30,7 @@ bool isPinned(int directory, const std::string& name, std::uint64_t attributes) 
 
 }  // namespace
 
-int mayReadAndRemove(const std::string& path, uid_t user) {
+int mayReadAndRemove(const std::string& path, uid_t user, const struct stat* notIn) {
     const auto place = resolveForUser(path, user);
     if (const int* error = std::get_if<int>(&place)) return *error;
     const auto& [folder, name] = std::get<ResolvedName>(place);
@@ -47,6 +47,7 @@ int mayReadAndRemove(const std::string& path, uid_t user) {
 
     if (const int error = mayChange(folder.get(), user); error != 0) return error;
     if (::fstat(folder.get(), &around) != 0) return errno;
+    if (notIn && notIn->st_dev == around.st_dev && notIn->st_ino == around.st_ino) return EACCES;
     const bool isSticky = (around.st_mode & S_ISVTX) != 0;
     if (isSticky && user != 0 && user != file.st_uid && user != around.st_uid) return EACCES;
     if (isPinned(folder.get(), name, STATX_ATTR_IMMUTABLE | STATX_ATTR_APPEND)) return EPERM;

@@ -51,7 +51,8 @@ public:
     /// Whose files this process makes.
     virtual UserID user() const = 0;
     /// Whether this user may itself read and remove the regular file at `path`, wherever it is; no link on the way is
-    /// followed that is not the user's own or the administrator's. False too when the disk has not answered.
+    /// followed that is not the user's own or the administrator's. False for what lies in the temporary directory,
+    /// under whatever name: that is this process's. False too when the disk has not answered.
     virtual bool userMayReadAndRemove(UserID user, const std::string& path) = 0;
     /// Removes a file, wherever it is, with that user's rights and as remove() does. EPERM where this process can't act
     /// for the user.

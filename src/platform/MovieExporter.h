@@ -67,7 +67,8 @@ public:
 class MovieExporters {
 public:
     virtual ~MovieExporters() = default;
-    /// Never null; see MovieAsset::duration for a movie that can't be read.
+    /// Never null; see MovieAsset::duration for a movie that can't be read. What stands at the path now is the movie,
+    /// whatever stands there later.
     virtual std::shared_ptr<MovieAsset> openMovie(const URL& url) = 0;
     virtual std::shared_ptr<MovieExporter> makeExporter(std::shared_ptr<MovieAsset> movie, ExportPreset preset,
                                                         const URL& outputURL) = 0;
