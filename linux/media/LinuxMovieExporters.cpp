@@ -15,6 +15,10 @@ namespace lumacast {
 
 namespace {
 
+/// What the library may take at a time, whatever a movie's header says: a picture of the largest size that can be
+/// recorded, and room.
+constexpr std::size_t kMostLibraryMemory = std::size_t{512} << 20;
+
 /// A regular file, for reading; without waiting for anybody, as the opening of a pipe would.
 std::shared_ptr<const FileDescriptor> openRegular(const std::string& path) {
     FileDescriptor file(::open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
@@ -112,6 +116,7 @@ LinuxMovieExporters::LinuxMovieExporters(std::shared_ptr<media::MovieFiles> file
     : files_(std::move(files)) {
     encodings_ = std::make_unique<media::EncodingQueue>(files_, priority);
     av_log_set_level(AV_LOG_QUIET);  // the library talks to the standard error output by itself
+    av_max_alloc(kMostLibraryMemory);
 }
 
 LinuxMovieExporters::~LinuxMovieExporters() {

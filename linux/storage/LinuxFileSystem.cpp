@@ -195,10 +195,12 @@ bool LinuxFileSystem::userMayReadAndRemove(UserID user, const std::string& path)
         if (place.beforeEachQuestion) place.beforeEachQuestion();
         const auto own = place.openDirectoryAgain();
         struct stat ours = {};
-        if (const int* error = std::get_if<int>(&own)) return *error;
-        if (::fstat(std::get<FileDescriptor>(own).get(), &ours) != 0) return errno;
-        const int error =
-            performAs(number(user), accounts, [&] { return mayReadAndRemove(path, number(user), &ours); });
+        const auto* const folder = std::get_if<FileDescriptor>(&own);
+        if (!folder && std::get<int>(own) != ENOENT) return std::get<int>(own);
+        if (folder && ::fstat(folder->get(), &ours) != 0) return errno;
+        const int error = performAs(number(user), accounts, [&] {
+            return mayReadAndRemove(path, number(user), folder ? &ours : nullptr);
+        });
         if (error != 0) return error;
         return Done{};
     });
