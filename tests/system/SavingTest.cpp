@@ -406,6 +406,8 @@ TEST(Saving, AMovieWhosePlaceANewerRecordingTakesIsSavedAllTheSameAndTheNewerOne
     ASSERT_TRUE(waitUntil([&] { return std::time(nullptr) != second; }));
     world.recorder().save(URL::file(recorded), answers.handler(1));
     ASSERT_TRUE(waitUntil([&] { return world.saveStates().size() == 2; }));
+    // The picture that the older one ended with isn't the newer one's first.
+    ASSERT_TRUE(application->waitForFrame(application->askForFrame("frame") + 1));
     first = application->askForFrame("start");
     ASSERT_TRUE(waitUntil([&] { return answers.total() == 2; }, kPatience));
     ASSERT_TRUE(application->waitForFrame(first + 10));
