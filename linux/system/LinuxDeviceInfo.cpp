@@ -16,18 +16,31 @@ std::optional<std::int64_t> LinuxDeviceInfo::userInterfaceIdiom() const { return
 std::optional<std::int64_t> LinuxDeviceInfo::chipID() const { return number("ChipID"); }
 std::optional<std::int64_t> LinuxDeviceInfo::reducedCaptureChipID() const { return number("ReducedCaptureChipID"); }
 
+std::optional<bool> LinuxDeviceInfo::regionalRule(std::string_view name) const {
+    const auto written = text("Region", name);
+    if (!written) return std::nullopt;
+    const Value value = iniValue(*written);
+    const bool* rule = value.as<bool>();
+    return rule ? std::optional(*rule) : std::nullopt;
+}
+
 std::optional<std::int64_t> LinuxDeviceInfo::number(std::string_view key) const {
-    const auto read = [directories = directories_, wanted = std::string(key)]() -> std::optional<std::int64_t> {
+    const auto value = text("", key);
+    return value ? wholeNumber(*value) : std::nullopt;
+}
+
+std::optional<std::string> LinuxDeviceInfo::text(std::string_view section, std::string_view key) const {
+    using Text = std::optional<std::string>;
+    const auto read = [directories = directories_, section = std::string(section), key = std::string(key)]() -> Text {
         for (const std::string& directory : directories) {
             const auto file = readSmallFile(directory + "/device.conf", kMaximumBytes);
             if (!file) continue;
             const IniFile settings = IniFile::parse(file->text);
-            const std::string* text = settings.find("", wanted);
-            if (text) return wholeNumber(*text);
+            if (const std::string* value = settings.find(section, key)) return *value;
         }
         return std::nullopt;
     };
-    return disk_.ask<std::optional<std::int64_t>>(patience_, read).value_or(std::nullopt);
+    return disk_.ask<Text>(patience_, read).value_or(std::nullopt);
 }
 
 }  // namespace lumacast

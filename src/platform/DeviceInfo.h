@@ -1,6 +1,7 @@
 #pragma once
 #include <cstdint>
 #include <optional>
+#include <string_view>
 
 namespace lumacast {
 
@@ -15,6 +16,8 @@ public:
     /// The chip identifier of the one tablet generation whose capture is capped at 1600 pixels; none when not
     /// configured.
     virtual std::optional<std::int64_t> reducedCaptureChipID() const = 0;
+    /// A rule of the region the device is sold in, "RegionalBehaviorShutterClick" for one; none when it has no such rule.
+    virtual std::optional<bool> regionalRule(std::string_view name) const = 0;
 };
 
 }  // namespace lumacast

@@ -1,5 +1,8 @@
 #pragma once
 #include <atomic>
+#include <map>
+#include <mutex>
+#include <string>
 
 #include "base/Guarded.h"
 #include "platform/DeviceInfo.h"
@@ -13,9 +16,19 @@ public:
     std::optional<std::int64_t> chipID() const override { return ++questions_, chip_.get(); }
     std::optional<std::int64_t> reducedCaptureChipID() const override { return reducedChip_.get(); }
 
+    std::optional<bool> regionalRule(std::string_view name) const override {
+        const std::lock_guard lock(rulesMutex_);
+        const auto found = rules_.find(std::string(name));
+        return found == rules_.end() ? std::nullopt : std::optional(found->second);
+    }
+
     void setUserInterfaceIdiom(std::optional<std::int64_t> idiom) { idiom_.set(idiom); }
     void setChipID(std::optional<std::int64_t> chip) { chip_.set(chip); }
     void setReducedCaptureChipID(std::optional<std::int64_t> chip) { reducedChip_.set(chip); }
+    void setRegionalRule(std::string_view name, bool value) {
+        const std::lock_guard lock(rulesMutex_);
+        rules_.insert_or_assign(std::string(name), value);
+    }
 
     /// How often it was asked for its idiom or its chip.
     int questions() const { return questions_; }
@@ -23,6 +36,8 @@ public:
 private:
     mutable std::atomic<int> questions_{0};
     Guarded<std::optional<std::int64_t>> idiom_, chip_, reducedChip_;
+    mutable std::mutex rulesMutex_;
+    std::map<std::string, bool> rules_;
 };
 
 }  // namespace lumacast
