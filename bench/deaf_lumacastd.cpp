@@ -79,7 +79,8 @@ Platform withQueues(const Platform& other, AudioInputQueues& queues) {
     return {other.log, other.scheduler, other.clock, other.ipc, other.bundles, other.renderServer, other.appStateMonitor,
             other.displayCapture, other.displayCloneControl, queues, other.deviceCapture, other.containerWriters,
             other.movieExporters, other.photoLibrary, other.fileSystem, other.preferences, other.deviceInfo,
-            other.telemetry, other.keepAlive, other.admin, other.storagePurge};
+            other.telemetry, other.keepAlive, other.admin, other.storagePurge,
+            other.userAlerts, other.systemSounds, other.screenReader, other.storeLookup, other.networkReachability};
 }
 
 }  // namespace

@@ -10,6 +10,7 @@
 #include <string>
 
 #include "base/Limits.h"
+#include "linux/AbsentServices.h"
 #include "linux/admin/LinuxAdminService.h"
 #include "linux/apps/Entitlements.h"
 #include "linux/apps/LinuxBundles.h"
@@ -95,12 +96,14 @@ public:
                      endUnreachable();
                  }),
           storagePurge_(scheduler_, fileSystem_),
+          storeLookup_(scheduler_),
           platform_{log_,       scheduler_, clock_,   ipc_,
                     bundles_,   renderServer_, appState_, capture_,
                     capture_,   audioInputQueues_, deviceCapture_, writers_,
                     exporters_, photoLibrary_, fileSystem_, preferences_,
                     deviceInfo_, telemetry_, keepAlive_, admin_,
-                    storagePurge_},
+                    storagePurge_, userAlerts_, systemSounds_, screenReader_,
+                    storeLookup_, networkReachability_},
           termination_([this] {
               keepAlive_.announceStopping(static_cast<int>(kTimeToClose.count()));
               writers_.closeOpenMovies();
@@ -157,6 +160,11 @@ private:
     X11AppStateMonitor appState_;
     LinuxAdminService admin_;
     LinuxStoragePurgeService storagePurge_;
+    AbsentUserAlerts userAlerts_;
+    AbsentSystemSounds systemSounds_;
+    AbsentScreenReader screenReader_;
+    AbsentStoreLookup storeLookup_;
+    AbsentNetworkReachability networkReachability_;
     Platform platform_;
     Termination termination_;  // last: it touches what is above
 };

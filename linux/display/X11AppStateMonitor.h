@@ -23,8 +23,6 @@ class X11AppStateMonitor final : public AppStateMonitor, private x11::QuestionLa
 public:
     /// The other bit that this monitor gives: the application runs, but not in the foreground.
     static constexpr std::uint32_t kRunningBackground = 4;
-    /// The update of an application that has ended.
-    static constexpr std::int64_t kEnded = 1;
 
     /// The application that a process runs; none for one that is no application's. Called on the monitor's own lane.
     using IdentifierOf = std::function<std::optional<BundleIdentifier>(ProcessID)>;

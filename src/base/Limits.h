@@ -21,12 +21,18 @@ enum class Limit : std::uint8_t {
     HeldBytesPerUser,
     ConnectionsBeforeHello,
     RequestsWithoutReply,
+    StartsWaitingForUser,
+    StartsOfApplicationWaitingForUser,
 };
+
+/// Who refuses what goes beyond it.
+enum class LimitKeeper : std::uint8_t { Connections, Manager };
 
 struct LimitRow {
     Limit limit;
     std::uint64_t value;
     std::string_view meaning;
+    LimitKeeper keeper = LimitKeeper::Connections;
 };
 
 /// In the order of the enumeration.
@@ -44,6 +50,10 @@ inline constexpr std::array kLimits{
     LimitRow{Limit::HeldBytesPerUser, 64 << 20, "bytes of unfinished and of unread messages of one user's connections"},
     LimitRow{Limit::ConnectionsBeforeHello, 64, "connections of one user that have not said hello"},
     LimitRow{Limit::RequestsWithoutReply, 1024, "requests of one connection known to get no reply, kept until it ends"},
+    LimitRow{Limit::StartsWaitingForUser, 32, "start requests that wait for the user's answer",
+             LimitKeeper::Manager},
+    LimitRow{Limit::StartsOfApplicationWaitingForUser, 4,
+             "start requests of one application that wait for the user's answer", LimitKeeper::Manager},
 };
 
 /// How little space may be free where movies are written before temporary ones are asked for.

@@ -17,6 +17,12 @@ constexpr char kServiceName[] = "com.orvane.lumacastd";
 LCRecordingManager::LCRecordingManager(const SessionServices& services, AlertQueue& alertQueue)
     : services_(services), platform_(services.platform), log_(services.platform.log), alertQueue_(alertQueue) {}
 
+LCRecordingManager::~LCRecordingManager() {
+    if (!layoutMonitor_) return;
+    layoutMonitor_->removeObserver(*this);
+    layoutMonitor_->invalidate();
+}
+
 std::shared_ptr<LCRecordingManager> LCRecordingManager::init(const SessionServices& services, AlertQueue& alertQueue,
                                                              SessionMaker makeSession) {
     std::shared_ptr<LCRecordingManager> manager(new LCRecordingManager(services, alertQueue));
@@ -69,6 +75,7 @@ bool LCRecordingManager::listenerShouldAcceptNewConnection(IpcListener&,
     }
     session->setClientProxy(std::make_shared<LCClientProxy>(log_, *bundleID, connection));
     session->managerRecord.connection = connection;
+    cancelOrphanedQuestions();
     connection->resume();
     expireAcknowledgementExemptionsForBundleID(*bundleID);
     return true;
@@ -81,10 +88,12 @@ void LCRecordingManager::applicationDisconnectedWithBundleID(const BundleIdentif
     if (session->isSystemRecording()) {
         // A system recording deliberately goes on without its client.
         if (const auto proxy = session->clientProxy()) proxy->setConnection(nullptr);
+        cancelOrphanedQuestions();
         return;
     }
     stopRecordingSession(session, 0, 0, {});
     removeSessionForBundleID(bundleID);
+    cancelOrphanedQuestions();
     resetUnansweredStops(session);
 }
 

@@ -1,6 +1,7 @@
 #pragma once
 // The daemon's one central object.
 
+#include <deque>
 #include <functional>
 #include <map>
 #include <memory>
@@ -11,7 +12,9 @@
 
 #include "base/Identifiers.h"
 #include "base/MessageTables.h"
+#include "daemon/AcknowledgementAlert.h"
 #include "daemon/AlertQueue.h"
+#include "platform/DisplayLayoutMonitor.h"
 #include "platform/Platform.h"
 #include "session/LCRecordingSession.h"
 
@@ -26,6 +29,16 @@ struct StartRequest {
     bool broadcast = false;
     bool systemRecording = false;
     bool captureEnabled = false;
+};
+
+/// A start request that waits for the user's answer, or for its turn to ask. Request lane.
+struct WaitingStart {
+    std::shared_ptr<LCRecordingSession> session;
+    std::shared_ptr<IpcConnection> connection;  ///< who asked
+    StartRequest request;
+    std::uint64_t number = 0;
+    std::function<void(std::optional<Error>, bool microphoneRecording, bool cameraRecording)> handler;
+    std::shared_ptr<AcknowledgementAlert> alert;
 };
 
 /// One movie on its way to the user's library. Request lane; what does not change is read elsewhere too.
@@ -50,12 +63,16 @@ struct MovieSave {
 class LCRecordingManager final : public IpcListenerDelegate,
                                  public IpcExportedObject,
                                  public LCRecordingSessionDelegate,
+                                 public DisplayLayoutObserver,
                                  public std::enable_shared_from_this<LCRecordingManager> {
 public:
     using StartHandler = std::function<void(std::optional<Error>, bool microphoneRecording, bool cameraRecording)>;
     using StopHandler = std::function<void(std::optional<URL>, std::optional<Error>)>;
     using SaveHandler = std::function<void(std::optional<Error>)>;
     using Handler = std::function<void()>;
+    /// Told of one system recording that was stopped: once for each.
+    using SystemStopHandler =
+        std::function<void(const std::shared_ptr<LCRecordingSession>&, std::optional<URL>, std::optional<Error>)>;
 
     /// Makes the session of an application.
     using SessionMaker =
@@ -65,6 +82,8 @@ public:
     /// real sessions.
     static std::shared_ptr<LCRecordingManager> init(const SessionServices& services, AlertQueue& alertQueue,
                                                     SessionMaker makeSession);
+    /// `dealloc` — stops observing the display's layout.
+    ~LCRecordingManager() override;
 
     /// `lumaAlertQueue` — the process's, see AlertQueue.
     SerialQueue& lumaAlertQueue() { return alertQueue_.get(); }
@@ -95,6 +114,25 @@ public:
     /// `frontmostSession:applicationPID:` — the process whose sound belongs to a recording of this session: of a system
     /// recording the process in front, -1 when nothing is; else the client's own. The handler is called at once.
     void frontmostSession(const LCRecordingSession& session, const std::function<void(ProcessID)>& handler);
+
+    /// `notifySystemRecordingMayBeStopped`, `notifySystemRecordingResumed` — to every system recording under way. Nothing
+    /// sends them.
+    void notifySystemRecordingMayBeStopped();
+    void notifySystemRecordingResumed();
+
+    /// `stopSystemRecordingWithHandler:` — stops every system recording, adds its movie to the library and calls the
+    /// handler for each; never when there is none. Nothing uses it.
+    void stopSystemRecordingWithHandler(SystemStopHandler handler);
+    /// `stopSystemRecordingWithInterruption` — the same, and tells the clients. Nothing uses it.
+    void stopSystemRecordingWithInterruption();
+
+    /// Where the platform has a monitor of the display's layout: the manager observes it and lets go of it at its end.
+    /// This platform has none. Before the service is resumed.
+    void setLayoutMonitor(std::shared_ptr<DisplayLayoutMonitor> monitor);
+    /// `layoutMonitor:didUpdateDisplayLayout:withContext:` — recordings of applications whose content was resized by the
+    /// new layout are stopped. Request lane.
+    void layoutMonitorDidUpdateDisplayLayout(DisplayLayoutMonitor* monitor,
+                                             const std::vector<DisplayLayoutElement>& layout) override;
 
     /// `isMicrophoneRecording` and `isCameraRecording` — what the last start that got that far asked for.
     bool isMicrophoneRecording() const { return microphoneRecording_; }
@@ -166,10 +204,27 @@ private:
 
     // Starting.
     bool checkContextIDsMatch(const std::vector<ContextID>& contextIDs);
-    void startProper(const std::shared_ptr<LCRecordingSession>& session, const StartRequest& request,
-                     std::uint64_t number, StartHandler handler);
+    using WaitingStartRef = std::shared_ptr<WaitingStart>;
+    void startProper(const WaitingStartRef& start);
+    /// `showAcknowledgementAlertForSession:` — goes on with the start once the user has acknowledged the recording, at
+    /// once when the session is exempt.
+    void showAcknowledgementAlertForSession(const WaitingStartRef& start);
+    /// Asks the user about the start that has waited longest, unless somebody is being asked.
+    void askNext();
+    void takeAnswer(const WaitingStartRef& start, std::optional<UserAlert::Response> response);
+    /// Whether the user's answer lets the recording go on; what it means for the microphone, the camera and later starts.
+    bool acknowledge(const LCRecordingSession& session, std::optional<UserAlert::Response> response);
+    void continueAcknowledged(const WaitingStartRef& start);
+    /// Takes down the questions of starts whose client has gone, or has connected anew.
+    void cancelOrphanedQuestions();
+    /// Whether whoever asked for the start still is the session's client.
+    bool isStillWanted(const WaitingStart& start) const;
+    void beginRecording(const WaitingStartRef& start);
+    void monitorForegroundApps(const std::shared_ptr<LCRecordingSession>& session);
+    /// `checkAndPlaySystemRecordSound:isRecordingOn:`
+    void checkAndPlaySystemRecordSound(const LCRecordingSession& session, bool isRecordingOn);
     void logRefusal(std::uint64_t number, RecordingErrorCode code, std::string_view reason);
-    void refuse(std::uint64_t number, RecordingErrorCode code, std::string_view reason, const StartHandler& handler);
+    void refuse(const WaitingStart& start, RecordingErrorCode code, std::string_view reason);
     void stopCurrentRecordingSessionWithHandler(Handler handler);
     void interruptOtherRecordingSessionAgainstSession(const std::shared_ptr<LCRecordingSession>& session);
     bool isApplicationInForegroundWithBundleIdentifier(const BundleIdentifier& bundleID);
@@ -186,6 +241,12 @@ private:
     /// Resets after stops that never will be answered: a failed trim, say.
     void resetUnansweredStops(const std::shared_ptr<LCRecordingSession>& session);
     void clearSystemRecordingUI(const LCRecordingSession& session);
+    /// Adds a system recording's movie to the library of the user whose client it was, waiting on a global queue; then
+    /// calls `added` with the error, also when there is no movie. `added` runs on the request lane.
+    void addSystemRecordingToLibrary(const LCRecordingSession& session, const std::optional<URL>& movieURL,
+                                     std::function<void(std::optional<Error>)> added);
+    void keepPreemptedSystemRecording(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation,
+                                      std::uint64_t claim, const std::optional<URL>& movieURL);
     void discardInterruptedRecording(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation,
                                      std::uint64_t claim, const std::optional<URL>& movieURL);
     void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
@@ -214,6 +275,13 @@ private:
     /// The connection whose message is being handled; only then.
     std::shared_ptr<IpcConnection> callingConnection_;
     std::uint64_t requestNumber_ = 0;
+
+    std::deque<WaitingStartRef> waitingStarts_;  ///< the first one is being asked about
+    bool isAsking_ = false;
+
+    std::weak_ptr<LCRecordingSession> monitoredSession_;  ///< whose start set the AppStateMonitor's handler last
+    std::shared_ptr<DisplayLayoutMonitor> layoutMonitor_;  ///< none on this system
+    std::int32_t previousElementCount_ = 0;
 
     std::vector<std::shared_ptr<MovieSave>> saves_;  ///< those under way and the last that have ended, oldest first
     std::uint64_t lastSave_ = 0;

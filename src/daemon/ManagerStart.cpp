@@ -10,8 +10,6 @@ namespace {
 
 constexpr std::string_view kSystemRecordingEntitlement = "com.orvane.private.luma-cast";
 
-constexpr ProcessID kNoProcess{-1};
-
 /// A session's capture source keeps its first size for good, so one that no picture can have must not get there.
 bool isSize(Size size) {
     return std::isfinite(size.width) && std::isfinite(size.height) && size.width >= 1 && size.height >= 1;
@@ -37,57 +35,61 @@ void LCRecordingManager::logRefusal(std::uint64_t number, RecordingErrorCode cod
     log_.line("start request %lu refused with %d: %@", number, code, reason);
 }
 
-void LCRecordingManager::refuse(std::uint64_t number, RecordingErrorCode code, std::string_view reason,
-                                const StartHandler& handler) {
-    logRefusal(number, code, reason);
-    handler(services_.errors._lcUserErrorForCode(code), false, false);
+void LCRecordingManager::refuse(const WaitingStart& start, RecordingErrorCode code, std::string_view reason) {
+    logRefusal(start.number, code, reason);
+    start.handler(services_.errors._lcUserErrorForCode(code), false, false);
 }
 
 void LCRecordingManager::startRecording(const StartRequest& request, StartHandler handler) {
-    const std::uint64_t number = ++requestNumber_;
-    const auto session = getCallingConnectionRecordingSession();
+    const auto start = std::make_shared<WaitingStart>();
+    start->session = getCallingConnectionRecordingSession();
+    start->connection = callingConnection_;
+    start->request = request;
+    start->number = ++requestNumber_;
+    start->handler = std::move(handler);
+    const auto& session = start->session;
     if (request.systemRecording) {
         const auto proxy = session ? session->clientProxy() : nullptr;
         const auto connection = proxy ? proxy->connection() : nullptr;
         const auto granted = connection ? connection->valueForEntitlement(kSystemRecordingEntitlement) : std::nullopt;
         const bool* entitled = granted ? granted->as<bool>() : nullptr;
         if (!entitled || !*entitled)
-            return refuse(number, RecordingErrorCode::Entitlements, "the application lacks the entitlement", handler);
-        return refuse(number, RecordingErrorCode::FailedToStart, "this daemon does not record the whole display",
-                      handler);
+            return refuse(*start, RecordingErrorCode::Entitlements, "the application lacks the entitlement");
+    } else if (!checkContextIDsMatch(request.windowLayerContextIDs)) {
+        return refuse(*start, RecordingErrorCode::FailedToStart, "a window layer is not the application's own");
     }
-    if (!checkContextIDsMatch(request.windowLayerContextIDs))
-        return refuse(number, RecordingErrorCode::FailedToStart, "a window layer is not the application's own",
-                      handler);
     if (!isSize(request.windowSize) || (session && !session->canCaptureSize(request.windowSize)))
-        return refuse(number, RecordingErrorCode::FailedToStart, "the window size is none", handler);
+        return refuse(*start, RecordingErrorCode::FailedToStart, "the window size is none");
     log_.line(
         "LCRecordingManager:startRecordingWindowLayerContextID:windowSize:microphoneEnabled:streaming:withHandler:");
-    stopCurrentRecordingSessionWithHandler(
-        [this, session, &request, number, &handler] { startProper(session, request, number, std::move(handler)); });
+    stopCurrentRecordingSessionWithHandler([this, start] { startProper(start); });
 }
 
-void LCRecordingManager::startProper(const std::shared_ptr<LCRecordingSession>& session, const StartRequest& request,
-                                     std::uint64_t number, StartHandler handler) {
+void LCRecordingManager::startProper(const WaitingStartRef& start) {
     if (!services_.tempStore._srDeviceHasSufficientFreeSpaceForRecording()) {
         log_.line("insufficient disk space for recording, calling handler with error");
-        return refuse(number, RecordingErrorCode::InsufficientStorage, "100 MB must be free", handler);
+        return refuse(*start, RecordingErrorCode::InsufficientStorage, "100 MB must be free");
     }
     // A session that has gone is nobody's, and nobody is in the foreground.
-    if (!session || !isApplicationInForegroundWithBundleIdentifier(session->bundleID())) {
+    if (!start->session || !isApplicationInForegroundWithBundleIdentifier(start->session->bundleID())) {
         log_.line("app is not in the foreground, calling handler with error");
-        return refuse(number, RecordingErrorCode::FailedToStart, "the application is not in the foreground", handler);
+        return refuse(*start, RecordingErrorCode::FailedToStart, "the application is not in the foreground");
     }
-    microphoneRecording_ = request.microphoneEnabled;
-    cameraRecording_ = request.cameraEnabled;
+    microphoneRecording_ = start->request.microphoneEnabled;
+    cameraRecording_ = start->request.cameraEnabled;
     const bool suppressAlert = isTrue(platform_.preferences.value(kPreferenceDomain, "LCSuppressAlert"));
     log_.line("LCRecordingManager: suppressAlert=%d", suppressAlert);
-    if (!suppressAlert && !isExemptFromAcknowledgementAlertSession(*session))
-        return refuse(number, RecordingErrorCode::UserDeclined,
-                      "this daemon can't ask the user; the preference LCSuppressAlert is not set", handler);
+    if (suppressAlert)
+        beginRecording(start);
+    else
+        showAcknowledgementAlertForSession(start);
+}
+
+void LCRecordingManager::beginRecording(const WaitingStartRef& start) {
+    const auto& session = start->session;
+    const StartRequest& request = start->request;
     if (request.captureEnabled)
-        return refuse(number, RecordingErrorCode::FailedToStart, "this daemon does not hand samples to clients",
-                      handler);
+        return refuse(*start, RecordingErrorCode::FailedToStart, "this daemon does not hand samples to clients");
 
     log_.line("starting...");
     resetUnansweredStops(session);
@@ -98,11 +100,11 @@ void LCRecordingManager::startProper(const std::shared_ptr<LCRecordingSession>& 
         log_.line("broadcast requested");
         log_.line("attempted to start broadcast without a session, bailing out");
         resetStatesForSession(session, generation);
-        logRefusal(number, RecordingErrorCode::InvalidBroadcastSession, "no broadcast has been set up");
+        logRefusal(start->number, RecordingErrorCode::InvalidBroadcastSession, "no broadcast has been set up");
         // Deliberately without user info, so without description.
-        handler(Error(std::string(kRecordingErrorDomain),
-                      static_cast<std::int64_t>(RecordingErrorCode::InvalidBroadcastSession)),
-                false, false);
+        start->handler(Error(std::string(kRecordingErrorDomain),
+                             static_cast<std::int64_t>(RecordingErrorCode::InvalidBroadcastSession)),
+                       false, false);
         return;
     }
     log_.line("broadcast disabled");
@@ -117,28 +119,12 @@ void LCRecordingManager::startProper(const std::shared_ptr<LCRecordingSession>& 
     session->setDelegate(weak_from_this());
     session->setCaptureRecording(request.captureEnabled);
     frontmostSession(*session, [&](ProcessID pid) { session->setFrontmostPIDForAudioTap(pid); });
-    session->startSessionWithHandler([self = shared_from_this(), handler = std::move(handler)] {
+    session->startSessionWithHandler([self = shared_from_this(), session, handler = start->handler] {
+        self->checkAndPlaySystemRecordSound(*session, true);
         self->log_.line("recording session started");
         handler(std::nullopt, self->microphoneRecording_, self->cameraRecording_);
     });
-    platform_.appStateMonitor.setHandler({});
-}
-
-bool LCRecordingManager::isApplicationInForegroundWithBundleIdentifier(const BundleIdentifier& bundleID) {
-    return (platform_.appStateMonitor.applicationState(bundleID) & AppStateMonitor::kRunningForeground) != 0;
-}
-
-void LCRecordingManager::frontmostSession(const LCRecordingSession& session,
-                                          const std::function<void(ProcessID)>& handler) {
-    if (session.isSystemRecording()) {
-        const auto front = platform_.appStateMonitor.frontmostApplication();
-        const auto process = front ? platform_.appStateMonitor.applicationProcess(*front) : std::nullopt;
-        handler(process.value_or(kNoProcess));
-        return;
-    }
-    const auto proxy = session.clientProxy();
-    const auto connection = proxy ? proxy->connection() : nullptr;
-    handler(connection ? connection->processIdentifier() : kNoProcess);
+    monitorForegroundApps(session);
 }
 
 void LCRecordingManager::stopCurrentRecordingSessionWithHandler(Handler handler) {
@@ -146,11 +132,13 @@ void LCRecordingManager::stopCurrentRecordingSessionWithHandler(Handler handler)
     const auto sessions = bundleIDToRecordingSessionLookup_;
     for (const auto& [id, session] : sessions) {
         if (!session->isRecording()) continue;
+        const auto end = session->isSystemRecording() ? &LCRecordingManager::keepPreemptedSystemRecording
+                                                      : &LCRecordingManager::discardInterruptedRecording;
         stopRecordingSession(session, 0, 0,
-                             [self = shared_from_this(), session,
+                             [self = shared_from_this(), end, session,
                               generation = session->managerRecord.startGeneration,
                               claim = session->pathClaim()](const std::optional<URL>& url, const std::optional<Error>&) {
-                                 self->discardInterruptedRecording(session, generation, claim, url);
+                                 ((*self).*end)(session, generation, claim, url);
                              });
     }
     // Deliberately without waiting for the stops to complete.

@@ -21,9 +21,11 @@ void LCRecordingManager::stopRecordingWithStartClipDuration(double startClipDura
 
 void LCRecordingManager::stopRecordingSession(const std::shared_ptr<LCRecordingSession>& session,
                                               double startClipDuration, double endClipDuration, StopHandler handler) {
+    checkAndPlaySystemRecordSound(*session, false);
     log_.line("LCRecordingManager: stopRecordingSession:handler:");
     clearSystemRecordingUI(*session);
     if (!session->isRecording()) return;
+    if (layoutMonitor_) layoutMonitor_->removeObserver(*this);
     const std::uint64_t generation = session->managerRecord.startGeneration;
     const auto underWay = noteStopUnderWay(session, generation);
     if (!handler && !session->broadcastExtensionID()) {
@@ -79,12 +81,6 @@ void LCRecordingManager::resetStatesForSession(const std::shared_ptr<LCRecording
         session->setPaused(false);
     }
     if (std::erase(session->managerRecord.openTransactions, generation) > 0) endTransaction();
-}
-
-void LCRecordingManager::clearSystemRecordingUI(const LCRecordingSession& session) {
-    if (!session.isSystemRecording()) return;
-    log_.line("stop monitoring foreground apps");
-    platform_.appStateMonitor.setHandler({});
 }
 
 void LCRecordingManager::discardRecordingWithHandler(Handler handler) {

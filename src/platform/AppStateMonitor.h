@@ -12,6 +12,8 @@ class AppStateMonitor {
 public:
     /// The bit of an application that runs in the foreground.
     static constexpr std::uint32_t kRunningForeground = 8;
+    /// The state value of an update about an application that has ended.
+    static constexpr std::int64_t kEnded = 1;
 
     /// An update about one application: its state value (1: it has ended), whether it is frontmost, its process.
     using Handler = std::function<void(std::int64_t state, bool frontmost, ProcessID pid)>;

@@ -27,6 +27,8 @@ public:
     virtual void addObserver(std::weak_ptr<DisplayLayoutObserver> observer) = 0;
     /// Nothing happens when it observes nothing.
     virtual void removeObserver(DisplayLayoutObserver& observer) = 0;
+    /// Ends it: nobody is told anything any more.
+    virtual void invalidate() = 0;
 };
 
 }  // namespace lumacast

@@ -18,12 +18,17 @@
 #include "platform/KeepAlive.h"
 #include "platform/LogSink.h"
 #include "platform/MovieExporter.h"
+#include "platform/NetworkReachability.h"
 #include "platform/PhotoLibrary.h"
 #include "platform/Preferences.h"
 #include "platform/RenderServer.h"
 #include "platform/Scheduler.h"
+#include "platform/ScreenReader.h"
 #include "platform/StoragePurgeService.h"
+#include "platform/StoreLookup.h"
+#include "platform/SystemSounds.h"
 #include "platform/TelemetryReporter.h"
+#include "platform/UserAlert.h"
 
 namespace lumacast {
 
@@ -50,6 +55,11 @@ struct Platform {
     KeepAlive& keepAlive;
     AdminService& admin;
     StoragePurgeService& storagePurge;
+    UserAlerts& userAlerts;
+    SystemSounds& systemSounds;
+    ScreenReader& screenReader;
+    StoreLookup& storeLookup;
+    NetworkReachability& networkReachability;
 };
 
 /// What owns the platform's objects.

@@ -59,6 +59,13 @@ std::shared_ptr<const Bundle> Localization::bundleWithPID(ProcessID pid) {
     return path ? bundles_.open(*path) : nullptr;
 }
 
+std::string Localization::filledIn(std::string text, std::string_view argument) {
+    constexpr std::string_view kPlace = "%@";
+    const auto place = text.find(kPlace);
+    if (place != std::string::npos) text.replace(place, kPlace.size(), argument);
+    return text;
+}
+
 BaseIdentifier Localization::baseIdentifier(std::string_view identifier) {
     const auto dot = identifier.rfind('.');
     return {std::string(dot == std::string_view::npos ? std::string_view() : identifier.substr(0, dot))};

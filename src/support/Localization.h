@@ -42,6 +42,8 @@ public:
     std::optional<std::string> _lcLocalizedAppNameFromBundleID(const BundleIdentifier& identifier);
     /// `bundleWithPID:` — the bundle of the process's executable, or null.
     std::shared_ptr<const Bundle> bundleWithPID(ProcessID pid);
+    /// A text with its first "%@" replaced by the argument.
+    static std::string filledIn(std::string text, std::string_view argument);
     /// `baseIdentifier:` — the identifier without its last dot-separated component ("a.b.c" gives "a.b", "x" gives "").
     static BaseIdentifier baseIdentifier(std::string_view identifier);
 

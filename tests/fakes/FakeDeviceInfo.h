@@ -25,9 +25,10 @@ public:
     void setUserInterfaceIdiom(std::optional<std::int64_t> idiom) { idiom_.set(idiom); }
     void setChipID(std::optional<std::int64_t> chip) { chip_.set(chip); }
     void setReducedCaptureChipID(std::optional<std::int64_t> chip) { reducedChip_.set(chip); }
-    void setRegionalRule(std::string_view name, bool value) {
+    void setRegionalRule(std::string_view name, std::optional<bool> value) {
         const std::lock_guard lock(rulesMutex_);
-        rules_.insert_or_assign(std::string(name), value);
+        rules_.erase(std::string(name));
+        if (value) rules_.emplace(name, *value);
     }
 
     /// How often it was asked for its idiom or its chip.

@@ -23,6 +23,8 @@ FakePlatform::FakePlatform(Scheduler& itsScheduler, std::function<HostTime()> ho
       photoLibrary(fileSystem, faults),
       telemetry(faults),
       admin(scheduler),
+      userAlerts(scheduler, faults),
+      storeLookup(scheduler, faults),
       storagePurge(scheduler),
       platform_{log,
                 scheduler,
@@ -44,7 +46,12 @@ FakePlatform::FakePlatform(Scheduler& itsScheduler, std::function<HostTime()> ho
                 telemetry,
                 keepAlive,
                 admin,
-                storagePurge} {
+                storagePurge,
+                userAlerts,
+                systemSounds,
+                screenReader,
+                storeLookup,
+                networkReachability} {
     containerWriters.setWhenMade([this] { displayCapture.deliverFrames(); });
 }
 

@@ -21,11 +21,16 @@
 #include "tests/fakes/FakeKeepAlive.h"
 #include "tests/fakes/FakeLogSink.h"
 #include "tests/fakes/FakeMovieExporter.h"
+#include "tests/fakes/FakeNetworkReachability.h"
 #include "tests/fakes/FakePhotoLibrary.h"
 #include "tests/fakes/FakePreferences.h"
 #include "tests/fakes/FakeRenderServer.h"
+#include "tests/fakes/FakeScreenReader.h"
 #include "tests/fakes/FakeStoragePurgeService.h"
+#include "tests/fakes/FakeStoreLookup.h"
+#include "tests/fakes/FakeSystemSounds.h"
 #include "tests/fakes/FakeTelemetry.h"
+#include "tests/fakes/FakeUserAlerts.h"
 #include "tests/fakes/FaultPlan.h"
 #include "tests/fakes/SimScheduler.h"
 
@@ -71,6 +76,11 @@ public:
     FakeTelemetry telemetry;
     FakeKeepAlive keepAlive;
     FakeAdminService admin;
+    FakeUserAlerts userAlerts;
+    FakeSystemSounds systemSounds;
+    FakeScreenReader screenReader;
+    FakeStoreLookup storeLookup;
+    FakeNetworkReachability networkReachability;
     FakeStoragePurgeService storagePurge;  ///< last: it holds who has registered
 
 private:

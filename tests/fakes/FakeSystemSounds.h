@@ -13,9 +13,14 @@ public:
         const std::lock_guard lock(mutex_);
         played_.push_back(sound);
     }
+    /// Since the last forget().
     std::vector<std::uint32_t> played() const {
         const std::lock_guard lock(mutex_);
         return played_;
+    }
+    void forget() {
+        const std::lock_guard lock(mutex_);
+        played_.clear();
     }
 
 private:

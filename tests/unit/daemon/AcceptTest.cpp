@@ -219,7 +219,12 @@ TEST(StartUp, TheDirectoryAndTheListenerComeBeforeThePurgeServiceAndNobodyIsServ
                             p.telemetry,
                             p.keepAlive,
                             p.admin,
-                            purge};
+                            purge,
+                            p.userAlerts,
+                            p.systemSounds,
+                            p.screenReader,
+                            p.storeLookup,
+                            p.networkReachability};
     Process process(platform);
     EXPECT_TRUE(purge.directoryWasThere);
     EXPECT_EQ(purge.lines, std::vector<std::string>{"_srSetupTempDirectory"});

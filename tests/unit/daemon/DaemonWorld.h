@@ -124,7 +124,9 @@ private:
 /// A started daemon with the question to the user suppressed.
 class DaemonWorld : public ::testing::Test {
 protected:
-    DaemonWorld() {
+    /// `prepare` installs what the daemon reads when it starts.
+    explicit DaemonWorld(void (*prepare)(FakePlatform&) = nullptr) {
+        if (prepare) prepare(fakes_);
         fakes_.preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
         fakes_.displayCapture.setPlanes(1 << 20);  // movies in memory keep their pictures
         process_ = std::make_unique<Process>(fakes_.platform());

@@ -11,7 +11,10 @@ constexpr char kExpiry[] = "LCRecordingManager:removeAcknowledgementExemptionIfO
 
 class Exemptions : public DaemonWorld {
 protected:
-    Exemptions() { fakes_.preferences.set(kPreferenceDomain, "LCSuppressAlert", false); }
+    Exemptions() {
+        fakes_.preferences.set(kPreferenceDomain, "LCSuppressAlert", false);
+        fakes_.userAlerts.setUser([](const AlertContent&) { return UserAlert::Response::OtherButton; });
+    }
 
     void tell(TestClient& client, DaemonMessage message) {
         fakes_.logSink.clear();

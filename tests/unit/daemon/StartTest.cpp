@@ -166,6 +166,7 @@ TEST_F(Start, AnApplicationThatIsNotInTheForegroundIsRefused) {
 }
 
 TEST_F(Start, AStartThatIsRefusedForTheForegroundOrByTheUserHasStillStoppedThePreviousRecording) {
+    fakes_.userAlerts.setUser([](const AlertContent&) { return UserAlert::Response::OtherButton; });
     for (const bool inForeground : {false, true}) {
         const auto other = makeRecording("Editor", 501, 8);
         const auto client = makeConnected();
@@ -195,7 +196,8 @@ TEST_F(Start, LackOfSpaceIsFoundBeforeTheForeground) {
     expectRefused(*started(*client), -5805);
 }
 
-TEST_F(Start, WithoutThePreferenceTheUserHasNotAgreed) {
+TEST_F(Start, WithoutThePreferenceTheUserIsAsked) {
+    fakes_.userAlerts.setUser([](const AlertContent&) { return UserAlert::Response::OtherButton; });
     const auto client = makeConnected();
     fakes_.preferences.set(kPreferenceDomain, "LCSuppressAlert", false);
     expectRefused(*started(*client), -5801);

@@ -46,7 +46,8 @@ protected:
                 exporters,       p.photoLibrary,   p.fileSystem,
                 p.preferences,   p.deviceInfo,     p.telemetry,       p.keepAlive,
                 p.admin,
-                p.storagePurge};
+                p.storagePurge,  p.userAlerts,     p.systemSounds,    p.screenReader,
+                p.storeLookup,   p.networkReachability};
     }
     void settle() { world_.scheduler.runUntilIdle(); }
 
