@@ -50,6 +50,7 @@ struct MovieSave {
     UserID user{};
     bool removesAsUser = false;  ///< the movie is not a temporary file
     std::uint64_t claim = 0;     ///< later ones of its path are other recordings'
+    std::shared_ptr<void> claims;
     std::function<void(std::optional<Error>)> handler;
 
     State state = State::Mixing;
@@ -240,15 +241,22 @@ private:
                                            std::uint64_t generation);
     /// Resets after stops that never will be answered: a failed trim, say.
     void resetUnansweredStops(const std::shared_ptr<LCRecordingSession>& session);
+    /// Whose a recording's movie is on its path, also when later ones of that path have come and gone.
+    struct PathClaim {
+        std::uint64_t number = 0;
+        std::shared_ptr<void> remembered;
+    };
+    PathClaim claimOf(const LCRecordingSession& session) const;
     void clearSystemRecordingUI(const LCRecordingSession& session);
     /// Adds a system recording's movie to the library of the user whose client it was, waiting on a global queue; then
-    /// calls `added` with the error, also when there is no movie. `added` runs on the request lane.
+    /// calls `added` with the error, also when there is no movie or a later recording than the claim's has its path.
+    /// `added` runs on the request lane.
     void addSystemRecordingToLibrary(const LCRecordingSession& session, const std::optional<URL>& movieURL,
-                                     std::function<void(std::optional<Error>)> added);
+                                     const PathClaim& claim, std::function<void(std::optional<Error>)> added);
     void keepPreemptedSystemRecording(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation,
-                                      std::uint64_t claim, const std::optional<URL>& movieURL);
+                                      const PathClaim& claim, const std::optional<URL>& movieURL);
     void discardInterruptedRecording(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation,
-                                     std::uint64_t claim, const std::optional<URL>& movieURL);
+                                     const PathClaim& claim, const std::optional<URL>& movieURL);
     void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
                                           const std::optional<Error>& error, const std::optional<URL>& movieURL);
     void recordingSessionInterrupted(const std::shared_ptr<LCRecordingSession>& session,

@@ -66,6 +66,7 @@ void LCRecordingManager::saveVideoToCameraRoll(const std::optional<URL>& movie, 
     save->user = user;
     save->removesAsUser = !isTemporary;
     save->claim = services_.tempStore.lastClaim();
+    if (isTemporary) save->claims = services_.tempStore.rememberClaims(movie->path());
     save->handler = std::move(handler);
     saves_.push_back(save);
     // Mixing reads with this process's rights. Another user could put a link to what is not theirs in the movie's place
@@ -144,6 +145,7 @@ void LCRecordingManager::endSave(const std::shared_ptr<MovieSave>& save, const s
                                  const std::string& problem) {
     save->state = savedAs ? MovieSave::State::Saved : MovieSave::State::Failed;
     save->savedAs = savedAs;
+    save->claims = nullptr;
     save->exporter = nullptr;
     if (!savedAs) save->problem = problem;
     const auto isOver = [](const auto& other) {

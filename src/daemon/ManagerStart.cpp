@@ -137,7 +137,7 @@ void LCRecordingManager::stopCurrentRecordingSessionWithHandler(Handler handler)
         stopRecordingSession(session, 0, 0,
                              [self = shared_from_this(), end, session,
                               generation = session->managerRecord.startGeneration,
-                              claim = session->pathClaim()](const std::optional<URL>& url, const std::optional<Error>&) {
+                              claim = claimOf(*session)](const std::optional<URL>& url, const std::optional<Error>&) {
                                  ((*self).*end)(session, generation, claim, url);
                              });
     }
@@ -146,7 +146,7 @@ void LCRecordingManager::stopCurrentRecordingSessionWithHandler(Handler handler)
 }
 
 void LCRecordingManager::discardInterruptedRecording(const std::shared_ptr<LCRecordingSession>& session,
-                                                     std::uint64_t generation, std::uint64_t claim,
+                                                     std::uint64_t generation, const PathClaim& claim,
                                                      const std::optional<URL>& movieURL) {
     auto tellClient = [self = shared_from_this(), session] {
         self->onRequestLane([self, session] {
@@ -161,7 +161,7 @@ void LCRecordingManager::discardInterruptedRecording(const std::shared_ptr<LCRec
     }
     // The application has started anew meanwhile: only this stop's own movie goes, and not where a later writer has
     // its path.
-    if (movieURL) services_.tempStore.removeFileOfClaim(*movieURL, claim, {});
+    if (movieURL) services_.tempStore.removeFileOfClaim(*movieURL, claim.number, {});
     tellClient();
 }
 

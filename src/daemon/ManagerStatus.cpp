@@ -36,6 +36,7 @@ Dictionary LCRecordingManager::snapshot() const {
         Dictionary entry{{"bundleID", id.text()},
                          {"connected", connection != nullptr},
                          {"recording", session->isRecording()},
+                         {"wholeDisplay", session->isSystemRecording()},
                          {"transactionOpen", !session->managerRecord.openTransactions.empty()}};
         if (connection) entry.set("pid", number(connection->processIdentifier()));
         if (session->isRecording()) entry.set("current", describeRecording(*session));
@@ -44,6 +45,7 @@ Dictionary LCRecordingManager::snapshot() const {
     return {{"service", "com.orvane.lumacastd"},
             {"temporaryDirectory", services_.tempStore._srTempPath()},
             {"freeBytes", services_.tempStore._srDeviceFreeDiskSpace()},
+            {"startsWaitingForUser", static_cast<std::uint64_t>(waitingStarts_.size())},
             {"sessions", std::move(sessions)},
             {"saves", describeSaves()}};
 }

@@ -4,6 +4,11 @@
 
 namespace lumacast {
 
+LCRecordingManager::PathClaim LCRecordingManager::claimOf(const LCRecordingSession& session) const {
+    const auto writer = session.movieWriter();
+    return {session.pathClaim(), writer ? services_.tempStore.rememberClaims(writer->outputPath()) : nullptr};
+}
+
 void LCRecordingManager::checkAndPlaySystemRecordSound(const LCRecordingSession& session, bool isRecordingOn) {
     const bool rule = platform_.deviceInfo.regionalRule("RegionalBehaviorShutterClick").value_or(false);
     if (!rule && !platform_.screenReader.isRunning()) return;
@@ -20,14 +25,15 @@ void LCRecordingManager::clearSystemRecordingUI(const LCRecordingSession& sessio
 }
 
 void LCRecordingManager::addSystemRecordingToLibrary(const LCRecordingSession& session,
-                                                     const std::optional<URL>& movieURL,
+                                                     const std::optional<URL>& movieURL, const PathClaim& claim,
                                                      std::function<void(std::optional<Error>)> added) {
     const auto connection = session.managerRecord.connection;
     const UserID user = connection ? connection->userIdentifier() : platform_.fileSystem.user();
     platform_.scheduler.globalQueue(QueuePriority::Default)
-        .async([self = shared_from_this(), movieURL, user, added = std::move(added)]() mutable {
+        .async([self = shared_from_this(), movieURL, claim, user, added = std::move(added)]() mutable {
             std::optional<Error> error;
-            if (movieURL) {
+            // Two that begin in the same second have one name: what stands there then is the newer one's.
+            if (movieURL && !self->services_.tempStore.isClaimedAfter(movieURL->path(), claim.number)) {
                 auto result = self->platform_.photoLibrary.addVideo(*movieURL, user);
                 if (auto* const failure = std::get_if<Error>(&result)) error = std::move(*failure);
             } else {
@@ -38,12 +44,12 @@ void LCRecordingManager::addSystemRecordingToLibrary(const LCRecordingSession& s
 }
 
 void LCRecordingManager::keepPreemptedSystemRecording(const std::shared_ptr<LCRecordingSession>& session,
-                                                      std::uint64_t generation, std::uint64_t claim,
+                                                      std::uint64_t generation, const PathClaim& claim,
                                                       const std::optional<URL>& movieURL) {
     // A newer recording of the same application has a handler of its own by then.
     if (session->managerRecord.startGeneration == generation) clearSystemRecordingUI(*session);
     addSystemRecordingToLibrary(
-        *session, movieURL,
+        *session, movieURL, claim,
         [self = shared_from_this(), session, generation, claim, movieURL](const std::optional<Error>& error) {
             if (error)
                 self->log_.line("LCRecordingManager:stopCurrentRecordingSession: Video saved to camera roll failed");
@@ -51,7 +57,7 @@ void LCRecordingManager::keepPreemptedSystemRecording(const std::shared_ptr<LCRe
                 self->log_.line(
                     "LCRecordingManager:stopCurrentRecordingSession: Video saved to camera roll successful");
             // The name that the session removes is that of the moment; the movie's own goes only once the library has it.
-            if (movieURL && !error) self->services_.tempStore.removeFileOfClaim(*movieURL, claim, {});
+            if (movieURL && !error) self->services_.tempStore.removeFileOfClaim(*movieURL, claim.number, {});
             self->discardInterruptedRecording(session, generation, claim, std::nullopt);
         });
 }
@@ -62,11 +68,11 @@ void LCRecordingManager::stopSystemRecordingWithHandler(SystemStopHandler handle
         if (!session->isSystemRecording() || !session->isRecording()) continue;
         stopRecordingSession(
             session, 0, 0,
-            [self = shared_from_this(), session = session, handler](const std::optional<URL>& url,
-                                                                    const std::optional<Error>& error) {
+            [self = shared_from_this(), session = session, claim = claimOf(*session), handler](
+                const std::optional<URL>& url, const std::optional<Error>& error) {
                 if (!url) return handler(session, url, error);
                 self->addSystemRecordingToLibrary(
-                    *session, url, [self, session, handler, url, error](const std::optional<Error>& failure) {
+                    *session, url, claim, [self, session, handler, url, error](const std::optional<Error>& failure) {
                         if (failure) self->log_.line("error saving file with code: %i", failure->code());
                         handler(session, url, error);
                     });

@@ -106,8 +106,24 @@ std::shared_ptr<void> FileRemovals::holdClaim(const std::string& path, std::uint
                 const auto found = self->claims_.find(key);
                 if (found == self->claims_.end()) return;
                 found->second.held.erase(claim);
-                if (found->second.held.empty()) self->claims_.erase(found);
+                self->forgetIfUnused(key);
             }};
+}
+
+std::shared_ptr<void> FileRemovals::rememberClaims(const std::string& path) {
+    const std::string key = keyOf(path);
+    const std::lock_guard lock(mutex_);
+    ++claims_[key].remembered;
+    return {static_cast<void*>(this), [self = shared_from_this(), key](void*) {
+                const std::lock_guard releaseLock(self->mutex_);
+                --self->claims_[key].remembered;
+                self->forgetIfUnused(key);
+            }};
+}
+
+void FileRemovals::forgetIfUnused(const std::string& key) {
+    const auto found = claims_.find(key);
+    if (found->second.held.empty() && found->second.remembered == 0) claims_.erase(found);
 }
 
 std::size_t FileRemovals::claimedPathCount() const {

@@ -48,6 +48,9 @@ public:
     std::uint64_t lastClaim() const;
     /// Keeps a claim until it is released: the path is forgotten when its last claim is.
     std::shared_ptr<void> holdClaim(const std::string& path, std::uint64_t claim);
+    /// Keeps the path's claims from being forgotten until it is released, so that isClaimedAfter still knows of those
+    /// whose writers have gone.
+    std::shared_ptr<void> rememberClaims(const std::string& path);
     /// How many paths are claimed now, for tests.
     std::size_t claimedPathCount() const;
 
@@ -66,8 +69,10 @@ private:
     struct Claims {
         std::uint64_t latest = 0;
         std::set<std::uint64_t> held;
+        std::size_t remembered = 0;  ///< how often
     };
 
+    void forgetIfUnused(const std::string& key);
     bool isClaimedAfterLocked(const std::string& key, std::uint64_t claim) const;
     std::optional<Error> perform(const std::string& key, const Removal& removal);
     /// Under the lock: the path's removals may go on. Whether a task has to be submitted for that.

@@ -79,6 +79,8 @@ public:
     std::shared_ptr<void> holdClaim(const std::string& path, std::uint64_t claim) {
         return removals_->holdClaim(path, claim);
     }
+    /// Keeps isClaimedAfter right about the path, also for writers that have gone by then, until it is released.
+    std::shared_ptr<void> rememberClaims(const std::string& path) { return removals_->rememberClaims(path); }
     /// How many paths are claimed now, for tests.
     std::size_t claimedPathCount() const { return removals_->claimedPathCount(); }
     /// The same removal for the file that the writer with this claim has left: when it is its turn and a later writer

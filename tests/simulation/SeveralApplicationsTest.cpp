@@ -1,6 +1,7 @@
 // Several applications compete for the recording on a platform that may fail: starts of every kind, pauses, resumes
 // with windows of their own and of others, stops, clips, discards, changes of the foreground, purges, a full disk,
-// capture that fails, is pre-empted or reset, and deaths at any step, in every interleaving that a seed gives.
+// capture that fails, is pre-empted or reset, and deaths at any step, in every interleaving that a seed gives. One of
+// them may record the whole display. The user is asked, and grants, refuses, takes a long time or never answers.
 // LC_SEED=n replays one seed; LC_SEEDS=n runs so many.
 
 #include <gtest/gtest.h>
@@ -25,6 +26,7 @@ using std::chrono::seconds;
 /// What the seeds did all together: a run that goes nowhere proves nothing.
 struct Tally {
     int movies = 0, clips = 0, purges = 0, deaths = 0;
+    int granted = 0, refusedByUser = 0, leftStanding = 0, systemRecordings = 0, inLibrary = 0, interrupted = 0;
     std::map<std::int64_t, int> refused;  ///< by the error of the start's answer
     std::map<std::int64_t, int> told;     ///< by the error of the message
 };
@@ -51,6 +53,13 @@ public:
         players_.emplace_back(fakes(), "Alpha", 500, 7);
         players_.emplace_back(fakes(), "Beta", 600, 8);
         players_.emplace_back(fakes(), "Gamma", 700, 9);
+        players_.emplace_back(fakes(), kPrivileged, 800, 10);
+        entitle(players_.back());
+        fakes().preferences.set(kPreferenceDomain, "LCSuppressAlert", random_.below(2) != 0);
+        fakes().deviceInfo.setRegionalRule("RegionalBehaviorShutterClick", random_.below(2) == 0);
+        fakes().userAlerts.setUser([this, user = daemon_.world.scheduler.fork()](const AlertContent&) mutable {
+            return answerOf(user.below(8));
+        });
         faulty_ = random_.below(3) == 0;
         if (faulty_) fakes().faults.failAtRandom(random_.next(), 1, 80);
     }
@@ -74,11 +83,37 @@ public:
 private:
     FakePlatform& fakes() { return daemon_.world.fakes; }
 
+    void entitle(const Player& player) {
+        fakes().ipc.grant(player.application.pid(), "com.orvane.private.luma-cast", true);
+        fakes().appStateMonitor.setProcess(player.application.identifier, player.application.pid());
+    }
+    /// None leaves the alert standing.
+    std::optional<UserAlert::Response> answerOf(std::uint64_t mood) {
+        switch (mood) {
+            case 0:
+            case 1: ++tally_.refusedByUser; return UserAlert::Response::OtherButton;
+            case 2:
+            case 3: ++tally_.leftStanding; return std::nullopt;
+            case 4: ++tally_.granted; return UserAlert::Response::AlternateButton;
+            default: ++tally_.granted; return UserAlert::Response::DefaultButton;
+        }
+    }
+    /// One that waits for the user may begin after anything that is asked now.
+    static bool aStartIsOpen(const Player& player) {
+        return std::any_of(player.starts.begin(), player.starts.end(),
+                           [](const auto& start) { return start->answers + start->failures == 0; });
+    }
+    static bool isPrivileged(const Player& player) { return player.application.name == kPrivileged; }
+    void startProcess(Player& player) {
+        player.application.startAgain(ProcessID{static_cast<std::int32_t>(1000 + ++incarnation_)});
+        if (isPrivileged(player)) entitle(player);
+        player.application.connect();
+    }
+
     void act(Player& player) {
         SimulatedApplication& application = player.application;
         if (!application.isAlive()) {
-            application.startAgain(ProcessID{static_cast<std::int32_t>(1000 + ++incarnation_)});
-            application.connect();
+            startProcess(player);
             return;
         }
         const std::uint64_t what = random_.below(16);
@@ -91,9 +126,16 @@ private:
             case 0:
             case 1:
             case 2:
-            case 3: player.starts.push_back(application.start()); break;
+            case 3:
+                player.starts.push_back(isPrivileged(player) && random_.below(2) == 0
+                                            ? application.start({}, {.microphone = true, .system = true})
+                                            : application.start());
+                break;
             case 4: player.starts.push_back(startOfAnotherKind(application)); break;
-            case 5: application.tell(DaemonMessage::PauseRecording); break;
+            case 5:
+                application.tell(DaemonMessage::PauseRecording);
+                if (random_.below(3) != 0) break;
+                [[fallthrough]];
             case 6: {
                 const bool ofAnother = random_.below(4) == 0;
                 if (ofAnother) player.lastStop.reset();
@@ -104,13 +146,17 @@ private:
             }
             case 7:
             case 8:
-                player.lastStop = application.ask(DaemonMessage::StopRecording);
-                player.stops.push_back(player.lastStop);
+                player.stops.push_back(application.ask(DaemonMessage::StopRecording));
+                if (!aStartIsOpen(player)) player.lastStop = player.stops.back();
                 break;
             case 9:
                 player.stops.push_back(application.ask(DaemonMessage::StopRecordingWithClipDurations, {1.0, 1.0}));
                 break;
-            case 10: player.lastDiscard = application.ask(DaemonMessage::DiscardRecording); break;
+            case 10: {
+                const auto discard = application.ask(DaemonMessage::DiscardRecording);
+                if (!aStartIsOpen(player)) player.lastDiscard = discard;
+                break;
+            }
             case 11: application.tell(DaemonMessage::ClientDidResignActive); break;
             case 12: application.tell(DaemonMessage::ClientDidBecomeActive); break;
             case 13: application.ask(DaemonMessage::SynchronousGetCurrentState); break;
@@ -151,7 +197,20 @@ private:
 
     /// The device does something.
     void disturb() {
-        switch (random_.below(6)) {
+        switch (random_.below(8)) {
+            case 6: {
+                // Late answers, and alerts whose program dies.
+                const auto response = answerOf(random_.below(8));
+                if (response) fakes().userAlerts.answer(*response);
+                break;
+            }
+            case 7: {
+                // Somebody comes to the front, leaves it, or ends.
+                const Player& other = players_[random_.below(players_.size())];
+                const std::uint64_t what = random_.below(3);
+                fakes().appStateMonitor.update(what == 0 ? 1 : what == 1 ? 8 : 4, what == 1, other.application.pid());
+                break;
+            }
             case 0: {
                 const std::int32_t urgency = 1 + static_cast<std::int32_t>(random_.below(3));
                 fakes().storagePurge.requestPurge(urgency, [this, urgency](const std::optional<PurgeRecord>&) {
@@ -173,7 +232,7 @@ private:
                 fakes().fileSystem.setFreeSize(full ? 0 : kPlenty);
                 break;
             }
-            case 4: fakes().preferences.set(kPreferenceDomain, "LCSuppressAlert", random_.below(4) != 0); break;
+            case 4: fakes().preferences.set(kPreferenceDomain, "LCSuppressAlert", random_.below(2) != 0); break;
             default:
                 for (const auto& source : fakes().displayCapture.sources()) {
                     if (!source->isRunning()) continue;
@@ -200,6 +259,7 @@ private:
         EXPECT_LE(std::count_if(sources.begin(), sources.end(), [](const auto& source) { return source->isRunning(); }),
                   1)
             << "two applications are captured at a time";
+        EXPECT_LE(fakes().userAlerts.standing(), 1u) << "the user is asked two things at a time";
         for (const Player& player : players_) {
             for (const auto& asked : player.application.asked()) {
                 EXPECT_LE(asked->answers + asked->failures, 1)
@@ -208,7 +268,12 @@ private:
             // Who loses its recording to another start hears why, and its movie is not handed out.
             for (const auto& told : player.application.told()) {
                 ASSERT_EQ(told.message, ClientMessage::StopRecordingWithError);
-                ASSERT_TRUE(told.arguments[0].asError());
+                // But to one that the user let begin meanwhile: then without an error, and with its movie.
+                if (!told.arguments[0].asError()) {
+                    EXPECT_TRUE(told.arguments[1].as<URL>());
+                    ++tally_.interrupted;
+                    continue;
+                }
                 if (told.arguments[0].asError()->code() == -5816) continue;  // its own doing: it has the movie
                 EXPECT_TRUE(told.arguments[1].isNull());
             }
@@ -240,7 +305,8 @@ private:
         int recording = 0;
         for (const Value& entry : *snapshot.find("sessions")->as<Array>()) {
             const Dictionary& session = *entry.as<Dictionary>();
-            EXPECT_TRUE(connected.contains(*session.find("bundleID")->as<std::string>())) << describe(entry);
+            const std::string identifier = *session.find("bundleID")->as<std::string>();
+            EXPECT_TRUE(connected.contains(identifier) || *session.find("wholeDisplay")->as<bool>()) << describe(entry);
             const bool records = *session.find("recording")->as<bool>();
             recording += records ? 1 : 0;
             if (!anUnansweredClip) {
@@ -255,6 +321,8 @@ private:
             ADD_FAILURE() << task.lane << " waits for " << task.waitsFor;
         if (faulty_) return;
         for (const Player& player : players_) {
+            // After a recording of the whole display another file is meant.
+            if (isPrivileged(player)) continue;
             if (player.lastDiscard && player.lastDiscard->answers == 1 && player.application.isAlive()) {
                 EXPECT_FALSE(fakes().fileSystem.exists(fakes().fileSystem.temporaryDirectory() + "/" +
                                                        player.application.name + ".mp4"));
@@ -276,11 +344,15 @@ private:
         fakes().faults.clear();
         fakes().fileSystem.setFreeSize(kPlenty);
         fakes().preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
+        fakes().userAlerts.setUser([](const AlertContent&) { return UserAlert::Response::DefaultButton; });
+        fakes().userAlerts.answer(UserAlert::Response::DefaultButton);
         daemon_.world.scheduler.advance(seconds(5));
+        EXPECT_EQ(fakes().userAlerts.standing(), 0u);
         checkAtRest();
         for (Player& player : players_) fakes().appStateMonitor.setState(player.application.identifier, 8);
         if (!faulty_)
             for (Player& player : players_) recordOnceMore(player);
+        endSystemRecordings();
         for (Player& player : players_) {
             for (const auto& start : player.starts) {
                 if (const Error* error = start->answers == 1 ? start->values[0].asError() : nullptr)
@@ -299,6 +371,12 @@ private:
         EXPECT_EQ(fakes().keepAlive.open(), 0);
         EXPECT_EQ(fakes().renderServer.portsOpen(), 0);
         EXPECT_EQ(daemon_.sessionCount(), 0u);
+        const std::size_t assets = fakes().photoLibrary.assets().size();
+        tally_.inLibrary += static_cast<int>(assets);
+        // What could not be written is handed over too.
+        for (const auto& asset : fakes().photoLibrary.assets()) {
+            EXPECT_TRUE(faulty_ || diskWasFull_ || (asset.content && asset.content->finished)) << asset.movie.path();
+        }
         for (const auto& source : fakes().displayCapture.sources()) EXPECT_FALSE(source->isRunning());
         for (const SimBlockedTask& task : daemon_.world.scheduler.blockedTasks())
             ADD_FAILURE() << task.lane << " waits for " << task.waitsFor;
@@ -307,12 +385,28 @@ private:
             for (const auto& recording : fakes().containerWriters.recordings()) judgePictures(recording->movie());
     }
 
+    /// A recording of the whole display outlives its client. Its last session becomes an application's again.
+    void endSystemRecordings() {
+        for (Player& player : players_) {
+            if (!isPrivileged(player)) continue;
+            if (!player.application.isAlive()) startProcess(player);
+            player.application.connect();
+            player.application.ask(DaemonMessage::StopRecording);
+            daemon_.world.scheduler.advance(seconds(2));
+            for (const auto& start : player.starts)
+                tally_.systemRecordings += start->answers == 1 && start->values[0].isNull() ? 1 : 0;
+            player.application.start();
+            daemon_.world.scheduler.advance(seconds(2));
+        }
+    }
+
     void checkFiles() {
         const std::string folder = fakes().fileSystem.temporaryDirectory() + "/";
         std::set<std::string> allowed;
-        for (const char* name : {"Alpha", "Beta", "Gamma"})
+        for (const char* name : {"Alpha", "Beta", "Gamma", kPrivileged})
             for (const char* end : {".mp4", "_trimmed.mp4"}) allowed.insert(folder + name + end);
-        for (const std::string& path : fakes().fileSystem.files()) EXPECT_TRUE(allowed.contains(path)) << path;
+        for (const std::string& path : fakes().fileSystem.files())
+            EXPECT_TRUE(allowed.contains(path) || path.starts_with(folder + "ScreenRecording_")) << path;
     }
 
     /// Whatever happened before, the application can record, alone, and that movie is whole.
@@ -342,6 +436,7 @@ private:
         EXPECT_NEAR(movie->duration().seconds(), 2.0, 0.1);
     }
 
+    static constexpr char kPrivileged[] = "Delta";
     static constexpr std::uint64_t kPlenty = 10'000'000'000;
 
     SimulatedDaemon daemon_;
@@ -371,6 +466,12 @@ TEST(SeveralApplications, LeaveNothingBehindInAnyOfManySeeds) {
     EXPECT_GT(tally.clips, 5);
     EXPECT_GT(tally.purges, 50);
     EXPECT_GT(tally.deaths, 100);
+    EXPECT_GT(tally.granted, 100);
+    EXPECT_GT(tally.refusedByUser, 50);
+    EXPECT_GT(tally.leftStanding, 50);
+    EXPECT_GT(tally.systemRecordings, 100);
+    EXPECT_GT(tally.inLibrary, 50);
+    EXPECT_GT(tally.interrupted, 0);
     for (const std::int64_t code : {-5801, -5803, -5805, -5808, -5810}) EXPECT_GT(tally.refused[code], 3) << code;
     for (const std::int64_t code : {-5805, -5806, -5816, -5817}) EXPECT_GT(tally.told[code], 3) << code;
 }

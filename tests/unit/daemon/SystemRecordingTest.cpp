@@ -198,9 +198,40 @@ TEST_F(SystemRecording, APreemptedOneLeavesTheNextOnesWatchAlone) {
     update(8, true, ProcessID{700});
     EXPECT_EQ(heard(*other), 700);
     // So does the next one of the same application.
+    advance(seconds(1));
     ASSERT_EQ(started(*other)->code(), 0);
     EXPECT_TRUE(fakes_.appStateMonitor.hasHandler());
     EXPECT_EQ(fakes_.photoLibrary.assets().size(), 2u);
+}
+
+TEST_F(SystemRecording, TheLibraryIsNotGivenTheNewerOfTwoThatBeganInTheSameSecond) {
+    const auto client = makeSystemRecording();
+    const auto other = makeSystemRecording("Remote", 601, 61);
+    ASSERT_EQ(session(*client)->movieWriter()->outputPath(), session(*other)->movieWriter()->outputPath());
+    EXPECT_TRUE(fakes_.photoLibrary.assets().empty());
+    EXPECT_EQ(client->toldOfStop(-5806), 1);
+    advance(seconds(2));
+    const auto asked = stopped(*other);
+    ASSERT_TRUE(asked->url(0));
+    EXPECT_TRUE(fakes_.fileSystem.exists(asked->url(0)->path()));
+}
+
+TEST_F(SystemRecording, NorTheMiddleOneOfThreeWhoseWriterIsGoneAgain) {
+    const auto client = makeSystemRecording();
+    const auto other = makeEntitled("Remote", 601, 61);
+    const auto player = makeConnected("Player", 500, 7);
+    const auto first = fakes_.containerWriters.recordings().back();
+    first->holdFinish(true);
+    other->start({}, kSystem);
+    player->start();
+    settle();
+    ASSERT_TRUE(session(*player)->isRecording());
+    first->holdFinish(false);
+    settle();
+    for (const auto& asset : fakes_.photoLibrary.assets())
+        EXPECT_TRUE(asset.content && asset.content->finished) << asset.movie.path();
+    EXPECT_EQ(client->toldOfStop(-5806), 1);
+    EXPECT_EQ(other->toldOfStop(-5806), 1);
 }
 
 TEST_F(SystemRecording, StoppingThemAllKeepsEachInTheLibraryAndTellsOncePerRecording) {

@@ -228,6 +228,20 @@ TEST_F(TempStoreTest, AClaimGoesWithItsHolder) {
     EXPECT_GT(store_.claimPath(path), later) << "numbers are never given out again";
 }
 
+TEST_F(TempStoreTest, ARememberedPathKeepsItsClaimsWhenTheirHoldersHaveGone) {
+    const std::string path = (ready(), addFile("a.mp4"));
+    const std::uint64_t older = store_.claimPath(path);
+    auto remembered = store_.rememberClaims(path), twice = store_.rememberClaims(path);
+    store_.holdClaim(path, older).reset();
+    EXPECT_FALSE(store_.isClaimedAfter(path, older));
+    store_.holdClaim(path, store_.claimPath(path)).reset();
+    EXPECT_TRUE(store_.isClaimedAfter(path, older));
+    twice.reset();
+    EXPECT_TRUE(store_.isClaimedAfter(path, older));
+    remembered.reset();
+    EXPECT_EQ(store_.claimedPathCount(), 0u);
+}
+
 TEST_F(TempStoreTest, OneHoldersEndLeavesTheOtherPathsAndClaimsAlone) {
     const std::string a = store_.pathFor("a.mp4"), b = store_.pathFor("b.mp4");
     const std::uint64_t claimA = store_.claimPath(a), claimB = store_.claimPath(b), laterA = store_.claimPath(a);
