@@ -12,6 +12,7 @@ enum ExitStatus : int {
     kProblemsFound = 3,
     kNotSaved = 4,
     kLeftToTheDaemon = 5,
+    kNotRecorded = 6,
 };
 
 struct ExitStatusRow {
@@ -23,13 +24,14 @@ struct ExitStatusRow {
 inline constexpr std::array kExitStatuses{
     ExitStatusRow{kGood, "all is well; or a watch was ended with Ctrl-C (SIGINT) or SIGTERM"},
     ExitStatusRow{kNoAnswer,
-                  "the daemon isn't running, does not answer, or ended during a watch or a save (status, storage, save), "
+                  "the daemon isn't running, does not answer, or ended during a watch, a save or a recording (all but doctor), "
                   "or the output could not be written"},
     ExitStatusRow{kWrongUsage, "wrong usage"},
     ExitStatusRow{kProblemsFound, "the doctor found problems; warnings alone are none"},
     ExitStatusRow{kNotSaved, "the movie could not be saved"},
     ExitStatusRow{kLeftToTheDaemon,
                   "Ctrl-C (SIGINT) or SIGTERM came before the daemon had saved the movie; it goes on"},
+    ExitStatusRow{kNotRecorded, "the display could not be recorded, or the daemon ended the recording"},
 };
 
 /// The table as --help shows it.

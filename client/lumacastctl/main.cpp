@@ -5,6 +5,7 @@
 
 #include <CLI/CLI.hpp>
 #include <chrono>
+#include <cmath>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
@@ -13,7 +14,10 @@
 #include <thread>
 
 #include "client/lumacastctl/ExitStatus.h"
+#include "client/lumacastctl/doctor/Display.h"
 #include "client/lumacastctl/doctor/Doctor.h"
+#include "client/lumacastctl/record/RecordCommand.h"
+#include "client/lumacastctl/record/StopWish.h"
 #include "client/lumacastctl/save/SaveCommand.h"
 #include "client/lumacastctl/status/StatusCommand.h"
 #include "client/lumacastctl/storage/StorageCommand.h"
@@ -82,6 +86,27 @@ int runSave(const std::string& directory, const std::string& file, Form form) {
     return saveMovie(directory, moviePath(file), form, screen, stdout, stderr, begun, nextRound);
 }
 
+int runRecord(const std::string& directory, RecordRequest request) {
+    if (!request.output.empty()) request.output = moviePath(request.output);
+    if (request.size.width < 1) {
+        const DisplayFacts display = probeDisplay(variable, std::chrono::seconds(5));
+        if (display.width == 0) {
+            std::fprintf(stderr, "lumacastctl: the display can't be asked for its size; `lumacastctl doctor` says why.\n");
+            return kNotRecorded;
+        }
+        request.size = {static_cast<double>(display.width), static_cast<double>(display.height)};
+    }
+    const Screen screen = ::isatty(STDERR_FILENO) == 1 ? Screen::Terminal : Screen::Plain;
+    std::optional<StopWish> wish(std::in_place);
+    return recordDisplay(
+        directory, request, screen, stdout, stderr,
+        [&](std::chrono::milliseconds limit) { return wish->came(limit); },
+        [&](const std::string& movie) {
+            wish.reset();
+            return runSave(directory, movie, Form::Text);
+        });
+}
+
 int runDoctor(const IdentityQuestion& question) {
     const Findings findings = examine(LinuxEnvironment::ofThisProcess(), variable, question);
     std::fputs(findingsText(findings).c_str(), stdout);
@@ -138,6 +163,20 @@ int main(int argc, char** argv) {
     save->add_option("FILE", movie, "The movie")->required();
     save->add_flag("--json", json, "Answer lines of JSON");
 
+    CLI::App* record = app.add_subcommand(
+        "record", "Record the whole display, with the sound of what is in front, until q, Enter, the space bar or Ctrl-C");
+    record->footer(exitStatuses);
+    bool display = false;
+    RecordRequest wanted;
+    double duration = 0;
+    record->add_flag("--display", display, "What to record: the whole display")->required();
+    record->add_option("--duration", duration, "End after so many seconds")
+        ->type_name("SECONDS")
+        ->check(CLI::Range(0.1, 86'400.0));
+    record->add_option("--output", wanted.output, "Where the movie goes; by default the Videos folder, sounds mixed")
+        ->type_name("FILE");
+    record->add_flag("--microphone", wanted.microphone, "Ask for the microphone too");
+
     try {
         app.parse(argc, argv);
     } catch (const CLI::ParseError& error) {
@@ -159,6 +198,9 @@ int main(int argc, char** argv) {
                                  : showStorage(directory, part, form, stdout, stderr);
     } else if (save->parsed()) {
         result = runSave(LinuxEnvironment::ofThisProcess().runtimeDirectory, movie, json ? Form::Json : Form::Text);
+    } else if (record->parsed()) {
+        wanted.duration = std::chrono::milliseconds(std::llround(duration * 1000));
+        result = runRecord(LinuxEnvironment::ofThisProcess().runtimeDirectory, wanted);
     } else {
         IdentityQuestion question;
         if (byProgram->count() > 0) question.executable = executable;

@@ -7,6 +7,12 @@ complete -c lumacastctl -n __fish_use_subcommand -a status -d 'Show the applicat
 complete -c lumacastctl -n __fish_use_subcommand -a doctor -d 'Look at all that recording takes'
 complete -c lumacastctl -n __fish_use_subcommand -a storage -d 'Show the temporary movies, or have old ones deleted'
 complete -c lumacastctl -n __fish_use_subcommand -a save -d 'Save a movie to the Videos folder'
+complete -c lumacastctl -n __fish_use_subcommand -a record -d 'Record the whole display'
+
+complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l display -d 'Record the whole display'
+complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l duration -x -d 'End after so many seconds'
+complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l output -r -F -d 'Where the movie goes'
+complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l microphone -d 'Ask for the microphone too'
 
 complete -c lumacastctl -n '__fish_seen_subcommand_from save' -F
 complete -c lumacastctl -n '__fish_seen_subcommand_from save' -l json -d 'Answer lines of JSON'

@@ -31,6 +31,7 @@ struct DisplayFacts {
     // Only when connected; an extension the server lacks has no version.
     std::optional<Version> composite, damage, fixes, sharedMemory, resources;
     bool takesMemoryByDescriptor = false;  ///< it was given some, and took it
+    std::uint32_t width = 0, height = 0;   ///< pixels
     bool pixelsAreBgrx = false;            ///< 32 bits a pixel in memory: blue, green, red, unused
 };
 

@@ -85,14 +85,17 @@ bool takesMemoryByDescriptor(xcb_connection_t* connection) {
     return true;
 }
 
-bool pixelsAreBgrx(xcb_connection_t* connection, int screenNumber) {
-    const xcb_setup_t* setup = xcb_get_setup(connection);
-    auto screens = xcb_setup_roots_iterator(setup);
+const xcb_screen_t* screenOf(xcb_connection_t* connection, int screenNumber) {
+    auto screens = xcb_setup_roots_iterator(xcb_get_setup(connection));
     for (; screens.rem > 1 && screenNumber > 0; --screenNumber) xcb_screen_next(&screens);
-    if (screens.rem == 0 || setup->image_byte_order != XCB_IMAGE_ORDER_LSB_FIRST) return false;
-    for (auto depth = xcb_screen_allowed_depths_iterator(screens.data); depth.rem > 0; xcb_depth_next(&depth))
+    return screens.rem == 0 ? nullptr : screens.data;
+}
+
+bool pixelsAreBgrx(xcb_connection_t* connection, const xcb_screen_t& screen) {
+    if (xcb_get_setup(connection)->image_byte_order != XCB_IMAGE_ORDER_LSB_FIRST) return false;
+    for (auto depth = xcb_screen_allowed_depths_iterator(&screen); depth.rem > 0; xcb_depth_next(&depth))
         for (auto visual = xcb_depth_visuals_iterator(depth.data); visual.rem > 0; xcb_visualtype_next(&visual))
-            if (visual.data->visual_id == screens.data->root_visual)
+            if (visual.data->visual_id == screen.root_visual)
                 return visual.data->red_mask == 0xFF0000 && visual.data->blue_mask == 0xFF;
     return false;
 }
@@ -106,7 +109,14 @@ DisplayFacts askServer(DisplayFacts facts, const std::string& localName) {
     facts.reach = DisplayFacts::Reach::Connected;
     readVersions(connection.get(), facts);
     if (facts.sharedMemory >= Version{1, 2}) facts.takesMemoryByDescriptor = takesMemoryByDescriptor(connection.get());
-    facts.pixelsAreBgrx = pixelsAreBgrx(connection.get(), screenNumber);
+    if (const xcb_screen_t* const screen = screenOf(connection.get(), screenNumber)) {
+        facts.pixelsAreBgrx = pixelsAreBgrx(connection.get(), *screen);
+        if (const Owned<xcb_get_geometry_reply_t> geometry{xcb_get_geometry_reply(
+                connection.get(), xcb_get_geometry(connection.get(), screen->root), nullptr)}) {
+            facts.width = geometry->width;
+            facts.height = geometry->height;
+        }
+    }
     return facts;
 }
 

@@ -29,6 +29,7 @@ std::optional<ApplicationSession> readSession(const Value& value) {
     result.application = *application;
     if (const auto pid = countIn(*entry, "pid")) result.pid = static_cast<std::int64_t>(*pid);
     result.connected = flagIn(*entry, "connected");
+    result.wholeDisplay = flagIn(*entry, "wholeDisplay");
     const Value* current = entry->find("current");
     const auto* recording = current ? current->as<Dictionary>() : nullptr;
     if (recording) result.recording = readRecording(*recording);

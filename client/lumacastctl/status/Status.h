@@ -27,6 +27,7 @@ struct ApplicationSession {
     std::string application;  ///< its bundle identifier
     std::optional<std::int64_t> pid;
     bool connected = false;
+    bool wholeDisplay = false;  ///< its last recording is one of the whole display
     std::optional<RunningRecording> recording;
 };
 

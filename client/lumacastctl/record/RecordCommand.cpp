@@ -1,0 +1,214 @@
+#include "client/lumacastctl/record/RecordCommand.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+#include <memory>
+#include <mutex>
+#include <utility>
+
+#include "client/Recorder.h"
+#include "client/lumacastctl/AskDaemon.h"
+#include "client/lumacastctl/ExitStatus.h"
+#include "client/lumacastctl/Text.h"
+#include "linux/admin/LinuxAdminService.h"
+#include "linux/system/FileDescriptor.h"
+
+namespace lumacast::ctl {
+
+namespace {
+
+using std::chrono::milliseconds;
+using Clock = std::chrono::steady_clock;
+
+constexpr milliseconds kLook{100};
+constexpr milliseconds kLine{500};
+constexpr milliseconds kStopPatience{60'000};
+constexpr char kClearLine[] = "\r\033[K";
+
+/// What the daemon answers and tells, from the recorder's thread.
+class Answers {
+public:
+    struct Known {
+        std::optional<client::StartAnswer> start;
+        std::optional<client::StopAnswer> stop;
+        bool hasStopped = false;  ///< by itself
+        std::optional<Error> stopError;
+        std::optional<URL> stopMovie;
+        bool isDisconnected = false;
+    };
+    Known known() const {
+        const std::lock_guard lock(mutex_);
+        return known_;
+    }
+    void change(const std::function<void(Known&)>& change) {
+        const std::lock_guard lock(mutex_);
+        change(known_);
+    }
+
+private:
+    mutable std::mutex mutex_;
+    Known known_;
+};
+
+int notRecorded(std::FILE* complaints, const std::string& reason) {
+    complain(complaints, "the display is not recorded: " + printable(reason));
+    return kNotRecorded;
+}
+
+/// The line that changes. Elsewhere than on a terminal it is not shown.
+class LiveLine final {
+public:
+    LiveLine(Screen screen, std::FILE* to) : screen_(screen), to_(to) {}
+    ~LiveLine() { clear(); }
+    void show(const std::string& text) {
+        if (screen_ != Screen::Terminal) return;
+        std::fprintf(to_, "%s%s\r", kClearLine, text.c_str());
+        std::fflush(to_);
+        isShown_ = true;
+    }
+    void clear() {
+        if (std::exchange(isShown_, false)) std::fputs(kClearLine, to_);
+    }
+
+private:
+    const Screen screen_;
+    std::FILE* const to_;
+    bool isShown_ = false;
+};
+
+}  // namespace
+
+std::optional<RunningRecording> displayRecording(const DaemonStatus& status) {
+    for (const ApplicationSession& session : status.sessions)
+        if (session.wholeDisplay && session.recording) return session.recording;
+    return std::nullopt;
+}
+
+std::string recordLine(const RunningRecording& recording) {
+    std::string line = durationText(recording.elapsedSeconds);
+    if (recording.bytes) line += "   " + bytesText(*recording.bytes);
+    if (const auto frames = recording.recorded ? recording.recorded : recording.frames)
+        line += "   " + std::to_string(*frames) + " frames";
+    if (recording.dropped.value_or(0) > 0) line += " (" + std::to_string(*recording.dropped) + " dropped)";
+    return line;
+}
+
+std::optional<std::string> moveMovie(const std::string& from, const std::string& to) {
+    if (::renameat2(AT_FDCWD, from.c_str(), AT_FDCWD, to.c_str(), RENAME_NOREPLACE) == 0) return std::nullopt;
+    if (errno != EXDEV && errno != EINVAL) return std::string(std::strerror(errno));
+    std::error_code failure;
+    // Without an option it copies over nothing.
+    if (!std::filesystem::copy_file(from, to, failure)) {
+        const std::string reason = failure ? failure.message() : "there is a file already";
+        if (failure != std::errc::file_exists) std::filesystem::remove(to, failure);
+        return reason;
+    }
+    const FileDescriptor copy(::open(to.c_str(), O_RDONLY | O_CLOEXEC));
+    if (!copy || ::fsync(copy.get()) != 0) {
+        const std::string reason = std::strerror(errno);
+        std::filesystem::remove(to, failure);
+        return reason;
+    }
+    std::filesystem::remove(from, failure);
+    return std::nullopt;
+}
+
+int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& request, Screen progress, std::FILE* out,
+                  std::FILE* complaints, const std::function<bool(milliseconds)>& stopWished,
+                  const std::function<int(const std::string&)>& save) {
+    std::error_code failure;
+    if (!request.output.empty() && std::filesystem::exists(std::filesystem::symlink_status(request.output, failure)))
+        return notRecorded(complaints, request.output + " is there already.");
+    const auto answers = std::make_shared<Answers>();
+    client::Events events;
+    events.stopped = [answers](std::optional<Error> error, std::optional<URL> movie) {
+        answers->change([&](Answers::Known& known) {
+            known.hasStopped = true;
+            known.stopError = std::move(error);
+            known.stopMovie = std::move(movie);
+        });
+    };
+    events.disconnected = [answers] { answers->change([](Answers::Known& known) { known.isDisconnected = true; }); };
+    client::Recorder recorder(std::move(events), runtimeDirectory);
+
+    client::StartOptions options;
+    options.size = request.size;
+    options.microphone = request.microphone;
+    options.systemRecording = true;
+    recorder.start(options, [answers](client::StartAnswer answer) {
+        answers->change([&](Answers::Known& known) { known.start = std::move(answer); });
+    });
+    LiveLine line(progress, complaints);
+    line.show("The user may be asked first…");
+    while (!answers->known().start)
+        if (stopWished(kLook)) return notRecorded(complaints, "it was stopped before it began.");
+    line.clear();
+    if (const auto error = answers->known().start.value_or(client::StartAnswer{}).error) {
+        const auto code = client::recordingCodeOf(*error);
+        return notRecorded(complaints, client::textOf(*error) +
+                                           (code == RecordingErrorCode::Entitlements
+                                                ? "\n`lumacastctl doctor` says who is, and how to change that."
+                                                : ""));
+    }
+
+    const auto begun = Clock::now();
+    auto nextLine = begun;
+    bool isWished = false;
+    while (!isWished) {
+        const auto known = answers->known();
+        if (known.hasStopped || known.isDisconnected) break;
+        const auto now = Clock::now();
+        if (request.duration.count() > 0 && now - begun >= request.duration) break;
+        if (progress == Screen::Terminal && now >= nextLine) {
+            nextLine = now + kLine;
+            const auto answer = askAdminService(runtimeDirectory + "/admin.sock", "status", kLine);
+            const auto status = answer ? readStatus(*answer) : std::variant<DaemonStatus, std::string>("");
+            if (const auto* daemon = std::get_if<DaemonStatus>(&status))
+                if (const auto recording = displayRecording(*daemon))
+                    line.show(recordLine(*recording) + "   (q or Ctrl-C stops)");
+        }
+        auto wait = kLook;
+        if (request.duration.count() > 0)
+            wait = std::min(wait, std::chrono::ceil<milliseconds>(request.duration - (now - begun)));
+        isWished = stopWished(std::max(wait, milliseconds(0)));
+    }
+    line.clear();
+
+    auto known = answers->known();
+    if (known.isDisconnected) return complain(complaints, "the daemon has ended; its recording is in its folder.");
+    if (known.hasStopped) {
+        complain(complaints, "the recording was ended by the daemon: " +
+                                 printable(known.stopError ? client::textOf(*known.stopError) : "no reason given"));
+        if (known.stopMovie) std::fprintf(out, "%s\n", known.stopMovie->path().c_str());
+        return kNotRecorded;
+    }
+    recorder.stop([answers](client::StopAnswer answer) {
+        answers->change([&](Answers::Known& changed) { changed.stop = std::move(answer); });
+    });
+    const auto stopped = Clock::now();
+    while (!(known = answers->known()).stop && !known.hasStopped && !known.isDisconnected &&
+           Clock::now() - stopped < kStopPatience)
+        stopWished(milliseconds(10));
+    if (!known.stop || !known.stop->movie) {
+        const std::string reason = known.stop && known.stop->error ? client::textOf(*known.stop->error)
+                                   : known.stopError               ? client::textOf(*known.stopError)
+                                                                   : "the daemon does not answer.";
+        return notRecorded(complaints, reason);
+    }
+    const std::string movie = known.stop->movie->path();
+    if (request.output.empty()) return save(movie);
+    if (const auto reason = moveMovie(movie, request.output)) {
+        complain(complaints, "the movie can't be moved to " + printable(request.output) + ": " + *reason + "\nIt is " +
+                                 printable(movie));
+        return kNotSaved;
+    }
+    std::fprintf(out, "%s\n", request.output.c_str());
+    return kGood;
+}
+
+}  // namespace lumacast::ctl
