@@ -3,6 +3,7 @@
 #include <array>
 #include <cmath>
 #include <cstdio>
+#include <ctime>
 
 namespace lumacast::ctl {
 
@@ -37,6 +38,16 @@ std::string durationText(double seconds) {
     else
         std::snprintf(text.data(), text.size(), "%lld:%02lld.%lld", minutes, whole % 60, tenths % 10);
     return text.data();
+}
+
+std::string momentText(double secondsSince1970) {
+    constexpr double kFarthest = 1e11;  // beyond it a year has more than four digits
+    std::tm fields{};
+    std::array<char, 32> text{};
+    if (!(std::abs(secondsSince1970) < kFarthest)) return "unknown";
+    const auto time = static_cast<std::time_t>(std::floor(secondsSince1970));
+    if (!::localtime_r(&time, &fields)) return "unknown";
+    return std::strftime(text.data(), text.size(), "%Y-%m-%d %H:%M:%S", &fields) > 0 ? text.data() : "unknown";
 }
 
 std::string settingText(const Value& value) {

@@ -16,6 +16,9 @@ std::string bytesText(std::uint64_t bytes);
 /// Anything below zero, and what is no number, is "0:00.0".
 std::string durationText(double seconds);
 
+/// How a moment is written: local time, to the second.
+std::string momentText(double secondsSince1970);
+
 /// The text with every control character replaced by '?': names and paths come from other programs, and a terminal
 /// obeys what it is sent.
 std::string printable(std::string_view text);

@@ -21,6 +21,7 @@
 #include "client/lumacastctl/save/SaveCommand.h"
 #include "client/lumacastctl/status/StatusCommand.h"
 #include "client/lumacastctl/storage/StorageCommand.h"
+#include "client/lumacastctl/usage/UsageCommand.h"
 #include "linux/system/IniFile.h"
 
 namespace {
@@ -163,6 +164,9 @@ int main(int argc, char** argv) {
     save->add_option("FILE", movie, "The movie")->required();
     save->add_flag("--json", json, "Answer lines of JSON");
 
+    CLI::App* usage = app.add_subcommand("usage", "Show the recordings that have ended, and why each did; newest last");
+    usage->footer(exitStatuses);
+    usage->add_flag("--json", json, "Answer one line of JSON");
     CLI::App* record = app.add_subcommand(
         "record", "Record the whole display, with the sound of what is in front, until q, Enter, the space bar or Ctrl-C");
     record->footer(exitStatuses);
@@ -196,6 +200,9 @@ int main(int argc, char** argv) {
                                                        : StoragePart::All;
         result = purge->parsed() ? purgeStorage(directory, urgency, form, stdout, stderr)
                                  : showStorage(directory, part, form, stdout, stderr);
+    } else if (usage->parsed()) {
+        const std::string directory = LinuxEnvironment::ofThisProcess().runtimeDirectory;
+        result = showUsage(directory, json ? Form::Json : Form::Text, stdout, stderr);
     } else if (save->parsed()) {
         result = runSave(LinuxEnvironment::ofThisProcess().runtimeDirectory, movie, json ? Form::Json : Form::Text);
     } else if (record->parsed()) {

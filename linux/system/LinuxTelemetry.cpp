@@ -7,7 +7,9 @@
 #include <cerrno>
 #include <condition_variable>
 #include <deque>
+#include <filesystem>
 #include <mutex>
+#include <sstream>
 #include <system_error>
 #include <thread>
 
@@ -15,6 +17,7 @@
 #include "linux/system/Json.h"
 #include "linux/system/LinuxClock.h"
 #include "linux/system/LinuxEnvironment.h"
+#include "linux/system/SmallFile.h"
 #include "linux/system/SystemError.h"
 #include "linux/system/Threads.h"
 
@@ -23,13 +26,21 @@ namespace lumacast {
 namespace {
 
 constexpr std::size_t kMaximumWaiting = 64;
+constexpr std::size_t kMaximumReads = 8;
+constexpr std::size_t kMaximumDepth = 8;  // far below what whoever reads an answer with all lines takes
 constexpr std::chrono::seconds kFarewell{2};
 
+/// Whether the file's last line has no end: the power went while it was written.
+bool endsWithinLine(const FileDescriptor& file, const struct stat& status) {
+    char last = '\n';
+    return status.st_size > 0 && ::pread(file.get(), &last, 1, status.st_size - 1) == 1 && last != '\n';
+}
+
 /// Appends a line with one write, after making room. Whether all of it is in the file.
-bool append(const std::string& path, std::uint64_t maximumBytes, const std::string& line) {
+bool append(const std::string& path, std::uint64_t maximumBytes, std::string line) {
     const auto open = [&] {
         return FileDescriptor(
-            ::open(path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600));
+            ::open(path.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600));
     };
     FileDescriptor file = open();
     if (!file && errno == ENOENT) {
@@ -38,31 +49,65 @@ bool append(const std::string& path, std::uint64_t maximumBytes, const std::stri
     }
     struct stat status = {};
     if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) return false;
-    if (status.st_size > 0 && static_cast<std::uint64_t>(status.st_size) + line.size() > maximumBytes) {
+    if (status.st_size > 0 && static_cast<std::uint64_t>(status.st_size) + line.size() + 1 > maximumBytes) {
         if (::rename(path.c_str(), (path + ".1").c_str()) != 0) return false;
         file = open();
         if (!file || ::fstat(file.get(), &status) != 0) return false;
     }
+    if (endsWithinLine(file, status)) line.insert(line.begin(), '\n');
     if (::write(file.get(), line.data(), line.size()) == static_cast<ssize_t>(line.size())) return true;
     // Half a line would spoil the next one too. Only this thread appends, so the old end is still the end.
     if (::ftruncate(file.get(), status.st_size) != 0) return false;
     return false;
 }
 
+void readLines(const std::string& path, std::uint64_t maximumBytes, TelemetryHistory& history) {
+    std::error_code unknown;
+    if (!std::filesystem::exists(path, unknown)) return;
+    const auto file = readSmallFile(path, maximumBytes);
+    if (!file) {
+        ++history.unreadableFiles;
+        return;
+    }
+    std::istringstream lines(file->text);
+    for (std::string line; std::getline(lines, line);) {
+        auto event = valueFromJson(line, kMaximumDepth);
+        if (event && event->as<Dictionary>())
+            history.events.push_back(std::move(*event));
+        else
+            ++history.damagedLines;
+    }
+}
+
 }  // namespace
 
 struct LinuxTelemetry::State {
+    /// A line to write, or where no line is, who wants to know what was written.
+    struct Work {
+        std::string line;
+        HistoryHandler reader;
+    };
+
     std::string path;
     std::uint64_t maximumBytes = 0;
     std::function<void()> beforeEachWrite;
     std::mutex mutex;
     std::condition_variable workCame;
     std::condition_variable workDone;
-    std::deque<std::string> waiting;
+    std::deque<Work> waiting;
     std::size_t unwritten = 0;  ///< those waiting and the one being written
+    std::size_t reads = 0;      ///< the same of those who want to know
     std::uint64_t lost = 0;
     bool stopping = false;
-    bool running = false;  ///< the thread is made with the first event
+    bool running = false;  ///< the thread is made with the first work
+
+    TelemetryHistory history(std::uint64_t lostEvents) const {
+        TelemetryHistory result;
+        result.lostEvents = lostEvents;
+        readLines(path + ".1", maximumBytes, result);
+        readLines(path, maximumBytes, result);
+        return result;
+    }
 };
 
 LinuxTelemetry::LinuxTelemetry(std::string path, std::uint64_t maximumBytes, std::function<void()> beforeEachWrite)
@@ -97,14 +142,25 @@ std::optional<Error> LinuxTelemetry::send(const TelemetrySession& session, const
 
     const std::lock_guard lock(state_->mutex);
     if (state_->unwritten >= kMaximumWaiting) return systemError(ENOBUFS);
-    if (!state_->running) {
-        if (!startDetachedThread([state = state_] { write(state); })) return systemError(EAGAIN);
-        state_->running = true;
-    }
-    state_->waiting.push_back(std::move(line));
+    if (!startLocked()) return systemError(EAGAIN);
+    state_->waiting.push_back({std::move(line), {}});
     ++state_->unwritten;
     state_->workCame.notify_one();
     return std::nullopt;
+}
+
+bool LinuxTelemetry::readHistory(HistoryHandler handler) {
+    const std::lock_guard lock(state_->mutex);
+    if (state_->reads >= kMaximumReads || !startLocked()) return false;
+    state_->waiting.push_back({{}, std::move(handler)});
+    ++state_->reads;
+    state_->workCame.notify_one();
+    return true;
+}
+
+bool LinuxTelemetry::startLocked() {
+    if (!state_->running) state_->running = startDetachedThread([state = state_] { work(state); });
+    return state_->running;
 }
 
 bool LinuxTelemetry::flush(std::chrono::milliseconds limit) {
@@ -117,19 +173,26 @@ std::uint64_t LinuxTelemetry::lostEvents() const {
     return state_->lost;
 }
 
-void LinuxTelemetry::write(const std::shared_ptr<State>& state) {
+void LinuxTelemetry::work(const std::shared_ptr<State>& state) {
     std::unique_lock lock(state->mutex);
     while (true) {
         state->workCame.wait(lock, [&] { return state->stopping || !state->waiting.empty(); });
         if (state->waiting.empty()) break;
-        const std::string line = std::move(state->waiting.front());
+        State::Work work = std::move(state->waiting.front());
         state->waiting.pop_front();
+        const std::uint64_t lost = state->lost;
         lock.unlock();
         if (state->beforeEachWrite) state->beforeEachWrite();
-        const bool written = append(state->path, state->maximumBytes, line);
+        const bool writes = !work.reader;
+        bool done = true;
+        if (writes)
+            done = append(state->path, state->maximumBytes, std::move(work.line));
+        else
+            work.reader(state->history(lost));
+        work = {};  // without the lock: it may hold the last reference to whoever asked
         lock.lock();
-        if (!written) ++state->lost;
-        --state->unwritten;
+        if (!done) ++state->lost;
+        --(writes ? state->unwritten : state->reads);
         state->workDone.notify_all();
     }
     state->running = false;

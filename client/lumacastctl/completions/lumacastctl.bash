@@ -7,7 +7,7 @@ _lumacastctl() {
         given=${COMP_WORDS[i]}
         case $given in
             -*) ;;
-            status | doctor | storage | save | record) [ -z "$command" ] && command=$given ;;
+            status | doctor | storage | save | usage | record) [ -z "$command" ] && command=$given ;;
             list | purgeable | purge) [ "$command" = storage ] && [ -z "$part" ] && part=$given ;;
         esac
     done
@@ -33,10 +33,11 @@ _lumacastctl() {
     fi
     local words
     case $command:$part in
-        :) words='status doctor storage save record -h --help' ;;
+        :) words='status doctor storage save usage record -h --help' ;;
         status:) words='--json --watch -h --help' ;;
         doctor:) words='--pid --exe -h --help' ;;
         save:) words='--json -h --help' ;;
+        usage:) words='--json -h --help' ;;
         record:) words='--display --duration --output --microphone -h --help' ;;
         storage:) words='list purgeable purge --json -h --help' ;;
         storage:purge) words='1 2 3 --json -h --help' ;;

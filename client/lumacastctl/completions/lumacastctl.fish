@@ -7,6 +7,7 @@ complete -c lumacastctl -n __fish_use_subcommand -a status -d 'Show the applicat
 complete -c lumacastctl -n __fish_use_subcommand -a doctor -d 'Look at all that recording takes'
 complete -c lumacastctl -n __fish_use_subcommand -a storage -d 'Show the temporary movies, or have old ones deleted'
 complete -c lumacastctl -n __fish_use_subcommand -a save -d 'Save a movie to the Videos folder'
+complete -c lumacastctl -n __fish_use_subcommand -a usage -d 'Show the recordings that have ended'
 complete -c lumacastctl -n __fish_use_subcommand -a record -d 'Record the whole display'
 
 complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l display -d 'Record the whole display'
@@ -22,6 +23,8 @@ complete -c lumacastctl -n '__fish_seen_subcommand_from status' -l watch -d 'Sho
 
 complete -c lumacastctl -n '__fish_seen_subcommand_from doctor' -l pid -x -a '(__fish_complete_pids)' -d 'Tell which application a process counts as'
 complete -c lumacastctl -n '__fish_seen_subcommand_from doctor' -l exe -r -F -d 'Tell which application a program counts as'
+
+complete -c lumacastctl -n '__fish_seen_subcommand_from usage' -l json -d 'Answer one line of JSON'
 
 complete -c lumacastctl -n '__fish_seen_subcommand_from storage' -l json -d 'Answer one line of JSON'
 set -l parts list purgeable purge

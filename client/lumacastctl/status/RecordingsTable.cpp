@@ -1,6 +1,4 @@
-#include <algorithm>
-#include <array>
-
+#include "client/lumacastctl/Table.h"
 #include "client/lumacastctl/Text.h"
 #include "client/lumacastctl/status/Status.h"
 
@@ -8,14 +6,9 @@ namespace lumacast::ctl {
 
 namespace {
 
-constexpr std::size_t kColumns = 6;
-/// From this one on they are numbers, and stand to the right.
-constexpr std::size_t kFirstNumber = 2;
-using Line = std::array<std::string, kColumns>;
-
 std::string countText(const std::optional<std::uint64_t>& count) { return count ? std::to_string(*count) : "-"; }
 
-Line lineOf(const ApplicationSession& session, const RunningRecording& recording) {
+std::vector<std::string> rowOf(const ApplicationSession& session, const RunningRecording& recording) {
     return {printable(session.application),
             recording.paused ? "paused" : "recording",
             durationText(recording.elapsedSeconds),
@@ -27,23 +20,18 @@ Line lineOf(const ApplicationSession& session, const RunningRecording& recording
 }  // namespace
 
 std::string recordingsTable(const DaemonStatus& status) {
-    std::vector<Line> lines{{"APPLICATION", "STATE", "ELAPSED", "SIZE", "RECORDED", "DROPPED"}};
+    constexpr auto kNumber = Column::Side::Right;
+    std::vector<std::vector<std::string>> rows;
     for (const ApplicationSession& session : status.sessions)
-        if (session.recording) lines.push_back(lineOf(session, *session.recording));
-    if (lines.size() == 1) return "Nothing is being recorded.\n";
-    std::array<std::size_t, kColumns> widths{};
-    for (const Line& line : lines)
-        for (std::size_t i = 0; i < kColumns; ++i) widths[i] = std::max(widths[i], line[i].size());
-    std::string text;
-    for (const Line& line : lines) {
-        for (std::size_t i = 0; i < kColumns; ++i) {
-            const std::string filling(widths[i] - line[i].size(), ' ');
-            if (i > 0) text += "  ";
-            text += i < kFirstNumber ? line[i] + filling : filling + line[i];
-        }
-        text += "\n";
-    }
-    return text;
+        if (session.recording) rows.push_back(rowOf(session, *session.recording));
+    if (rows.empty()) return "Nothing is being recorded.\n";
+    return tableText({{"APPLICATION"},
+                      {"STATE"},
+                      {"ELAPSED", kNumber},
+                      {"SIZE", kNumber},
+                      {"RECORDED", kNumber},
+                      {"DROPPED", kNumber}},
+                     rows);
 }
 
 }  // namespace lumacast::ctl

@@ -35,9 +35,6 @@ struct PurgeOutcome {
 std::variant<StorageReport, std::string> readStorage(std::string_view answer);
 std::variant<PurgeOutcome, std::string> readPurge(std::string_view answer);
 
-/// How a moment is written: local time, to the second.
-std::string momentText(double secondsSince1970);
-
 /// For people, several lines with a newline each.
 std::string purgeableText(const StorageReport& report);
 /// The files, a line each, the newest first as the daemon sends them.

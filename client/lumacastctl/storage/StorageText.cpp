@@ -1,7 +1,4 @@
 #include <algorithm>
-#include <array>
-#include <cmath>
-#include <ctime>
 
 #include "client/lumacastctl/Text.h"
 #include "client/lumacastctl/storage/Storage.h"
@@ -16,16 +13,6 @@ std::string padded(std::string text, std::size_t width) {
 }
 
 }  // namespace
-
-std::string momentText(double secondsSince1970) {
-    constexpr double kFarthest = 1e11;  // beyond it a year has more than four digits
-    std::tm fields{};
-    std::array<char, 32> text{};
-    if (!(std::abs(secondsSince1970) < kFarthest)) return "unknown";
-    const auto time = static_cast<std::time_t>(std::floor(secondsSince1970));
-    if (!::localtime_r(&time, &fields)) return "unknown";
-    return std::strftime(text.data(), text.size(), "%Y-%m-%d %H:%M:%S", &fields) > 0 ? text.data() : "unknown";
-}
 
 std::string purgeableText(const StorageReport& report) {
     std::string text = "Purgeable:  ";

@@ -4,6 +4,8 @@
 #include <sys/stat.h>
 
 #include <algorithm>
+#include <atomic>
+#include <future>
 
 #include "linux/system/Json.h"
 #include "tests/contract/ScratchDirectory.h"
@@ -92,6 +94,92 @@ TEST(LinuxTelemetry, ItsEndWaitsForWhatWasHandedOver) {
     }
     const std::string text = ScratchDirectory::read(scratch.path("telemetry.jsonl"));
     EXPECT_EQ(std::count(text.begin(), text.end(), '\n'), 20);
+}
+
+/// What the files tell, waited for.
+TelemetryHistory historyOf(LinuxTelemetry& telemetry) {
+    auto told = std::make_shared<std::promise<TelemetryHistory>>();
+    auto history = told->get_future();
+    EXPECT_TRUE(telemetry.readHistory([told](TelemetryHistory result) { told->set_value(std::move(result)); }));
+    return history.wait_for(kPatience) == std::future_status::ready ? history.get() : TelemetryHistory{};
+}
+
+std::int64_t typeOf(const Value& event) { return *event.as<Dictionary>()->find("type")->as<std::int64_t>(); }
+
+TEST(LinuxTelemetry, TellsItsHistoryAcrossTheRotation) {
+    ScratchDirectory scratch;
+    LinuxTelemetry telemetry(scratch.path("telemetry.jsonl"), 1000);
+    EXPECT_TRUE(historyOf(telemetry).events.empty()) << "there are no files yet";
+    for (std::int64_t type = 0; type < 30; ++type) EXPECT_FALSE(send(telemetry, type));
+    const TelemetryHistory history = historyOf(telemetry);  // without a flush: it comes behind what was sent
+    ASSERT_GT(history.events.size(), 3u);
+    for (std::size_t i = 0; i < history.events.size(); ++i)
+        EXPECT_EQ(typeOf(history.events[i]), 30 - static_cast<std::int64_t>(history.events.size() - i));
+    EXPECT_EQ(history.damagedLines, 0u) << "each file has whole lines";
+    EXPECT_EQ(history.unreadableFiles, 0u);
+}
+
+TEST(LinuxTelemetry, SkipsAndCountsDamagedLines) {
+    ScratchDirectory scratch;
+    const std::string deep(20, '[');
+    scratch.write("telemetry.jsonl.1", "{\"type\":1}\nnonsense\n{\"type\":2}\n");
+    scratch.write("telemetry.jsonl", "[]\n{\"type\":3}\n{\"a\":" + deep + std::string(20, ']') + "}\n{\"type\":4");
+    LinuxTelemetry telemetry(scratch.path("telemetry.jsonl"));
+    const TelemetryHistory history = historyOf(telemetry);
+    ASSERT_EQ(history.events.size(), 3u);
+    for (std::size_t i = 0; i < 3; ++i) EXPECT_EQ(typeOf(history.events[i]), static_cast<std::int64_t>(i) + 1);
+    EXPECT_EQ(history.damagedLines, 4u);
+}
+
+TEST(LinuxTelemetry, ALineThatWasCutOffDoesNotSpoilTheNext) {
+    ScratchDirectory scratch;
+    scratch.write("telemetry.jsonl", "{\"type\":3}\n{\"type\":4");
+    LinuxTelemetry telemetry(scratch.path("telemetry.jsonl"));
+    EXPECT_FALSE(send(telemetry, 5));
+    const TelemetryHistory history = historyOf(telemetry);
+    ASSERT_EQ(history.events.size(), 2u);
+    EXPECT_EQ(typeOf(history.events[1]), 5);
+    EXPECT_EQ(history.damagedLines, 1u);
+    EXPECT_EQ(telemetry.lostEvents(), 0u);
+}
+
+TEST(LinuxTelemetry, AStateDirectoryThatCantBeWrittenLosesOnlyTheLine) {
+    ScratchDirectory scratch;
+    scratch.write("state", "a file where the directory should be");
+    LinuxTelemetry telemetry(scratch.path("state/lumacast/telemetry.jsonl"));
+    EXPECT_FALSE(send(telemetry, 1)) << "it is handed over, and refused by the disk";
+    EXPECT_EQ(historyOf(telemetry).lostEvents, 1u);
+    std::filesystem::remove(scratch.path("state"));
+    EXPECT_FALSE(send(telemetry, 2));
+    const TelemetryHistory history = historyOf(telemetry);
+    ASSERT_EQ(history.events.size(), 1u);
+    EXPECT_EQ(typeOf(history.events[0]), 2);
+}
+
+TEST(LinuxTelemetry, AFileThatIsNoneIsCountedAndNotWaitedFor) {
+    ScratchDirectory scratch;
+    ASSERT_EQ(::mkfifo(scratch.path("telemetry.jsonl").c_str(), 0600), 0);
+    scratch.makeDirectory("telemetry.jsonl.1");
+    LinuxTelemetry telemetry(scratch.path("telemetry.jsonl"));
+    EXPECT_FALSE(send(telemetry, 1));
+    const TelemetryHistory history = historyOf(telemetry);
+    EXPECT_EQ(history.unreadableFiles, 2u);
+    EXPECT_EQ(history.lostEvents, 1u);
+}
+
+TEST(LinuxTelemetry, ADiskThatHangsIsAskedForHistoryOnlyAFewTimes) {
+    ScratchDirectory scratch;
+    const auto gate = std::make_shared<Gate>();
+    const auto told = std::make_shared<std::atomic<int>>(0);
+    gate->shut();
+    LinuxTelemetry telemetry(scratch.path("telemetry.jsonl"), LinuxTelemetry::kDefaultLimit, [gate] { gate->pass(); });
+    const auto ask = [&] { return telemetry.readHistory([told](TelemetryHistory) { ++*told; }); };
+    for (int i = 0; i < 8; ++i) EXPECT_TRUE(ask()) << i;
+    EXPECT_FALSE(ask());
+    EXPECT_FALSE(send(telemetry, 1)) << "events have places of their own";
+    gate->open();
+    EXPECT_TRUE(until([&] { return *told == 8; }));
+    EXPECT_EQ(historyOf(telemetry).events.size(), 1u);
 }
 
 }  // namespace

@@ -6,6 +6,7 @@
 
 #include "client/lumacastctl/ExitStatus.h"
 #include "client/lumacastctl/Fields.h"
+#include "client/lumacastctl/Text.h"
 #include "client/lumacastctl/storage/StorageCommand.h"
 #include "tests/contract/ScratchDirectory.h"
 #include "tests/unit/lumacastctl/Snapshots.h"

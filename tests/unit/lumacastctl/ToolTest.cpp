@@ -77,6 +77,8 @@ TEST_F(Tool, TellsWrongUsageFromEverythingElse) {
                                                       {"save"},
                                                       {"save", "a.mp4", "b.mp4"},
                                                       {"save", "--watch", "a.mp4"},
+                                                      {"usage", "more"},
+                                                      {"usage", "--watch"},
                                                       {"doctor", "--pid", "0"},
                                                       {"doctor", "--pid", "-4"},
                                                       {"doctor", "--pid", "many"},
@@ -96,7 +98,7 @@ TEST_F(Tool, DocumentsItsExitStatuses) {
         EXPECT_THAT(readme, HasSubstr("| " + std::to_string(row.status) + " | " + row.meaning + " |\n"));
     for (const std::vector<std::string>& arguments :
          {std::vector<std::string>{"--help"}, {"status", "--help"}, {"doctor", "--help"}, {"storage", "--help"},
-          {"save", "--help"}, {"storage", "list", "--help"}, {"storage", "purgeable", "--help"},
+          {"save", "--help"}, {"usage", "--help"}, {"storage", "list", "--help"}, {"storage", "purgeable", "--help"},
           {"storage", "purge", "--help"}}) {
         const Outcome result = run(arguments);
         EXPECT_EQ(result.status, 0);
