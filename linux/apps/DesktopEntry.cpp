@@ -103,6 +103,7 @@ void setEntry(DesktopEntry& entry, std::string_view key, std::string_view value)
     if (key == "Type") entry.isApplication = value == "Application";
     if (key == "Hidden") entry.hidden = value == "true";
     if (key == "Name") entry.name = unescaped(value);
+    if (key == "Icon") entry.icon = unescaped(value);
     if (key == "Exec") entry.exec = unescaped(value);
     if (key == "TryExec") entry.tryExec = unescaped(value);
     if (key == "X-Lumacast-Executable") entry.lumacastExecutable = unescaped(value);

@@ -17,6 +17,7 @@ struct DesktopEntry {
     bool hidden = false;         ///< counts as if it had been deleted
     std::string name;
     std::vector<std::pair<std::string, std::string>> localizedNames;  ///< locale as written ("pt_BR"), name
+    std::string icon;  ///< a name of the icon theme, or an absolute path
     std::string exec;
     std::string tryExec;
     std::string

@@ -67,6 +67,7 @@ OpenedBundle openDesktopEntry(const std::string& path, const std::string& identi
         set(contents.localizedInfo, key, entry->localizedName(locales));
         if (!entry->name.empty()) set(contents.info, key, entry->name);
     }
+    if (!entry->icon.empty()) contents.info.emplace(kInfoIcon, entry->icon);
     return {std::make_shared<const LinuxBundle>(std::move(contents)), {path}};
 }
 
@@ -85,6 +86,7 @@ OpenedBundle openFolder(const std::string& path, const std::vector<Locale>& loca
     if (!manifest.identifier.empty()) contents.identifier = BundleIdentifier(manifest.identifier);
     set(contents.info, kInfoName, manifest.name);
     set(contents.info, kInfoDisplayName, manifest.displayName);
+    set(contents.info, kInfoIcon, manifest.icon);
     set(contents.localizedInfo, kInfoName, manifest.localizedName(locales));
     // A translated name is worth more to a user than a display name in another language.
     const auto localized = manifest.localizedDisplayName(locales);

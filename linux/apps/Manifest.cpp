@@ -52,6 +52,7 @@ std::optional<Manifest> Manifest::parse(std::string_view text) {
         if (!string) continue;
         if (key == "identifier" && isBundleIdentifier(*string)) manifest.identifier = *string;
         if (key == "name") manifest.name = *string;
+        if (key == "icon") manifest.icon = *string;
         if (key == "displayName") manifest.displayName = *string;
         if (key == "developmentLanguage" && isBundleIdentifier(*string)) manifest.developmentLanguage = *string;
         if (const auto language = languageOf("name", key);

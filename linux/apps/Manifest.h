@@ -12,12 +12,13 @@
 namespace lumacast {
 
 /// What `manifest.json` says: {"identifier": "org.example.Player", "name": "Player", "name[de]": "Spieler",
-/// "displayName": ..., "displayName[de]": ..., "developmentLanguage": "en"}. Only the identifier must be there, for an
-/// application; a folder of resources may leave it out. A value.
+/// "displayName": ..., "displayName[de]": ..., "icon": "player", "developmentLanguage": "en"}. Only the identifier must be
+/// there, for an application; a folder of resources may leave it out. A value.
 struct Manifest {
     std::string identifier;  ///< empty when the manifest has none
     std::optional<std::string> name;
     std::optional<std::string> displayName;
+    std::optional<std::string> icon;  ///< a name of the icon theme, or an absolute path
     std::vector<std::pair<std::string, std::string>> localizedNames;  ///< language tag as written, name
     std::vector<std::pair<std::string, std::string>> localizedDisplayNames;
     std::string developmentLanguage = "en";

@@ -35,6 +35,8 @@ public:
 
 inline constexpr std::string_view kInfoDisplayName = "DisplayName";
 inline constexpr std::string_view kInfoName = "Name";
+/// A name of the icon theme, or an absolute path. The bundle says it of itself.
+inline constexpr std::string_view kInfoIcon = "Icon";
 
 /// Finds bundles. Answers from memory or within 100 ms; callable from any lane. A missing thing answers null or none.
 class Bundles {

@@ -50,7 +50,7 @@ public:
         FakeBundle bundle;
         bundle.bundleIdentifier = application.identifier;
         bundle.path = "/fake/apps/" + application.identifier.text();
-        bundle.infos = {{std::string(kInfoName), application.name}};
+        bundle.infos = {{std::string(kInfoName), application.name}, {std::string(kInfoIcon), "the-icon"}};
         if (application.nameInUsersLanguage)
             bundle.localizedInfos = {{std::string(kInfoDisplayName), *application.nameInUsersLanguage}};
         bundles_.install(std::move(bundle));
@@ -92,7 +92,7 @@ public:
     void install(const Application& application) override {
         const std::string& id = application.identifier.text();
         installExecutable(scratch_.path("bin/" + id));
-        std::string entry = "[Desktop Entry]\nType=Application\nName=" + application.name + "\nExec=" + id + " %U\n";
+        std::string entry = "[Desktop Entry]\nType=Application\nName=" + application.name + "\nIcon=the-icon\nExec=" + id + " %U\n";
         if (application.nameInUsersLanguage) entry += "Name[de]=" + *application.nameInUsersLanguage + "\n";
         scratch_.write("applications/" + id + ".desktop", entry);
     }
@@ -157,6 +157,7 @@ TEST_P(BundlesContract, AProcessLeadsToItsApplication) {
     EXPECT_EQ(bundle->identifier(), kPlayer);
     EXPECT_EQ(bundle->localizedInfo(kInfoDisplayName), "Spieler");
     EXPECT_EQ(bundle->info(kInfoName), "Player");
+    EXPECT_EQ(bundle->info(kInfoIcon), "the-icon");
     EXPECT_EQ(bundle->info("NoSuchKey"), std::nullopt);
     EXPECT_EQ(bundle->localizedInfo("NoSuchKey"), std::nullopt);
 }

@@ -14,9 +14,11 @@ Name[pt_BR]=Reprodutor
 Name[sr@latin]=Svirac
  Exec = "/opt/my player/bin/player" --open %U
 TryExec=player
+Icon=org.example.Player
 
 [Desktop Action New]
 Name=New Window
+Icon=other
 Exec=other
 )";
 
@@ -40,6 +42,7 @@ TEST(DesktopEntry, ItsOwnGroupIsReadAndNoOther) {
     EXPECT_FALSE(parsed.hidden);
     EXPECT_EQ(parsed.name, "Player");
     EXPECT_EQ(parsed.tryExec, "player");
+    EXPECT_EQ(parsed.icon, "org.example.Player");
     EXPECT_EQ(parsed.program(), "/opt/my player/bin/player");
 }
 

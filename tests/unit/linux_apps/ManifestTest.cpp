@@ -8,7 +8,7 @@ namespace lumacast {
 namespace {
 
 constexpr const char* kManifest = R"({"identifier": "org.example.Player", "name": "Player", "name[de]": "Spieler",
-    "displayName": "The Player", "displayName[pt-BR]": "O Reprodutor", "name[]": "x", "version": 3})";
+    "displayName": "The Player", "displayName[pt-BR]": "O Reprodutor", "name[]": "x", "icon": "player", "version": 3})";
 
 TEST(Manifest, ItsTextsAreRead) {
     const auto manifest = Manifest::parse(kManifest);
@@ -16,6 +16,7 @@ TEST(Manifest, ItsTextsAreRead) {
     EXPECT_EQ(manifest->identifier, "org.example.Player");
     EXPECT_EQ(manifest->name, "Player");
     EXPECT_EQ(manifest->displayName, "The Player");
+    EXPECT_EQ(manifest->icon, "player");
     EXPECT_EQ(manifest->developmentLanguage, "en");
     EXPECT_EQ(manifest->localizedName(userLocales("de_AT", "")), "Spieler");
     EXPECT_EQ(manifest->localizedDisplayName(userLocales("pt_BR", "")), "O Reprodutor");
