@@ -46,6 +46,14 @@ bool isIcon(std::string_view icon) {
     });
 }
 
+/// A name of the icon theme has no ending, but is often written with one.
+std::string iconNamed(std::string icon) {
+    if (icon.front() != '/')
+        for (const std::string_view ending : {".png", ".svg", ".xpm"})
+            if (icon.size() > ending.size() && icon.ends_with(ending)) icon.resize(icon.size() - ending.size());
+    return icon;
+}
+
 /// A press of Alt with a letter of the label must press nothing: no underlined letters.
 std::string withoutMnemonic(std::string_view label) {
     std::string doubled;
@@ -114,7 +122,7 @@ std::optional<DialogTexts> dialogTexts(const AlertContent& content, const std::o
     texts.defaultButton = plainAlertText(content.defaultButton, kLongestButton);
     if (content.alternateButton) texts.alternateButton = plainAlertText(*content.alternateButton, kLongestButton);
     texts.otherButton = plainAlertText(content.otherButton.value_or(""), kLongestButton);
-    texts.icon = icon && isIcon(*icon) ? *icon : kUnknownIcon;
+    texts.icon = icon && isIcon(*icon) ? iconNamed(*icon) : kUnknownIcon;
     if (texts.defaultButton.empty() || texts.otherButton.empty() || texts.defaultButton == texts.otherButton)
         return std::nullopt;
     if (texts.alternateButton && (texts.alternateButton->empty() || *texts.alternateButton == texts.defaultButton ||

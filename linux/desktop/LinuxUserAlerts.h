@@ -30,7 +30,7 @@ public:
         /// asked again.
         std::chrono::milliseconds tooSoon{500};
         /// How long the display may take to answer, and the program to show its window.
-        std::chrono::milliseconds displayPatience{5'000}, windowPatience{60'000};
+        std::chrono::milliseconds displayPatience{5'000}, windowPatience{20'000};
         IconLookup icon;
         /// Told why an alert could not be shown.
         std::function<void(std::string_view reason)> explain;

@@ -185,6 +185,25 @@ TEST_P(RealDialogTest, ARefusalCountsAtOnce) {
     EXPECT_EQ(answer_.wait(), Response::OtherButton);
 }
 
+TEST_P(RealDialogTest, UnderAWindowManagerItIsTheSame) {
+    const test::ChildProcess manager({"openbox", "--sm-disable"}, -1, {"DISPLAY=" + world_.display().name()});
+    for (const auto& [button, response] :
+         {std::pair(Button::Alternate, Response::AlternateButton), std::pair(Button::Default, Response::DefaultButton),
+          std::pair(Button::Other, Response::OtherButton)}) {
+        answer_ = Answer();
+        ASSERT_NO_FATAL_FAILURE(show(threeButtons()));
+        EXPECT_TRUE(user().click(dialog_, button));
+        EXPECT_EQ(answer_.wait(), response);
+    }
+    for (const auto& [name, harm] : {std::pair("close", &DialogUser::close), std::pair("destroy", &DialogUser::destroy),
+                                     std::pair("kill", &DialogUser::killClient)}) {
+        answer_ = Answer();
+        ASSERT_NO_FATAL_FAILURE(show(threeButtons()));
+        (user().*harm)(dialog_);
+        EXPECT_EQ(answer_.wait(), Response::OtherButton) << name;
+    }
+}
+
 TEST_P(RealDialogTest, TextsOfApplicationsAreNothingButTexts) {
     const std::string long10k(10'000, 'W');
     for (const std::string& name :
