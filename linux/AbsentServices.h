@@ -6,15 +6,8 @@
 #include "platform/ScreenReader.h"
 #include "platform/StoreLookup.h"
 #include "platform/SystemSounds.h"
-#include "platform/UserAlert.h"
 
 namespace lumacast {
-
-/// No alert can be shown: whoever must be asked about is refused.
-class AbsentUserAlerts final : public UserAlerts {
-public:
-    std::shared_ptr<UserAlert> show(const AlertContent&) override { return nullptr; }
-};
 
 class AbsentSystemSounds final : public SystemSounds {
 public:

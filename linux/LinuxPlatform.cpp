@@ -16,6 +16,7 @@
 #include "linux/apps/LinuxBundles.h"
 #include "linux/audio/LinuxAudioInputQueues.h"
 #include "linux/audio/LinuxDeviceCapture.h"
+#include "linux/desktop/LinuxUserAlerts.h"
 #include "linux/display/X11AppStateMonitor.h"
 #include "linux/display/X11DisplayCapture.h"
 #include "linux/display/X11RenderServer.h"
@@ -35,6 +36,7 @@
 #include "linux/system/LinuxPreferences.h"
 #include "linux/system/LinuxTelemetry.h"
 #include "linux/system/Termination.h"
+#include "linux/system/UsageCommand.h"
 #include "platform/Platform.h"
 #include "support/ThreadScheduler.h"
 
@@ -96,6 +98,7 @@ public:
                      endUnreachable();
                  }),
           storagePurge_(scheduler_, fileSystem_),
+          userAlerts_(alertOptions(environment)),
           storeLookup_(scheduler_),
           platform_{log_,       scheduler_, clock_,   ipc_,
                     bundles_,   renderServer_, appState_, capture_,
@@ -112,6 +115,7 @@ public:
     /// What must be there before the daemon can work; the error when it can't be had.
     std::optional<Error> prepare() {
         if (auto error = fileSystem_.prepare()) return error;
+        admin_.addCommand("usage", usageCommand(telemetry_));
         // The main loop's first task: by then clients are accepted.
         scheduler_.mainQueue().async([this] { keepAlive_.announceReady(); });
         return std::nullopt;
@@ -125,6 +129,20 @@ private:
         const auto path = executable ? bundles_.bundlePathForExecutable(*executable) : std::nullopt;
         const auto bundle = path ? bundles_.open(*path) : nullptr;
         return bundle ? bundle->identifier() : std::nullopt;
+    }
+
+    LinuxUserAlerts::Options alertOptions(const LinuxEnvironment& environment) {
+        LinuxUserAlerts::Options options;
+        options.display = environmentVariable("DISPLAY");
+        options.searchPath = environment.searchPath;
+        options.styleDirectory = environment.runtimeDirectory + "/dialog";
+        options.environment = dialogEnvironment(environ, options.display);
+        options.icon = [this](const BundleIdentifier& application) {
+            const auto bundle = bundles_.withIdentifier(application);
+            return bundle ? bundle->info(kInfoIcon) : std::nullopt;
+        };
+        options.explain = [this](std::string_view reason) { log_.error("the user can't be asked: %s", reason); };
+        return options;
     }
 
     LinuxFileSystem::Options fileSystemOptions(const LinuxEnvironment& environment) {
@@ -160,7 +178,7 @@ private:
     X11AppStateMonitor appState_;
     LinuxAdminService admin_;
     LinuxStoragePurgeService storagePurge_;
-    AbsentUserAlerts userAlerts_;
+    LinuxUserAlerts userAlerts_;
     AbsentSystemSounds systemSounds_;
     AbsentScreenReader screenReader_;
     AbsentStoreLookup storeLookup_;

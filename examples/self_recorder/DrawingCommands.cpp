@@ -39,6 +39,10 @@ void addDrawingCommands(CommandTable& commands, Loop& loop, SceneWindow& window,
         window.show();
         reply("ok");
     });
+    commands.add("raise", "put the window above all others", [&window](const Arguments&, const Reply& reply) {
+        window.raise();
+        reply("ok");
+    });
     commands.add("still", "stop drawing: nothing changes", [&painter](const Arguments&, const Reply& reply) {
         painter.setStill(true);
         reply("ok");

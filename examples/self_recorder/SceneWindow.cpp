@@ -149,6 +149,12 @@ void SceneWindow::show() {
     xcb_flush(connection_.get());
 }
 
+void SceneWindow::raise() {
+    const std::uint32_t above = XCB_STACK_MODE_ABOVE;
+    xcb_configure_window(connection_.get(), window_, XCB_CONFIG_WINDOW_STACK_MODE, &above);
+    xcb_flush(connection_.get());
+}
+
 void SceneWindow::pump() {
     while (const Owned<xcb_generic_event_t> event{xcb_poll_for_event(connection_.get())}) handle(*event);
     if (xcb_connection_has_error(connection_.get()) != 0) lost("the display is gone");

@@ -48,6 +48,8 @@ public:
     void move(int x, int y);
     void hide();
     void show();
+    /// Above all others.
+    void raise();
 
     /// Handles what the server has sent and calls the events.
     void pump();

@@ -1,5 +1,7 @@
 #include "tests/dialog/DialogUser.h"
 
+#include <signal.h>
+
 #include <xcb/res.h>
 #include <xcb/xtest.h>
 
@@ -223,6 +225,11 @@ bool DialogUser::gone(xcb_window_t window) {
     const Owned<xcb_get_geometry_reply_t> size(
         xcb_get_geometry_reply(connection_.get(), xcb_get_geometry(connection_.get(), window), nullptr));
     return size == nullptr;
+}
+
+bool DialogUser::killProgram(const Dialog& dialog) {
+    // -1 would be everybody.
+    return dialog.pid > 1 && ::kill(dialog.pid, SIGKILL) == 0;
 }
 
 bool DialogUser::answer(Button button, std::optional<pid_t> pid, std::chrono::seconds limit, milliseconds look) {

@@ -48,6 +48,8 @@ public:
     void close(const Dialog& dialog);
     void destroy(const Dialog& dialog);
     void killClient(const Dialog& dialog);
+    /// Ends the dialog's program with SIGKILL; false when nobody knows which it is.
+    static bool killProgram(const Dialog& dialog);
 
     /// Waits for a dialog, looks at it for `look` (the daemon does not believe a press that comes at once), presses the
     /// button and waits until the dialog has gone.

@@ -99,12 +99,13 @@ TEST(Endings, ATerminatedDaemonFinishesItsMovieAndLeavesWithStatusZero) {
     EXPECT_GT(durationOf(world.moviePath()), 1.0);
 }
 
-TEST(Endings, AStartThatIsNotAllowedIsRefusedWithItsReason) {
+TEST(Endings, WhereNobodyCanBeAskedAStartIsRefusedWithItsReason) {
     World world(World::Consent::Asked);
-    world.startDaemon();
+    world.startDaemon({"PATH=" + world.path("no programs")});
     const auto application = world.application({"--size", "320x180", "--fps", "30"});
     ASSERT_TRUE(application->waitForFrame(1));
     EXPECT_TRUE(application->ask("start").starts_with("error -5801")) << world.daemonLog();
+    EXPECT_NE(world.daemonLog().find("error showing acknowledgement alert"), std::string::npos) << world.daemonLog();
     EXPECT_NE(world.daemonLog().find(" refused with -5801: "), std::string::npos) << world.daemonLog();
 }
 

@@ -92,6 +92,7 @@ std::string Application::stop(const std::string& command) {
 }
 
 void Application::kill() {
+    ASSERT_GT(child_->pid(), 1);  // -1 would be everybody
     ::kill(child_->pid(), SIGKILL);
     child_->wait();
 }
@@ -148,6 +149,8 @@ void World::startDaemon(const std::vector<std::string>& variables) {
 }
 
 int World::endDaemon(int signal) {
+    EXPECT_GT(daemon_->pid(), 1);
+    if (daemon_->pid() <= 1) return -1;  // would be everybody
     ::kill(daemon_->pid(), signal);
     return daemon_->wait();
 }
