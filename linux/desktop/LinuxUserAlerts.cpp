@@ -10,9 +10,8 @@
 namespace lumacast {
 namespace {
 
-constexpr std::array<std::string_view, 7> kPassedOn{
-    "HOME", "PATH", "XAUTHORITY", "LANG", "LANGUAGE", "USER", "DBUS_SESSION_BUS_ADDRESS"};
-constexpr std::array<std::string_view, 2> kFamiliesPassedOn{"LC_", "XDG_"};
+constexpr std::array<std::string_view, 5> kPassedOn{"HOME", "PATH", "XAUTHORITY", "USER", "DBUS_SESSION_BUS_ADDRESS"};
+constexpr std::string_view kFamilyPassedOn = "XDG_";
 
 class LinuxUserAlert final : public UserAlert {
 public:
@@ -67,14 +66,13 @@ std::shared_ptr<UserAlert> LinuxUserAlerts::show(const AlertContent& content) {
 }
 
 std::vector<std::string> dialogEnvironment(const char* const* variables, const std::string& display) {
-    std::vector<std::string> environment{"DISPLAY=" + display, "GDK_BACKEND=x11"};
+    std::vector<std::string> environment{"DISPLAY=" + display, "GDK_BACKEND=x11", "LC_ALL=C.UTF-8"};
     bool hasBus = false;
     for (; *variables != nullptr; ++variables) {
         const std::string_view variable = *variables;
         const std::string_view name = variable.substr(0, variable.find('='));
         if (std::find(kPassedOn.begin(), kPassedOn.end(), name) == kPassedOn.end() &&
-            std::none_of(kFamiliesPassedOn.begin(), kFamiliesPassedOn.end(),
-                         [&](std::string_view family) { return name.starts_with(family); }))
+            !name.starts_with(kFamilyPassedOn))
             continue;
         hasBus |= name == "DBUS_SESSION_BUS_ADDRESS";
         environment.emplace_back(variable);

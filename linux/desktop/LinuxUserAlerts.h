@@ -45,8 +45,9 @@ private:
     const Options options_;
 };
 
-/// What a dialog needs of this process's environment: display, home, path, language and directories; the session bus
-/// for screen readers where there is one, and nothing that would start one.
+/// What a dialog needs of this process's environment: display, home, path and directories; the session bus for screen
+/// readers where there is one, and nothing that would start one. Never the locale: the texts are the user's language
+/// already, and in one that isn't installed, or isn't UTF-8, the program would refuse them.
 std::vector<std::string> dialogEnvironment(const char* const* variables, const std::string& display);
 
 }  // namespace lumacast
