@@ -1,4 +1,4 @@
-// Presses a button of the daemon's dialog, as a user would.
+// Presses a button of the daemon's dialog, as a user would, or says which window it is.
 
 #include <cstdio>
 #include <cstdlib>
@@ -13,7 +13,9 @@ namespace {
 using lumacast::test::DialogUser;
 
 int usage() {
-    std::fprintf(stderr, "usage: click_button default|alternate|other [--display :7] [--pid PID] [--wait SECONDS]\n");
+    std::fprintf(stderr,
+                 "usage: click_button default|alternate|other [--display :7] [--pid PID] [--wait SECONDS]\n"
+                 "       click_button window [the same]\n");
     return 2;
 }
 
@@ -28,7 +30,8 @@ std::optional<DialogUser::Button> buttonNamed(std::string_view name) {
 
 int main(int count, char** words) {
     const auto button = count > 1 ? buttonNamed(words[1]) : std::nullopt;
-    if (!button || count % 2 != 0) return usage();
+    const bool onlyLook = count > 1 && std::string_view(words[1]) == "window";
+    if ((!button && !onlyLook) || count % 2 != 0) return usage();
     const char* const variable = std::getenv("DISPLAY");
     std::string display = variable != nullptr ? variable : "";
     std::optional<pid_t> pid;
@@ -48,6 +51,11 @@ int main(int count, char** words) {
     if (!user.works()) {
         std::fprintf(stderr, "click_button: there is no display %s\n", display.c_str());
         return 1;
+    }
+    if (onlyLook) {
+        const auto dialog = user.waitForDialog(pid, std::chrono::seconds(seconds));
+        if (dialog) std::printf("0x%x\n", dialog->window);
+        return dialog ? 0 : 1;
     }
     if (user.answer(*button, pid, std::chrono::seconds(seconds))) return 0;
     std::fprintf(stderr, "click_button: no dialog with such a button, or it stayed\n");
