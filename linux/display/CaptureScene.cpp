@@ -5,30 +5,38 @@
 
 namespace lumacast::x11 {
 
-void CaptureScene::capture(Targets& into, xcb_window_t window, CaptureTarget::Kind kind) {
+void CaptureScene::capture(Targets& into, xcb_window_t window) {
     const auto known = std::find_if(targets_.begin(), targets_.end(), [&](const auto& target) {
-        return target && target->window() == window && target->kind() == kind && !target->gone();
+        return target && target->window() == window && !target->gone();
     });
-    auto target = known != targets_.end() ? std::move(*known) : CaptureTarget::open(connection_, window, kind);
+    auto target = known != targets_.end() ? std::move(*known)
+                                          : CaptureTarget::open(connection_, window, CaptureTarget::Kind::Window);
     if (target) into.push_back(std::move(target));
 }
 
-bool CaptureScene::follow(const CloneSelection::Wanted& wanted) {
-    using Kind = CaptureTarget::Kind;
+bool CaptureScene::follow(const CloneSelection::Wanted& wanted, std::int64_t now) {
     const bool screen = wanted.mode == DisplayCloneControl::kMirrorDisplay;
+    // It selects the root's events, and so does a canvas: only one of them at a time.
+    if (!screen) mirror_.reset();
     Targets next;
-    if (screen) {
-        capture(next, connection_.screen().root, Kind::Screen);
-    } else if (wanted.mode == DisplayCloneControl::kCloneContexts) {
+    if (wanted.mode == DisplayCloneControl::kCloneContexts)
         for (const ContextID context : wanted.contexts) {
             const xcb_window_t window = number(context);
-            if (window != 0 && !connection_.isRoot(window)) capture(next, window, Kind::Window);
+            if (window != 0 && !connection_.isRoot(window)) capture(next, window);
         }
-    }
     std::swap(targets_, next);
     choosePicture();
+    if (screen) return followScreen(now);
     // Off: nothing to show, for now.
-    return !targets_.empty() || (!screen && wanted.mode != DisplayCloneControl::kCloneContexts);
+    return !targets_.empty() || wanted.mode != DisplayCloneControl::kCloneContexts;
+}
+
+bool CaptureScene::followScreen(std::int64_t now) {
+    if (!mirror_) mirror_ = ScreenMirror::open(connection_, interval_);
+    if (!mirror_) return false;
+    mirror_->lookWhetherBlank(now);
+    picture_ = mirror_.get();
+    return true;
 }
 
 void CaptureScene::choosePicture() {
@@ -44,6 +52,7 @@ void CaptureScene::choosePicture() {
 void CaptureScene::handle(const xcb_generic_event_t& event, std::int64_t now) {
     for (const auto& target : targets_) target->handle(event, now);
     if (canvas_) canvas_->handle(event);
+    if (mirror_) mirror_->handle(event, now);
 }
 
 bool CaptureScene::anyGone() const {

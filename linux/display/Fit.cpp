@@ -1,6 +1,7 @@
 #include "linux/display/Fit.h"
 
 #include <algorithm>
+#include <utility>
 
 #include "linux/display/DamageRegion.h"
 
@@ -26,7 +27,9 @@ Span touched(std::int32_t at, std::int32_t length, std::int32_t source, std::int
 
 }  // namespace
 
-Fit fit(std::int32_t sourceWidth, std::int32_t sourceHeight, std::int32_t frameWidth, std::int32_t frameHeight) {
+Fit fit(std::int32_t sourceWidth, std::int32_t sourceHeight, std::int32_t frameWidth, std::int32_t frameHeight,
+        Turn turn) {
+    if (turn == Turn::Counterclockwise) std::swap(frameWidth, frameHeight);
     const std::int64_t wide = static_cast<std::int64_t>(sourceWidth) * frameHeight;
     const std::int64_t high = static_cast<std::int64_t>(frameWidth) * sourceHeight;
     PixelRect target{0, 0, frameWidth, frameHeight};
@@ -37,15 +40,25 @@ Fit fit(std::int32_t sourceWidth, std::int32_t sourceHeight, std::int32_t frameW
         target.width = scaled(sourceWidth, frameHeight, sourceHeight);
         target.x = (frameWidth - target.width) / 2;
     }
-    return {sourceWidth, sourceHeight, target};
+    return {sourceWidth, sourceHeight, target, turn, frameWidth};
 }
 
 PixelRect Fit::toFrame(const PixelRect& rect) const {
     if (isEmpty(rect)) return {};
-    if (exact()) return rect;
+    if (exact()) return turned(rect);
     const Span x = touched(rect.x, rect.width, sourceWidth, target.width);
     const Span y = touched(rect.y, rect.height, sourceHeight, target.height);
-    return {target.x + x.begin, target.y + y.begin, x.end - x.begin, y.end - y.begin};
+    return turned({target.x + x.begin, target.y + y.begin, x.end - x.begin, y.end - y.begin});
+}
+
+PixelRect Fit::turned(const PixelRect& rect) const {
+    if (turn == Turn::None) return rect;
+    return {rect.y, uprightWidth - rect.x - rect.width, rect.height, rect.width};
+}
+
+PixelRect Fit::upright(const PixelRect& rect) const {
+    if (turn == Turn::None) return rect;
+    return {uprightWidth - rect.y - rect.height, rect.x, rect.height, rect.width};
 }
 
 }  // namespace lumacast::x11

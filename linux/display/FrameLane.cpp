@@ -17,6 +17,8 @@ namespace {
 constexpr int kReadings = 3;
 // A source that stands longer gives the window and its planes back.
 constexpr std::int64_t kReleaseAfter = 10'000'000'000;
+// Of the transform flags.
+constexpr std::uint32_t kRotateClockwise = 4;
 
 std::int64_t steadyNow() {
     return std::chrono::duration_cast<std::chrono::nanoseconds>(std::chrono::steady_clock::now().time_since_epoch())
@@ -73,6 +75,7 @@ std::int64_t FrameLane::nextDeadline(const Order& order) const {
     if (!shown_) return FramePacer::kNever;
     if (scene_->anyGone()) return 0;
     std::int64_t deadline = last_.picture ? pacer_.nextRepeat() : FramePacer::kNever;
+    deadline = std::min(deadline, shown_->nextLook());
     if (shown_->readable() && shown_->repaintDeadline() != 0) deadline = std::min(deadline, shown_->repaintDeadline());
     return pictureIsDue() ? std::min(deadline, pacer_.nextChange()) : deadline;
 }
@@ -83,7 +86,7 @@ bool FrameLane::pictureIsDue() const {
     if (shown_->damaged()) return true;
     // When an application is late with its painting, that has to be seen to, news or not.
     if (shown_->repaintDeadline() != 0) return steadyNow() >= shown_->repaintDeadline();
-    return pictureWanted_ || (maker_->follows(*shown_) && maker_->somethingNew());
+    return pictureWanted_ || (maker_->follows(*shown_, maker_->turn()) && maker_->somethingNew());
 }
 
 void FrameLane::sleep(std::int64_t deadline) {
@@ -125,13 +128,12 @@ bool FrameLane::drainEvents(bool onlyQueued) {
 
 void FrameLane::work(const Order& order) {
     if (order.run != run_ && !beginRun(order)) return;
-    if (connection_->broken()) {
-        forgetWindows();
-        return fail(order, X11CaptureStatus::kDisplayLost);
-    }
+    if (connection_->broken()) return displayIsLost(order);
     if (selectionVersion_ != setup_.selection->version() && !followSelection(order)) return;
     if (scene_->anyGone() && !followSelection(order)) return;
     if (!shown_) return;
+    if (steadyNow() >= shown_->nextLook()) shown_->look(steadyNow());
+    if (screenIsTaken(order)) return;
     if (pictureIsDue() && steadyNow() >= pacer_.nextChange()) takePicture(order);
     if (last_.picture && steadyNow() >= pacer_.nextRepeat())
         repeatPicture(order, order.clock->now(), CaptureControl::Stamp::Fresh);
@@ -157,9 +159,18 @@ bool FrameLane::connect(const Order& order) {
     connection_ = X11Connection::open(setup_.display, interrupt_);
     if (!connection_) return fail(order, X11CaptureStatus::kNoDisplay), false;
     if (!connection_->canCapture()) return fail(order, X11CaptureStatus::kNotSupported), false;
-    maker_ = std::make_unique<PictureMaker>(*connection_, setup_.width, setup_.height);
-    scene_ = std::make_unique<CaptureScene>(*connection_);
+    scene_ = std::make_unique<CaptureScene>(*connection_, pacer_.interval());
+    makeMaker();
     return true;
+}
+
+// Frames of the screen and of windows may have different sizes.
+void FrameLane::makeMaker() {
+    auto [width, height] = std::pair(setup_.width, setup_.height);
+    if (mirrors_ && width > height) std::swap(width, height);
+    if (maker_ && maker_->makes(width, height)) return;
+    maker_ = std::make_unique<PictureMaker>(*connection_, width, height);
+    pictureWanted_ = true;
 }
 
 bool FrameLane::followSelection(const Order& order) {
@@ -167,28 +178,45 @@ bool FrameLane::followSelection(const Order& order) {
     const auto wanted = setup_.selection->wanted();
     selectionVersion_ = wanted.version;
     const std::uint32_t before = shown_ ? shown_->id() : 0;
-    const bool any = scene_->follow(wanted);
+    mirrors_ = wanted.mode == DisplayCloneControl::kMirrorDisplay;
+    const bool any = scene_->follow(wanted, steadyNow());
     shown_ = scene_->picture();
-    if (connection_->broken()) {
-        forgetWindows();
-        return fail(order, X11CaptureStatus::kDisplayLost), false;
-    }
+    if (connection_->broken()) return displayIsLost(order), false;
     if (wanted.mode == DisplayCloneControl::kCloneContexts)
         for (const ContextID context : scene_->missing(wanted)) setup_.selection->forget(context);
     if (!any) return fail(order, X11CaptureStatus::kWindowGone), false;
     if (shown_ && shown_->id() != before) pictureWanted_ = true;
+    if (shown_) makeMaker();
     drainEvents(true);
+    return !screenIsTaken(order);
+}
+
+// A screen that is locked or dark belongs to somebody else.
+bool FrameLane::screenIsTaken(const Order& order) {
+    if (!scene_->screenIsBlank()) return false;
+    end(order, [](auto& delegate, auto& source) { delegate.screenCaptureControllerWasPreempted(source); });
     return true;
 }
 
+// The recording's first picture decides: a movie has one orientation.
+Turn FrameLane::turnOf(const Order& order) {
+    if (!mirrors_) return Turn::None;
+    if (turnedFor_ != order.clock) {
+        turnedFor_ = order.clock;
+        turn_ = shown_->width() > shown_->height() ? Turn::Counterclockwise : Turn::None;
+    }
+    return turn_;
+}
+
 // Whether the picture can be read now; what has changed in it is noted.
-bool FrameLane::lookAtPicture() {
+bool FrameLane::lookAtPicture(const Order& order) {
     if (shown_->needsRefresh()) {
         shown_->refresh();
         drainEvents(true);
     }
     if (!shown_->readable()) return false;
-    if (!maker_->follows(*shown_)) maker_->follow(*shown_);
+    const Turn turn = turnOf(order);
+    if (!maker_->follows(*shown_, turn)) maker_->follow(*shown_, turn);
     DamageRegion damage;
     if (shown_->damaged()) shown_->takeDamage(damage);
     maker_->add(damage);
@@ -203,7 +231,7 @@ void FrameLane::takePicture(const Order& order) {
     std::optional<std::size_t> plane;
     for (int reading = 0; reading < kReadings; ++reading) {
         const bool hadNews = shown_->damaged() || shown_->needsRefresh();
-        if (!lookAtPicture()) return;
+        if (!lookAtPicture(order)) return;
         if (!maker_->somethingNew() && !pictureWanted_) return;
         if (!plane) plane = maker_->acquire();
         if (!plane) return dropPicture(hadNews);
@@ -211,7 +239,10 @@ void FrameLane::takePicture(const Order& order) {
         drainEvents(true);
         if (!shown_->overtaken() && !shown_->needsRefresh()) break;
     }
-    if (!deliver(order, maker_->picture(*plane, ++pictures_), stamp, CaptureControl::Stamp::Fresh)) return;
+    // What a locked screen shows is nobody's business; the next look ends the run.
+    if (scene_->screenIsBlank()) return;
+    const std::uint32_t flags = maker_->turn() == Turn::Counterclockwise ? kRotateClockwise : 0;
+    if (!deliver(order, maker_->picture(*plane, ++pictures_), flags, stamp, CaptureControl::Stamp::Fresh)) return;
     maker_->delivered();
     pictureWanted_ = false;
 }
@@ -224,12 +255,13 @@ void FrameLane::dropPicture(bool hadNews) {
 }
 
 void FrameLane::repeatPicture(const Order& order, MediaTime stamp, CaptureControl::Stamp kind) {
-    deliver(order, std::make_shared<Picture>(last_.picture->plane(), DamageRegion{}, ++pictures_), stamp, kind);
+    deliver(order, std::make_shared<Picture>(last_.picture->plane(), DamageRegion{}, ++pictures_), last_.transformFlags,
+            stamp, kind);
 }
 
 // False when the order has changed meanwhile.
-bool FrameLane::deliver(const Order& order, std::shared_ptr<Picture> picture, MediaTime stamp,
-                        CaptureControl::Stamp kind) {
+bool FrameLane::deliver(const Order& order, std::shared_ptr<Picture> picture, std::uint32_t transformFlags,
+                        MediaTime stamp, CaptureControl::Stamp kind) {
     const std::int64_t began = steadyNow();
     pacer_.taken(began);
     const auto source = setup_.source.lock();
@@ -237,9 +269,10 @@ bool FrameLane::deliver(const Order& order, std::shared_ptr<Picture> picture, Me
     if (!source || !delegate) return true;  // to nobody
     const auto given = setup_.control->beginDelivery(order, stamp, kind);
     if (!given) return false;
-    last_ = {picture, *given, order.clock};
+    last_ = {picture, *given, order.clock, transformFlags};
     delegate->screenCaptureControllerDidReceiveSampleBuffer(
-        *source, SampleBuffer::makeVideo(PixelBuffer(std::move(picture)), *given, setup_.minimumInterval), 0);
+        *source, SampleBuffer::makeVideo(PixelBuffer(std::move(picture)), *given, setup_.minimumInterval),
+        transformFlags);
     setup_.control->countDelivered();
     setup_.control->endDelivery();
 
@@ -251,12 +284,24 @@ bool FrameLane::deliver(const Order& order, std::shared_ptr<Picture> picture, Me
 }
 
 void FrameLane::fail(const Order& order, std::int32_t status) {
+    end(order,
+        [status](auto& delegate, auto& source) { delegate.screenCaptureControllerDidFailWithStatus(source, status); });
+}
+
+void FrameLane::displayIsLost(const Order& order) {
+    forgetWindows();
+    if (!mirrors_) return fail(order, X11CaptureStatus::kDisplayLost);
+    end(order, [](auto& delegate, auto& source) { delegate.screenCaptureControllerMediaServicesWereReset(source); });
+}
+
+// The run is over, and its delegate is told why.
+void FrameLane::end(const Order& order, Telling telling) {
     release();
     if (!setup_.control->endRun(order)) return;
-    setup_.scheduler->mainQueue().async([source = setup_.source, control = setup_.control, run = order.run, status] {
-        const auto failed = source.lock();
+    setup_.scheduler->mainQueue().async([source = setup_.source, control = setup_.control, run = order.run, telling] {
+        const auto ended = source.lock();
         const auto delegate = control->delegateOfEnded(run);
-        if (failed && delegate) delegate->screenCaptureControllerDidFailWithStatus(*failed, status);
+        if (ended && delegate) telling(*delegate, *ended);
     });
 }
 

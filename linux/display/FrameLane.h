@@ -5,6 +5,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <string>
 
@@ -19,7 +20,7 @@
 
 namespace lumacast::x11 {
 
-/// What a frame lane captures, and for whom.
+/// What a frame lane captures, and for whom. Of the screen frames are always portrait: the shorter side is their width.
 struct FrameLaneSetup {
     std::string display;
     std::int32_t width = 0, height = 0;
@@ -50,20 +51,28 @@ private:
         std::shared_ptr<Picture> picture;
         MediaTime stamp;
         std::shared_ptr<CaptureClock> clock;
+        std::uint32_t transformFlags = 0;
     };
+    using Telling = std::function<void(DisplayCaptureDelegate&, DisplayCaptureSource&)>;
 
     void work(const Order& order);
     bool beginRun(const Order& order);
     bool connect(const Order& order);
     bool followSelection(const Order& order);
+    void makeMaker();
+    bool screenIsTaken(const Order& order);
     bool pictureIsDue() const;
 
     void takePicture(const Order& order);
-    bool lookAtPicture();
+    bool lookAtPicture(const Order& order);
+    Turn turnOf(const Order& order);
     void dropPicture(bool hadNews);
     void repeatPicture(const Order& order, MediaTime stamp, CaptureControl::Stamp kind);
-    bool deliver(const Order& order, std::shared_ptr<Picture> picture, MediaTime stamp, CaptureControl::Stamp kind);
+    bool deliver(const Order& order, std::shared_ptr<Picture> picture, std::uint32_t transformFlags, MediaTime stamp,
+                 CaptureControl::Stamp kind);
     void fail(const Order& order, std::int32_t status);
+    void displayIsLost(const Order& order);
+    void end(const Order& order, Telling telling);
 
     void forgetWindows();
     bool drainEvents(bool onlyQueued);
@@ -84,6 +93,10 @@ private:
     FramePacer pacer_;
     std::uint64_t run_ = 0;
     std::uint64_t selectionVersion_ = 0;
+    bool mirrors_ = false;  ///< the screen, not windows
+    // How the screen lies in the frames of one recording, which has one clock.
+    Turn turn_ = Turn::None;
+    std::shared_ptr<CaptureClock> turnedFor_;
     bool pictureWanted_ = false;  ///< the current picture is due though nothing may have changed
     std::int64_t stoppedSince_ = 0;
     std::uint64_t pictures_ = 0;  ///< numbered so far

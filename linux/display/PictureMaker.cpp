@@ -39,6 +39,17 @@ Strips rowsOf(const DamageRegion& region) {
     return rows;
 }
 
+// Premultiplied colours: what shines through is added to them.
+void drawOver(const std::uint32_t* over, std::uint8_t* under, std::int32_t pixels) {
+    for (std::int32_t x = 0; x < pixels; ++x, under += 4) {
+        const std::uint32_t pixel = over[x], through = 255 - (pixel >> 24);
+        for (int byte = 0; byte < 3; ++byte) {
+            const std::uint32_t own = pixel >> (8 * byte) & 0xFF;
+            under[byte] = static_cast<std::uint8_t>(std::min(255u, own + (under[byte] * through + 127) / 255));
+        }
+    }
+}
+
 }  // namespace
 
 PictureMaker::PictureMaker(X11Connection& connection, std::int32_t width, std::int32_t height)
@@ -46,13 +57,14 @@ PictureMaker::PictureMaker(X11Connection& connection, std::int32_t width, std::i
 
 PictureMaker::~PictureMaker() {
     if (image_) image_->detach(connection_);
+    pool_.detach(connection_);
 }
 
-void PictureMaker::follow(const PictureSource& target) {
+void PictureMaker::follow(const PictureSource& target, Turn turn) {
     source_ = target.id();
     layout_ = target.layout();
     if (!target.readable()) return;
-    const Fit fitted = fit(target.width(), target.height(), pool_.width(), pool_.height());
+    const Fit fitted = fit(target.width(), target.height(), pool_.width(), pool_.height(), turn);
     if (image_ && (fitted.sourceWidth != fit_.sourceWidth || fitted.sourceHeight != fit_.sourceHeight)) {
         image_->detach(connection_);
         image_.reset();
@@ -60,6 +72,7 @@ void PictureMaker::follow(const PictureSource& target) {
     fit_ = fitted;
     imageStale_.clear();
     imageStale_.add(PixelRect{0, 0, fit_.sourceWidth, fit_.sourceHeight});
+    drawnOver_ = {};
     tracker_.addAll();
 }
 
@@ -89,7 +102,9 @@ bool PictureMaker::update(std::size_t index, PictureSource& target) {
         planeFits_[index] = fit_;
     }
     const bool rowsAreTight = plane.stride() == static_cast<std::size_t>(fit_.sourceWidth) * 4;
-    const bool done = fit_.exact() && rowsAreTight ? updateDirectly(index, target) : updateFromImage(index, target);
+    const bool direct = fit_.exact() && rowsAreTight && fit_.turn == Turn::None && target.overlay().pixels.empty() &&
+                        isEmpty(drawnOver_);
+    const bool done = direct ? updateDirectly(index, target) : updateFromImage(index, target);
     if (done) tracker_.planeIsCurrent(index);
     return done;
 }
@@ -112,29 +127,56 @@ bool PictureMaker::readImage(PictureSource& target) {
         if (!image_) return false;
         imageStale_.add(PixelRect{0, 0, fit_.sourceWidth, fit_.sourceHeight});
     }
+    // What was drawn over is read again.
+    imageStale_.add(drawnOver_);
     const Strips rows = rowsOf(imageStale_);
     if (!target.read(*image_, rows.span())) return false;
     imageStale_.clear();
+    draw(target.overlay());
     return true;
 }
 
-// Copies or scales the part of the window that lies in `rect` of the frame.
+void PictureMaker::draw(const Overlay& overlay) {
+    const PixelRect& place = overlay.place;
+    drawnOver_ = overlay.pixels.empty() ? PixelRect{}
+                                        : intersection(place, PixelRect{0, 0, fit_.sourceWidth, fit_.sourceHeight});
+    const int stride = fit_.sourceWidth * 4;
+    for (std::int32_t y = drawnOver_.y; y < drawnOver_.y + drawnOver_.height; ++y)
+        drawOver(overlay.pixels.data() + (y - place.y) * place.width + (drawnOver_.x - place.x),
+                 image_->bytes().data() + y * stride + drawnOver_.x * 4, drawnOver_.width);
+}
+
+// Copies, scales or turns the part of the picture that lies in `rect` of the frame.
 void PictureMaker::show(const PixelRect& rect, Plane& plane) {
-    const PixelRect visible = intersection(rect, fit_.target);
+    const PixelRect visible = intersection(fit_.upright(rect), fit_.target);
     if (isEmpty(visible)) return;
-    const std::uint8_t* const from = image_->bytes().data();
-    const int fromStride = fit_.sourceWidth * 4;
+    const std::uint8_t* from = image_->bytes().data();
+    int fromStride = fit_.sourceWidth * 4;
     const int toStride = static_cast<int>(plane.stride());
-    std::uint8_t* const bytes = plane.memory().bytes().data();
-    if (fit_.exact()) {
+    std::uint8_t* const frame = plane.memory().bytes().data();
+    if (fit_.turn == Turn::None) {
+        if (!fit_.exact()) return scale(visible, frame, toStride);
         libyuv::ARGBCopy(from + visible.y * fromStride + visible.x * 4, fromStride,
-                         bytes + visible.y * toStride + visible.x * 4, toStride, visible.width, visible.height);
+                         frame + visible.y * toStride + visible.x * 4, toStride, visible.width, visible.height);
         return;
     }
-    std::uint8_t* const to = bytes + fit_.target.y * toStride + fit_.target.x * 4;
-    libyuv::ARGBScaleClip(from, fromStride, fit_.sourceWidth, fit_.sourceHeight, to, toStride, fit_.target.width,
-                          fit_.target.height, visible.x - fit_.target.x, visible.y - fit_.target.y, visible.width,
-                          visible.height, libyuv::kFilterBilinear);
+    if (!fit_.exact()) {
+        fromStride = plane.height() * 4;
+        scaled_.resize(static_cast<std::size_t>(fromStride) * static_cast<std::size_t>(plane.width()));
+        scale(visible, scaled_.data(), fromStride);
+        from = scaled_.data();
+    }
+    const PixelRect place = fit_.turned(visible);
+    turnCounterclockwise(from + visible.y * fromStride + visible.x * 4, static_cast<std::size_t>(fromStride),
+                         frame + place.y * toStride + place.x * 4, plane.stride(), visible.width, visible.height);
+}
+
+// Into an upright frame.
+void PictureMaker::scale(const PixelRect& rect, std::uint8_t* frame, int stride) const {
+    libyuv::ARGBScaleClip(image_->bytes().data(), fit_.sourceWidth * 4, fit_.sourceWidth, fit_.sourceHeight,
+                          frame + fit_.target.y * stride + fit_.target.x * 4, stride, fit_.target.width,
+                          fit_.target.height, rect.x - fit_.target.x, rect.y - fit_.target.y, rect.width, rect.height,
+                          libyuv::kFilterBilinear);
 }
 
 std::shared_ptr<Picture> PictureMaker::picture(std::size_t plane, std::uint64_t number) {

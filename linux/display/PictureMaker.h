@@ -1,10 +1,11 @@
 #pragma once
-// Turns a window's changing picture into planes of the frame's size.
+// Makes planes of the frame's size out of a changing picture.
 
 #include <array>
 #include <cstdint>
 #include <memory>
 #include <optional>
+#include <vector>
 
 #include "linux/display/DamageTracker.h"
 #include "linux/display/Fit.h"
@@ -13,9 +14,10 @@
 
 namespace lumacast::x11 {
 
-/// Reads from a target into planes, only what changed since each plane's own picture. Where window and frame have one
-/// size the display server writes straight into the plane; else into an image of the window, from which the plane is
-/// copied or scaled. Belongs to the frame lane. Waits for the server while reading.
+/// Reads from a target into planes, only what changed since each plane's own picture. Where picture and frame have one
+/// size the display server writes straight into the plane; else, and where something is drawn over the picture, into an
+/// image of it, from which the plane is copied, scaled or turned. Belongs to the frame lane. Waits for the server while
+/// reading.
 class PictureMaker final {
 public:
     /// Pictures of this size; the connection must outlive the maker.
@@ -24,10 +26,17 @@ public:
     PictureMaker(const PictureMaker&) = delete;
     PictureMaker& operator=(const PictureMaker&) = delete;
 
-    /// The target to read from now on, or its new layout: everything has changed.
-    void follow(const PictureSource& target);
-    /// Whether follow() was last called for this target as it is laid out now.
-    bool follows(const PictureSource& target) const { return source_ == target.id() && layout_ == target.layout(); }
+    bool makes(std::int32_t width, std::int32_t height) const {
+        return pool_.width() == width && pool_.height() == height;
+    }
+    /// The target to read from now on, or its new layout, or another turn: everything has changed.
+    void follow(const PictureSource& target, Turn turn);
+    /// Whether follow() was last called for this target as it is laid out now, and this turn.
+    bool follows(const PictureSource& target, Turn turn) const {
+        return source_ == target.id() && layout_ == target.layout() && fit_.turn == turn;
+    }
+    /// How the picture lies in the frame.
+    Turn turn() const { return fit_.turn; }
     /// This part of the target's picture has changed.
     void add(const DamageRegion& damage);
     /// The next picture goes to somebody who has seen none.
@@ -47,7 +56,9 @@ private:
     bool updateDirectly(std::size_t plane, PictureSource& target);
     bool updateFromImage(std::size_t plane, PictureSource& target);
     bool readImage(PictureSource& target);
+    void draw(const Overlay& overlay);
     void show(const PixelRect& rect, Plane& plane);
+    void scale(const PixelRect& rect, std::uint8_t* frame, int stride) const;
 
     X11Connection& connection_;
     PlanePool pool_;
@@ -56,8 +67,10 @@ private:
     std::uint64_t layout_ = 0;
     Fit fit_;
     std::array<Fit, kPlanes> planeFits_{};  ///< what each plane's borders were cleared for
-    std::optional<SharedMemory> image_;     ///< the window's picture, where it is not copied as it is
+    std::optional<SharedMemory> image_;     ///< the target's picture, where it doesn't go straight into the plane
     DamageRegion imageStale_;
+    PixelRect drawnOver_;               ///< of the image
+    std::vector<std::uint8_t> scaled_;  ///< an upright frame, where it is scaled before it is turned
 };
 
 }  // namespace lumacast::x11

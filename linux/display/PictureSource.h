@@ -4,6 +4,7 @@
 #include <xcb/xcb.h>
 
 #include <cstdint>
+#include <limits>
 #include <span>
 
 #include "linux/display/DamageRegion.h"
@@ -12,9 +13,16 @@
 
 namespace lumacast::x11 {
 
+/// What is drawn over a picture after it was read: pixels of its own, 0xAARRGGBB, their colours multiplied by their
+/// alpha already, row by row. Parts of it may lie outside the picture. Empty where there is nothing to draw.
+struct Overlay {
+    PixelRect place;
+    std::span<const std::uint32_t> pixels;  ///< borrowed from who gives the overlay
+};
+
 /// A changing picture that the display server keeps: one window's, the screen's, or several windows' put together.
-/// Belongs to one thread; `refresh`, `takeDamage` and `read` wait for the server. Times are nanoseconds of the steady
-/// clock.
+/// Belongs to one thread; `refresh`, `look`, `takeDamage` and `read` wait for the server. Times are nanoseconds of the
+/// steady clock.
 class PictureSource {
 public:
     virtual ~PictureSource() = default;
@@ -31,6 +39,12 @@ public:
     virtual std::int32_t height() const = 0;
     /// Another number whenever the whole picture has to be read anew.
     virtual std::uint64_t layout() const = 0;
+
+    /// When to look() next, for what the server tells nobody; never for most.
+    virtual std::int64_t nextLook() const { return std::numeric_limits<std::int64_t>::max(); }
+    virtual void look(std::int64_t /*now*/) {}
+    /// What to draw over what was read; takeDamage tells of its changes too.
+    virtual Overlay overlay() const { return {}; }
 
     /// Something has changed since takeDamage.
     virtual bool damaged() const = 0;

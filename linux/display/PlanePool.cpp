@@ -17,7 +17,9 @@ Picture::Picture(std::shared_ptr<Plane> plane, const DamageRegion& damage, std::
 }
 
 // Whatever the holder read, it read before the pool writes again.
-Picture::~Picture() { plane_->pictures_.fetch_sub(1, std::memory_order_release); }
+Picture::~Picture() {
+    plane_->pictures_.fetch_sub(1, std::memory_order_release);
+}
 
 PlanePool::PlanePool(std::int32_t width, std::int32_t height)
     : width_(width), height_(height), stride_(strideOf(width)) {}
@@ -31,6 +33,11 @@ std::optional<std::size_t> PlanePool::make(X11Connection& connection) {
         return i;
     }
     return std::nullopt;
+}
+
+void PlanePool::detach(X11Connection& connection) {
+    for (const auto& plane : planes_)
+        if (plane) plane->memory().detach(connection);
 }
 
 }  // namespace lumacast::x11

@@ -20,10 +20,10 @@ namespace lumacast::x11 {
 /// How many planes the holders may have at a time. The pool is larger than all quotas together, so a slow consumer
 /// costs frames and never stops the source.
 struct PlaneQuota {
-    std::size_t encoder = 4;                                ///< waiting in front of the encoder, and in it
-    std::size_t extension = limitOf(Limit::PlanesLeased);   ///< lent to a broadcast extension
-    std::size_t client = limitOf(Limit::PlanesLeased);      ///< lent to the recorded application
-    std::size_t source = 1;                                 ///< the current picture, for repeats
+    std::size_t encoder = 4;                               ///< waiting in front of the encoder, and in it
+    std::size_t extension = limitOf(Limit::PlanesLeased);  ///< lent to a broadcast extension
+    std::size_t client = limitOf(Limit::PlanesLeased);     ///< lent to the recorded application
+    std::size_t source = 1;                                ///< the current picture, for repeats
 };
 inline constexpr PlaneQuota kPlaneQuota;
 inline constexpr std::size_t kPlanes = 14;
@@ -96,6 +96,8 @@ public:
         return best ? best : make(connection);
     }
     const std::shared_ptr<Plane>& plane(std::size_t index) const { return planes_[index]; }
+    /// The server forgets the planes; pictures keep them. Only on the connection they were made on.
+    void detach(X11Connection& connection);
 
 private:
     std::optional<std::size_t> make(X11Connection& connection);

@@ -25,9 +25,12 @@ public:
                                                                std::uint32_t transformFlags) = 0;
     /// Capture failed with this status and has ended.
     virtual void screenCaptureControllerDidFailWithStatus(DisplayCaptureSource& source, std::int32_t status) = 0;
-    /// Something of higher priority has taken the display.
+    /// Something of higher priority has taken the display, as when the screen is locked or dark while all of it is
+    /// mirrored. Capture has ended; told once for each start. A source that is started meanwhile tells it, too, and
+    /// delivers no new picture.
     virtual void screenCaptureControllerWasPreempted(DisplayCaptureSource& source) = 0;
-    /// The media services were reset; nothing captured before is of use.
+    /// The media services were reset, as when the display goes while all of it is mirrored; nothing captured before is
+    /// of use. Capture has ended.
     virtual void screenCaptureControllerMediaServicesWereReset(DisplayCaptureSource& source) = 0;
 };
 
@@ -77,7 +80,10 @@ class DisplayCapture {
 public:
     virtual ~DisplayCapture() = default;
     /// A source whose frames have this size (fractions are cut off, odd sizes are kept) and come at least
-    /// `minimumInterval` apart. Never null: a source that can't capture reports a failure after its start.
+    /// `minimumInterval` apart. Frames of the whole display are always portrait, the native orientation: the shorter
+    /// side is their width. What is wider than high then lies in them turned by a quarter counterclockwise, with the
+    /// flag that turns it back; the first picture of a recording (of a capture clock) decides that for all of it.
+    /// Never null: a source that can't capture reports a failure after its start.
     virtual std::shared_ptr<DisplayCaptureSource> makeSource(Size captureSize, MediaTime minimumInterval) = 0;
 };
 

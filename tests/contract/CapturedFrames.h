@@ -29,6 +29,7 @@ struct CapturedFrame {
     std::int64_t width = 0, height = 0;
     std::uint32_t colour = 0;   ///< of the middle, 0xRRGGBB
     bool oneColour = false;     ///< everywhere the middle's
+    std::uint32_t transformFlags = 0;
     std::chrono::steady_clock::time_point at;
     std::shared_ptr<SharedPlane> plane;  ///< only while kept
 };
@@ -52,12 +53,12 @@ inline bool sameColour(std::uint32_t a, std::uint32_t b) {
 class CapturedFrames final : public DisplayCaptureDelegate {
 public:
     void screenCaptureControllerDidReceiveSampleBuffer(DisplayCaptureSource& source, const SampleRef& sample,
-                                                       std::uint32_t) override {
+                                                       std::uint32_t transformFlags) override {
         const auto& plane = sample->image()->plane();
         CapturedFrame frame{sample->presentationTime(), sample->duration(), plane->pictureNumber(),
                             {plane->damage().begin(), plane->damage().end()}, plane->width(), plane->height(),
                             colourAt(*plane, plane->width() / 2, plane->height() / 2), true,
-                            std::chrono::steady_clock::now(), nullptr};
+                            transformFlags, std::chrono::steady_clock::now(), nullptr};
         for (int y = 0; y < plane->height() && frame.oneColour; y += checkEvery)
             for (int x = 0; x < plane->width(); x += checkEvery)
                 frame.oneColour &= sameColour(colourAt(*plane, x, y), frame.colour);
@@ -78,8 +79,8 @@ public:
         }
         changed_.notify_all();
     }
-    void screenCaptureControllerWasPreempted(DisplayCaptureSource&) override {}
-    void screenCaptureControllerMediaServicesWereReset(DisplayCaptureSource&) override {}
+    void screenCaptureControllerWasPreempted(DisplayCaptureSource&) override { count(preemptions_); }
+    void screenCaptureControllerMediaServicesWereReset(DisplayCaptureSource&) override { count(resets_); }
 
     using Frames = std::vector<CapturedFrame>;
     /// Waits until `reached` is true of the frames so far; answers whether it became so.
@@ -102,6 +103,20 @@ public:
                                  [&] { return !failures_.empty(); }))
             return std::nullopt;
         return failures_.back();
+    }
+    bool waitForPreemptions(std::size_t number) {
+        return waitFor([&](const Frames&) { return preemptions_ >= number; });
+    }
+    bool waitForReset() {
+        return waitFor([&](const Frames&) { return resets_ > 0; });
+    }
+    std::size_t preemptions() const {
+        const std::lock_guard lock(mutex_);
+        return preemptions_;
+    }
+    std::size_t resets() const {
+        const std::lock_guard lock(mutex_);
+        return resets_;
     }
     Frames frames() const {
         const std::lock_guard lock(mutex_);
@@ -137,11 +152,21 @@ public:
     std::atomic<bool> keepPlanes{false};
 
 private:
+    void count(std::size_t& events) {
+        {
+            const std::lock_guard lock(mutex_);
+            ++events;
+            failureThread_ = std::this_thread::get_id();
+        }
+        changed_.notify_all();
+    }
+
     mutable std::mutex mutex_;
     std::condition_variable changed_;
     Frames frames_;
     std::vector<std::thread::id> threads_;
     std::vector<std::int32_t> failures_;
+    std::size_t preemptions_ = 0, resets_ = 0;
     std::thread::id failureThread_;
 };
 

@@ -9,6 +9,7 @@
 #include "support/ThreadScheduler.h"
 #include "tests/contract/CapturedFrames.h"
 #include "tests/contract/PrivateDisplay.h"
+#include "tests/contract/TestScreen.h"
 #include "tests/contract/TestWindow.h"
 #include "tests/fakes/FakeDisplayCloneControl.h"
 #include "tests/fakes/ThreadLoop.h"
@@ -65,9 +66,9 @@ public:
         frames_->keepPlanes = true;
         return frames_->waitFor([](const test::CapturedFrames::Frames& got) {
             if (got.empty() || !got.back().plane) return false;
-            const SharedPlane& plane = *got.back().plane;
-            return test::colourAt(plane, 50, 50) == kRed && test::colourAt(plane, 250, 50) == kGreen &&
-                   test::colourAt(plane, 190, 50) == 0;
+            const test::Pixels screen = test::uprightPixels(*got.back().plane, got.back().transformFlags);
+            return screen.width == 400 && screen.at(50, 50) == kRed && screen.at(250, 50) == kGreen &&
+                   screen.at(190, 50) == 0;
         });
     }
     // Whatever is drawn, nothing is delivered until something is to be shown again.

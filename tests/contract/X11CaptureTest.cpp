@@ -328,24 +328,6 @@ TEST_F(X11Capture, FollowsTheSelectionWhileItRuns) {
     ASSERT_TRUE(frames->waitForColour(kGreen));
 }
 
-TEST_F(X11Capture, MirrorsTheScreenAsItIsShown) {
-    TestWindow back(display.name(), {.place = {0, 0, 2200, 1300}, .colour = kRed});
-    capture.setMirroringMode(DisplayCloneControl::kMirrorDisplay);
-    frames->keepPlanes = true;
-    frames->checkEvery = 50;
-    const auto made = source(2200, 1300);
-    made->openGate();
-    made->start();
-    ASSERT_TRUE(frames->waitForColour(kRed));
-    TestWindow front(display.name(), {.place = {100, 100, 300, 200}, .colour = kGreen});
-    const auto shown = [](const Frames& got) { return colourAt(*got.back().plane, 399, 299) == kGreen; };
-    ASSERT_TRUE(frames->waitFor(shown));
-    const auto plane = frames->frames().back().plane;
-    EXPECT_EQ(colourAt(*plane, 100, 100), kGreen);
-    EXPECT_EQ(colourAt(*plane, 99, 99), kRed);
-    EXPECT_EQ(colourAt(*plane, 400, 300), kRed);
-}
-
 TEST_F(X11Capture, SealsItsPlanesSoThatNobodyElseCanWriteOrResizeThem) {
     TestWindow window(display.name(), {.colour = kRed});
     frames->keepPlanes = true;
