@@ -28,7 +28,9 @@ void ScreenMirror::look(std::int64_t now) {
     if (now >= blank_.nextLook()) blank_.look(now);
     if (now < nextPointerLook_) return;
     pointer_.look();
-    nextPointerLook_ = now + interval_;
+    if (pointer_.changed()) pointerMoved_ = now;
+    const bool rests = now - pointerMoved_ >= kRest;
+    nextPointerLook_ = now + (rests ? std::max(interval_, kRestInterval) : interval_);
 }
 
 // The pointer that goes with this picture is the one of now.

@@ -17,6 +17,9 @@ namespace lumacast::x11 {
 /// picture. Belongs to the frame lane.
 class ScreenMirror final : public PictureSource {
 public:
+    /// A pointer that has rested this long is looked after less often: so late, at most, its next move is seen.
+    static constexpr std::int64_t kRest = 1'000'000'000, kRestInterval = 50'000'000;
+
     /// Null when the screen's pixels aren't 32 bits wide. The pointer is looked after `interval` nanoseconds apart. The
     /// connection must outlive the mirror.
     static std::unique_ptr<ScreenMirror> open(X11Connection& connection, std::int64_t interval);
@@ -55,6 +58,7 @@ private:
     BlankWatch blank_;
     const std::int64_t interval_;
     std::int64_t nextPointerLook_ = 0;
+    std::int64_t pointerMoved_ = 0;
 };
 
 }  // namespace lumacast::x11

@@ -1,13 +1,12 @@
-// The whole screen as frames: portrait, upright when turned as their flags say, with the pointer.
+// The whole screen as frames: portrait, and upright when turned as their flags say.
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <random>
-#include <string>
 #include <utility>
 
-#include "tests/contract/TestScreen.h"
-#include "tests/contract/X11CaptureFixture.h"
+#include "tests/contract/MirrorWorld.h"
 
 namespace lumacast::test {
 namespace {
@@ -17,61 +16,6 @@ using Frames = CapturedFrames::Frames;
 using PointerLook = TestScreen::PointerLook;
 
 constexpr std::uint32_t kRed = 0xC01020, kGreen = 0x10B030, kBlue = 0x2030D0;
-constexpr std::uint32_t kRotateClockwise = 4;
-
-/// A small screen of any shape, with a pointer in the top left corner that can't be seen.
-class MirrorWorld {
-public:
-    explicit MirrorWorld(int width, int height)
-        : display(std::to_string(width) + "x" + std::to_string(height) + "x24"), screen(display.name()) {
-        screen.setPointer(nothing);
-        screen.movePointer(0, 0);
-        clock.startCaptureClock();
-        capture.setMirroringMode(DisplayCloneControl::kMirrorDisplay);
-        frames->keepPlanes = true;
-        frames->checkEvery = 50;
-    }
-    std::shared_ptr<DisplayCaptureSource> start(int width, int height, int perSecond = 60) {
-        return start(frames, width, height, perSecond);
-    }
-    std::shared_ptr<DisplayCaptureSource> start(const std::shared_ptr<CapturedFrames>& into, int width, int height,
-                                                int perSecond = 60) {
-        auto made = capture.makeSource({static_cast<double>(width), static_cast<double>(height)},
-                                       MediaTime::make(1, perSecond));
-        made->setDelegate(into);
-        made->openGate();
-        made->start();
-        return made;
-    }
-    /// Until the newest frame, seen upright, is this.
-    bool shows(const Pixels& pixels, std::chrono::milliseconds limit = kGenerous) {
-        return frames->waitFor([&](const Frames& got) { return !got.empty() && upright(got.back()) == pixels; }, limit);
-    }
-    static Pixels upright(const CapturedFrame& frame) { return uprightPixels(*frame.plane, frame.transformFlags); }
-
-    const PointerLook nothing = TestScreen::square(8, 0);
-    const PrivateDisplay display;
-    TestScreen screen;
-    LinuxClock clock;
-    const std::shared_ptr<ThreadLoop> loop = std::make_shared<ThreadLoop>();
-    ThreadScheduler scheduler{loop};
-    RunningThreadLoop running{*loop};
-    X11DisplayCapture capture{display.name(), clock, scheduler};
-    const std::shared_ptr<CapturedFrames> frames = std::make_shared<CapturedFrames>();
-};
-
-class LandscapeMirror : public ::testing::Test, protected MirrorWorld {
-protected:
-    LandscapeMirror() : MirrorWorld(400, 300) {}
-    /// Four corners of different colours, one of them small.
-    TestWindow back{display.name(), {.place = {0, 0, 400, 300}, .colour = kRed, .repaints = false}};
-};
-
-class PortraitMirror : public ::testing::Test, protected MirrorWorld {
-protected:
-    PortraitMirror() : MirrorWorld(300, 400) {}
-    TestWindow back{display.name(), {.place = {0, 0, 300, 400}, .colour = kRed, .repaints = false}};
-};
 
 TEST_F(LandscapeMirror, IsTurnedIntoAPortraitFrameWhateverTheCaptureSize) {
     TestWindow corner(display.name(), {.place = {0, 0, 40, 20}, .colour = kGreen});
@@ -177,70 +121,6 @@ INSTANTIATE_TEST_SUITE_P(Shapes, X11MirrorOfManyChanges,
                                            Shape{320, 480, 480, 320}, Shape{300, 400, 120, 200},
                                            Shape{300, 300, 200, 340}));
 
-TEST_F(LandscapeMirror, DrawsThePointerWithWhatShinesThrough) {
-    const auto made = start(400, 300);
-    ASSERT_TRUE(shows(screen.withoutPointer()));
-    PointerLook look{4, 3, 1, 2, {}};
-    look.pixels = {0xFF0000FF, 0x80402000, 0x00000000, 0xFFFFFFFF, 0x40404040, 0x01000000,
-                   0x7F7F0000, 0xFF123456, 0x00000000, 0xFE00FE00, 0x80808080, 0xFF000000};
-    screen.movePointer(200, 100);
-    screen.setPointer(look);
-    EXPECT_TRUE(shows(screen.withPointer(look, 200, 100)));
-    EXPECT_EQ(upright(frames->frames().back()).at(199, 98), 0x0000FFu);
-    EXPECT_EQ(upright(frames->frames().back()).at(201, 98), kRed);
-}
-
-TEST_F(LandscapeMirror, FollowsThePointerThoughNothingElseChanges) {
-    const PointerLook look = TestScreen::square(12, 0xFF00FF00);
-    screen.setPointer(look);
-    const auto made = start(400, 300);
-    ASSERT_TRUE(shows(screen.withPointer(look, 0, 0)));
-    for (const auto& [x, y] : {std::pair{50, 60}, {399, 299}, {0, 299}, {55, 65}, {60, 65}}) {
-        const std::size_t before = frames->count();
-        screen.movePointer(x, y);
-        ASSERT_TRUE(shows(screen.withPointer(look, x, y))) << x << "," << y;
-        EXPECT_EQ(frames->frames()[before].transformFlags, kRotateClockwise);
-    }
-    // Where it was, and where it is.
-    const std::size_t before = frames->count();
-    screen.movePointer(300, 100);
-    ASSERT_TRUE(frames->waitForCount(before + 1));
-    const auto damage = frames->frames()[before].damage;
-    std::int64_t pixels = 0;
-    for (const PixelRect& rect : damage) pixels += std::int64_t{rect.width} * rect.height;
-    EXPECT_GE(pixels, 2 * 12 * 12);
-    EXPECT_LT(pixels, 400 * 300) << "and no more than around both";
-}
-
-TEST_F(LandscapeMirror, FollowsThePointersShapeAndItsEnd) {
-    PointerLook look = TestScreen::square(12, 0xFF00FF00);
-    const auto made = start(400, 300);
-    screen.movePointer(100, 100);
-    screen.setPointer(look);
-    ASSERT_TRUE(shows(screen.withPointer(look, 100, 100)));
-    look = TestScreen::square(20, 0xFF0000FF);
-    look.hotX = 19;
-    screen.setPointer(look);
-    ASSERT_TRUE(shows(screen.withPointer(look, 100, 100)));
-    screen.setPointer(nothing);
-    ASSERT_TRUE(shows(screen.withoutPointer()));
-    const std::size_t before = frames->count();
-    for (int i = 0; i < 20; ++i) screen.movePointer(100 + i, 100);
-    ASSERT_TRUE(frames->waitForCount(before + 1));
-    EXPECT_TRUE(frames->frames()[before].damage.empty()) << "moves of what can't be seen are no news";
-}
-
-TEST_F(LandscapeMirror, GivesNothingButRepeatsWhileThePointerRests) {
-    screen.setPointer(TestScreen::square(12, 0xFF00FF00));
-    const auto made = start(400, 300);
-    ASSERT_TRUE(frames->waitForCount(4));
-    const Frames got = frames->frames();
-    for (std::size_t i = 1; i < got.size(); ++i) {
-        EXPECT_TRUE(got[i].damage.empty()) << i;
-        EXPECT_GT(got[i].stamp.seconds() - got[i - 1].stamp.seconds(), 0.5) << i;
-    }
-}
-
 TEST_F(LandscapeMirror, LeavesThePointerAndTheTurnOutOfWindows) {
     const PointerLook look = TestScreen::square(30, 0xFF00FF00);
     screen.setPointer(look);
@@ -322,47 +202,6 @@ TEST_F(LandscapeMirror, KeepsTheRecordingsOrientationWhenTheScreenChangesItsSize
     }));
     EXPECT_EQ(frames->frames().back().transformFlags, 0u);
     EXPECT_TRUE(frames->failures().empty());
-}
-
-TEST_F(LandscapeMirror, IsPreemptedOnceWhenTheScreenIsBlankedAndGoesOnAfterIt) {
-    const auto made = start(400, 300);
-    ASSERT_TRUE(shows(screen.withoutPointer()));
-    std::thread::id mainThread;
-    loop->sync([&] { mainThread = std::this_thread::get_id(); });
-    screen.saveScreen(true);
-    ASSERT_TRUE(frames->waitForPreemptions(1));
-    EXPECT_EQ(frames->failureThread(), mainThread);
-    const std::size_t count = frames->count();
-    screen.movePointer(50, 50);
-    back.paint(kGreen);
-    screen.saveScreen(true);
-    // Another source is told when it begins, without a picture.
-    const auto later = std::make_shared<CapturedFrames>();
-    const auto other = start(later, 400, 300);
-    ASSERT_TRUE(later->waitForPreemptions(1));
-    EXPECT_EQ(later->count(), 0u);
-    EXPECT_EQ(frames->preemptions(), 1u);
-    EXPECT_EQ(frames->count(), count) << "what the screen shows then is nobody's business";
-    screen.saveScreen(false);
-    for (const auto& source : {made, other}) source->start();
-    ASSERT_TRUE(shows(screen.withoutPointer()));
-    ASSERT_TRUE(later->waitForCount(1));
-    EXPECT_EQ(later->preemptions(), 1u);
-    EXPECT_TRUE(frames->failures().empty());
-}
-
-TEST_F(LandscapeMirror, TellsThatTheMediaServicesWereResetWhenTheServerDies) {
-    const auto made = start(400, 300);
-    ASSERT_TRUE(frames->waitForCount(1));
-    std::thread::id mainThread;
-    loop->sync([&] { mainThread = std::this_thread::get_id(); });
-    display.crash();
-    ASSERT_TRUE(frames->waitForReset());
-    EXPECT_EQ(frames->failureThread(), mainThread);
-    made->start();
-    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kNoDisplay);
-    EXPECT_EQ(frames->resets(), 1u);
-    EXPECT_EQ(frames->preemptions(), 0u);
 }
 
 }  // namespace

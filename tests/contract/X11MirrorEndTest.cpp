@@ -1,0 +1,54 @@
+// What ends the mirroring of a screen.
+
+#include <gtest/gtest.h>
+
+#include "tests/contract/MirrorWorld.h"
+
+namespace lumacast::test {
+namespace {
+
+constexpr std::uint32_t kGreen = 0x10B030;
+
+TEST_F(LandscapeMirror, IsPreemptedOnceWhenTheScreenIsBlankedAndGoesOnAfterIt) {
+    const auto made = start(400, 300);
+    ASSERT_TRUE(shows(screen.withoutPointer()));
+    std::thread::id mainThread;
+    loop->sync([&] { mainThread = std::this_thread::get_id(); });
+    screen.saveScreen(true);
+    ASSERT_TRUE(frames->waitForPreemptions(1));
+    EXPECT_EQ(frames->failureThread(), mainThread);
+    const std::size_t count = frames->count();
+    screen.movePointer(50, 50);
+    back.paint(kGreen);
+    screen.saveScreen(true);
+    // Another source is told when it begins, without a picture.
+    const auto later = std::make_shared<CapturedFrames>();
+    const auto other = start(later, 400, 300);
+    ASSERT_TRUE(later->waitForPreemptions(1));
+    EXPECT_EQ(later->count(), 0u);
+    EXPECT_EQ(frames->preemptions(), 1u);
+    EXPECT_EQ(frames->count(), count) << "what the screen shows then is nobody's business";
+    screen.saveScreen(false);
+    for (const auto& source : {made, other}) source->start();
+    ASSERT_TRUE(shows(screen.withoutPointer()));
+    ASSERT_TRUE(later->waitForCount(1));
+    EXPECT_EQ(later->preemptions(), 1u);
+    EXPECT_TRUE(frames->failures().empty());
+}
+
+TEST_F(LandscapeMirror, TellsThatTheMediaServicesWereResetWhenTheServerDies) {
+    const auto made = start(400, 300);
+    ASSERT_TRUE(frames->waitForCount(1));
+    std::thread::id mainThread;
+    loop->sync([&] { mainThread = std::this_thread::get_id(); });
+    display.crash();
+    ASSERT_TRUE(frames->waitForReset());
+    EXPECT_EQ(frames->failureThread(), mainThread);
+    made->start();
+    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kNoDisplay);
+    EXPECT_EQ(frames->resets(), 1u);
+    EXPECT_EQ(frames->preemptions(), 0u);
+}
+
+}  // namespace
+}  // namespace lumacast::test
