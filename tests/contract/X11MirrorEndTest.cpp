@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include "tests/contract/MirrorWorld.h"
+#include "tests/contract/PoweredDisplay.h"
 
 namespace lumacast::test {
 namespace {
@@ -48,6 +49,32 @@ TEST_F(LandscapeMirror, TellsThatTheMediaServicesWereResetWhenTheServerDies) {
     EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kNoDisplay);
     EXPECT_EQ(frames->resets(), 1u);
     EXPECT_EQ(frames->preemptions(), 0u);
+}
+
+TEST_F(LandscapeMirror, IsPreemptedWhenTheMonitorsAreTurnedOff) {
+    PoweredDisplay powered(display.name());
+    X11DisplayCapture behind(powered.name(), clock, scheduler);
+    behind.setMirroringMode(DisplayCloneControl::kMirrorDisplay);
+    const auto made = behind.makeSource({400, 300}, MediaTime::make(1, 60));
+    made->setDelegate(frames);
+    made->openGate();
+    std::size_t preemptions = 0;
+    for (const auto power : {PoweredDisplay::Standby, PoweredDisplay::Suspend, PoweredDisplay::Off}) {
+        powered.set(PoweredDisplay::On);
+        frames->clear();
+        made->start();
+        ASSERT_TRUE(frames->waitForCount(3)) << "for all the questions: " << powered.questions();
+        EXPECT_EQ(frames->preemptions(), preemptions);
+        powered.set(power);
+        ASSERT_TRUE(frames->waitForPreemptions(++preemptions));
+        // Off at the start.
+        const std::size_t count = frames->count();
+        made->start();
+        ASSERT_TRUE(frames->waitForPreemptions(++preemptions));
+        EXPECT_LE(frames->count(), count + 1) << "at most the last picture once more";
+    }
+    EXPECT_GT(powered.questions(), 6);
+    EXPECT_TRUE(frames->failures().empty());
 }
 
 }  // namespace
