@@ -27,16 +27,20 @@ std::int64_t ScreenMirror::nextLook() const {
 void ScreenMirror::look(std::int64_t now) {
     if (now >= blank_.nextLook()) blank_.look(now);
     if (now < nextPointerLook_) return;
-    pointer_.look();
-    if (pointer_.changed()) pointerMoved_ = now;
+    if (!std::exchange(pictureCameAlong_, false)) pointer_.look();
+    if (std::exchange(moved_, false) || pointer_.changed()) pointerMoved_ = now;
     const bool rests = now - pointerMoved_ >= kRest;
     nextPointerLook_ = now + (rests ? std::max(interval_, kRestInterval) : interval_);
 }
 
 // The pointer that goes with this picture is the one of now.
 void ScreenMirror::takeDamage(DamageRegion& into) {
-    if (screen_->damaged()) screen_->takeDamage(into);
+    if (screen_->damaged()) {
+        screen_->takeDamage(into);
+        pictureCameAlong_ = true;
+    }
     pointer_.look();
+    moved_ |= pointer_.changed();
     pointer_.take(into);
 }
 

@@ -39,6 +39,7 @@ public:
     std::int32_t height() const override { return screen_->height(); }
     std::uint64_t layout() const override { return screen_->layout(); }
     std::int64_t nextLook() const override;
+    /// Where the screen itself gives steady pictures they bring the pointer along: it isn't looked after besides.
     void look(std::int64_t now) override;
     Overlay overlay() const override { return pointer_.drawn(); }
     bool damaged() const override { return screen_->damaged() || pointer_.changed(); }
@@ -59,6 +60,9 @@ private:
     const std::int64_t interval_;
     std::int64_t nextPointerLook_ = 0;
     std::int64_t pointerMoved_ = 0;
+    // Since the last look().
+    bool pictureCameAlong_ = false;
+    bool moved_ = false;
 };
 
 }  // namespace lumacast::x11

@@ -38,6 +38,10 @@ TEST_F(LandscapeMirror, FollowsThePointerThoughNothingElseChanges) {
         ASSERT_TRUE(shows(screen.withPointer(look, x, y))) << x << "," << y;
         EXPECT_EQ(frames->frames()[before].transformFlags, kRotateClockwise);
     }
+    // What of it lies beyond the edge is nowhere else.
+    screen.movePointer(398, 100);
+    back.paintPart({0, 90, 30, 30}, 0x2030D0);
+    ASSERT_TRUE(shows(screen.withPointer(look, 398, 100)));
     // Where it was, and where it is.
     frames->clear();
     screen.movePointer(300, 100);
