@@ -73,6 +73,18 @@ TEST_F(LandscapeMirror, IsPreemptedWhenTheMonitorsAreTurnedOff) {
         ASSERT_TRUE(frames->waitForPreemptions(++preemptions));
         EXPECT_LE(frames->count(), count + 1) << "at most the last picture once more";
     }
+    // Off while it was paused, however shortly.
+    powered.set(PoweredDisplay::On);
+    frames->clear();
+    made->start();
+    ASSERT_TRUE(frames->waitForCount(2));
+    made->closeGate(GateWait::UntilDelivered);
+    made->openGate();
+    powered.set(PoweredDisplay::Off);
+    const std::size_t count = frames->count();
+    made->start();
+    ASSERT_TRUE(frames->waitForPreemptions(++preemptions));
+    EXPECT_LE(frames->count(), count + 1) << "at most the last picture once more";
     EXPECT_GT(powered.questions(), 6);
     EXPECT_TRUE(frames->failures().empty());
 }

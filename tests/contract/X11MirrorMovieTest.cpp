@@ -30,7 +30,7 @@ AffineTransform transformOf(std::uint32_t flags) {
 class X11MirrorMovie : public ::testing::TestWithParam<std::pair<int, int>> {};
 
 TEST_P(X11MirrorMovie, IsUprightForAPlayer) {
-    const auto [width, height] = GetParam();
+    const int width = GetParam().first, height = GetParam().second;
     MirrorWorld world(width, height);
     const TestWindow back(world.display.name(), {.place = {0, 0, width, height}, .colour = 0xC01020});
     const TestWindow topLeft(world.display.name(), {.place = {0, 0, 80, 60}, .colour = 0x10B030});
