@@ -200,6 +200,19 @@ TEST_F(LinuxSystemSoundsTest, AWholeSoundIsPlayedAndThenNothingIsLeft) {
     EXPECT_NEAR(monitor_->secondsOf(1000), 1.5, 0.15);
 }
 
+TEST_F(LinuxSystemSoundsTest, AShortSoundEndsBeforeALongOne) {
+    writeTheme(data_);
+    data_.write("sounds/freedesktop/stereo/camera-shutter.wav", toneFile(1000, 4));
+    listen();
+    sounds_->play(kBegin);
+    sounds_->play(kEnd);
+    EXPECT_EQ(sounds_->soundsInFlight(), 2u);
+    ASSERT_TRUE(eventually([this] { return sounds_->soundsInFlight() < 2; }));
+    EXPECT_EQ(sounds_->soundsInFlight(), 1u);
+    const std::size_t since = monitor_->frames() + MonitorSound::kRate / 5;
+    EXPECT_TRUE(eventually([&] { return monitor_->loudest(1000, since) > -20; }));
+}
+
 TEST_F(LinuxSystemSoundsTest, NoMoreThanFourAreHeardAtOnce) {
     writeTheme(data_);
     data_.write("sounds/freedesktop/stereo/camera-shutter.wav", toneFile(1000, 2));
