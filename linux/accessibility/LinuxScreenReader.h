@@ -14,7 +14,7 @@ class LinuxScreenReader final : public ScreenReader {
 public:
     struct Options {
         std::string address;  ///< as in $DBUS_SESSION_BUS_ADDRESS; empty: no bus, and no thread
-        std::chrono::milliseconds firstRetry{500}, slowestRetry{10'000};
+        std::chrono::milliseconds firstRetry{500}, slowestRetry{60'000};
     };
     /// Where the user's session bus is: $DBUS_SESSION_BUS_ADDRESS (`address`), else the socket `bus` in
     /// $XDG_RUNTIME_DIR (`runtimeDirectory`, of the user), if it is set.

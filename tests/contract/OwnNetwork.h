@@ -7,12 +7,18 @@
 #include <linux/seccomp.h>
 #include <sched.h>
 #include <stddef.h>
+#include <sys/mman.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include <cerrno>
+#include <cstdio>
+#include <fstream>
 #include <functional>
+#include <new>
 #include <string>
 #include <thread>
 #include <vector>
@@ -23,8 +29,29 @@
 
 namespace lumacast::test {
 
+/// Runs `action` in a process with an empty network of an ordinary user's; what the test is to know of it afterwards has
+/// to be in shared memory. Whether it could be made.
+inline bool inProcessWithOwnNetwork(const std::function<void()>& action) {
+    const std::string user = "0 " + std::to_string(::geteuid()) + " 1\n", group = "0 " + std::to_string(::getegid()) + " 1\n";
+    const pid_t child = ::fork();
+    if (child == 0) {
+        if (::unshare(CLONE_NEWUSER | CLONE_NEWNET) != 0) ::_exit(2);
+        std::ofstream("/proc/self/setgroups") << "deny";
+        std::ofstream("/proc/self/uid_map") << user;
+        std::ofstream("/proc/self/gid_map") << group;
+        action();
+        std::fflush(nullptr);
+        ::_exit(::testing::Test::HasFailure() ? 1 : 0);
+    }
+    int status = 0;
+    if (child < 0 || ::waitpid(child, &status, 0) != child) return false;
+    if (WIFEXITED(status) && WEXITSTATUS(status) == 2) return false;
+    EXPECT_EQ(status, 0) << "in the process with its own network";
+    return true;
+}
+
 /// Runs `action` on a thread with an empty network, which only it and the threads and programs it starts have, and which
-/// ends with it. False where this process may not make one (it takes CAP_SYS_ADMIN); then nothing ran.
+/// ends with it; for an ordinary user, in a process. False where neither can be made; then nothing ran.
 inline bool withOwnNetwork(const std::function<void()>& action) {
     bool made = false;
     std::thread([&] {
@@ -32,8 +59,23 @@ inline bool withOwnNetwork(const std::function<void()>& action) {
         made = true;
         action();
     }).join();
-    return made;
+    return made || inProcessWithOwnNetwork(action);
 }
+
+/// A value that a process made by withOwnNetwork can leave to the test.
+template <class T>
+class SharedWithProcesses final {
+public:
+    SharedWithProcesses()
+        : value_(new (::mmap(nullptr, sizeof(T), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0)) T()) {}
+    ~SharedWithProcesses() { ::munmap(value_, sizeof(T)); }
+    SharedWithProcesses(const SharedWithProcesses&) = delete;
+    SharedWithProcesses& operator=(const SharedWithProcesses&) = delete;
+    T& operator*() const { return *value_; }
+
+private:
+    T* const value_;
+};
 
 /// `ip` with these arguments; whether it did it.
 inline bool ip(const std::string& arguments) {

@@ -8,6 +8,8 @@
 #include <memory>
 #include <string>
 #include <thread>
+#include <utility>
+#include <vector>
 
 #include "linux/accessibility/ScreenReaderBus.h"
 #include "tests/contract/HeardSound.h"
@@ -73,6 +75,9 @@ public:
         // Told by its own thread.
         eventually([&] { return told_ == running || ending_; });
     }
+    /// Answers are kept back, each with what was true when it was asked for; false sends them.
+    void holdAnswers(bool holding) { holding_ = holding; }
+    int heldAnswers() const { return heldAnswers_; }
     /// Signals that say something else than the service does when it is asked.
     void lie(int times) { lies_ = times; }
 
@@ -84,7 +89,10 @@ private:
         if (sd_bus_message_read(message, "ss", &interface, &property) < 0) return 0;
         ++service.questions_;
         const bool value = std::string(property) == "ScreenReaderEnabled" ? service.running_.load() : true;
-        return sd_bus_reply_method_return(message, "v", "b", value ? 1 : 0);
+        if (!service.holding_) return sd_bus_reply_method_return(message, "v", "b", value ? 1 : 0);
+        service.held_.emplace_back(BusMessage(sd_bus_message_ref(message)), value);
+        ++service.heldAnswers_;
+        return 1;
     }
 
     void announce(bool value) {
@@ -104,6 +112,9 @@ private:
                 told_ = running_.load();
             }
             for (; lies_ > 0; --lies_) announce(!running_);
+            if (!holding_)
+                for (const auto& [question, value] : std::exchange(held_, {}))
+                    sd_bus_reply_method_return(question.get(), "v", "b", value ? 1 : 0);
             int result = 1;
             while (result > 0) result = sd_bus_process(bus_.get(), nullptr);
             if (result < 0) return;
@@ -113,8 +124,9 @@ private:
 
     BusHandle bus_;
     bool there_ = false;
-    std::atomic<bool> running_{false}, told_{false}, ending_{false};
-    std::atomic<int> questions_{0}, lies_{0};
+    std::vector<std::pair<BusMessage, bool>> held_;
+    std::atomic<bool> running_{false}, told_{false}, ending_{false}, holding_{false};
+    std::atomic<int> questions_{0}, lies_{0}, heldAnswers_{0};
     std::atomic<Announce> how_{Announce::Value};
     std::thread thread_;
 };
