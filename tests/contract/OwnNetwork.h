@@ -33,6 +33,7 @@ namespace lumacast::test {
 /// to be in shared memory. Whether it could be made.
 inline bool inProcessWithOwnNetwork(const std::function<void()>& action) {
     const std::string user = "0 " + std::to_string(::geteuid()) + " 1\n", group = "0 " + std::to_string(::getegid()) + " 1\n";
+    std::fflush(nullptr);  // or the child writes it again
     const pid_t child = ::fork();
     if (child == 0) {
         if (::unshare(CLONE_NEWUSER | CLONE_NEWNET) != 0) ::_exit(2);
