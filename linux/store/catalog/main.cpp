@@ -93,12 +93,10 @@ std::vector<std::string> spellings(const std::string& identifier) {
 }
 
 Owned<AsComponent> find(AsPool* pool, const std::string& identifier) {
+    // Those that took the place of one with this id are among them.
     const auto byId = [&](const char* name) { return as_pool_get_components_by_id(pool, name); };
     const auto byEntry = [&](const char* name) {
         return as_pool_get_components_by_launchable(pool, AS_LAUNCHABLE_KIND_DESKTOP_ID, name);
-    };
-    const auto byFormerId = [&](const char* name) {
-        return as_pool_get_components_by_provided_item(pool, AS_PROVIDED_KIND_ID, name);
     };
     const auto search = [&](const auto& question) -> AsComponent* {
         for (const std::string& spelling : spellings(identifier)) {
@@ -110,7 +108,6 @@ Owned<AsComponent> find(AsPool* pool, const std::string& identifier) {
     };
     AsComponent* component = search(byId);
     if (!component) component = search(byEntry);
-    if (!component) component = search(byFormerId);
     return Owned<AsComponent>(component);
 }
 
