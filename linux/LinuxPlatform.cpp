@@ -10,7 +10,7 @@
 #include <string>
 
 #include "base/Limits.h"
-#include "linux/AbsentServices.h"
+#include "linux/accessibility/LinuxScreenReader.h"
 #include "linux/admin/LinuxAdminService.h"
 #include "linux/apps/Entitlements.h"
 #include "linux/apps/LinuxBundles.h"
@@ -24,8 +24,11 @@
 #include "linux/library/LinuxPhotoLibrary.h"
 #include "linux/media/LinuxContainerWriters.h"
 #include "linux/media/LinuxMovieExporters.h"
+#include "linux/network/LinuxNetworkReachability.h"
+#include "linux/sounds/LinuxSystemSounds.h"
 #include "linux/storage/LinuxFileSystem.h"
 #include "linux/storage/LinuxStoragePurgeService.h"
+#include "linux/store/LinuxStoreLookup.h"
 #include "linux/system/Allocator.h"
 #include "linux/system/DescriptorLimit.h"
 #include "linux/system/LinuxClock.h"
@@ -99,7 +102,10 @@ public:
                  }),
           storagePurge_(scheduler_, fileSystem_),
           userAlerts_(alertOptions(environment)),
-          storeLookup_(scheduler_),
+          systemSounds_(soundServer_, {environment.dataDirectories, environment.configDirectories}),
+          screenReader_({.address = LinuxScreenReader::sessionBus(environmentVariable("DBUS_SESSION_BUS_ADDRESS"),
+                                                                  environmentVariable("XDG_RUNTIME_DIR"))}),
+          storeLookup_(scheduler_, LinuxStoreLookup::optionsFrom(environment)),
           platform_{log_,       scheduler_, clock_,   ipc_,
                     bundles_,   renderServer_, appState_, capture_,
                     capture_,   audioInputQueues_, deviceCapture_, writers_,
@@ -179,10 +185,10 @@ private:
     LinuxAdminService admin_;
     LinuxStoragePurgeService storagePurge_;
     LinuxUserAlerts userAlerts_;
-    AbsentSystemSounds systemSounds_;
-    AbsentScreenReader screenReader_;
-    AbsentStoreLookup storeLookup_;
-    AbsentNetworkReachability networkReachability_;
+    LinuxSystemSounds systemSounds_;
+    LinuxScreenReader screenReader_;
+    LinuxStoreLookup storeLookup_;
+    LinuxNetworkReachability networkReachability_;
     Platform platform_;
     Termination termination_;  // last: it touches what is above
 };

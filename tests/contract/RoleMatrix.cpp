@@ -12,7 +12,8 @@ std::vector<std::string> platformRoles() {
     return {"Scheduler",  "Clock",       "Ipc",         "Bundles",    "RenderServer", "AppStateMonitor",
             "DisplayCapture", "DisplayCloneControl", "ContainerWriter", "MovieExporter", "FileSystem", "Preferences",
             "DeviceInfo", "Telemetry",   "KeepAlive",   "LogSink",    "AdminService", "StoragePurgeService", "PhotoLibrary",
-            "AudioInputQueue", "DeviceCapture", "UserAlert"};
+            "AudioInputQueue", "DeviceCapture", "UserAlert", "SystemSounds", "ScreenReader", "StoreLookup",
+            "NetworkReachability"};
 }
 
 RoleMatrix::RoleMatrix(std::vector<std::string> roles, const std::vector<ContractOutcome>& outcomes)
