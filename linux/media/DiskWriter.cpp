@@ -101,6 +101,7 @@ void DiskWriter::work(MovieFile& file) {
         busy_ = true;
         lock.unlock();
         if (const int error = perform(file, operation); error != 0) return fail(error);
+        answers_.fetch_add(1, std::memory_order_relaxed);
         lock.lock();
         waitingBytes_ -= std::min(waitingBytes_, operation.bytes.size());
     }

@@ -51,6 +51,8 @@ public:
     bool hasEnded() const { return ended_.load(std::memory_order_acquire); }
     /// Bytes in the file so far. Any thread.
     std::uint64_t bytesWritten() const { return written_.load(std::memory_order_relaxed); }
+    /// How often the disk has answered: goes on as long as it works. Any thread.
+    std::uint64_t answers() const { return answers_.load(std::memory_order_relaxed); }
 
 private:
     struct Operation {
@@ -67,6 +69,7 @@ private:
 
     const std::function<void(int)> failed_;
     std::atomic<std::uint64_t> written_ = 0;
+    std::atomic<std::uint64_t> answers_ = 0;
     std::atomic<bool> ended_ = false;
     std::uint64_t end_ = 0;  ///< where the next append goes; the encoder thread's
 

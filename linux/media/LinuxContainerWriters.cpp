@@ -10,6 +10,9 @@ namespace lumacast {
 
 namespace {
 
+/// How often a movie that is being closed is looked at.
+constexpr std::chrono::milliseconds kClosingLook{100};
+
 std::string withSingleSlashes(const std::string& path) {
     std::string result;
     std::unique_copy(path.begin(), path.end(), std::back_inserter(result),
@@ -57,15 +60,49 @@ std::optional<std::uint64_t> LinuxContainerWriters::bytesBeingWritten(const std:
     return std::nullopt;
 }
 
-void LinuxContainerWriters::closeOpenMovies() {
-    Recordings open;
-    {
-        const std::lock_guard lock(mutex_);
-        open = recordings_;
+LinuxContainerWriters::Recordings LinuxContainerWriters::openMovies() {
+    const std::lock_guard lock(mutex_);
+    return recordings_;
+}
+
+std::vector<media::ClosedMovie> LinuxContainerWriters::closeOpenMovies() {
+    using Clock = std::chrono::steady_clock;
+    const Recordings open = openMovies();
+    std::vector<media::ClosedMovie> closed;
+    for (const auto& each : open) {  // all at once, then wait for each
+        if (auto movie = each.recording->requestFinish()) {
+            movie->path = each.path;
+            closed.push_back(std::move(*movie));
+        }
     }
-    const auto deadline = std::chrono::steady_clock::now() + kClosingLimit;
-    for (const auto& each : open) each.recording->requestFinish();  // all at once, then wait for each
-    for (const auto& each : open) each.recording->waitUntilFinished(deadline);
+    const auto deadline = Clock::now() + kClosingLimit;
+    const auto isOver = [&](const Open& each) {
+        return each.recording->waitUntilFinished(std::min(Clock::now() + kClosingLook, deadline));
+    };
+    const auto progressOfAll = [&] {
+        std::uint64_t sum = 0;
+        for (const auto& each : open) sum += each.recording->progress();
+        return sum;
+    };
+    std::uint64_t progress = progressOfAll();
+    auto stalled = Clock::now() + kClosingStall;
+    while (!std::all_of(open.begin(), open.end(), isOver)) {
+        const auto now = Clock::now();
+        const std::uint64_t before = std::exchange(progress, progressOfAll());
+        if (progress != before) stalled = now + kClosingStall;
+        if (now >= std::min(stalled, deadline)) break;
+    }
+    return closed;
+}
+
+bool LinuxContainerWriters::secureOpenMovies(std::chrono::milliseconds limit) {
+    const auto deadline = std::chrono::steady_clock::now() + limit;
+    const Recordings open = openMovies();
+    std::vector<std::uint64_t> requests;
+    for (const auto& each : open) requests.push_back(each.recording->requestSecuring());
+    bool all = true;
+    for (std::size_t i = 0; i < open.size(); ++i) all &= open[i].recording->waitUntilSecured(requests[i], deadline);
+    return all;
 }
 
 /// Lets go of recordings whose threads only have to be joined, which takes no time.

@@ -20,8 +20,9 @@ class LinuxContainerWriters final : public ContainerWriters {
 public:
     /// How long making a writer waits for the disk; a file that can't be made after that fails the writer later.
     static constexpr std::chrono::milliseconds kCreationLimit{40};
-    /// How long closeOpenMovies waits for encoders and disks.
-    static constexpr std::chrono::seconds kClosingLimit{5};
+    /// How long closeOpenMovies waits for encoders and disks that do nothing, and for those that work.
+    static constexpr std::chrono::seconds kClosingStall{5};
+    static constexpr std::chrono::seconds kClosingLimit{60};
 
     /// `clock` must outlive it.
     explicit LinuxContainerWriters(const Clock& clock);
@@ -38,9 +39,14 @@ public:
     std::optional<std::uint64_t> bytesBeingWritten(const std::string& path);
 
     /// For the end of the process: finishes every movie that is being written, each up to its own clock's time, and
-    /// waits for that, at most kClosingLimit in all. Needs no lane of the daemon; to be called on a thread that may
-    /// wait. The writers take no samples any more.
-    void closeOpenMovies();
+    /// waits for that: as long as something is done, at most kClosingLimit in all, and kClosingStall for one that does
+    /// nothing. Needs no lane of the daemon; to be called on a thread that may wait. The writers take no samples any
+    /// more. Answers those that were being recorded, the ones whose end was asked for before left out.
+    std::vector<media::ClosedMovie> closeOpenMovies();
+
+    /// Brings everything that was appended until now onto the disk for good, waiting for that at most `limit`; the
+    /// recordings go on. Whether it is there. For a device that is about to sleep; needs no lane either.
+    bool secureOpenMovies(std::chrono::milliseconds limit);
 
 private:
     struct Open {
@@ -48,6 +54,7 @@ private:
         std::shared_ptr<media::MovieRecording> recording;
     };
     using Recordings = std::vector<Open>;
+    Recordings openMovies();
     void forgetEnded();
 
     const Clock& clock_;

@@ -117,16 +117,41 @@ std::optional<Error> MovieRecording::error() const {
     return error_;
 }
 
-void MovieRecording::requestFinish() {
+std::optional<ClosedMovie> MovieRecording::requestFinish() {
     const std::lock_guard lock(mutex_);
-    if (status_ != ContainerStatus::Writing) return;
+    if (status_ != ContainerStatus::Writing || finishing_) return std::nullopt;
     finishLocked();
     changed_.notify_all();
+    ClosedMovie closed;
+    constexpr double kNanosecondsPerSecond = 1e9;
+    if (const auto end = movieEnd().lastPicture) closed.seconds = static_cast<double>(*end) / kNanosecondsPerSecond;
+    for (const Track& track : tracks_)
+        if (const auto* video = std::get_if<VideoTrackSettings>(&track.plan.settings)) {
+            closed.width = video->width;
+            closed.height = video->height;
+        }
+    closed.pictures = picturesTaken();
+    closed.bytes = bytesWritten();
+    return closed;
 }
 
-void MovieRecording::waitUntilFinished(std::chrono::steady_clock::time_point deadline) {
+bool MovieRecording::waitUntilFinished(std::chrono::steady_clock::time_point deadline) {
     std::unique_lock lock(mutex_);
-    changed_.wait_until(lock, deadline, [this] { return status_ != ContainerStatus::Writing; });
+    return changed_.wait_until(lock, deadline, [this] { return status_ != ContainerStatus::Writing; });
+}
+
+std::uint64_t MovieRecording::requestSecuring() {
+    const std::lock_guard lock(mutex_);
+    secureAfter_ = itemsTaken_.load(std::memory_order_relaxed) + items_.size();
+    changed_.notify_all();
+    return ++securingsWanted_;
+}
+
+bool MovieRecording::waitUntilSecured(std::uint64_t request, std::chrono::steady_clock::time_point deadline) {
+    std::unique_lock lock(mutex_);
+    return changed_.wait_until(lock, deadline, [&] {
+        return securingsDone_ >= request || status_ != ContainerStatus::Writing;
+    });
 }
 
 // --- Called with the lock held ---------------------------------------------------------------------------------------
@@ -163,7 +188,14 @@ std::optional<MovieRecording::Item> MovieRecording::takeItem() {
     Item item = std::move(items_.front());
     items_.pop_front();
     tracks_[item.track].waiting -= 1;
+    itemsTaken_.fetch_add(1, std::memory_order_relaxed);
     return item;
+}
+
+/// Whether all that was appended before the newest request has been taken.
+bool MovieRecording::securesNow(bool hasItem) const {
+    return securingsDone_ != securingsWanted_ &&
+           (!hasItem || itemsTaken_.load(std::memory_order_relaxed) >= secureAfter_);
 }
 
 // --- The encoder thread ----------------------------------------------------------------------------------------------
@@ -195,12 +227,21 @@ void MovieRecording::runPipeline(std::unique_lock<std::mutex>& lock) {
         std::optional<Item> item = takeItem();
         if (!item && finishing_) return finishPipeline(lock, pipeline.get());
         const bool isLast = !item && abandoned_;
+        const bool secures = securesNow(item.has_value());
+        const std::uint64_t securing = securingsWanted_;
         lock.unlock();
         std::optional<Error> error;
         if (item) error = pipeline->add(item->track, std::move(item->sample), item->nanoseconds);
-        if (!error && (flushes || isLast)) error = pipeline->flush();
+        if (!error && (flushes || isLast || secures)) error = pipeline->flush();
+        if (!error && secures) {
+            if (const int diskError = disk_.drain(); diskError != 0) error = systemError(diskError);
+        }
         lock.lock();
         if (error) return failLocked(*error);
+        if (secures) {
+            securingsDone_ = securing;
+            changed_.notify_all();
+        }
         if (isLast) {
             status_ = ContainerStatus::Cancelled;
             changed_.notify_all();
@@ -212,7 +253,7 @@ void MovieRecording::runPipeline(std::unique_lock<std::mutex>& lock) {
 /// Waits for a sample, for the end, or for the time at which pending samples are due on the disk; whether they are.
 bool MovieRecording::waitForWork(std::unique_lock<std::mutex>& lock, std::optional<MoviePipeline::SteadyTime> until) {
     const auto woken = [this] {
-        return !items_.empty() || finishing_ || abandoned_ || status_ != ContainerStatus::Writing;
+        return !items_.empty() || finishing_ || abandoned_ || status_ != ContainerStatus::Writing || securesNow(false);
     };
     if (until) {
         changed_.wait_until(lock, *until, woken);

@@ -20,6 +20,15 @@
 
 namespace lumacast::media {
 
+/// What can be said of a movie that ends with the process.
+struct ClosedMovie {
+    std::string path;
+    double seconds = 0;  ///< as long as its recording
+    int width = 0, height = 0;
+    std::uint64_t pictures = 0;  ///< that were taken
+    std::uint64_t bytes = 0;     ///< in the file when it was told to end
+};
+
 /// One movie being written: its state, the bounded queues of its tracks, its encoder thread and its disk thread. Every
 /// operation may come from any lane and returns at once; none waits for the encoder or the disk, but where it says so.
 /// Once the movie is over, finished or failed, the file is closed and the threads end, whoever keeps the object.
@@ -67,10 +76,19 @@ public:
 
     /// Whether both threads have nothing left to do but end.
     bool hasEnded() const { return ended_.load(std::memory_order_acquire) && disk_.hasEnded(); }
-    /// As finish, for the end of the process: only where something is being written, and nobody is told.
-    void requestFinish();
-    /// Waits until nothing is being written any more, or until `deadline`.
-    void waitUntilFinished(std::chrono::steady_clock::time_point deadline);
+    /// As finish, for the end of the process: only where something is being written, and nobody is told. Answers the
+    /// movie (its path is left to the caller) if it was being recorded; none when it was at its end already.
+    std::optional<ClosedMovie> requestFinish();
+    /// Waits until nothing is being written any more, or until `deadline`; whether nothing is.
+    bool waitUntilFinished(std::chrono::steady_clock::time_point deadline);
+    /// Goes on as long as the encoder and the disk do their work.
+    std::uint64_t progress() const { return itemsTaken_.load(std::memory_order_relaxed) + disk_.answers(); }
+
+    /// Asks that everything appended until now be brought onto the disk for good; the recording goes on. Answers what
+    /// waitUntilSecured is to be asked with.
+    std::uint64_t requestSecuring();
+    /// Waits until that is so, the movie is over, or until `deadline`; false for the last.
+    bool waitUntilSecured(std::uint64_t request, std::chrono::steady_clock::time_point deadline);
 
 private:
     struct Track {
@@ -96,6 +114,7 @@ private:
     void endWithoutThread();
     MoviePipeline::End movieEnd() const;
     void finishLocked();
+    bool securesNow(bool hasItem) const;
 
     const std::shared_ptr<CaptureClock> clock_;
     const std::shared_ptr<EncoderChoice> choice_;
@@ -114,6 +133,9 @@ private:
     bool abandoned_ = false;
     std::atomic<bool> ended_ = false;  ///< no encoder thread, and none will come; set with the lock held
     std::atomic<std::uint64_t> picturesTaken_ = 0;
+    std::atomic<std::uint64_t> itemsTaken_ = 0;  ///< by the encoder thread
+    std::uint64_t securingsWanted_ = 0, securingsDone_ = 0;
+    std::uint64_t secureAfter_ = 0;  ///< items taken: what was appended before the newest request
 
     std::thread thread_;
     DiskWriter disk_;  ///< last: its thread uses the rest as soon as it is made, and until it has gone

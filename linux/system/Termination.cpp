@@ -7,6 +7,7 @@
 #include <sys/signalfd.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <condition_variable>
 #include <cstdint>
@@ -28,8 +29,8 @@ sigset_t terminationSignals() {
     return signals;
 }
 
-/// Runs `work` on a thread of its own and waits for it at most `limit`.
-void runLimited(const std::function<void()>& work, std::chrono::milliseconds limit) {
+/// Runs `work` on a thread of its own and waits for it at most `limit`, calling the beat meanwhile.
+void runLimited(const std::function<void()>& work, std::chrono::milliseconds limit, const Termination::Beat& beat) {
     struct Progress {
         std::mutex mutex;
         std::condition_variable changed;
@@ -42,9 +43,18 @@ void runLimited(const std::function<void()>& work, std::chrono::milliseconds lim
         progress->done = true;
         progress->changed.notify_all();
     });
+    if (beat.call) beat.call();
     if (!started) return work();
+    const auto deadline = std::chrono::steady_clock::now() + limit;
     std::unique_lock lock(progress->mutex);
-    progress->changed.wait_for(lock, limit, [&] { return progress->done; });
+    while (true) {
+        const auto next = beat.call ? std::min(std::chrono::steady_clock::now() + beat.every, deadline) : deadline;
+        if (progress->changed.wait_until(lock, next, [&] { return progress->done; })) return;
+        if (next == deadline) return;
+        lock.unlock();
+        beat.call();
+        lock.lock();
+    }
 }
 
 }  // namespace
@@ -54,14 +64,16 @@ void blockTerminationSignals() {
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
 }
 
-Termination::Termination(std::function<void()> onTerminate, std::chrono::milliseconds limit) {
+Termination::Termination(std::function<void()> onTerminate, std::chrono::milliseconds limit, Beat beat) {
     blockTerminationSignals();
     const sigset_t signals = terminationSignals();
     signals_.reset(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
     end_.reset(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
     if (!signals_ || !end_) return;
     try {
-        thread_ = std::thread([this, onTerminate = std::move(onTerminate), limit] { wait(onTerminate, limit); });
+        thread_ = std::thread([this, onTerminate = std::move(onTerminate), limit, beat = std::move(beat)] {
+            wait(onTerminate, limit, beat);
+        });
     } catch (const std::system_error&) {
         // isWatching() tells.
     }
@@ -74,11 +86,12 @@ Termination::~Termination() {
     thread_.join();
 }
 
-void Termination::wait(const std::function<void()>& onTerminate, std::chrono::milliseconds limit) const {
+void Termination::wait(const std::function<void()>& onTerminate, std::chrono::milliseconds limit,
+                       const Beat& beat) const {
     pollfd waited[] = {{signals_.get(), POLLIN, 0}, {end_.get(), POLLIN, 0}};
     while (::poll(waited, 2, -1) < 0 && errno == EINTR) {}
     if (waited[1].revents != 0) return;
-    runLimited(onTerminate, limit);
+    runLimited(onTerminate, limit, beat);
     ::_exit(0);
 }
 

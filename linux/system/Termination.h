@@ -20,7 +20,14 @@ void blockTerminationSignals();
 /// them. Construct it when what `onTerminate` touches is there.
 class Termination final {
 public:
-    explicit Termination(std::function<void()> onTerminate, std::chrono::milliseconds limit = std::chrono::seconds(8));
+    /// What is called at once and then again and again while `onTerminate` works; must not wait.
+    struct Beat {
+        std::function<void()> call;
+        std::chrono::milliseconds every;
+    };
+
+    explicit Termination(std::function<void()> onTerminate, std::chrono::milliseconds limit = std::chrono::seconds(8),
+                         Beat beat = {});
     /// Ends the waiting. The signals stay blocked: a signal that came meanwhile must not kill a process that is ending.
     ~Termination();
     Termination(const Termination&) = delete;
@@ -30,7 +37,7 @@ public:
     bool isWatching() const { return thread_.joinable(); }
 
 private:
-    void wait(const std::function<void()>& onTerminate, std::chrono::milliseconds limit) const;
+    void wait(const std::function<void()>& onTerminate, std::chrono::milliseconds limit, const Beat& beat) const;
 
     FileDescriptor signals_;
     FileDescriptor end_;

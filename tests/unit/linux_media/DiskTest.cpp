@@ -11,6 +11,7 @@
 #include <csignal>
 #include <filesystem>
 #include <fstream>
+#include <future>
 #include <random>
 
 #include "tests/unit/linux_media/FaultyFiles.h"
@@ -248,10 +249,17 @@ TEST(Daemon, ClosesItsOpenMoviesAtTheEnd) {
     }
     clock.captureClock()->run();
     clock.advance(std::chrono::seconds(3));
-    writers.closeOpenMovies();
+    const auto closed = writers.closeOpenMovies();
     EXPECT_EQ(open[0]->status(), ContainerStatus::Completed);
     EXPECT_EQ(open[2]->status(), ContainerStatus::Unknown);
     for (const char* name : {"a.mp4", "b.mp4"}) EXPECT_EQ(movieNanoseconds(directory.file(name)), 3 * kSecond);
+    ASSERT_EQ(closed.size(), 2u) << "what was never begun is no recording";
+    EXPECT_EQ(closed[1].path, directory.file("b.mp4"));
+    EXPECT_EQ(closed[1].seconds, 3.0);
+    EXPECT_EQ(closed[1].width, 128);
+    EXPECT_EQ(closed[1].height, 96);
+    EXPECT_EQ(closed[1].pictures, 1u);
+    EXPECT_TRUE(writers.closeOpenMovies().empty()) << "they are at their ends";
     Happening done;
     open[0]->finishWriting([&] { done.happen(); });  // a lane that comes too late is still answered
     EXPECT_TRUE(done.waitFor());
@@ -266,6 +274,65 @@ TEST(Daemon, WaitsForADeadDiskOnlyForAWhileAtTheEnd) {
     EXPECT_GE(seconds, 4.9);
     EXPECT_LT(seconds, 15.0);
     faulty.disk->thaw();
+}
+
+TEST(Daemon, AMovieWhoseEndWasAskedForBeforeIsWaitedForAndNotToldOf) {
+    FaultyMovie faulty;
+    faulty.movie.start();
+    ASSERT_TRUE(faulty.movie.appendGrey(100, 0));
+    faulty.disk->freeze();
+    Happening done;
+    faulty.movie.writer->finishWriting([&] { done.happen(); });
+    auto closing = std::async(std::launch::async, [&] { return faulty.movie.writers().closeOpenMovies(); });
+    EXPECT_EQ(closing.wait_for(std::chrono::milliseconds(300)), std::future_status::timeout) << "it is waited for";
+    faulty.disk->thaw();
+    EXPECT_TRUE(closing.get().empty());
+    EXPECT_EQ(faulty.movie.writer->status(), ContainerStatus::Completed);
+    EXPECT_TRUE(done.waitFor());
+}
+
+TEST(Daemon, ADiskThatIsSlowButWorksIsWaitedForAtTheEnd) {
+    FaultyMovie faulty;
+    faulty.movie.start();
+    for (int i = 0; i < 3; ++i) ASSERT_TRUE(faulty.movie.appendGrey(i * 10, i * kSecond));
+    faulty.disk->slowDown(std::chrono::milliseconds(400));
+    const int before = faulty.disk->answers();
+    const double seconds = secondsTaken([&] { faulty.movie.writers().closeOpenMovies(); });
+    EXPECT_EQ(faulty.movie.writer->status(), ContainerStatus::Completed);
+    const int answers = faulty.disk->answers() - before;
+    std::printf("%d answers of the disk, %.1f s\n", answers, seconds);
+    EXPECT_GT(seconds, 5.5) << "longer than one that does nothing";
+    EXPECT_EQ(shownPictures(faulty.movie.path()).size(), 3u);
+}
+
+TEST(Daemon, SecuresItsOpenMoviesAndRecordsOn) {
+    FaultyMovie faulty;
+    faulty.movie.start();
+    ASSERT_TRUE(faulty.movie.appendGrey(100, 0));
+    ASSERT_TRUE(faulty.movie.appendGrey(120, 10 * kMillisecond));
+    ASSERT_TRUE(faulty.movie.writers().secureOpenMovies(std::chrono::seconds(30)));
+    EXPECT_EQ(picturesSoFar(faulty.movie.path()), 2u) << "it is there when the answer is";
+    const int syncs = faulty.disk->syncs();
+    EXPECT_GE(syncs, 1);
+    EXPECT_TRUE(faulty.movie.writers().secureOpenMovies(std::chrono::seconds(30))) << "with nothing new";
+    ASSERT_TRUE(faulty.movie.appendGrey(140, 20 * kMillisecond));
+    ASSERT_TRUE(faulty.movie.writers().secureOpenMovies(std::chrono::seconds(30)));
+    EXPECT_GT(faulty.disk->syncs(), syncs);
+    EXPECT_EQ(picturesSoFar(faulty.movie.path()), 3u);
+    ASSERT_EQ(faulty.movie.finish(), ContainerStatus::Completed);
+    EXPECT_EQ(shownPictures(faulty.movie.path()).size(), 3u);
+    EXPECT_TRUE(faulty.movie.writers().secureOpenMovies(std::chrono::seconds(30))) << "nothing is open";
+}
+
+TEST(Daemon, SecuringWaitsForADeadDiskOnlyAsLongAsItMay) {
+    FaultyMovie faulty;
+    faulty.movie.start();
+    ASSERT_TRUE(faulty.movie.appendGrey(100, 0));
+    faulty.disk->freeze();
+    EXPECT_FALSE(faulty.movie.writers().secureOpenMovies(std::chrono::milliseconds(50)));
+    faulty.disk->thaw();
+    EXPECT_TRUE(faulty.movie.writers().secureOpenMovies(std::chrono::seconds(30)));
+    EXPECT_EQ(faulty.movie.finish(), ContainerStatus::Completed);
 }
 
 /// What the child of the next test does: records pictures in real time at `rate`, the luma telling the number, and

@@ -43,6 +43,15 @@ public:
         frozen_ = false;
         changed_.notify_all();
     }
+    /// Every answer takes so long.
+    void slowDown(std::chrono::milliseconds delay) {
+        const std::lock_guard lock(mutex_);
+        delay_ = delay;
+    }
+    int answers() {
+        const std::lock_guard lock(mutex_);
+        return answers_;
+    }
     int syncs() {
         const std::lock_guard lock(mutex_);
         return syncs_;
@@ -53,7 +62,19 @@ private:
 
     std::mutex mutex_;
     std::condition_variable changed_;
+    /// Waits as the disk would; with the lock.
+    void answer(std::unique_lock<std::mutex>& lock) {
+        // A clock that nobody changes; nothing but the time ends it.
+        const auto until = std::chrono::steady_clock::now() + delay_;
+        while (std::chrono::steady_clock::now() < until) slow_.wait_until(lock, until);
+        changed_.wait(lock, [this] { return !frozen_; });
+        ++answers_;
+    }
+
     bool frozen_ = false;
+    std::chrono::milliseconds delay_{0};
+    int answers_ = 0;
+    std::condition_variable slow_;
     std::uint64_t bytesLeft_ = UINT64_MAX;
     int error_ = 0, syncError_ = 0, creationError_ = 0, syncs_ = 0;
 };
@@ -64,7 +85,7 @@ public:
     int write(std::uint64_t offset, std::span<const std::uint8_t> bytes) override {
         {
             std::unique_lock lock(disk_.mutex_);
-            disk_.changed_.wait(lock, [this] { return !disk_.frozen_; });
+            disk_.answer(lock);
             if (bytes.size() > disk_.bytesLeft_) return disk_.error_;
             disk_.bytesLeft_ -= bytes.size();
         }
@@ -72,7 +93,7 @@ public:
     }
     int sync() override {
         std::unique_lock lock(disk_.mutex_);
-        disk_.changed_.wait(lock, [this] { return !disk_.frozen_; });
+        disk_.answer(lock);
         disk_.syncs_ += 1;
         return disk_.syncError_;
     }

@@ -5,6 +5,7 @@
 #include <signal.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <string>
 #include <thread>
 
@@ -42,6 +43,32 @@ TEST_F(TerminationDeathTest, WorkThatHangsIsNotWaitedForWithoutLimit) {
             hang();
         },
         testing::ExitedWithCode(0), "");
+}
+
+TEST_F(TerminationDeathTest, MoreTimeIsAskedForAgainAndAgainWhileTheWorkGoesOn) {
+    EXPECT_EXIT(
+        {
+            std::atomic<int> asked{0};
+            const Termination termination(
+                [&] {
+                    while (asked < 5) std::this_thread::yield();
+                    (void)!::write(2, "done", 4);
+                },
+                60s, {[&] { ++asked; }, 1ms});
+            ::kill(::getpid(), SIGTERM);
+            hang();
+        },
+        testing::ExitedWithCode(0), "^done$");
+}
+
+TEST_F(TerminationDeathTest, TimeIsAskedForAtOnceAndOnlyUntilTheLimit) {
+    EXPECT_EXIT(
+        {
+            const Termination termination([] { hang(); }, 50ms, {[] { (void)!::write(2, "more ", 5); }, 1h});
+            ::kill(::getpid(), SIGTERM);
+            hang();
+        },
+        testing::ExitedWithCode(0), "^more $");
 }
 
 TEST_F(TerminationDeathTest, FurtherSignalsChangeNothing) {
