@@ -4,13 +4,13 @@ namespace lumacast {
 
 void LinuxKeepAlive::beginTransaction() {
     const std::lock_guard lock(mutex_);  // held while sending, which never waits: the last status told is the true one
-    if (++open_ == 1) announceStatus(open_);
+    if (++open_ == 1) busyChanged();
 }
 
 void LinuxKeepAlive::endTransaction() {
     const std::lock_guard lock(mutex_);
     if (open_ == 0) return;  // an end without a begin must not make a later transaction invisible
-    if (--open_ == 0) announceStatus(open_);
+    if (--open_ == 0) busyChanged();
 }
 
 int LinuxKeepAlive::openTransactions() const {
@@ -21,7 +21,7 @@ int LinuxKeepAlive::openTransactions() const {
 void LinuxKeepAlive::announceReady() {
     const std::lock_guard lock(mutex_);
     socket_.send("READY=1\n");
-    announceStatus(open_);
+    announceStatus();
 }
 
 void LinuxKeepAlive::announceStopping(int seconds) {
@@ -30,6 +30,11 @@ void LinuxKeepAlive::announceStopping(int seconds) {
                  "\n");
 }
 
-void LinuxKeepAlive::announceStatus(int open) { socket_.send(open > 0 ? "STATUS=Recording.\n" : "STATUS=Idle.\n"); }
+void LinuxKeepAlive::busyChanged() {
+    announceStatus();
+    if (inhibitor_) inhibitor_->setBusy(open_ > 0);
+}
+
+void LinuxKeepAlive::announceStatus() { socket_.send(open_ > 0 ? "STATUS=Recording.\n" : "STATUS=Idle.\n"); }
 
 }  // namespace lumacast
