@@ -30,6 +30,7 @@
 #include "linux/storage/LinuxStoragePurgeService.h"
 #include "linux/store/LinuxStoreLookup.h"
 #include "linux/system/Allocator.h"
+#include "linux/system/ClosedMovieEvent.h"
 #include "linux/system/DescriptorLimit.h"
 #include "linux/system/LinuxClock.h"
 #include "linux/system/LinuxDeviceInfo.h"
@@ -47,8 +48,13 @@ namespace lumacast {
 
 namespace {
 
-/// What closing the open movies may take at termination.
-constexpr std::chrono::seconds kTimeToClose{8};
+/// What the end may take: closing the open movies, and noting them.
+constexpr std::chrono::seconds kTimeToEnd = LinuxContainerWriters::kClosingLimit + std::chrono::seconds(5);
+constexpr std::chrono::seconds kTimeToNote{1};
+/// How much more time the service manager is asked for, and how often.
+constexpr std::chrono::seconds kMoreTime{10}, kAskForTimeEvery{2};
+/// What a device that is about to sleep waits for the movies: a second less than its login manager lets it.
+constexpr std::chrono::seconds kTimeToSecure{4};
 
 /// Two for each connection that one user may have, and as many again for other users and everything else.
 constexpr std::uint64_t kDescriptors = 4 * (limitOf(Limit::ConnectionsPerUser) + limitOf(Limit::ConnectionsBeforeHello));
@@ -91,7 +97,7 @@ public:
           preferences_(environment.configDirectories),
           deviceInfo_(environment.systemDirectories),
           telemetry_(environment.stateDirectory + "/telemetry.jsonl"),
-          keepAlive_(environment.notifySocket),
+          keepAlive_(environment.notifySocket, sleepInhibitor()),
           capture_(environmentVariable("DISPLAY"), clock_, scheduler_),
           renderServer_(environmentVariable("DISPLAY")),
           appState_(environmentVariable("DISPLAY"), scheduler_, [this](ProcessID pid) { return applicationOf(pid); }),
@@ -113,15 +119,14 @@ public:
                     deviceInfo_, telemetry_, keepAlive_, admin_,
                     storagePurge_, userAlerts_, systemSounds_, screenReader_,
                     storeLookup_, networkReachability_},
-          termination_([this] {
-              keepAlive_.announceStopping(static_cast<int>(kTimeToClose.count()));
-              writers_.closeOpenMovies();
-          }, kTimeToClose) {}
+          termination_([this] { closeMovies(); }, kTimeToEnd,
+                       {[this] { keepAlive_.announceStopping(static_cast<int>(kMoreTime.count())); }, kAskForTimeEvery}) {
+        admin_.addCommand("usage", usageCommand(telemetry_));
+    }
 
     /// What must be there before the daemon can work; the error when it can't be had.
     std::optional<Error> prepare() {
         if (auto error = fileSystem_.prepare()) return error;
-        admin_.addCommand("usage", usageCommand(telemetry_));
         // The main loop's first task: by then clients are accepted.
         scheduler_.mainQueue().async([this] { keepAlive_.announceReady(); });
         return std::nullopt;
@@ -130,11 +135,24 @@ public:
     Platform& platform() override { return platform_; }
 
 private:
+    /// At the end of the process, waiting for no lane.
+    void closeMovies() {
+        for (const media::ClosedMovie& movie : writers_.closeOpenMovies())
+            reportEndedWithProcess(telemetry_, {movie.seconds, movie.width, movie.height, movie.pictures, movie.bytes});
+        telemetry_.flush(kTimeToNote);
+    }
+
     std::optional<BundleIdentifier> applicationOf(ProcessID pid) {
         const auto executable = bundles_.executablePath(pid);
         const auto path = executable ? bundles_.bundlePathForExecutable(*executable) : std::nullopt;
         const auto bundle = path ? bundles_.open(*path) : nullptr;
         return bundle ? bundle->identifier() : std::nullopt;
+    }
+
+    SleepInhibitor::Options sleepInhibitor() {
+        SleepInhibitor::Options options;
+        options.beforeSleep = [this] { writers_.secureOpenMovies(kTimeToSecure); };
+        return options;
     }
 
     LinuxUserAlerts::Options alertOptions(const LinuxEnvironment& environment) {
