@@ -98,8 +98,8 @@ public:
         options_.tooSoon = std::chrono::milliseconds(0);
         const std::string home = "HOME=" + scratch_.makeDirectory("home");
         const std::string runtime = "XDG_RUNTIME_DIR=" + scratch_.makeDirectory("run");
-        const char* const variables[] = {home.c_str(), runtime.c_str(), "PATH=/usr/bin:/bin",
-                                         "LANG=xx_XX", "LC_ALL=C",      nullptr};
+        const char* const variables[] = {home.c_str(), runtime.c_str(), "PATH=/usr/bin:/bin", "LANG=xx_XX", "LC_ALL=C",
+                                         "SECRET=1",   nullptr};
         options_.environment = dialogEnvironment(variables, display_.name());
         if (!program.empty()) std::filesystem::create_symlink("/usr/bin/" + program, scratch_.path("bin/" + program));
     }
