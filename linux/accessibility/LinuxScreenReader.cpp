@@ -66,6 +66,8 @@ LinuxScreenReader::~LinuxScreenReader() {
     if (state_->end.valid()) state_->end.wait_for(kFarewell);
 }
 
-bool LinuxScreenReader::isRunning() const { return state_->running; }
+bool LinuxScreenReader::isRunning() const {
+    return state_->running;
+}
 
 }  // namespace lumacast

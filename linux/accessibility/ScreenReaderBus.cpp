@@ -18,7 +18,9 @@ constexpr const char* kInterface = "org.a11y.Status";
 constexpr const char* kProperty = "ScreenReaderEnabled";
 constexpr const char* kProperties = "org.freedesktop.DBus.Properties";
 
-BusSlot owned(sd_bus_slot* slot) { return BusSlot(slot); }
+BusSlot owned(sd_bus_slot* slot) {
+    return BusSlot(slot);
+}
 
 }  // namespace
 
@@ -37,13 +39,15 @@ bool ScreenReaderBus::follow() {
         return 0;
     };
     sd_bus_slot* slot = nullptr;
-    const std::string owner =
-        std::string("type='signal',sender='org.freedesktop.DBus',path='/org/freedesktop/DBus',"
-                    "interface='org.freedesktop.DBus',member='NameOwnerChanged',arg0='") + kService + "'";
+    const std::string owner = std::string(
+                                  "type='signal',sender='org.freedesktop.DBus',path='/org/freedesktop/DBus',"
+                                  "interface='org.freedesktop.DBus',member='NameOwnerChanged',arg0='") +
+                              kService + "'";
     if (sd_bus_add_match_async(bus_.get(), &slot, owner.c_str(), askAgain, nullptr, this) < 0) return false;
     ownerMatch_ = owned(slot);
     const std::string properties = std::string("type='signal',sender='") + kService + "',path='" + kObject +
-                                   "',interface='" + kProperties + "',member='PropertiesChanged',arg0='" + kInterface + "'";
+                                   "',interface='" + kProperties + "',member='PropertiesChanged',arg0='" + kInterface +
+                                   "'";
     if (sd_bus_add_match_async(bus_.get(), &slot, properties.c_str(), askAgain, nullptr, this) < 0) return false;
     propertyMatch_ = owned(slot);
     return true;
@@ -58,15 +62,15 @@ bool ScreenReaderBus::ask() {
     if (sd_bus_message_new_method_call(bus_.get(), &made, kService, kObject, kProperties, "Get") < 0) return false;
     const BusMessage message(made);
     sd_bus_slot* slot = nullptr;
-    const bool asked =
-        sd_bus_message_set_auto_start(made, 0) >= 0 && sd_bus_message_append(made, "ss", kInterface, kProperty) >= 0 &&
-        sd_bus_call_async(
-            bus_.get(), &slot, made,
-            [](sd_bus_message* reply, void* self, sd_bus_error*) {
-                static_cast<ScreenReaderBus*>(self)->answered(*reply);
-                return 0;
-            },
-            this, 0) >= 0;
+    const bool asked = sd_bus_message_set_auto_start(made, 0) >= 0 &&
+                       sd_bus_message_append(made, "ss", kInterface, kProperty) >= 0 &&
+                       sd_bus_call_async(
+                           bus_.get(), &slot, made,
+                           [](sd_bus_message* reply, void* self, sd_bus_error*) {
+                               static_cast<ScreenReaderBus*>(self)->answered(*reply);
+                               return 0;
+                           },
+                           this, 0) >= 0;
     question_ = owned(slot);
     return asked;
 }

@@ -10,8 +10,8 @@
 
 namespace lumacast {
 
-/// The way to a host by the system's resolver and the kernel's routing table; see the folder's README for what the flags
-/// mean here. Callable from any lane that may wait a second.
+/// The way to a host by the system's resolver and the kernel's routing table; see the folder's README for what the
+/// flags mean here. Callable from any lane that may wait a second.
 class LinuxNetworkReachability final : public NetworkReachability {
 public:
     struct Options {

@@ -33,7 +33,9 @@ std::optional<NetworkAddress> addressIn(const sockaddr& address) {
 
 }  // namespace
 
-std::size_t NetworkAddress::length() const { return family == AF_INET ? sizeof(in_addr) : sizeof(in6_addr); }
+std::size_t NetworkAddress::length() const {
+    return family == AF_INET ? sizeof(in_addr) : sizeof(in6_addr);
+}
 
 std::optional<NetworkAddress> NetworkAddress::parse(const std::string& text) {
     NetworkAddress address;
@@ -53,7 +55,8 @@ std::vector<NetworkAddress> resolveBySystem(const std::string& hostName) {
     const std::unique_ptr<addrinfo, FreeAddresses> owned(list);
     std::vector<NetworkAddress> addresses;
     for (const addrinfo* entry = list; entry && addresses.size() < kMostAddresses; entry = entry->ai_next)
-        if (const auto address = entry->ai_addr ? addressIn(*entry->ai_addr) : std::nullopt) addresses.push_back(*address);
+        if (const auto address = entry->ai_addr ? addressIn(*entry->ai_addr) : std::nullopt)
+            addresses.push_back(*address);
     return addresses;
 }
 

@@ -39,8 +39,14 @@ std::optional<T> attribute(std::span<const char> attributes, unsigned short want
 /// The errors with which the kernel says that there is no way: no route, refusing routes, a family it does not speak.
 bool meansNoWay(int error) {
     switch (error) {
-        case ENETUNREACH: case EHOSTUNREACH: case EINVAL: case EACCES: case ENODEV: case ENETDOWN:
-        case EOPNOTSUPP: case EAFNOSUPPORT: return true;
+        case ENETUNREACH:
+        case EHOSTUNREACH:
+        case EINVAL:
+        case EACCES:
+        case ENODEV:
+        case ENETDOWN:
+        case EOPNOTSUPP:
+        case EAFNOSUPPORT: return true;
         default: return false;
     }
 }
@@ -63,7 +69,8 @@ struct RoutingTable::Answer {
 };
 
 RoutingTable::RoutingTable() : socket_(::socket(AF_NETLINK, SOCK_RAW | SOCK_CLOEXEC, NETLINK_ROUTE)) {
-    if (socket_ && ::setsockopt(socket_.get(), SOL_SOCKET, SO_RCVTIMEO, &kPatience, sizeof kPatience) != 0) socket_.reset();
+    if (socket_ && ::setsockopt(socket_.get(), SOL_SOCKET, SO_RCVTIMEO, &kPatience, sizeof kPatience) != 0)
+        socket_.reset();
 }
 
 std::optional<RoutingTable::Answer> RoutingTable::ask(Request& request) {
@@ -77,12 +84,14 @@ std::optional<RoutingTable::Answer> RoutingTable::ask(Request& request) {
     for (int strangers = 0; strangers < kStrangersPassedOver; ++strangers) {
         char bytes[8192];
         socklen_t length = sizeof kernel;
-        const ssize_t got = ::recvfrom(socket_.get(), bytes, sizeof bytes, 0, reinterpret_cast<sockaddr*>(&kernel), &length);
+        const ssize_t got =
+            ::recvfrom(socket_.get(), bytes, sizeof bytes, 0, reinterpret_cast<sockaddr*>(&kernel), &length);
         if (got < 0) return std::nullopt;
         nlmsghdr header;
         if (kernel.nl_pid != 0 || static_cast<std::size_t>(got) < sizeof header) continue;
         std::memcpy(&header, bytes, sizeof header);
-        if (header.nlmsg_seq != sequence_ || header.nlmsg_len < sizeof header || header.nlmsg_len > static_cast<std::size_t>(got))
+        if (header.nlmsg_seq != sequence_ || header.nlmsg_len < sizeof header ||
+            header.nlmsg_len > static_cast<std::size_t>(got))
             continue;
         Answer answer{0, {bytes + NLMSG_HDRLEN, bytes + header.nlmsg_len}};
         if (header.nlmsg_type == NLMSG_ERROR && answer.body.size() >= sizeof(nlmsgerr)) {
@@ -131,7 +140,8 @@ std::optional<Way> RoutingTable::stateOf(int device) {
     if (answer->body.size() < sizeof link) return std::nullopt;
     std::memcpy(&link, answer->body.data(), sizeof link);
     // Devices without a state of their own (loopback, tunnels) say "unknown"; RFC 2863, 3.1.12.
-    const auto state = attribute<std::uint8_t>(std::span(answer->body).subspan(NLMSG_ALIGN(sizeof link)), IFLA_OPERSTATE);
+    const auto state =
+        attribute<std::uint8_t>(std::span(answer->body).subspan(NLMSG_ALIGN(sizeof link)), IFLA_OPERSTATE);
     const bool isRunning = !state || *state == IF_OPER_UP || *state == IF_OPER_UNKNOWN;
     return (link.ifi_flags & IFF_UP) != 0 && isRunning ? Way::Usable : Way::NeedsConnection;
 }

@@ -29,7 +29,8 @@ public:
             },
             this);
         pa_stream_set_write_callback(
-            stream_.get(), [](pa_stream*, std::size_t room, void* self) { static_cast<Stream*>(self)->feed(room); }, this);
+            stream_.get(), [](pa_stream*, std::size_t room, void* self) { static_cast<Stream*>(self)->feed(room); },
+            this);
         if (pa_stream_connect_playback(stream_.get(), nullptr, nullptr, PA_STREAM_NOFLAGS, nullptr, nullptr) < 0) end();
     }
 
@@ -67,8 +68,10 @@ EventPlayer::EventPlayer() = default;
 EventPlayer::~EventPlayer() = default;
 
 void EventPlayer::add(EventSound sound) {
-    if (context_) start(std::move(sound));
-    else waiting_.push_back(std::move(sound));
+    if (context_)
+        start(std::move(sound));
+    else
+        waiting_.push_back(std::move(sound));
 }
 
 void EventPlayer::start(EventSound sound) {

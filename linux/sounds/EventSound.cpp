@@ -18,7 +18,8 @@ constexpr std::size_t kMostSamples = EventSound::kLongest.count() * EventSound::
 
 AvOwned<AVFormatContext> openSound(const std::string& path) {
     struct stat status {};
-    if (::stat(path.c_str(), &status) != 0 || !S_ISREG(status.st_mode) || status.st_size > kMaximumBytes) return nullptr;
+    if (::stat(path.c_str(), &status) != 0 || !S_ISREG(status.st_mode) || status.st_size > kMaximumBytes)
+        return nullptr;
     AVDictionary* options = nullptr;
     // Nothing that would open other files.
     av_dict_set(&options, "format_whitelist", "ogg,wav", 0);
@@ -57,7 +58,8 @@ private:
         AVChannelLayout stereo = AV_CHANNEL_LAYOUT_STEREO, theirs{};
         if (frame.ch_layout.order == AV_CHANNEL_ORDER_UNSPEC)
             av_channel_layout_default(&theirs, frame.ch_layout.nb_channels);
-        else if (av_channel_layout_copy(&theirs, &frame.ch_layout) < 0) return false;
+        else if (av_channel_layout_copy(&theirs, &frame.ch_layout) < 0)
+            return false;
         SwrContext* converter = nullptr;
         const int made = swr_alloc_set_opts2(&converter, &stereo, AV_SAMPLE_FMT_FLT, EventSound::kRate, &theirs,
                                              static_cast<AVSampleFormat>(frame.format), frame.sample_rate, 0, nullptr);

@@ -14,8 +14,8 @@ struct EventSound {
     static constexpr std::size_t kChannels = 2;
     static constexpr std::chrono::seconds kLongest{5};
 
-    std::string name;            ///< by the naming specification, e.g. "camera-shutter"
-    std::vector<float> samples;  ///< interleaved, -1 to 1
+    std::string name;                ///< by the naming specification, e.g. "camera-shutter"
+    std::vector<float> samples;      ///< interleaved, -1 to 1
     std::shared_ptr<void> inFlight;  ///< kept until it has been played or given up
 
     std::chrono::milliseconds length() const {

@@ -28,7 +28,8 @@ struct SoundChoice {
 };
 
 constexpr std::array kChoices{
-    SoundChoice{SystemSounds::kBeginRecording, {"camera-shutter", "screen-capture", "device-added", "message"}, 660, 990},
+    SoundChoice{
+        SystemSounds::kBeginRecording, {"camera-shutter", "screen-capture", "device-added", "message"}, 660, 990},
     SoundChoice{SystemSounds::kEndRecording, {"complete", "device-removed", "message", "bell"}, 990, 660}};
 
 const SoundChoice* choiceFor(std::uint32_t number) {
@@ -122,7 +123,8 @@ void LinuxSystemSounds::run(const std::shared_ptr<State>& state) {
                 player = std::make_shared<sound::EventPlayer>();
                 if (!state->server->attach(player)) player = nullptr;
             }
-            if (player) state->server->post([player, sound = std::move(sound)]() mutable { player->add(std::move(sound)); });
+            if (player)
+                state->server->post([player, sound = std::move(sound)]() mutable { player->add(std::move(sound)); });
         }
         lock.lock();
     }

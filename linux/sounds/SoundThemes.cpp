@@ -111,7 +111,8 @@ std::vector<SoundThemes::Theme> SoundThemes::chain() const {
     while (!waiting.empty() && themes.size() < kMaximumThemes) {
         const std::string name = waiting.back();
         waiting.pop_back();
-        const bool known = std::any_of(themes.begin(), themes.end(), [&](const Theme& theme) { return theme.name == name; });
+        const bool known =
+            std::any_of(themes.begin(), themes.end(), [&](const Theme& theme) { return theme.name == name; });
         if (known || !isPlainName(name) || name == kDefaultTheme) continue;
         themes.push_back(read(name));
         const auto& parents = themes.back().parents;

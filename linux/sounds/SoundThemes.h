@@ -16,10 +16,10 @@ struct SoundThemes {
     std::string currentTheme() const;
 
     /// The files for the first of `names` that the current theme, those it inherits from, "freedesktop" or the sounds
-    /// outside themes have, then those for the next name; best first, at most 16. Names of a theme or a sound that would
-    /// lead out of their folder find nothing. Sounds are not looked for by language: none that is asked for speaks.
-    /// A theme's mark that it has no such sound (".disabled") does not count, deliberately: these are played because
-    /// a rule or the user wants them to be heard.
+    /// outside themes have, then those for the next name; best first, at most 16. Names of a theme or a sound that
+    /// would lead out of their folder find nothing. Sounds are not looked for by language: none that is asked for
+    /// speaks. A theme's mark that it has no such sound (".disabled") does not count, deliberately: these are played
+    /// because a rule or the user wants them to be heard.
     std::vector<std::string> files(const std::vector<std::string>& names) const;
 
 private:

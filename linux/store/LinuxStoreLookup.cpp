@@ -27,7 +27,8 @@ constexpr int kLocalized = 1;
 
 bool isIdentifier(const std::string& text) {
     return !text.empty() && text.size() <= kLongestIdentifier && std::all_of(text.begin(), text.end(), [](char c) {
-        return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '.' || c == '_' || c == '-';
+        return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '.' || c == '_' ||
+               c == '-';
     });
 }
 
@@ -79,7 +80,8 @@ struct LinuxStoreLookup::State {
         const bool localized = request.localizationStyle == kLocalized;
         ProgramRun run{{options.program, "--locale", localized ? options.locale : "C"}, options.environment};
         run.patience = options.patience;
-        for (const std::string& catalog : options.catalogs) run.command.insert(run.command.end(), {"--catalog", catalog});
+        for (const std::string& catalog : options.catalogs)
+            run.command.insert(run.command.end(), {"--catalog", catalog});
         run.command.emplace_back("--");
         std::size_t identifiers = 0;
         for (const std::string& identifier : request.bundleIdentifiers) {
@@ -101,21 +103,17 @@ LinuxStoreLookup::Options LinuxStoreLookup::optionsFrom(const LinuxEnvironment& 
     Options options;
     const std::string directory = environment.executable.substr(0, environment.executable.rfind('/') + 1);
     options.program = directory + "lumacast-catalog";
-    if (::access(options.program.c_str(), X_OK) != 0) options.program = directory + "../libexec/lumacast/lumacast-catalog";
+    if (::access(options.program.c_str(), X_OK) != 0)
+        options.program = directory + "../libexec/lumacast/lumacast-catalog";
     options.locale = localeName(userLocales(environment.languageList, environment.messageLocale).front());
     std::string dataDirectories;
     for (std::size_t i = 1; i < environment.dataDirectories.size(); ++i)
         dataDirectories += (i > 1 ? ":" : "") + environment.dataDirectories[i];
-    options.environment = {"HOME=" + environment.home,
-                           "PATH=/usr/bin:/bin",
-                           "XDG_DATA_HOME=" + environment.dataHome,
-                           "XDG_DATA_DIRS=" + dataDirectories,
-                           "XDG_CACHE_HOME=" + environment.cacheDirectory,
-                           "LANGUAGE=" + environment.languageList,
-                           "LC_ALL=" + environment.messageLocale,
+    options.environment = {"HOME=" + environment.home, "PATH=/usr/bin:/bin", "XDG_DATA_HOME=" + environment.dataHome,
+                           "XDG_DATA_DIRS=" + dataDirectories, "XDG_CACHE_HOME=" + environment.cacheDirectory,
+                           "LANGUAGE=" + environment.languageList, "LC_ALL=" + environment.messageLocale,
                            // The library's own helpers are not to load others' modules, which would look for a bus.
-                           "GIO_USE_VFS=local",
-                           "GIO_MODULE_DIR=/nonexistent"};
+                           "GIO_USE_VFS=local", "GIO_MODULE_DIR=/nonexistent"};
     return options;
 }
 

@@ -66,7 +66,8 @@ public:
         if (pid_ <= 0) return false;
         ::kill(pid_, SIGKILL);
         int status = 0;
-        while (::waitpid(pid_, &status, 0) < 0 && errno == EINTR) {}
+        while (::waitpid(pid_, &status, 0) < 0 && errno == EINTR) {
+        }
         pid_ = -1;
         return WIFEXITED(status) && WEXITSTATUS(status) == 0;
     }

@@ -46,7 +46,8 @@ public:
         const std::size_t window = kRate / 20;
         int windows = 0;
         for (std::size_t at = 0; at + window <= ear_->samples.size(); at += window)
-            windows += checkers::toneLevel(std::span(ear_->samples).subspan(at, window), kRate, frequency) > -20 ? 1 : 0;
+            windows +=
+                checkers::toneLevel(std::span(ear_->samples).subspan(at, window), kRate, frequency) > -20 ? 1 : 0;
         return windows * 0.05;
     }
     bool isSilent(std::size_t from = 0) const {
@@ -95,11 +96,14 @@ private:
         void hear() {
             const void* bytes = nullptr;
             std::size_t length = 0;
-            while (pa_stream_readable_size(stream.get()) > 0 && pa_stream_peek(stream.get(), &bytes, &length) >= 0 && length > 0) {
+            while (pa_stream_readable_size(stream.get()) > 0 && pa_stream_peek(stream.get(), &bytes, &length) >= 0 &&
+                   length > 0) {
                 const std::lock_guard lock(mutex);
                 const auto* const first = static_cast<const float*>(bytes);
-                if (first) samples.insert(samples.end(), first, first + length / sizeof(float));
-                else samples.resize(samples.size() + length / sizeof(float));
+                if (first)
+                    samples.insert(samples.end(), first, first + length / sizeof(float));
+                else
+                    samples.resize(samples.size() + length / sizeof(float));
                 pa_stream_drop(stream.get());
             }
         }

@@ -27,9 +27,13 @@ constexpr std::uint32_t kReachable = NetworkReachability::kReachable;
 constexpr std::uint32_t kLater = kReachable | NetworkReachability::kConnectionRequired;
 constexpr const char* kHost = "probe.example";
 
-NetworkAddress address(const char* text) { return NetworkAddress::parse(text).value(); }
+NetworkAddress address(const char* text) {
+    return NetworkAddress::parse(text).value();
+}
 /// Kept for documentation: nobody is there.
-NetworkAddress hostAddress() { return address("198.51.100.7"); }
+NetworkAddress hostAddress() {
+    return address("198.51.100.7");
+}
 
 LinuxNetworkReachability::Options resolvingTo(std::vector<NetworkAddress> addresses) {
     return {[addresses](const std::string&) { return addresses; }, std::chrono::seconds(30)};
@@ -82,11 +86,15 @@ protected:
     std::unique_ptr<NetworkReachabilityWorld> world_ = GetParam()();
 };
 
-TEST_P(NetworkReachabilityContract, AWayThatCanBeUsedIsReachable) { EXPECT_EQ(world_->flagsIn(Network::Usable), kReachable); }
+TEST_P(NetworkReachabilityContract, AWayThatCanBeUsedIsReachable) {
+    EXPECT_EQ(world_->flagsIn(Network::Usable), kReachable);
+}
 TEST_P(NetworkReachabilityContract, AWayThatNeedsAConnectionSaysSo) {
     EXPECT_EQ(world_->flagsIn(Network::WaitsForAConnection), kLater);
 }
-TEST_P(NetworkReachabilityContract, NoWayIsNoFlag) { EXPECT_EQ(world_->flagsIn(Network::Nowhere), 0u); }
+TEST_P(NetworkReachabilityContract, NoWayIsNoFlag) {
+    EXPECT_EQ(world_->flagsIn(Network::Nowhere), 0u);
+}
 TEST_P(NetworkReachabilityContract, WhatCannotBeReadIsNone) {
     EXPECT_EQ(world_->flagsIn(Network::Unreadable), std::nullopt);
 }

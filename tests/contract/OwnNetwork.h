@@ -29,10 +29,11 @@
 
 namespace lumacast::test {
 
-/// Runs `action` in a process with an empty network of an ordinary user's; what the test is to know of it afterwards has
-/// to be in shared memory. Whether it could be made.
+/// Runs `action` in a process with an empty network of an ordinary user's; what the test is to know of it afterwards
+/// has to be in shared memory. Whether it could be made.
 inline bool inProcessWithOwnNetwork(const std::function<void()>& action) {
-    const std::string user = "0 " + std::to_string(::geteuid()) + " 1\n", group = "0 " + std::to_string(::getegid()) + " 1\n";
+    const std::string user = "0 " + std::to_string(::geteuid()) + " 1\n",
+                      group = "0 " + std::to_string(::getegid()) + " 1\n";
     std::fflush(nullptr);  // or the child writes it again
     const pid_t child = ::fork();
     if (child == 0) {
@@ -51,8 +52,8 @@ inline bool inProcessWithOwnNetwork(const std::function<void()>& action) {
     return true;
 }
 
-/// Runs `action` on a thread with an empty network, which only it and the threads and programs it starts have, and which
-/// ends with it; for an ordinary user, in a process. False where neither can be made; then nothing ran.
+/// Runs `action` on a thread with an empty network, which only it and the threads and programs it starts have, and
+/// which ends with it; for an ordinary user, in a process. False where neither can be made; then nothing ran.
 inline bool withOwnNetwork(const std::function<void()>& action) {
     bool made = false;
     std::thread([&] {
@@ -120,7 +121,8 @@ public:
         sockaddr_storage from{};
         socklen_t length = sizeof from;
         ssize_t got = 0;
-        while ((got = ::recvfrom(socket_.get(), bytes, sizeof bytes, 0, reinterpret_cast<sockaddr*>(&from), &length)) > 0) {
+        while ((got = ::recvfrom(socket_.get(), bytes, sizeof bytes, 0, reinterpret_cast<sockaddr*>(&from), &length)) >
+               0) {
             const std::string packet(bytes, static_cast<std::size_t>(got));
             const std::string sought(reinterpret_cast<const char*>(address.bytes.data()), address.length());
             // A question for a neighbour by ARP: hardware type Ethernet, protocol IPv4.

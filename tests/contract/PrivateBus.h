@@ -26,8 +26,8 @@ public:
     /// Also again, at the same address; whether it is there.
     bool start() {
         std::filesystem::remove(scratch_.path("bus"));
-        scratch_.write("services/org.a11y.Bus.service", "[D-BUS Service]\nName=org.a11y.Bus\nExec=/usr/bin/touch " +
-                                                            scratch_.path("started") + "\n");
+        scratch_.write("services/org.a11y.Bus.service",
+                       "[D-BUS Service]\nName=org.a11y.Bus\nExec=/usr/bin/touch " + scratch_.path("started") + "\n");
         scratch_.write("bus.conf", "<busconfig><type>session</type><listen>" + address() + "</listen><servicedir>" +
                                        scratch_.path("services") +
                                        "</servicedir><policy context=\"default\"><allow send_destination=\"*\"/>"
@@ -97,11 +97,13 @@ private:
 
     void announce(bool value) {
         sd_bus_message* made = nullptr;
-        sd_bus_message_new_signal(bus_.get(), &made, "/org/a11y/bus", "org.freedesktop.DBus.Properties", "PropertiesChanged");
+        sd_bus_message_new_signal(bus_.get(), &made, "/org/a11y/bus", "org.freedesktop.DBus.Properties",
+                                  "PropertiesChanged");
         const BusMessage signal(made);
         if (how_ == Announce::Value)
             sd_bus_message_append(made, "sa{sv}as", "org.a11y.Status", 1, "ScreenReaderEnabled", "b", value ? 1 : 0, 0);
-        else sd_bus_message_append(made, "sa{sv}as", "org.a11y.Status", 0, 1, "ScreenReaderEnabled");
+        else
+            sd_bus_message_append(made, "sa{sv}as", "org.a11y.Status", 0, 1, "ScreenReaderEnabled");
         sd_bus_send(bus_.get(), made, nullptr);
     }
 

@@ -11,14 +11,16 @@ class SoundThemesTest : public ::testing::Test {
 protected:
     void theme(const ScratchDirectory& data, const std::string& name, const std::string& parents = "",
                const std::string& folders = "stereo") {
-        data.write("sounds/" + name + "/index.theme", "[Sound Theme]\nName=" + name + "\nInherits=" + parents +
-                                                          "\nDirectories=" + folders +
-                                                          "\n[stereo]\nOutputProfile=stereo\n[surround]\nOutputProfile=5.1\n");
+        data.write("sounds/" + name + "/index.theme",
+                   "[Sound Theme]\nName=" + name + "\nInherits=" + parents + "\nDirectories=" + folders +
+                       "\n[stereo]\nOutputProfile=stereo\n[surround]\nOutputProfile=5.1\n");
     }
     void wanted(const std::string& name) {
         config_.write("gtk-3.0/settings.ini", "[Settings]\ngtk-sound-theme-name=" + name + "\n");
     }
-    std::string sound(const ScratchDirectory& data, const std::string& name) { return data.write("sounds/" + name, "x"); }
+    std::string sound(const ScratchDirectory& data, const std::string& name) {
+        return data.write("sounds/" + name, "x");
+    }
     std::vector<std::string> files(const std::vector<std::string>& names) { return themes_.files(names); }
     using Files = std::vector<std::string>;
 
@@ -41,8 +43,8 @@ TEST_F(SoundThemesTest, AThemeIsAskedBeforeItsParentsAndFreedesktopLast) {
     theme(system_, "second");
     theme(system_, "grand");
     theme(system_, "freedesktop");
-    const Files expected{sound(system_, "child/stereo/bell.oga"),  sound(system_, "first/stereo/bell.oga"),
-                         sound(system_, "grand/stereo/bell.oga"),  sound(system_, "second/stereo/bell.oga"),
+    const Files expected{sound(system_, "child/stereo/bell.oga"),       sound(system_, "first/stereo/bell.oga"),
+                         sound(system_, "grand/stereo/bell.oga"),       sound(system_, "second/stereo/bell.oga"),
                          sound(system_, "freedesktop/stereo/bell.oga"), sound(system_, "bell.wav")};
     EXPECT_EQ(files({"bell"}), expected);
 }

@@ -201,7 +201,7 @@ TEST_F(LinuxStoreLookupTest, NamesAreInTheUsersLanguage) {
     EXPECT_EQ(nameOf("com.example.Clock"), "Clock");
     options_.locale = "de_AT";
     EXPECT_EQ(nameOf("com.example.Clock"), "Uhr");
-    EXPECT_EQ(find(requestFor({"com.example.Clock"}))[0].artistName, "Kunst");
+    EXPECT_EQ(find(requestFor({"com.example.Clock"})).at(0).artistName, "Kunst");
     EXPECT_EQ(nameOf("com.example.Clock", 0), "Clock");
     options_.locale = "pt_BR";
     EXPECT_EQ(nameOf("com.example.Clock"), "Relógio");
@@ -222,7 +222,8 @@ TEST_F(LinuxStoreLookupTest, AnApplicationIsFoundByWhateverNamesItsEntry) {
 }
 
 TEST_F(LinuxStoreLookupTest, TheLinkIsTheHomepageOnTheWebOrTheSoftwareCentres) {
-    write(component("a", "A", "<url type=\"homepage\">http://a.example/</url><url type=\"bugtracker\">https://b.example/</url>") +
+    write(component("a", "A",
+                    "<url type=\"homepage\">http://a.example/</url><url type=\"bugtracker\">https://b.example/</url>") +
           component("b", "B", "<url type=\"bugtracker\">https://b.example/</url>") +
           component("c", "C", "<url type=\"homepage\">file:///etc/passwd</url>"));
     EXPECT_EQ(find(requestFor({"a"})).at(0).shortProductURL, "http://a.example/");
@@ -238,8 +239,9 @@ TEST_F(LinuxStoreLookupTest, GenresAreTheMainCategoriesOrAsTheyAreWritten) {
 }
 
 TEST_F(LinuxStoreLookupTest, CataloguesInYamlCountToo) {
-    scratch_.write("yaml/test.yml", "---\nFile: DEP-11\nVersion: '0.14'\nOrigin: test\n---\nType: desktop-application\n"
-                                    "ID: com.example.Clock\nPackage: x\nName:\n  C: Clock\nSummary:\n  C: It is one\n");
+    scratch_.write("yaml/test.yml",
+                   "---\nFile: DEP-11\nVersion: '0.14'\nOrigin: test\n---\nType: desktop-application\n"
+                   "ID: com.example.Clock\nPackage: x\nName:\n  C: Clock\nSummary:\n  C: It is one\n");
     EXPECT_EQ(nameOf("com.example.Clock"), "Clock");
 }
 
@@ -255,7 +257,8 @@ TEST_F(LinuxStoreLookupTest, ABrokenCatalogueTakesNothingFromTheOthers) {
 TEST_F(LinuxStoreLookupTest, WhatIsNoIdentifierIsNotAskedFor) {
     const std::string heard = scratch_.path("heard");
     useScript("for word; do echo \"$word\"; done >" + heard + "; echo '[]'");
-    find(requestFor({"", "-x-is-allowed", std::string(256, 'a'), "a b", "a\nb", "../x", "\xc3\xa4", std::string("a\0b", 3)}));
+    find(requestFor(
+        {"", "-x-is-allowed", std::string(256, 'a'), "a b", "a\nb", "../x", "\xc3\xa4", std::string("a\0b", 3)}));
     EXPECT_EQ(ScratchDirectory::read(heard), "--locale\nen\n--catalog\n" + scratch_.path() + "\n--\n-x-is-allowed\n");
     find(requestFor(std::vector<std::string>(100, "a")));
     const std::string asked = ScratchDirectory::read(heard);
@@ -329,8 +332,9 @@ TEST_F(LinuxStoreLookupTest, NoMoreThanThirtyTwoWait) {
 
 TEST_F(LinuxStoreLookupTest, TheProgramGetsNothingButItsOwnEnvironment) {
     ASSERT_EQ(::setenv("LC_TEST_SECRET", "1", 1), 0);
-    useScript("[ -z \"$LC_TEST_SECRET\" ] && [ \"$LC_ALL\" = C.UTF-8 ] && [ -z \"$DBUS_SESSION_BUS_ADDRESS$DISPLAY\" ] && "
-              "echo '[{\"name\":\"Clock\"}]'");
+    useScript(
+        "[ -z \"$LC_TEST_SECRET\" ] && [ \"$LC_ALL\" = C.UTF-8 ] && [ -z \"$DBUS_SESSION_BUS_ADDRESS$DISPLAY\" ] && "
+        "echo '[{\"name\":\"Clock\"}]'");
     EXPECT_EQ(find(requestFor({"a"})).size(), 1u);
     ::unsetenv("LC_TEST_SECRET");
 }

@@ -1,10 +1,10 @@
 #include <gtest/gtest.h>
 
+#include <unistd.h>
 #include <cmath>
 #include <functional>
 #include <numbers>
 #include <thread>
-#include <unistd.h>
 
 #include "linux/sounds/LinuxSystemSounds.h"
 #include "tests/contract/MonitorSound.h"
@@ -32,7 +32,8 @@ std::string toneFile(double frequency, double seconds) {
     put(16, 4), put(1, 2), put(1, 2), put(44100, 4), put(88200, 4), put(2, 2), put(16, 2);
     file += "data", put(frames * 2, 4);
     for (std::uint32_t frame = 0; frame < frames; ++frame)
-        put(static_cast<std::uint16_t>(std::lround(16000 * std::sin(2 * std::numbers::pi * frequency * frame / 44100))), 2);
+        put(static_cast<std::uint16_t>(std::lround(16000 * std::sin(2 * std::numbers::pi * frequency * frame / 44100))),
+            2);
     return file;
 }
 

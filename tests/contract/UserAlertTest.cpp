@@ -107,6 +107,7 @@ TEST_P(RealDialogTest, AKilledProgramRefuses) {
     for (const int signal : {SIGKILL, SIGTERM, SIGUSR1, SIGUSR2, SIGSEGV}) {
         answer_ = Answer();
         ASSERT_NO_FATAL_FAILURE(show(twoButtons()));
+        ASSERT_GT(dialog_.pid, 1);  // -1 would be everybody
         ::kill(dialog_.pid, signal);
         EXPECT_EQ(answer_.wait(), Response::OtherButton) << "signal " << signal;
     }

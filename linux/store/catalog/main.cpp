@@ -45,17 +45,23 @@ std::optional<Arguments> argumentsFrom(const std::vector<std::string_view>& word
             return arguments;
         }
         if (at + 1 == words.size()) break;
-        if (words[at] == "--locale") arguments.locale = words[++at];
-        else if (words[at] == "--catalog") arguments.catalogs.emplace_back(words[++at]);
-        else break;
+        if (words[at] == "--locale")
+            arguments.locale = words[++at];
+        else if (words[at] == "--catalog")
+            arguments.catalogs.emplace_back(words[++at]);
+        else
+            break;
     }
     return std::nullopt;
 }
 
 /// Bytes of other people are read here: whatever they lead to ends soon.
 void limitThisProcess() {
-    constexpr rlimit kMemory{2ull << 30, 2ull << 30}, kSeconds{30, 30};
+#ifndef LC_SANITIZED  // a sanitizer maps far more than it uses
+    constexpr rlimit kMemory{2ull << 30, 2ull << 30};
     ::setrlimit(RLIMIT_AS, &kMemory);
+#endif
+    constexpr rlimit kSeconds{30, 30};
     ::setrlimit(RLIMIT_CPU, &kSeconds);
     ::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0);
 }
@@ -63,8 +69,8 @@ void limitThisProcess() {
 Owned<AsPool> openCatalogs(const Arguments& arguments) {
     Owned<AsPool> pool(as_pool_new());
     as_pool_set_locale(pool.get(), arguments.locale.c_str());
-    as_pool_set_flags(pool.get(), static_cast<AsPoolFlags>(AS_POOL_FLAG_LOAD_OS_CATALOG | AS_POOL_FLAG_LOAD_OS_METAINFO |
-                                                           AS_POOL_FLAG_LOAD_FLATPAK));
+    as_pool_set_flags(pool.get(), static_cast<AsPoolFlags>(AS_POOL_FLAG_LOAD_OS_CATALOG |
+                                                           AS_POOL_FLAG_LOAD_OS_METAINFO | AS_POOL_FLAG_LOAD_FLATPAK));
     if (!arguments.catalogs.empty()) as_pool_set_load_std_data_locations(pool.get(), FALSE);
     for (const std::string& catalog : arguments.catalogs)
         as_pool_add_extra_data_location(pool.get(), catalog.c_str(), AS_FORMAT_STYLE_CATALOG);
@@ -123,7 +129,8 @@ Array genresOf(AsComponent* component) {
     }
     if (!genres.empty()) return genres;
     const GPtrArray* const written = as_component_get_categories(component);
-    for (guint i = 0; written && i < written->len; ++i) genres.emplace_back(static_cast<const char*>(written->pdata[i]));
+    for (guint i = 0; written && i < written->len; ++i)
+        genres.emplace_back(static_cast<const char*>(written->pdata[i]));
     return genres;
 }
 
@@ -133,8 +140,10 @@ Value describe(AsComponent* component) {
     if (const char* developer = as_component_get_developer_name(component)) product.set("developer", developer);
     const char* const homepage = as_component_get_url(component, AS_URL_KIND_HOMEPAGE);
     const std::string_view page = homepage ? homepage : "";
-    if (page.starts_with("https://") || page.starts_with("http://")) product.set("link", page);
-    else product.set("link", std::string("appstream:") + as_component_get_id(component));
+    if (page.starts_with("https://") || page.starts_with("http://"))
+        product.set("link", page);
+    else
+        product.set("link", std::string("appstream:") + as_component_get_id(component));
     if (Array genres = genresOf(component); !genres.empty()) product.set("genres", std::move(genres));
     return product;
 }
