@@ -29,7 +29,7 @@ enum Circumstance : unsigned {
     kFaults = 1,          ///< one call of the platform in forty fails
     kMovingScreen = 2,    ///< each frame is a new picture
     kFullResolution = 4,  ///< the preference that lifts the limit of the size
-    kAsking = 8,          ///< the preference that suppresses the question is not set: no start may succeed
+    kAsking = 8,          ///< the preference that suppresses the question is not set: the user is asked
     kEntitled = 16,       ///< the first application may record the whole display
     kTablet = 32,
     kInterleaving = 64,  ///< tasks give way to each other in their midst, which costs a change of threads each time
@@ -124,6 +124,7 @@ private:
     /// The device does something.
     void disturb() {
         const unsigned what = in_.byte();
+        if (what >= 250) return answerTheQuestion(what % 3);
         const auto source = fakes().displayCapture.lastSource();
         switch (what % 10) {
             case 0: fakes().storagePurge.requestPurge(what / 10 % 5, [](const std::optional<PurgeRecord>&) {}); break;
@@ -145,7 +146,13 @@ private:
         }
     }
 
+    void answerTheQuestion(unsigned button) {
+        const auto response = static_cast<UserAlert::Response>(button);
+        if (fakes().userAlerts.answer(response) && response != UserAlert::Response::OtherButton) userHasGranted_ = true;
+    }
+
     void checkAlways() {
+        require(fakes().userAlerts.standing() <= 1, "the user is asked one thing at a time");
         require(!fakes().keepAlive.endedWithoutBegin(), "a transaction ends once");
         int running = 0;
         for (const auto& source : fakes().displayCapture.sources()) {
@@ -189,7 +196,7 @@ private:
                     "a transaction is open while a recording is, and no longer");
         }
         require(recording <= 1, "one application records at a time");
-        require(recording == 0 || !is(kAsking), "nobody records without having been asked");
+        require(recording == 0 || !is(kAsking) || userHasGranted_, "nobody records without having been asked");
         require(anUnansweredClip() || fakes().keepAlive.open() == recording,
                 "a transaction is open while a recording is, and no longer");
         checkNobodyWaits();
@@ -209,13 +216,31 @@ private:
         }
     }
 
+    /// A recording of the whole display outlives its client, and so does the session of one that has ended.
+    std::size_t wholeDisplaySessions() {
+        const Dictionary snapshot = daemon_.snapshot();
+        const Array& sessions = *snapshot.find("sessions")->as<Array>();
+        return static_cast<std::size_t>(std::count_if(sessions.begin(), sessions.end(), [](const Value& entry) {
+            return *entry.as<Dictionary>()->find("wholeDisplay")->as<bool>();
+        }));
+    }
+    void endSystemRecording() {
+        if (wholeDisplaySessions() == 0) return;
+        SimulatedApplication& player = players_.front();
+        if (!player.isAlive()) player.startAgain(ProcessID{static_cast<std::int32_t>(1000 + ++incarnation_)});
+        player.connect();
+        player.ask(DaemonMessage::StopRecording);
+        pass(milliseconds(300));
+    }
+
     void checkFiles() {
         const std::string folder = fakes().fileSystem.temporaryDirectory() + "/";
         std::set<std::string> allowed;
         for (const char* name : {"Alpha", "Beta"})
             for (const char* ending : {".mp4", "_trimmed.mp4"}) allowed.insert(folder + name + ending);
         for (const std::string& path : fakes().fileSystem.files())
-            require(allowed.contains(path), "no message makes a file with another name");
+            require(allowed.contains(path) || path.starts_with(folder + "ScreenRecording_"),
+                    "no message makes a file with another name");
     }
 
     /// Nothing stands in the way any more; then everybody goes.
@@ -223,15 +248,18 @@ private:
         fakes().faults.clear();
         fakes().fileSystem.setFreeSize(kPlenty);
         pass(milliseconds(300));  // each frame of a recording costs, and nothing takes longer
+        // The user refuses whatever is asked still.
+        while (fakes().userAlerts.answer(UserAlert::Response::OtherButton)) pass(milliseconds(10));
         checkAlways();
         checkAtRest();
+        endSystemRecording();
         for (SimulatedApplication& player : players_) player.die();
         pass(seconds(2));
         checkAlways();
         checkNobodyWaits();
         require(fakes().keepAlive.open() == 0, "no transaction is left open");
         require(fakes().renderServer.portsOpen() == 0, "no port is left open");
-        require(daemon_.sessionCount() == 0, "no session is left");
+        require(daemon_.sessionCount() == wholeDisplaySessions(), "no session is left");
         for (const auto& source : fakes().displayCapture.sources())
             require(!source->isRunning(), "nothing is captured for nobody");
         checkMovies();
@@ -244,6 +272,7 @@ private:
     const unsigned circumstances_;
     std::deque<SimulatedApplication> players_;
     int incarnation_ = 0;
+    bool userHasGranted_ = false;
 };
 
 }  // namespace

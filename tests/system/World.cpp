@@ -104,7 +104,7 @@ checkers::FramesLog Application::framesLog() const {
     return log.value_or(checkers::FramesLog{});
 }
 
-World::World(Consent consent) : display_("1280x800x24") {
+World::World(Consent consent, const std::string& screen) : display_(screen) {
     std::string pattern = (fs::temp_directory_path() / "lumacast-XXXXXX").string();
     EXPECT_TRUE(::mkdtemp(pattern.data()));
     folder_ = pattern;

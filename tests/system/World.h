@@ -62,7 +62,8 @@ class World {
 public:
     enum class Consent { Suppressed, Asked };
 
-    explicit World(Consent consent = Consent::Suppressed);
+    /// `screen` is the display's size, as "1280x800x24".
+    explicit World(Consent consent = Consent::Suppressed, const std::string& screen = "1280x800x24");
     ~World();
     World(const World&) = delete;
     World& operator=(const World&) = delete;
