@@ -77,21 +77,24 @@ void ActiveWindow::watch(bool wanted) {
     xcb_flush(connection_.get());
 }
 
-bool ActiveWindow::concerns(const xcb_generic_event_t& event) const {
+ActiveWindow::Change ActiveWindow::meaningOf(const xcb_generic_event_t& event) const {
     switch (event.response_type & 0x7F) {
         case XCB_PROPERTY_NOTIFY: {
             const xcb_atom_t atom = reinterpret_cast<const xcb_property_notify_event_t&>(event).atom;
-            return atom == activeWindow_ || atom == managerCheck_;
+            // With the window manager the windows that count come or go.
+            if (atom == clientList_ || atom == managerCheck_) return Change::Windows;
+            return atom == activeWindow_ ? Change::Active : Change::None;
         }
         case XCB_MAP_NOTIFY:
+        case XCB_REPARENT_NOTIFY:
+            return Change::Windows;
         case XCB_UNMAP_NOTIFY:
         case XCB_DESTROY_NOTIFY:
         case XCB_CONFIGURE_NOTIFY:  // also another order
         case XCB_CIRCULATE_NOTIFY:
-        case XCB_REPARENT_NOTIFY:
-            return true;
+            return Change::Active;
         default:
-            return false;
+            return Change::None;
     }
 }
 

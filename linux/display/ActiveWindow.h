@@ -21,8 +21,9 @@ public:
 
     /// Lets events come that may mean another active window, or no longer.
     void watch(bool wanted);
-    /// Whether it is such an event.
-    bool concerns(const xcb_generic_event_t& event) const;
+    /// What an event may mean; Windows also another active one.
+    enum class Change { None, Active, Windows };
+    Change meaningOf(const xcb_generic_event_t& event) const;
 
 private:
     bool hasWindowManager();

@@ -10,8 +10,8 @@ namespace {
 
 using x11::X11Connection;
 
-// Applications whose end is waited for, at most.
-constexpr std::size_t kMostSeen = 64;
+// Processes whose end is waited for, at most.
+constexpr std::size_t kMostSeen = 256;
 
 bool contains(const std::vector<ProcessID>& processes, ProcessID pid) {
     return std::find(processes.begin(), processes.end(), pid) != processes.end();
@@ -114,8 +114,9 @@ void X11AppStateMonitor::watch(X11Connection* connection, bool wanted) {
     if (connection == nullptr) return;
     activeWindow_->watch(wanted);
     if (!wanted) return;
+    rememberOwnersOfWindows(*connection);
     front_ = frontProcess(*connection);
-    if (front_) remember(*front_);
+    if (front_ && !remember(*front_)) front_.reset();
 }
 
 std::optional<ProcessID> X11AppStateMonitor::frontProcess(X11Connection& connection) {
@@ -129,29 +130,51 @@ x11::HeldProcess* X11AppStateMonitor::remembered(ProcessID pid) {
     return found == seen_.end() ? nullptr : &*found;
 }
 
-void X11AppStateMonitor::remember(ProcessID pid) {
-    if (remembered(pid) != nullptr) return;
-    if (seen_.size() >= kMostSeen) seen_.erase(seen_.begin());
-    if (auto process = x11::HeldProcess::hold(pid)) seen_.push_back(std::move(*process));
+/// False for one that has ended.
+bool X11AppStateMonitor::remember(ProcessID pid) {
+    if (const x11::HeldProcess* const known = remembered(pid)) return !known->ended();
+    auto process = x11::HeldProcess::hold(pid);
+    if (!process) return false;
+    if (seen_.size() >= kMostSeen) {
+        // The one that has been there for the longest time, but never the one in front.
+        const auto oldest =
+            std::find_if(seen_.begin(), seen_.end(), [&](const auto& each) { return each.pid() != front_; });
+        seen_.erase(oldest);
+    }
+    seen_.push_back(std::move(*process));
+    return true;
+}
+
+void X11AppStateMonitor::rememberOwnersOfWindows(X11Connection& connection) {
+    for (const ProcessID owner : x11::ownersOf(connection, activeWindow_->applicationWindows())) remember(owner);
 }
 
 void X11AppStateMonitor::eventsMayHaveCome(X11Connection& connection) {
-    bool any = false;
+    using Change = x11::ActiveWindow::Change;
+    Change change = Change::None;
     while (const x11::Owned<xcb_generic_event_t> event{xcb_poll_for_event(connection.get())})
-        any |= activeWindow_->concerns(*event);
-    if (any && watching_) lookForChange(connection);
+        change = std::max(change, activeWindow_->meaningOf(*event));
+    if (change == Change::None || !watching_) return;
+    if (change == Change::Windows) rememberOwnersOfWindows(connection);
+    lookForChange(connection);
+}
+
+bool X11AppStateMonitor::areOneApplication(ProcessID one, ProcessID other) const {
+    const auto identifier = identifierOf_(one);
+    return identifier && identifier == identifierOf_(other);
 }
 
 void X11AppStateMonitor::lookForChange(X11Connection& connection) {
-    const auto now = frontProcess(connection);
+    auto now = frontProcess(connection);
+    // The server may still have the window of a process that has ended.
+    if (now && !remember(*now)) now.reset();
     if (now == front_) return;
     const auto before = std::exchange(front_, now);
     // One that has ended is told of when its end is seen.
     const x11::HeldProcess* const left = before ? remembered(*before) : nullptr;
-    if (left != nullptr && !left->ended()) tell(kRunningBackground, false, *before);
-    if (!now) return;
-    tell(kRunningForeground, true, *now);
-    remember(*now);
+    if (left != nullptr && !left->ended() && !(now && areOneApplication(*before, *now)))
+        tell(kRunningBackground, false, *before);
+    if (now) tell(kRunningForeground, true, *now);
 }
 
 std::vector<int> X11AppStateMonitor::descriptors() {

@@ -19,6 +19,10 @@ namespace lumacast {
 /// An application is in the foreground when one of its processes owns the active window. A tool that has no windows is
 /// in the foreground when the active window belongs to one of its ancestors (the terminal it was started from), or when
 /// nothing is active.
+///
+/// While somebody listens, the updates are: another application has come to the front or left it, also where none is in
+/// front before or after; another process of the same application is in front now (one that nobody has left); and the end
+/// of a process that had a window, in front or not.
 class X11AppStateMonitor final : public AppStateMonitor, private x11::QuestionLaneObserver {
 public:
     /// The other bit that this monitor gives: the application runs, but not in the foreground.
@@ -54,7 +58,9 @@ private:
     void watch(x11::X11Connection* connection, bool wanted);
     std::optional<ProcessID> frontProcess(x11::X11Connection& connection);
     x11::HeldProcess* remembered(ProcessID pid);
-    void remember(ProcessID pid);
+    bool remember(ProcessID pid);
+    void rememberOwnersOfWindows(x11::X11Connection& connection);
+    bool areOneApplication(ProcessID one, ProcessID other) const;
     void lookForChange(x11::X11Connection& connection);
     std::uint32_t stateOf(x11::X11Connection& connection, const BundleIdentifier& identifier);
     bool isToolInFront(x11::X11Connection& connection, const std::vector<ProcessID>& processes,
@@ -70,7 +76,7 @@ private:
     std::unique_ptr<x11::ActiveWindow> activeWindow_;
     bool watching_ = false;
     std::optional<ProcessID> front_;
-    std::vector<x11::HeldProcess> seen_;  ///< those that were in front and have not ended
+    std::vector<x11::HeldProcess> seen_;  ///< those with windows that have not ended
 
     std::unique_ptr<x11::QuestionLane> lane_;  // last: its thread uses what stands above
 };

@@ -262,6 +262,24 @@ protected:
             return property && property->value_len == 1;
         }));
     }
+    std::shared_ptr<Updates> listen() {
+        auto updates = std::make_shared<Updates>();
+        SerialQueue& queue = world_.mainQueue();
+        monitor_.setHandler([updates, &queue](std::int64_t state, bool frontmost, ProcessID pid) {
+            updates->add({state, frontmost, pid}, queue.isCurrent());
+        });
+        return updates;
+    }
+    /// Has the window manager activate a window, again and again: a request for one that it has not taken note of yet
+    /// is lost.
+    void activate(ContextID window, const BundleIdentifier& front, const BundleIdentifier& behind) {
+        EXPECT_TRUE(becomes([&] {
+            const test::ChildProcess command({"xdotool", "windowactivate", std::to_string(number(window))}, -1,
+                                             {"DISPLAY=" + world_.display().name()});
+            becomes([&] { return command.ended(); });
+            return isInFront(monitor_, front) && isBehind(monitor_, behind);
+        }));
+    }
     PortAppStateWorld world_;
     AppStateMonitor& monitor_ = world_.monitor();
 };
@@ -326,6 +344,98 @@ TEST_F(X11AppState, BelievesTheWindowManager) {
     EXPECT_TRUE(comesToFront(world_.first()->window(), kFirst, kSecond));
     EXPECT_TRUE(becomes([&] { return updates->has(true, world_.first()->pid()); }));
     EXPECT_TRUE(becomes([&] { return isInFront(monitor_, kTool); })) << "its ancestor is";
+}
+
+TEST_F(X11AppState, TellsWhenAnApplicationEndsThatWasNeverInFront) {
+    world_.openTwoApplications();
+    const auto updates = listen();
+    ASSERT_TRUE(becomes([&] { return isInFront(monitor_, kFirst); }));
+    const ProcessID second = world_.second()->pid();
+    world_.second().reset();
+    EXPECT_TRUE(becomes([&] { return updates->has(false, second, AppStateMonitor::kEnded); }));
+    EXPECT_EQ(updates->count(), 1u) << "and nothing else has changed";
+}
+
+TEST_F(X11AppState, AnotherWindowOfTheSameProcessIsNoChange) {
+    world_.openTwoApplications();
+    const auto updates = listen();
+    ASSERT_TRUE(becomes([&] { return isInFront(monitor_, kFirst); }));
+    const ProcessID self{::getpid()};
+    test::TestWindow one(world_.display().name(), {}), another(world_.display().name(), {});
+    ASSERT_TRUE(becomes([&] { return updates->has(true, self); }));
+    one.raise();
+    another.raise();
+    world_.bringSecondToFront();
+    EXPECT_TRUE(becomes([&] { return updates->has(true, world_.second()->pid()); }));
+    EXPECT_TRUE(updates->has(false, self));
+    EXPECT_EQ(updates->count(), 4u) << "to this process and on to the second application";
+}
+
+TEST_F(X11AppState, AnotherProcessOfTheSameApplicationTakesOverWithoutAnyoneLeaving) {
+    world_.openTwoApplications();
+    world_.name(kFirst, {world_.first()->pid(), world_.second()->pid()});
+    const auto updates = listen();
+    ASSERT_TRUE(becomes([&] { return monitor_.applicationProcess(kFirst) == world_.first()->pid(); }));
+    world_.bringSecondToFront();
+    EXPECT_TRUE(becomes([&] { return updates->has(true, world_.second()->pid()); }));
+    EXPECT_TRUE(isInFront(monitor_, kFirst));
+    EXPECT_EQ(monitor_.applicationProcess(kFirst), world_.second()->pid()) << "the one in front";
+    world_.mainQueue().sync([] {});
+    EXPECT_EQ(updates->count(), 1u) << "the application has not left the front";
+}
+
+TEST_F(X11AppState, TellsOfTheFrontComingFromNothingAndGoingBackToIt) {
+    const auto updates = listen();
+    ASSERT_TRUE(becomes([&] { return !monitor_.frontmostApplication(); }));
+    const test::XClientProcess application(world_.display().name());
+    world_.name(kFirst, {application.pid()});
+    EXPECT_TRUE(becomes([&] { return updates->has(true, application.pid(), AppStateMonitor::kRunningForeground); }));
+    EXPECT_TRUE(becomes([&] { return monitor_.frontmostApplication() == kFirst; }));
+    test::TestWindow helper(world_.display().name(), {.mapped = false});
+    xcb_unmap_window(helper.connection(), number(application.window()));
+    helper.sync();
+    EXPECT_TRUE(becomes([&] { return updates->has(false, application.pid()); }));
+    EXPECT_FALSE(updates->has(false, application.pid(), AppStateMonitor::kEnded));
+    EXPECT_EQ(monitor_.frontmostApplication(), std::nullopt);
+    xcb_map_window(helper.connection(), number(application.window()));
+    helper.sync();
+    EXPECT_TRUE(becomes([&] { return updates->count() == 3; })) << "and forth again";
+}
+
+TEST_F(X11AppState, AWindowManagerMayComeAndGo) {
+    world_.openTwoApplications();
+    const auto updates = listen();
+    ASSERT_TRUE(becomes([&] { return isInFront(monitor_, kFirst); }));
+    {
+        test::ChildProcess manager({"openbox", "--config-file", "/dev/null"}, -1, {"DISPLAY=" + world_.display().name()});
+        waitForManager();
+        activate(world_.second()->window(), kSecond, kFirst);
+        EXPECT_TRUE(becomes([&] { return updates->has(true, world_.second()->pid()); }));
+        activate(world_.first()->window(), kFirst, kSecond);
+        manager.end(SIGKILL);
+    }
+    // Its properties are left over and say nothing any more; what is on top counts again.
+    test::TestWindow own(world_.display().name(), {});
+    EXPECT_TRUE(becomes([&] { return updates->has(true, ProcessID{::getpid()}); }));
+    own.unmap();
+    EXPECT_TRUE(becomes([&] { return monitor_.frontmostApplication().has_value(); }));
+    world_.bringSecondToFront();
+    EXPECT_TRUE(becomes([&] { return isInFront(monitor_, kSecond) && isBehind(monitor_, kFirst); }));
+}
+
+TEST_F(X11AppState, TheEndOfTheApplicationInFrontIsToldWithAWindowManagerToo) {
+    const test::ChildProcess manager({"openbox", "--config-file", "/dev/null"}, -1,
+                                     {"DISPLAY=" + world_.display().name()});
+    waitForManager();
+    world_.openTwoApplications();
+    activate(world_.first()->window(), kFirst, kSecond);
+    const auto updates = listen();
+    ASSERT_TRUE(becomes([&] { return isInFront(monitor_, kFirst); }));
+    const ProcessID first = world_.first()->pid();
+    world_.first().reset();
+    EXPECT_TRUE(becomes([&] { return updates->has(false, first, AppStateMonitor::kEnded); }));
+    EXPECT_TRUE(becomes([&] { return updates->has(true, world_.second()->pid()); })) << "the manager's choice";
+    EXPECT_FALSE(updates->has(true, first)) << "it does not come back";
 }
 
 TEST(X11AppStateWithoutDisplay, AnswersZero) {
