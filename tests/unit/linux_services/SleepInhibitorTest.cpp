@@ -125,7 +125,13 @@ TEST(SleepInhibitor, ManyShortRecordingsLeaveNoLockBehind) {
     const PrivateBus bus;
     const StandInLoginManager manager(bus.address());
     SleepInhibitor inhibitor(optionsFor(bus));
-    for (int i = 0; i < 500; ++i) inhibitor.setBusy(i % 2 == 0);
+    for (int i = 0; i < 50; ++i) {
+        const std::size_t before = manager.locks().size();
+        inhibitor.setBusy(true);
+        // A lock has been given; the answer may still be on its way.
+        ASSERT_TRUE(until([&] { return manager.locks().size() > before; }));
+        inhibitor.setBusy(false);
+    }
     EXPECT_TRUE(until([&] { return noneIsHeld(manager); }));
     inhibitor.setBusy(true);
     EXPECT_TRUE(until([&] { return bothAreHeld(manager); }));
