@@ -7,6 +7,7 @@
 #include <filesystem>
 #include <fstream>
 
+#include "tests/contract/SmallDisk.h"
 #include "tests/system/World.h"
 
 namespace lumacast::test {
@@ -96,6 +97,28 @@ TEST(Storage, APurgeAtEachUrgencyDoesWhatItShould) {
 
     EXPECT_EQ(world.endDaemon(SIGTERM), 0);
     EXPECT_EQ(tool(world, {"storage", "list"}).status, 1);
+}
+
+TEST(Storage, WhereLessThanARecordingNeedsIsFreeNoneBegins) {
+    World world;
+    const std::filesystem::path folder = std::filesystem::path(world.moviePath()).parent_path();
+    std::filesystem::create_directories(folder);
+    const auto refusedOn = [&](const std::string& room) {
+        bool refused = false;
+        const bool isMounted = withSmallDisk(folder, room, [&] {
+            world.startDaemon();
+            const auto application = world.application({"--size", "320x180", "--fps", "10"});
+            EXPECT_TRUE(application->waitForFrame(1));
+            const std::string answer = application->ask("start");
+            refused = answer.starts_with("error -5805");
+            EXPECT_TRUE(refused || answer.starts_with("started")) << answer;
+            EXPECT_EQ(world.endDaemon(SIGTERM), 0);
+        });
+        EXPECT_TRUE(isMounted) << "this process may not mount anything";
+        return refused;
+    };
+    EXPECT_TRUE(refusedOn("90m"));
+    EXPECT_FALSE(refusedOn("200m"));
 }
 
 }  // namespace

@@ -6,6 +6,7 @@
 #include "client/lumacastctl/doctor/Display.h"
 #include "client/lumacastctl/doctor/Encoders.h"
 #include "client/lumacastctl/doctor/Preferences.h"
+#include "client/lumacastctl/doctor/Question.h"
 #include "client/lumacastctl/doctor/Resources.h"
 #include "client/lumacastctl/doctor/Sound.h"
 #include "client/lumacastctl/doctor/Storage.h"
@@ -37,6 +38,7 @@ Findings examine(const LinuxEnvironment& environment, const LinuxEnvironment::Va
     add(checkIdentity(probeIdentity(bundles, options, question)));
     add(checkEntitlements(probeEntitlements(bundles, Entitlements::directoriesFrom(environment), question)));
     add(checkPreferences(probePreferences(environment.configDirectories)));
+    add(checkQuestion(probeQuestion(environment.searchPath)));
     add(checkStorage(probeStorage(environment.root, daemon.temporaryDirectory)));
     add(checkResources(probeResources(bundles, environment.dataHome)));
     add(checkDaemon(daemon));

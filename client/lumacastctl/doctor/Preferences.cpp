@@ -67,17 +67,15 @@ Findings checkFiles(const std::vector<File>& files) {
 
 Finding checkSuppressAlert(const PreferenceFacts& facts) {
     const Preference& preference = facts.suppressAlert;
-    const std::string refused = "so every start is refused with -5801, as this daemon can't ask the user yet";
-    const std::string file = facts.files.empty() ? "the preference file" : facts.files.front().path;
     const bool* flag = flagOf(preference);
     if (flag && *flag)
         return ok(kSubject, preferenceText("LCSuppressAlert", preference) +
                                 ": applications may record themselves without the user being asked.");
-    if (preference.value && !flag) return notAFlag("LCSuppressAlert", preference, Severity::Problem, refused);
-    return problem(kSubject,
-                   (flag ? preferenceText("LCSuppressAlert", preference) : std::string("LCSuppressAlert is not set")) +
-                       ", " + refused + "; write LCSuppressAlert=true into " + file +
-                       " (a line before any [section]). It counts from the next start on.");
+    if (preference.value && !flag)
+        return notAFlag("LCSuppressAlert", preference, Severity::Warning, "so it counts as not set");
+    return ok(kSubject,
+              (flag ? preferenceText("LCSuppressAlert", preference) : std::string("LCSuppressAlert is not set")) +
+                  ": the user is asked before an application records itself.");
 }
 
 Finding checkBitRate(const Preference& preference) {

@@ -1,4 +1,5 @@
 #include "client/lumacastctl/doctor/Preferences.h"
+#include "client/lumacastctl/doctor/Question.h"
 
 #include "tests/contract/ScratchDirectory.h"
 #include "tests/unit/lumacastctl/FindingMatchers.h"
@@ -27,13 +28,11 @@ protected:
     ScratchDirectory scratch_;
 };
 
-TEST_F(DoctorPreferences, WithoutFilesTellWhereTheyWouldBeAndThatStartsAreRefused) {
+TEST_F(DoctorPreferences, WithoutFilesTellWhereTheyWouldBeAndThatTheUserIsAsked) {
     const Findings findings = findingsOn(nullptr);
     EXPECT_THAT(findings,
                 Contains(Finds(kOk, "no file is there; looked for " + usersFile() + ", " + administratorsFile())));
-    EXPECT_THAT(findings,
-                Contains(Finds(kProblem, "LCSuppressAlert is not set, so every start is refused with -5801")));
-    EXPECT_THAT(findings, Contains(Finds(kProblem, "write LCSuppressAlert=true into " + usersFile())));
+    EXPECT_THAT(findings, Contains(Finds(kOk, "LCSuppressAlert is not set: the user is asked")));
     EXPECT_THAT(findings, Contains(Finds(kOk, "LCBitRateOverride is not set")));
     EXPECT_THAT(findings, Contains(Finds(kOk, "LCFullResCapture is not set")));
 }
@@ -48,15 +47,15 @@ TEST_F(DoctorPreferences, ThatAreSetAreToldWithTheFileThatDecides) {
     EXPECT_THAT(findings, Contains(Finds(kOk, "LCBitRateOverride=8000000 (" + usersFile() + ")")));
 }
 
-TEST_F(DoctorPreferences, ThatSuppressNothingAreAProblem) {
+TEST_F(DoctorPreferences, ThatSuppressNothingLetTheUserBeAsked) {
     EXPECT_THAT(findingsOn("LCSuppressAlert=false\n", "LCSuppressAlert=true\n"),
-                Contains(Finds(kProblem, "LCSuppressAlert=false (" + usersFile() + "), so every start is refused")));
+                Contains(Finds(kOk, "LCSuppressAlert=false (" + usersFile() + "): the user is asked")));
 }
 
 TEST_F(DoctorPreferences, OfTheWrongKindAreFound) {
     const Findings findings = findingsOn("LCSuppressAlert=1\nLCBitRateOverride=fast\nLCFullResCapture=2\n");
     EXPECT_THAT(findings,
-                Contains(Finds(kProblem, "LCSuppressAlert=1 (" + usersFile() + ") is neither true nor false")));
+                Contains(Finds(kWarning, "LCSuppressAlert=1 (" + usersFile() + ") is neither true nor false")));
     EXPECT_THAT(findings, Contains(Finds(kWarning, "LCBitRateOverride=\"fast\" (" + usersFile() + ") is no bit rate")));
     EXPECT_THAT(findings,
                 Contains(Finds(kWarning, "LCFullResCapture=2 (" + usersFile() + ") is neither true nor false")));
@@ -64,7 +63,7 @@ TEST_F(DoctorPreferences, OfTheWrongKindAreFound) {
 
 TEST_F(DoctorPreferences, BehindASectionDoNotCount) {
     EXPECT_THAT(findingsOn("[General]\nLCSuppressAlert=true\n"),
-                Contains(Finds(kProblem, "a line before any [section]")));
+                Contains(Finds(kOk, "LCSuppressAlert is not set")));
 }
 
 TEST_F(DoctorPreferences, InAFileThatCannotBeReadAreMissing) {
@@ -76,7 +75,18 @@ TEST_F(DoctorPreferences, InAFileThatIsTooLargeAreMissing) {
     const std::string large = "LCSuppressAlert=true\n#" + std::string(64 * 1024, 'x');
     const Findings findings = findingsOn(large.c_str());
     EXPECT_THAT(findings, Contains(Finds(kWarning, usersFile() + " counts as missing")));
-    EXPECT_THAT(findings, Contains(Finds(kProblem, "LCSuppressAlert is not set")));
+    EXPECT_THAT(findings, Contains(Finds(kOk, "LCSuppressAlert is not set")));
+}
+
+TEST(DoctorQuestion, IsAskedByTheAdministratorsProgramAlone) {
+    EXPECT_THAT(checkQuestion(probeQuestion({"/usr/local/bin", "/usr/bin", "/bin"})),
+                Contains(Finds(kOk, "the user is asked by /usr/bin/")));
+    const ScratchDirectory scratch;
+    EXPECT_THAT(checkQuestion(probeQuestion({scratch.path()})),
+                Contains(Finds(kProblem, "neither yad nor zenity is in the PATH")));
+    std::filesystem::permissions(scratch.write("yad", "#!/bin/sh\n"), std::filesystem::perms::all);
+    EXPECT_THAT(checkQuestion(probeQuestion({scratch.path()})),
+                Contains(Finds(kProblem, scratch.path("yad") + " is not the administrator's")));
 }
 
 }  // namespace

@@ -145,7 +145,7 @@ TEST_F(Tool, FindsProblemsWhereThereIsNothing) {
     EXPECT_EQ(result.status, 3);
     EXPECT_EQ(result.complaints, "");
     EXPECT_THAT(result.out, HasSubstr("problem display: DISPLAY is not set"));
-    EXPECT_THAT(result.out, HasSubstr("problem preferences: LCSuppressAlert is not set"));
+    EXPECT_THAT(result.out, HasSubstr("ok      preferences: LCSuppressAlert is not set"));
     EXPECT_THAT(result.out, HasSubstr("problem daemon: it isn't running"));
     EXPECT_THAT(result.out, HasSubstr("ok      identity: process " + std::to_string(::getpid())));
 }
