@@ -4,10 +4,12 @@
 #include <sysexits.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "base/Limits.h"
 #include "linux/accessibility/LinuxScreenReader.h"
@@ -137,7 +139,11 @@ public:
 private:
     /// At the end of the process, waiting for no lane.
     void closeMovies() {
-        for (const media::ClosedMovie& movie : writers_.closeOpenMovies())
+        // A recording that ended by itself, whose movie nobody has asked for, has had its summary: only the newest ones run.
+        const auto running = static_cast<std::size_t>(keepAlive_.openTransactions());
+        const auto closed = writers_.closeOpenMovies();
+        const auto first = closed.end() - static_cast<std::ptrdiff_t>(std::min(running, closed.size()));
+        for (const media::ClosedMovie& movie : std::vector(first, closed.end()))
             reportEndedWithProcess(telemetry_, {movie.seconds, movie.width, movie.height, movie.pictures, movie.bytes});
         telemetry_.flush(kTimeToNote);
     }

@@ -54,7 +54,9 @@ std::optional<BundleIdentifier> X11AppStateMonitor::frontmostApplication() {
         const auto active = frontProcess(connection);
         return active ? identifierOf_(*active) : std::nullopt;
     };
-    return lane_->ask<Answer>(question, std::nullopt);
+    const Answer answer = lane_->ask<Answer>(question, std::nullopt);
+    answered_ = kAnsweredNobody;
+    return answer;
 }
 
 std::optional<ProcessID> X11AppStateMonitor::applicationProcess(const BundleIdentifier& identifier) {
@@ -65,7 +67,9 @@ std::optional<ProcessID> X11AppStateMonitor::applicationProcess(const BundleIden
         const auto processes = processesOf_(identifier);
         return processes.empty() ? std::nullopt : std::optional(processes.front());
     };
-    return lane_->ask<Answer>(question, std::nullopt);
+    const Answer answer = lane_->ask<Answer>(question, std::nullopt);
+    answered_ = answer ? number(*answer) : kAnsweredNobody;
+    return answer;
 }
 
 std::uint32_t X11AppStateMonitor::stateOf(X11Connection& connection, const BundleIdentifier& identifier) {
@@ -105,7 +109,8 @@ void X11AppStateMonitor::connected(X11Connection& connection) {
     lookForChange(connection);
 }
 
-// Without a server the next connection takes note. Only changes are told: not who is in front at first.
+// Without a server the next connection takes note. Only changes are told: not who is in front at first, unless it is
+// another one than was answered last.
 void X11AppStateMonitor::watch(X11Connection* connection, bool wanted) {
     if (wanted == watching_) return;
     watching_ = wanted;
@@ -117,6 +122,8 @@ void X11AppStateMonitor::watch(X11Connection* connection, bool wanted) {
     rememberOwnersOfWindows(*connection);
     front_ = frontProcess(*connection);
     if (front_ && !remember(*front_)) front_.reset();
+    const std::int32_t answered = answered_.exchange(kNotAsked);
+    if (front_ && answered != kNotAsked && answered != number(*front_)) tell(kRunningForeground, true, *front_);
 }
 
 std::optional<ProcessID> X11AppStateMonitor::frontProcess(X11Connection& connection) {

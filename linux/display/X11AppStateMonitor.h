@@ -1,6 +1,7 @@
 #pragma once
 // What applications are doing, as an X11 desktop sees it.
 
+#include <atomic>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -71,6 +72,9 @@ private:
     const ProcessesOf processesOf_;
     Scheduler& scheduler_;
     const std::shared_ptr<Listener> listener_ = std::make_shared<Listener>();
+
+    static constexpr std::int32_t kNotAsked = 0, kAnsweredNobody = -1;
+    std::atomic<std::int32_t> answered_{kNotAsked};  ///< who was said to be in front last, since the watch began
 
     // Of the lane alone.
     std::unique_ptr<x11::ActiveWindow> activeWindow_;

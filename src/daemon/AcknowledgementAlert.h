@@ -19,8 +19,8 @@ struct AcknowledgementRequest {
     bool camera = false;
 };
 
-/// The alert's texts in the user's language. A text that is not installed is its key; an application without a name is
-/// its identifier. Answers within what the Bundles role takes.
+/// The alert's texts in the user's language. A text that is not installed is deliberately its key, so that
+/// every button has one; an application without a name is its identifier. Answers within what the Bundles role takes.
 AlertContent acknowledgementAlertContent(Localization& localization, const AcknowledgementRequest& request);
 
 /// One alert: asked and waited for on the alert queue, taken down from the request lane. Asks once.
@@ -31,7 +31,7 @@ public:
     /// Shows the alert and waits for the user without limit: on the alert queue only. None when it can't be shown; the
     /// other button, shown or not, when it was cancelled.
     std::optional<UserAlert::Response> ask(const AlertContent& content);
-    /// Takes the alert down; one that is not shown yet never is. Any lane; does not block.
+    /// Takes the alert down; one that is about to be shown may be seen for a moment. Any lane; does not block.
     void cancel();
     bool isCancelled() const;
 

@@ -85,8 +85,8 @@ void LCRecordingManager::applicationDisconnectedWithBundleID(const BundleIdentif
     log_.line("LCRecordingManager: applicationDisconnected");
     const auto session = registeredSession(bundleID);
     if (!session) return;
-    if (session->isSystemRecording()) {
-        // A system recording deliberately goes on without its client.
+    if (session->isSystemRecording() && !session->isDead()) {
+        // A system recording deliberately goes on without its client, and its session stays when it has ended.
         if (const auto proxy = session->clientProxy()) proxy->setConnection(nullptr);
         cancelOrphanedQuestions();
         return;

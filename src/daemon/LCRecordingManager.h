@@ -205,6 +205,11 @@ private:
 
     // Starting.
     bool checkContextIDsMatch(const std::vector<ContextID>& contextIDs);
+    bool checkContextIDsMatch(const std::vector<ContextID>& contextIDs, const std::optional<BundleIdentifier>& caller);
+    /// What a request may not record; none when it may. Asked again when the user has answered: a window's number may be
+    /// another application's by then.
+    using Refusal = std::pair<RecordingErrorCode, std::string_view>;
+    std::optional<Refusal> whyNotAllowed(const WaitingStart& start, const std::optional<BundleIdentifier>& caller);
     using WaitingStartRef = std::shared_ptr<WaitingStart>;
     void startProper(const WaitingStartRef& start);
     /// `showAcknowledgementAlertForSession:` — goes on with the start once the user has acknowledged the recording, at

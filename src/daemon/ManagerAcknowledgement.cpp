@@ -1,6 +1,7 @@
 // Asking the user before a recording. The alert queue shows the alert and waits; everything else is the request lane's.
 
 #include <algorithm>
+#include <utility>
 
 #include "base/Limits.h"
 #include "daemon/LCRecordingManager.h"
@@ -24,17 +25,20 @@ void LCRecordingManager::showAcknowledgementAlertForSession(const WaitingStartRe
 void LCRecordingManager::askNext() {
     while (!isAsking_ && !waitingStarts_.empty()) {
         const auto start = waitingStarts_.front();
-        microphoneRecording_ = start->request.microphoneEnabled;
-        cameraRecording_ = start->request.cameraEnabled;
+        // While it waits, the flags are those of whoever has begun.
+        const bool microphone = std::exchange(microphoneRecording_, start->request.microphoneEnabled);
+        const bool camera = std::exchange(cameraRecording_, start->request.cameraEnabled);
         if (isExemptFromAcknowledgementAlertSession(*start->session)) {
             // While it waited, the user has acknowledged another start of the application.
             waitingStarts_.pop_front();
             continueAcknowledged(start);
             continue;
         }
+        microphoneRecording_ = microphone;
+        cameraRecording_ = camera;
         isAsking_ = true;
         const AcknowledgementRequest request{start->session->bundleID(), start->session->isCapturing(),
-                                             microphoneRecording_, cameraRecording_};
+                                             start->request.microphoneEnabled, start->request.cameraEnabled};
         lumaAlertQueue().async([self = shared_from_this(), start, request] {
             const auto response = start->alert->ask(acknowledgementAlertContent(self->services_.localization, request));
             self->onRequestLane([self, start, response] { self->takeAnswer(start, response); });
@@ -48,13 +52,17 @@ void LCRecordingManager::takeAnswer(const WaitingStartRef& start, std::optional<
     // An answer about a client that is not there any more has no effect.
     if (!isStillWanted(*start)) {
         refuse(*start, RecordingErrorCode::FailedToStart, "the client has gone while the user was asked");
+    } else if (const auto reason = whyNotAllowed(*start, start->session->bundleID())) {
+        refuse(*start, reason->first, reason->second);
     } else {
         // Other starts have set them meanwhile.
-        microphoneRecording_ = start->request.microphoneEnabled;
-        cameraRecording_ = start->request.cameraEnabled;
+        const bool microphone = std::exchange(microphoneRecording_, start->request.microphoneEnabled);
+        const bool camera = std::exchange(cameraRecording_, start->request.cameraEnabled);
         if (acknowledge(*start->session, response)) {
             continueAcknowledged(start);
         } else {
+            microphoneRecording_ = microphone;
+            cameraRecording_ = camera;
             log_.line("user declined");
             refuse(*start, RecordingErrorCode::UserDeclined,
                    response ? "the user does not want it" : "the user can't be asked");

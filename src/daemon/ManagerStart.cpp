@@ -18,7 +18,11 @@ bool isSize(Size size) {
 }  // namespace
 
 bool LCRecordingManager::checkContextIDsMatch(const std::vector<ContextID>& contextIDs) {
-    const auto caller = getCallingConnectionBundleID();
+    return checkContextIDsMatch(contextIDs, getCallingConnectionBundleID());
+}
+
+bool LCRecordingManager::checkContextIDsMatch(const std::vector<ContextID>& contextIDs,
+                                              const std::optional<BundleIdentifier>& caller) {
     for (const ContextID contextID : contextIDs) {
         auto port = platform_.renderServer.clientPort(contextID);
         if (!port) return false;
@@ -48,21 +52,27 @@ void LCRecordingManager::startRecording(const StartRequest& request, StartHandle
     start->number = ++requestNumber_;
     start->handler = std::move(handler);
     const auto& session = start->session;
-    if (request.systemRecording) {
-        const auto proxy = session ? session->clientProxy() : nullptr;
-        const auto connection = proxy ? proxy->connection() : nullptr;
-        const auto granted = connection ? connection->valueForEntitlement(kSystemRecordingEntitlement) : std::nullopt;
-        const bool* entitled = granted ? granted->as<bool>() : nullptr;
-        if (!entitled || !*entitled)
-            return refuse(*start, RecordingErrorCode::Entitlements, "the application lacks the entitlement");
-    } else if (!checkContextIDsMatch(request.windowLayerContextIDs)) {
-        return refuse(*start, RecordingErrorCode::FailedToStart, "a window layer is not the application's own");
-    }
+    if (const auto reason = whyNotAllowed(*start, getCallingConnectionBundleID()))
+        return refuse(*start, reason->first, reason->second);
     if (!isSize(request.windowSize) || (session && !session->canCaptureSize(request.windowSize)))
         return refuse(*start, RecordingErrorCode::FailedToStart, "the window size is none");
     log_.line(
         "LCRecordingManager:startRecordingWindowLayerContextID:windowSize:microphoneEnabled:streaming:withHandler:");
     stopCurrentRecordingSessionWithHandler([this, start] { startProper(start); });
+}
+
+std::optional<LCRecordingManager::Refusal> LCRecordingManager::whyNotAllowed(
+    const WaitingStart& start, const std::optional<BundleIdentifier>& caller) {
+    if (!start.request.systemRecording) {
+        if (checkContextIDsMatch(start.request.windowLayerContextIDs, caller)) return std::nullopt;
+        return Refusal{RecordingErrorCode::FailedToStart, "a window layer is not the application's own"};
+    }
+    const auto proxy = start.session ? start.session->clientProxy() : nullptr;
+    const auto connection = proxy ? proxy->connection() : nullptr;
+    const auto granted = connection ? connection->valueForEntitlement(kSystemRecordingEntitlement) : std::nullopt;
+    const bool* entitled = granted ? granted->as<bool>() : nullptr;
+    if (entitled && *entitled) return std::nullopt;
+    return Refusal{RecordingErrorCode::Entitlements, "the application lacks the entitlement"};
 }
 
 void LCRecordingManager::startProper(const WaitingStartRef& start) {
@@ -109,6 +119,7 @@ void LCRecordingManager::beginRecording(const WaitingStartRef& start) {
     }
     log_.line("broadcast disabled");
     session->disableBroadcast();
+    session->managerRecord.user = start->connection->userIdentifier();
     session->setRecording(true);
     session->setIsBroadcasting(request.broadcast);
     interruptOtherRecordingSessionAgainstSession(session);

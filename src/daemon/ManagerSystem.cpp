@@ -27,8 +27,7 @@ void LCRecordingManager::clearSystemRecordingUI(const LCRecordingSession& sessio
 void LCRecordingManager::addSystemRecordingToLibrary(const LCRecordingSession& session,
                                                      const std::optional<URL>& movieURL, const PathClaim& claim,
                                                      std::function<void(std::optional<Error>)> added) {
-    const auto connection = session.managerRecord.connection;
-    const UserID user = connection ? connection->userIdentifier() : platform_.fileSystem.user();
+    const UserID user = session.managerRecord.user.value_or(platform_.fileSystem.user());
     platform_.scheduler.globalQueue(QueuePriority::Default)
         .async([self = shared_from_this(), movieURL, claim, user, added = std::move(added)]() mutable {
             std::optional<Error> error;
@@ -70,6 +69,7 @@ void LCRecordingManager::stopSystemRecordingWithHandler(SystemStopHandler handle
             session, 0, 0,
             [self = shared_from_this(), session = session, claim = claimOf(*session), handler](
                 const std::optional<URL>& url, const std::optional<Error>& error) {
+                if (!handler) return;
                 if (!url) return handler(session, url, error);
                 self->addSystemRecordingToLibrary(
                     *session, url, claim, [self, session, handler, url, error](const std::optional<Error>& failure) {

@@ -8,6 +8,7 @@ Process::Process(const Platform& platform, LCRecordingManager::SessionMaker make
       tempStore_(platform_),
       localization_(platform_.bundles),
       errors_(localization_),
+      storeManager_(platform_, localization_),
       captureManager_(LCCaptureManager::init(platform_)),
       alertQueue_(platform_.scheduler) {
     manager_ = LCRecordingManager::init(

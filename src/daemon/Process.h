@@ -6,6 +6,7 @@
 #include "daemon/LCClientProxy.h"
 #include "daemon/LCRecordingManager.h"
 #include "platform/Platform.h"
+#include "support/LCStoreManager.h"
 #include "support/Localization.h"
 #include "support/RecordingErrors.h"
 #include "support/TempStore.h"
@@ -29,11 +30,15 @@ public:
     /// `+clientProxy` — the proxy of nobody, the same one at every call. Nothing uses it.
     const std::shared_ptr<LCClientProxy>& clientProxy();
 
+    /// `sharedManager` of LCStoreManager.
+    LCStoreManager& storeManager() { return storeManager_; }
+
 private:
     const Platform platform_;
     TempStore tempStore_;
     Localization localization_;
     RecordingErrors errors_;
+    LCStoreManager storeManager_;
     const std::shared_ptr<LCCaptureManager> captureManager_;
     AlertQueue alertQueue_;
     std::once_flag clientProxyOnce_;

@@ -25,7 +25,8 @@ public:
     virtual std::optional<BundleIdentifier> frontmostApplication() = 0;
     /// A process of the application, the one in front if it has one there; none when it does not run.
     virtual std::optional<ProcessID> applicationProcess(const BundleIdentifier& identifier) = 0;
-    /// Whom to tell of updates, on the main queue; an empty handler for nobody. One handler at a time.
+    /// Whom to tell of updates, on the main queue; an empty handler for nobody. One handler at a time. What was answered
+    /// just before counts as known: only what differs from it is told.
     virtual void setHandler(Handler handler) = 0;
 };
 

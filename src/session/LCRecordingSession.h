@@ -72,6 +72,8 @@ public:
     void setRecording(bool recording) {
         recordingState_ = (((recordingState_ >> 1) + 1) << 1) | static_cast<std::uint64_t>(recording);
     }
+    /// The media services were reset: it never delivers another frame.
+    bool isDead() const { return shouldStop_; }
     bool isPaused() const { return paused_; }
     void setPaused(bool paused) { paused_ = paused; }
     bool isSystemRecording() const { return systemRecording_; }
@@ -230,6 +232,7 @@ public:
         std::vector<std::uint64_t> stopsUnderWay;     ///< the starts whose stop may still be answered
         /// The accepted connection, kept while it is lost too: the proxy's messages then still end in their errors.
         std::shared_ptr<IpcConnection> connection;
+        std::optional<UserID> user;  ///< whose client began the last recording
 
         bool hasTransactionOf(std::uint64_t generation) const {
             return std::find(openTransactions.begin(), openTransactions.end(), generation) != openTransactions.end();

@@ -9,6 +9,7 @@
 #include <filesystem>
 #include <memory>
 #include <mutex>
+#include <thread>
 #include <utility>
 
 #include "client/Recorder.h"
@@ -28,6 +29,7 @@ using Clock = std::chrono::steady_clock;
 constexpr milliseconds kLook{100};
 constexpr milliseconds kLine{500};
 constexpr milliseconds kStopPatience{60'000};
+constexpr milliseconds kFarewell{500};
 constexpr char kClearLine[] = "\r\033[K";
 
 /// What the daemon answers and tells, from the recorder's thread.
@@ -58,6 +60,11 @@ private:
 int notRecorded(std::FILE* complaints, const std::string& reason) {
     complain(complaints, "the display is not recorded: " + printable(reason));
     return kNotRecorded;
+}
+
+std::string whereItIs(const std::string& path) {
+    if (path.empty()) return "What was recorded is in the daemon's folder; see `lumacastctl storage`.";
+    return "What was recorded was written to " + printable(path) + ", or is in the Videos folder.";
 }
 
 /// The line that changes. Elsewhere than on a terminal it is not shown.
@@ -145,8 +152,22 @@ int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& requ
     });
     LiveLine line(progress, complaints);
     line.show("The user may be asked first…");
-    while (!answers->known().start)
-        if (stopWished(kLook)) return notRecorded(complaints, "it was stopped before it began.");
+    while (!answers->known().start) {
+        if (!stopWished(kLook)) continue;
+        // It may begin at this moment, and would go on without anybody: the daemon is told to stop it, and does so before
+        // the connection ends.
+        recorder.stop([answers](client::StopAnswer answer) {
+            answers->change([&](Answers::Known& known) { known.stop = std::move(answer); });
+        });
+        const auto wished = Clock::now();
+        const auto isOver = [&] {
+            const auto known = answers->known();
+            return known.stop || (known.start && known.start->error);
+        };
+        while (!isOver() && Clock::now() - wished < (answers->known().start ? kStopPatience : kFarewell))
+            std::this_thread::sleep_for(kLook / 10);
+        return notRecorded(complaints, "it was stopped before it began.");
+    }
     line.clear();
     if (const auto error = answers->known().start.value_or(client::StartAnswer{}).error) {
         const auto code = client::recordingCodeOf(*error);
@@ -159,18 +180,21 @@ int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& requ
     const auto begun = Clock::now();
     auto nextLine = begun;
     bool isWished = false;
+    std::string path;  ///< where the daemon writes it
     while (!isWished) {
         const auto known = answers->known();
         if (known.hasStopped || known.isDisconnected) break;
         const auto now = Clock::now();
         if (request.duration.count() > 0 && now - begun >= request.duration) break;
-        if (progress == Screen::Terminal && now >= nextLine) {
+        if (now >= nextLine) {
             nextLine = now + kLine;
             const auto answer = askAdminService(runtimeDirectory + "/admin.sock", "status", kLine);
             const auto status = answer ? readStatus(*answer) : std::variant<DaemonStatus, std::string>("");
             if (const auto* daemon = std::get_if<DaemonStatus>(&status))
-                if (const auto recording = displayRecording(*daemon))
+                if (const auto recording = displayRecording(*daemon)) {
+                    path = recording->path.value_or(path);
                     line.show(recordLine(*recording) + "   (q or Ctrl-C stops)");
+                }
         }
         auto wait = kLook;
         if (request.duration.count() > 0)
@@ -180,10 +204,12 @@ int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& requ
     line.clear();
 
     auto known = answers->known();
-    if (known.isDisconnected) return complain(complaints, "the daemon has ended; its recording is in its folder.");
+    if (known.isDisconnected)
+        return complain(complaints, "the connection to the daemon was lost; the recording may go on. " + whereItIs(path));
     if (known.hasStopped) {
         complain(complaints, "the recording was ended by the daemon: " +
-                                 printable(known.stopError ? client::textOf(*known.stopError) : "no reason given"));
+                                 printable(known.stopError ? client::textOf(*known.stopError) : "no reason given") +
+                                 "\n" + whereItIs(path));
         if (known.stopMovie) std::fprintf(out, "%s\n", known.stopMovie->path().c_str());
         return kNotRecorded;
     }
@@ -200,6 +226,8 @@ int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& requ
                                                                    : "the daemon does not answer.";
         return notRecorded(complaints, reason);
     }
+    // The tool is in front no longer: the next time the user may be asked again.
+    recorder.didResignActive();
     const std::string movie = known.stop->movie->path();
     if (request.output.empty()) return save(movie);
     if (const auto reason = moveMovie(movie, request.output)) {

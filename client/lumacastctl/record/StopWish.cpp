@@ -21,6 +21,8 @@ StopWish::StopWish() {
     sigemptyset(&wanted);
     sigaddset(&wanted, SIGINT);
     sigaddset(&wanted, SIGTERM);
+    sigaddset(&wanted, SIGHUP);  // the terminal has gone
+    sigaddset(&wanted, SIGQUIT);
     ::pthread_sigmask(SIG_BLOCK, &wanted, &mask_);
     signals_ = FileDescriptor(::signalfd(-1, &wanted, SFD_CLOEXEC | SFD_NONBLOCK));
     termios now{};

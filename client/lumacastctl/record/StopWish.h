@@ -11,7 +11,7 @@
 
 namespace lumacast::ctl {
 
-/// From its making to its end SIGINT and SIGTERM are wishes, and so are q, Enter and the space bar where standard input is
+/// From its making to its end SIGINT, SIGTERM, SIGHUP and SIGQUIT are wishes, and so are q, Enter and the space bar where standard input is
 /// a terminal; both are as they were afterwards, and wishes that nobody asked for are forgotten. One at a time.
 class StopWish final {
 public:

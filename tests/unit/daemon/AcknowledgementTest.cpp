@@ -230,6 +230,46 @@ TEST_F(Acknowledgement, FlagsOfAnotherStartWhileTheUserIsAskedAreNotMixedUp) {
     EXPECT_EQ(one->values[2], Value(false));
 }
 
+TEST_F(Acknowledgement, AnAcknowledgedStartIsNotToldOfTheMicrophoneThatTheNextOneWants) {
+    const auto first = makeConnected("Player", 500, 7), second = makeConnected("Editor", 501, 8);
+    for (const Response response : {Response::DefaultButton, Response::OtherButton}) {
+        const auto one = started(*first), two = started(*second, {.microphone = true, .camera = true});
+        answer(Response::DefaultButton);
+        EXPECT_EQ(one->code(), 0);
+        EXPECT_EQ(one->values[1], Value(false));
+        EXPECT_EQ(one->values[2], Value(false));
+        answer(response);
+        EXPECT_EQ(two->answers, 1);
+        EXPECT_FALSE(process_->manager().isMicrophoneRecording());
+        advance(std::chrono::seconds(1));
+        first->tell(DaemonMessage::ClientDidResignActive);
+        settle();
+        advance(std::chrono::seconds(500));
+        first->tell(DaemonMessage::ClientDidBecomeActive);  // it is to be asked about again
+        settle();
+    }
+}
+
+TEST_F(Acknowledgement, AWindowThatIsSomebodyElsesWhenTheUserHasAnsweredIsNotRecorded) {
+    const auto client = makeConnected();
+    const auto asked = started(*client);
+    fakes_.renderServer.addLayer(client->window, ProcessID{999});
+    answer(Response::DefaultButton);
+    EXPECT_EQ(asked->code(), -5803);
+    EXPECT_FALSE(session(*client)->isRecording());
+    EXPECT_FALSE(isExempt(*client));
+}
+
+TEST_F(Acknowledgement, AnEntitlementThatIsGoneWhenTheUserHasAnsweredCountsNoMore) {
+    const auto client = makeConnected();
+    fakes_.ipc.grant(client->pid, "com.orvane.private.luma-cast", true);
+    const auto asked = started(*client, {.system = true});
+    fakes_.ipc.grant(client->pid, "com.orvane.private.luma-cast", false);
+    answer(Response::DefaultButton);
+    EXPECT_EQ(asked->code(), -5810);
+    EXPECT_FALSE(session(*client)->isRecording());
+}
+
 TEST_F(Acknowledgement, ASecondStartOfTheSameApplicationIsNotAskedAboutOnceTheFirstIsAcknowledged) {
     const auto client = makeConnected();
     const auto one = started(*client), two = started(*client);

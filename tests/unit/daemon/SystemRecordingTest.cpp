@@ -77,6 +77,47 @@ TEST_F(SystemRecording, ItsClientMayGoAndComeBack) {
     EXPECT_TRUE(fakes_.fileSystem.exists(asked->url(0)->path()));
 }
 
+TEST_F(SystemRecording, ItWorksAgainAfterTheDisplayServerHasEnded) {
+    const auto client = makeSystemRecording();
+    fakes_.displayCapture.lastSource()->mediaServicesWereReset();
+    settle();
+    EXPECT_EQ(client->toldOfStop(-5817), 1);
+    client->connection->invalidate();
+    settle();
+    client->connect();
+    settle();
+    fakes_.ipc.grant(client->pid, "com.orvane.private.luma-cast", true);
+    ASSERT_EQ(started(*client)->code(), 0);
+    advance(seconds(2));
+    const auto asked = stopped(*client);
+    ASSERT_TRUE(asked->url(0));
+    const auto movie = fakes_.fileSystem.movie(asked->url(0)->path());
+    ASSERT_TRUE(movie);
+    EXPECT_GT(movie->tracks[0].samples.size(), 1u);
+}
+
+TEST_F(SystemRecording, OnlySystemRecordingsUnderWayAreToldThatTheyMayBeStopped) {
+    fakes_.displayCapture.setAutomatic(true);
+    const auto client = makeSystemRecording();
+    advance(seconds(1));
+    onRequestLane([](LCRecordingManager& manager) { manager.notifySystemRecordingMayBeStopped(); });
+    advance(seconds(1));
+    const auto cut = stopped(*client);
+    ASSERT_TRUE(cut->url(0));
+    EXPECT_NEAR(fakes_.fileSystem.movie(cut->url(0)->path())->duration().seconds(), 1, 0.1);
+    advance(seconds(1));
+    ASSERT_EQ(started(*client)->code(), 0);
+    advance(seconds(1));
+    onRequestLane([](LCRecordingManager& manager) {
+        manager.notifySystemRecordingMayBeStopped();
+        manager.notifySystemRecordingResumed();
+    });
+    advance(seconds(1));
+    const auto whole = stopped(*client);
+    ASSERT_TRUE(whole->url(0));
+    EXPECT_NEAR(fakes_.fileSystem.movie(whole->url(0)->path())->duration().seconds(), 2, 0.1);
+}
+
 TEST_F(SystemRecording, ItsSoundFollowsTheForeground) {
     const auto game = makeConnected("Game", 700, 70), player = makeConnected("Player", 701, 71);
     auto client = makeEntitled();
