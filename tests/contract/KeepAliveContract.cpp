@@ -33,7 +33,8 @@ public:
     bool isKeptAlive() override { return keepAlive_.openTransactions() > 0; }
 
 private:
-    LinuxKeepAlive keepAlive_{""};
+    // Where there is no bus, nobody is asked to keep the device awake, and nothing else is different.
+    LinuxKeepAlive keepAlive_{"", SleepInhibitor::Options{.busAddress = "unix:path=/no/such/bus", .beforeSleep = {}}};
 };
 
 using Maker = std::function<std::unique_ptr<KeepAliveWorld>()>;
