@@ -22,8 +22,8 @@ namespace lumacast {
 /// nothing is active.
 ///
 /// While somebody listens, the updates are: another application has come to the front or left it, also where none is in
-/// front before or after; another process of the same application is in front now (one that nobody has left); and the end
-/// of a process that had a window, in front or not.
+/// front before or after; another process of the same application is in front now, which nobody has left; and the end of
+/// a process that had a window, in front or not.
 class X11AppStateMonitor final : public AppStateMonitor, private x11::QuestionLaneObserver {
 public:
     /// The other bit that this monitor gives: the application runs, but not in the foreground.

@@ -13,8 +13,8 @@ struct EndedWithProcess {
     std::uint64_t bytes = 0;
 };
 
-/// Notes it: an event of the kind kClosedAtEndEvent, with the entries of a summary that the port knows and "interrupted"
-/// (-5806) as its end reason. The port does not know which kind of recording it was, so the service has no name.
+/// Notes it: an event of the kind kClosedAtEndEvent, with the entries of a summary that the port knows and as its end
+/// reason "interrupted" (-5806). The port does not know which kind of recording it was: the service has no name.
 void reportEndedWithProcess(TelemetryReporter& telemetry, const EndedWithProcess& recording);
 
 }  // namespace lumacast

@@ -30,8 +30,8 @@ public:
 
     /// Tells the service manager that the daemon answers its clients.
     void announceReady();
-    /// Tells it that the daemon ends of its own accord, and that its open movies may take `seconds` more to close. May be
-    /// told again, before these have passed.
+    /// Tells it that the daemon ends of its own accord, and that its open movies may take `seconds` more to close. May
+    /// be told again, before these have passed.
     void announceStopping(int seconds);
 
 private:

@@ -60,7 +60,9 @@ bool LoginLocks::process() {
     return result == 0;
 }
 
-void LoginLocks::disconnect() { bus_.reset(); }
+void LoginLocks::disconnect() {
+    bus_.reset();
+}
 
 void LoginLocks::letGo() {
     disconnect();

@@ -116,6 +116,8 @@ private:
 
 SleepInhibitor::SleepInhibitor(Options options) : lane_(std::make_unique<Lane>(std::move(options))) {}
 SleepInhibitor::~SleepInhibitor() = default;
-void SleepInhibitor::setBusy(bool busy) { lane_->setBusy(busy); }
+void SleepInhibitor::setBusy(bool busy) {
+    lane_->setBusy(busy);
+}
 
 }  // namespace lumacast

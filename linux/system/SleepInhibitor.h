@@ -11,13 +11,13 @@ namespace lumacast {
 /// Asks the login manager (org.freedesktop.login1 on the system bus) for two locks while the daemon is busy:
 ///  - "sleep" in the mode "delay": the device waits a few seconds until what was recorded is safe. It is not kept from
 ///    sleeping: who closes the lid or presses the button means it.
-///  - "idle" in the mode "block": a device that nobody touches is not put to sleep in the middle of a recording, which may
-///    run without anybody touching it.
+///  - "idle" in the mode "block": a device that nobody touches is not put to sleep in the middle of a recording, which
+///    may run without anybody touching it.
 /// Shutting down needs no lock: the daemon is told to end, and given the time to close its movies.
 ///
-/// Everything happens on a thread of its own, which is made with the first busy moment and sleeps when the daemon is idle:
-/// then it holds no lock and no connection. Without a bus, or a login manager on it, there is nothing but another try
-/// every now and then while the daemon is busy.
+/// Everything happens on a thread of its own, which is made with the first busy moment and sleeps when the daemon is
+/// idle: then it holds no lock and no connection. Without a bus, or a login manager on it, there is nothing but another
+/// try every now and then while the daemon is busy.
 class SleepInhibitor final {
 public:
     struct Options {

@@ -407,7 +407,8 @@ TEST_F(X11AppState, AWindowManagerMayComeAndGo) {
     const auto updates = listen();
     ASSERT_TRUE(becomes([&] { return isInFront(monitor_, kFirst); }));
     {
-        test::ChildProcess manager({"openbox", "--config-file", "/dev/null"}, -1, {"DISPLAY=" + world_.display().name()});
+        test::ChildProcess manager({"openbox", "--config-file", "/dev/null"}, -1,
+                                   {"DISPLAY=" + world_.display().name()});
         waitForManager();
         activate(world_.second()->window(), kSecond, kFirst);
         EXPECT_TRUE(becomes([&] { return updates->has(true, world_.second()->pid()); }));

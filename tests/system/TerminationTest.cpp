@@ -122,7 +122,8 @@ TEST_F(Termination, WithAMainLaneThatIsStuckIsNoDifferent) {
 /// The service manager's end of the notify socket.
 class Manager {
 public:
-    explicit Manager(const std::string& path) : socket_(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0)) {
+    explicit Manager(const std::string& path)
+        : socket_(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0)) {
         sockaddr_un address{};
         address.sun_family = AF_UNIX;
         path.copy(address.sun_path, sizeof address.sun_path - 1);
@@ -197,7 +198,8 @@ TEST(TerminationOfASave, AtAnyMomentLeavesTheMovieInOnePlaceAtLeast) {
         const std::string movie = world.makeMovie("two " + std::to_string(i) + ".mp4", {440, 880});
         const auto before = world.library();
         auto saved = std::async(std::launch::async, [&] { return world.save(movie); });
-        ASSERT_TRUE(waitUntil([&] { return world.countInLog("saveVideoToCameraRoll") > 0 || !world.saveStates().empty(); }));
+        ASSERT_TRUE(
+            waitUntil([&] { return world.countInLog("saveVideoToCameraRoll") > 0 || !world.saveStates().empty(); }));
         if (i > 0) {
             // Later each time: when the mixed movie is there, when the copy is begun, when it is done.
             ASSERT_TRUE(waitUntil([&] {

@@ -142,7 +142,8 @@ TEST_F(Usage, AWindowThatGoesIsAFailedCapture) {
     xcb_flush(helper.connection());
     EXPECT_THAT(application->nextEvent(), HasSubstr("stopped -5817"));
     expectSummaryWithFile(newEvent(), -5817);
-    EXPECT_THAT(tool(world_, {"usage"}).out, HasSubstr("  the capture failed: its window or the display is gone (-5817)\n"));
+    EXPECT_THAT(tool(world_, {"usage"}).out,
+                HasSubstr("  the capture failed: its window or the display is gone (-5817)\n"));
 }
 
 TEST_F(Usage, ADisplayServerThatDiesIsAFailedCapture) {

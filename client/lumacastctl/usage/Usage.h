@@ -18,7 +18,7 @@ struct UsageEntry {
     std::optional<std::uint64_t> width, height;  ///< pixels
     std::optional<std::uint64_t> rate;           ///< frames a second, at most
     std::optional<std::uint64_t> frames;
-    std::optional<std::uint64_t> soundBuffers;       ///< of the application
+    std::optional<std::uint64_t> soundBuffers;  ///< of the application
     std::optional<std::uint64_t> microphoneBuffers;
     std::optional<std::uint64_t> fileBytes;
     std::optional<std::int64_t> endReason;

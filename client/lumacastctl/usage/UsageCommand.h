@@ -11,8 +11,8 @@ namespace lumacast::ctl {
 inline constexpr std::chrono::seconds kUsageLimit{65};
 
 /// `lumacastctl usage`: asks the daemon whose runtime directory this is for the recordings that have ended and prints
-/// them to `out`, or to `complaints` why there is no answer and what to do. Answers the process's exit status. Blocks for
-/// at most `limit`.
+/// them to `out`, or to `complaints` why there is no answer and what to do. Answers the process's exit status. Blocks
+/// for at most `limit`.
 int showUsage(const std::string& runtimeDirectory, Form form, std::FILE* out, std::FILE* complaints,
               std::chrono::milliseconds limit = kUsageLimit);
 

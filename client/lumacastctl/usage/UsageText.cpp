@@ -6,7 +6,9 @@ namespace lumacast::ctl {
 
 namespace {
 
-std::string countText(const std::optional<std::uint64_t>& count) { return count ? std::to_string(*count) : "-"; }
+std::string countText(const std::optional<std::uint64_t>& count) {
+    return count ? std::to_string(*count) : "-";
+}
 
 /// Whole seconds: the daemon rounds.
 std::string secondsText(const std::optional<double>& seconds) {

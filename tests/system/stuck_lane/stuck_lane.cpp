@@ -1,6 +1,6 @@
 // A main lane that does not get anywhere: preloaded into the shipped daemon, which knows nothing of it. As long as the
-// file $LC_LANE_STUCK is there, the main thread waits where it asks for its next work, as it would in a call that hangs.
-// That it does tells the file $LC_LANE_STUCK.now.
+// file $LC_LANE_STUCK is there, the main thread waits where it asks for its next work, as it would in a call that
+// hangs. That it does tells the file $LC_LANE_STUCK.now.
 
 #include <dlfcn.h>
 #include <fcntl.h>

@@ -51,11 +51,11 @@ StandInLoginManager::StandInLoginManager(const std::string& busAddress)
         SD_BUS_SIGNAL("PrepareForSleep", "b", 0),
         SD_BUS_VTABLE_END,
     };
-    const bool isThere =
-        sd_bus_new(&bus_) >= 0 && sd_bus_set_address(bus_, busAddress.c_str()) >= 0 &&
-        sd_bus_set_bus_client(bus_, 1) >= 0 && sd_bus_negotiate_fds(bus_, 1) >= 0 && sd_bus_start(bus_) >= 0 &&
-        sd_bus_add_object_vtable(bus_, nullptr, kPath, kInterface, kTable, this) >= 0 &&
-        sd_bus_request_name(bus_, kName, 0) >= 0;
+    const bool isThere = sd_bus_new(&bus_) >= 0 && sd_bus_set_address(bus_, busAddress.c_str()) >= 0 &&
+                         sd_bus_set_bus_client(bus_, 1) >= 0 && sd_bus_negotiate_fds(bus_, 1) >= 0 &&
+                         sd_bus_start(bus_) >= 0 &&
+                         sd_bus_add_object_vtable(bus_, nullptr, kPath, kInterface, kTable, this) >= 0 &&
+                         sd_bus_request_name(bus_, kName, 0) >= 0;
     EXPECT_TRUE(isThere);
     if (isThere) thread_ = std::thread([this] { run(); });
 }

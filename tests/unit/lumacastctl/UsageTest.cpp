@@ -21,12 +21,17 @@ namespace {
 using ::testing::HasSubstr;
 
 Dictionary eventOf(const std::string& service, std::int64_t type, std::int64_t endReason, double time) {
-    const Dictionary payload{{"ActiveDuration", std::int64_t{3723}}, {"VideoCaptureWidth", std::int64_t{1280}},
-                             {"VideoCaptureHeight", std::int64_t{720}}, {"VideoCaptureRate", std::int64_t{60}},
-                             {"VideoFrameCount", std::int64_t{223'380}}, {"AppAudioFrameCount", std::int64_t{99}},
-                             {"MicFrameCount", std::int64_t{0}}, {"RecordedFileSize", std::uint64_t{12'345'678}},
+    const Dictionary payload{{"ActiveDuration", std::int64_t{3723}},
+                             {"VideoCaptureWidth", std::int64_t{1280}},
+                             {"VideoCaptureHeight", std::int64_t{720}},
+                             {"VideoCaptureRate", std::int64_t{60}},
+                             {"VideoFrameCount", std::int64_t{223'380}},
+                             {"AppAudioFrameCount", std::int64_t{99}},
+                             {"MicFrameCount", std::int64_t{0}},
+                             {"RecordedFileSize", std::uint64_t{12'345'678}},
                              {"EndReason", endReason}};
-    return {{"time", time}, {"serviceName", service}, {"category", std::int64_t{2}}, {"type", type}, {"payload", payload}};
+    return {
+        {"time", time}, {"serviceName", service}, {"category", std::int64_t{2}}, {"type", type}, {"payload", payload}};
 }
 
 Dictionary usageAnswer() {
@@ -76,16 +81,16 @@ TEST_F(Usage, WhatIsMissingFromTheTableIsCounted) {
     answer.set("damagedLines", std::uint64_t{1});
     answer.set("unreadableFiles", std::uint64_t{1});
     answer.set("lostEvents", std::uint64_t{1});
-    EXPECT_THAT(usageText(read(answer)),
-                HasSubstr("\n1 line is damaged and left out.\n1 file of the daemon's notes can't be read.\n1 line was lost "
-                          "since the daemon was started: its state directory could not be written.\n"));
+    EXPECT_THAT(
+        usageText(read(answer)),
+        HasSubstr("\n1 line is damaged and left out.\n1 file of the daemon's notes can't be read.\n1 line was lost "
+                  "since the daemon was started: its state directory could not be written.\n"));
     answer.set("events", Array{Value(3), Value(Dictionary{{"type", std::int64_t{1}}}), Value(Dictionary())});
     EXPECT_EQ(read(answer).damagedLines, 4u) << "what is no event counts too";
 }
 
 TEST_F(Usage, EventsOfOtherKindsArePassedOver) {
-    const UsageReport report =
-        read({{"events", Array{Value(eventOf("a", 7, 0, 0)), Value(eventOf("b", 1, 0, 0))}}});
+    const UsageReport report = read({{"events", Array{Value(eventOf("a", 7, 0, 0)), Value(eventOf("b", 1, 0, 0))}}});
     ASSERT_EQ(report.entries.size(), 1u);
     EXPECT_EQ(report.entries[0].service, "b");
     EXPECT_EQ(report.damagedLines, 0u);
@@ -118,9 +123,9 @@ TEST_F(Usage, AnswersThatAreNoneAreNotUnderstood) {
 
 /// The tool as it is built against the command as the daemon has it.
 TEST_F(Usage, TheToolShowsBothFilesOfTheStateDirectoryInTheirOrder) {
-    scratch_.write("state/lumacast/telemetry.jsonl.1", jsonText(eventOf("First", 1, 0, 1'700'000'000.0)) +
-                                                           "\n{\"type\":1,\"payl\n\n" +
-                                                           jsonText(eventOf("Second", 1, -5806, 1'700'000'001.0)) + "\n");
+    scratch_.write("state/lumacast/telemetry.jsonl.1",
+                   jsonText(eventOf("First", 1, 0, 1'700'000'000.0)) + "\n{\"type\":1,\"payl\n\n" +
+                       jsonText(eventOf("Second", 1, -5806, 1'700'000'001.0)) + "\n");
     scratch_.write("state/lumacast/telemetry.jsonl", jsonText(eventOf("Third", 1, 0, 1'700'000'002.0)) + "\n");
     LinuxTelemetry telemetry(scratch_.path("state/lumacast/telemetry.jsonl"));
     const StandInDaemon daemon(runtimeDirectory(), emptySnapshot, StandInDaemon::Lane::Runs,
@@ -147,9 +152,10 @@ TEST_F(Usage, TheToolSaysWhyThereIsNoAnswer) {
     EXPECT_EQ(none.status, kNoAnswer);
     EXPECT_EQ(none.out, "");
     EXPECT_THAT(none.complaints, HasSubstr("the daemon isn't running"));
-    const StandInDaemon daemon(
-        runtimeDirectory(), emptySnapshot, StandInDaemon::Lane::Runs,
-        {{"usage", [](const auto&, const AdminAnswer& answer) { answer({{"error", "not\x1B now"}}); }}});
+    const StandInDaemon daemon(runtimeDirectory(), emptySnapshot, StandInDaemon::Lane::Runs,
+                               {{"usage", [](const auto&, const AdminAnswer& answer) {
+                                     answer({{"error", "not\x1B now"}});
+                                 }}});
     const Outcome refused = run({"usage", "--json"});
     EXPECT_EQ(refused.status, kNoAnswer);
     EXPECT_EQ(refused.out, "");
