@@ -5,12 +5,14 @@
 #include <signal.h>
 
 #include <filesystem>
+#include <thread>
 #include <mutex>
 
 #include "client/Recorder.h"
 #include "linux/admin/LinuxAdminService.h"
 #include "tests/client/Heard.h"
 #include "tests/contract/TestWindow.h"
+#include "tests/dialog/DialogUser.h"
 #include "tests/system/World.h"
 
 namespace lumacast::test {
@@ -154,7 +156,10 @@ TEST_F(Client, IsToldThatABroadcastTakesASetUp) {
 }
 
 TEST_F(ClientOfAskedUser, IsToldThatTheUserDeclined) {
+    const std::string display = world_.display().name();
+    std::thread user([&] { EXPECT_TRUE(DialogUser(display).answer(DialogUser::Button::Other)); });
     EXPECT_EQ(keyIn(start(options())), "RECORDING_ERROR_USER_DECLINED");
+    user.join();
 }
 
 TEST_F(Client, IsToldThatSpaceRanOut) {
