@@ -120,7 +120,13 @@ std::shared_ptr<LCRecordingSession> LCRecordingManager::registeredSession(const 
 
 std::shared_ptr<LCRecordingSession> LCRecordingManager::recordingSessionForBundleID(const BundleIdentifier& bundleID) {
     log_.line("LCRecordingManager:recordingSessionForBundleID");
-    if (auto session = registeredSession(bundleID)) return session;
+    if (auto session = registeredSession(bundleID)) {
+        // One that can't deliver anything any more is kept for nobody.
+        const auto proxy = session->clientProxy();
+        const bool isOver = session->isDead() && !session->isRecording() && proxy && !proxy->connection();
+        if (!isOver) return session;
+        removeSessionForBundleID(bundleID);
+    }
     log_.line("no session, creating a new one");
     auto session = makeSession_ ? makeSession_(services_, bundleID)
                                 : std::make_shared<LCRecordingSession>(services_, bundleID);

@@ -231,7 +231,8 @@ private:
     void checkAndPlaySystemRecordSound(const LCRecordingSession& session, bool isRecordingOn);
     void logRefusal(std::uint64_t number, RecordingErrorCode code, std::string_view reason);
     void refuse(const WaitingStart& start, RecordingErrorCode code, std::string_view reason);
-    void stopCurrentRecordingSessionWithHandler(Handler handler);
+    /// `stopCurrentRecordingSessionWithHandler:` — makes room for this start.
+    void stopCurrentRecordingSessionWithHandler(const WaitingStart& by, Handler handler);
     void interruptOtherRecordingSessionAgainstSession(const std::shared_ptr<LCRecordingSession>& session);
     bool isApplicationInForegroundWithBundleIdentifier(const BundleIdentifier& bundleID);
 
@@ -251,6 +252,12 @@ private:
         std::uint64_t number = 0;
         std::shared_ptr<void> remembered;
     };
+    /// A recording that another one takes the place of.
+    struct EndedRecording {
+        std::uint64_t generation = 0;
+        PathClaim claim;
+        bool isTold = true;  ///< its client is
+    };
     PathClaim claimOf(const LCRecordingSession& session) const;
     void clearSystemRecordingUI(const LCRecordingSession& session);
     /// Adds a system recording's movie to the library of the user whose client it was, waiting on a global queue; then
@@ -258,10 +265,10 @@ private:
     /// `added` runs on the request lane.
     void addSystemRecordingToLibrary(const LCRecordingSession& session, const std::optional<URL>& movieURL,
                                      const PathClaim& claim, std::function<void(std::optional<Error>)> added);
-    void keepPreemptedSystemRecording(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation,
-                                      const PathClaim& claim, const std::optional<URL>& movieURL);
-    void discardInterruptedRecording(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation,
-                                     const PathClaim& claim, const std::optional<URL>& movieURL);
+    void keepPreemptedSystemRecording(const std::shared_ptr<LCRecordingSession>& session, const EndedRecording& ended,
+                                      const std::optional<URL>& movieURL);
+    void discardInterruptedRecording(const std::shared_ptr<LCRecordingSession>& session, const EndedRecording& ended,
+                                     const std::optional<URL>& movieURL);
     void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
                                           const std::optional<Error>& error, const std::optional<URL>& movieURL);
     void recordingSessionInterrupted(const std::shared_ptr<LCRecordingSession>& session,

@@ -96,7 +96,7 @@ bool LCRecordingManager::acknowledge(const LCRecordingSession& session, std::opt
 void LCRecordingManager::continueAcknowledged(const WaitingStartRef& start) {
     if (!start->session->isRecording()) return beginRecording(start);
     // Another start of the application has been faster.
-    stopCurrentRecordingSessionWithHandler([this, start] { beginRecording(start); });
+    stopCurrentRecordingSessionWithHandler(*start, [this, start] { beginRecording(start); });
 }
 
 bool LCRecordingManager::isStillWanted(const WaitingStart& start) const {

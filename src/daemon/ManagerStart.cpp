@@ -58,7 +58,7 @@ void LCRecordingManager::startRecording(const StartRequest& request, StartHandle
         return refuse(*start, RecordingErrorCode::FailedToStart, "the window size is none");
     log_.line(
         "LCRecordingManager:startRecordingWindowLayerContextID:windowSize:microphoneEnabled:streaming:withHandler:");
-    stopCurrentRecordingSessionWithHandler([this, start] { startProper(start); });
+    stopCurrentRecordingSessionWithHandler(*start, [this, start] { startProper(start); });
 }
 
 std::optional<LCRecordingManager::Refusal> LCRecordingManager::whyNotAllowed(
@@ -119,6 +119,7 @@ void LCRecordingManager::beginRecording(const WaitingStartRef& start) {
     }
     log_.line("broadcast disabled");
     session->disableBroadcast();
+    session->managerRecord.startConnection = start->connection;
     session->managerRecord.user = start->connection->userIdentifier();
     session->setRecording(true);
     session->setIsBroadcasting(request.broadcast);
@@ -138,41 +139,42 @@ void LCRecordingManager::beginRecording(const WaitingStartRef& start) {
     monitorForegroundApps(session);
 }
 
-void LCRecordingManager::stopCurrentRecordingSessionWithHandler(Handler handler) {
+void LCRecordingManager::stopCurrentRecordingSessionWithHandler(const WaitingStart& by, Handler handler) {
     log_.line("LCRecordingManager:stopCurrentRecordingSession:");
     const auto sessions = bundleIDToRecordingSessionLookup_;
     for (const auto& [id, session] : sessions) {
         if (!session->isRecording()) continue;
         const auto end = session->isSystemRecording() ? &LCRecordingManager::keepPreemptedSystemRecording
                                                       : &LCRecordingManager::discardInterruptedRecording;
-        stopRecordingSession(session, 0, 0,
-                             [self = shared_from_this(), end, session,
-                              generation = session->managerRecord.startGeneration,
-                              claim = claimOf(*session)](const std::optional<URL>& url, const std::optional<Error>&) {
-                                 ((*self).*end)(session, generation, claim, url);
-                             });
+        // Whoever starts in the place of a client that has gone has not lost anything.
+        const bool isTold = session != by.session || session->managerRecord.startConnection.lock() == by.connection;
+        stopRecordingSession(
+            session, 0, 0,
+            [self = shared_from_this(), end, session,
+             ended = EndedRecording{session->managerRecord.startGeneration, claimOf(*session), isTold}](
+                const std::optional<URL>& url, const std::optional<Error>&) { ((*self).*end)(session, ended, url); });
     }
     // Deliberately without waiting for the stops to complete.
     if (handler) handler();
 }
 
 void LCRecordingManager::discardInterruptedRecording(const std::shared_ptr<LCRecordingSession>& session,
-                                                     std::uint64_t generation, const PathClaim& claim,
-                                                     const std::optional<URL>& movieURL) {
-    auto tellClient = [self = shared_from_this(), session] {
+                                                     const EndedRecording& ended, const std::optional<URL>& movieURL) {
+    auto tellClient = [self = shared_from_this(), session, isTold = ended.isTold] {
+        if (!isTold) return;
         self->onRequestLane([self, session] {
             if (const auto proxy = session->clientProxy())
                 proxy->stopRecordingWithError(
                     self->services_.errors._lcUserErrorForCode(RecordingErrorCode::Interrupted), std::nullopt);
         });
     };
-    if (session->managerRecord.startGeneration == generation) {
+    if (session->managerRecord.startGeneration == ended.generation) {
         session->finishAndCleanupSessionFilesWithHandler(std::move(tellClient));
         return;
     }
     // The application has started anew meanwhile: only this stop's own movie goes, and not where a later writer has
     // its path.
-    if (movieURL) services_.tempStore.removeFileOfClaim(*movieURL, claim.number, {});
+    if (movieURL) services_.tempStore.removeFileOfClaim(*movieURL, ended.claim.number, {});
     tellClient();
 }
 

@@ -43,21 +43,21 @@ void LCRecordingManager::addSystemRecordingToLibrary(const LCRecordingSession& s
 }
 
 void LCRecordingManager::keepPreemptedSystemRecording(const std::shared_ptr<LCRecordingSession>& session,
-                                                      std::uint64_t generation, const PathClaim& claim,
+                                                      const EndedRecording& ended,
                                                       const std::optional<URL>& movieURL) {
     // A newer recording of the same application has a handler of its own by then.
-    if (session->managerRecord.startGeneration == generation) clearSystemRecordingUI(*session);
+    if (session->managerRecord.startGeneration == ended.generation) clearSystemRecordingUI(*session);
     addSystemRecordingToLibrary(
-        *session, movieURL, claim,
-        [self = shared_from_this(), session, generation, claim, movieURL](const std::optional<Error>& error) {
+        *session, movieURL, ended.claim,
+        [self = shared_from_this(), session, ended, movieURL](const std::optional<Error>& error) {
             if (error)
                 self->log_.line("LCRecordingManager:stopCurrentRecordingSession: Video saved to camera roll failed");
             else
                 self->log_.line(
                     "LCRecordingManager:stopCurrentRecordingSession: Video saved to camera roll successful");
             // The name that the session removes is that of the moment; the movie's own goes only once the library has it.
-            if (movieURL && !error) self->services_.tempStore.removeFileOfClaim(*movieURL, claim.number, {});
-            self->discardInterruptedRecording(session, generation, claim, std::nullopt);
+            if (movieURL && !error) self->services_.tempStore.removeFileOfClaim(*movieURL, ended.claim.number, {});
+            self->discardInterruptedRecording(session, ended, std::nullopt);
         });
 }
 

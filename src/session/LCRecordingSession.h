@@ -232,7 +232,8 @@ public:
         std::vector<std::uint64_t> stopsUnderWay;     ///< the starts whose stop may still be answered
         /// The accepted connection, kept while it is lost too: the proxy's messages then still end in their errors.
         std::shared_ptr<IpcConnection> connection;
-        std::optional<UserID> user;  ///< whose client began the last recording
+        std::weak_ptr<IpcConnection> startConnection;  ///< who began the last recording
+        std::optional<UserID> user;                    ///< whose client began the last recording
 
         bool hasTransactionOf(std::uint64_t generation) const {
             return std::find(openTransactions.begin(), openTransactions.end(), generation) != openTransactions.end();

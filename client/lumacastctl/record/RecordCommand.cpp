@@ -29,7 +29,8 @@ using Clock = std::chrono::steady_clock;
 constexpr milliseconds kLook{100};
 constexpr milliseconds kLine{500};
 constexpr milliseconds kStopPatience{60'000};
-constexpr milliseconds kFarewell{500};
+constexpr milliseconds kFarewell{300};
+constexpr milliseconds kInsistence{3000};
 constexpr char kClearLine[] = "\r\033[K";
 
 /// What the daemon answers and tells, from the recorder's thread.
@@ -65,6 +66,24 @@ int notRecorded(std::FILE* complaints, const std::string& reason) {
 std::string whereItIs(const std::string& path) {
     if (path.empty()) return "What was recorded is in the daemon's folder; see `lumacastctl storage`.";
     return "What was recorded was written to " + printable(path) + ", or is in the Videos folder.";
+}
+
+/// Ends a start that has not been answered. It may begin at this moment, and would go on without anybody: then it is
+/// stopped. A question that stands dies with the connection.
+void takeBack(client::Recorder& recorder, const std::shared_ptr<Answers>& answers) {
+    const auto wished = Clock::now();
+    bool isStopped = false;
+    while (true) {
+        const auto known = answers->known();
+        const bool hasBegun = known.start && !known.start->error;
+        if (known.stop || (known.start && known.start->error)) return;
+        if (hasBegun && !std::exchange(isStopped, true))
+            recorder.stop([answers](client::StopAnswer answer) {
+                answers->change([&](Answers::Known& changed) { changed.stop = std::move(answer); });
+            });
+        if (Clock::now() - wished >= (hasBegun ? kStopPatience : kFarewell)) return;
+        std::this_thread::sleep_for(kLook / 10);
+    }
 }
 
 /// The line that changes. Elsewhere than on a terminal it is not shown.
@@ -131,6 +150,9 @@ int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& requ
     std::error_code failure;
     if (!request.output.empty() && std::filesystem::exists(std::filesystem::symlink_status(request.output, failure)))
         return notRecorded(complaints, request.output + " is there already.");
+    const auto folder = std::filesystem::path(request.output).parent_path();
+    if (!request.output.empty() && !std::filesystem::is_directory(folder, failure))
+        return notRecorded(complaints, folder.string() + " is no folder.");
     const auto answers = std::make_shared<Answers>();
     client::Events events;
     events.stopped = [answers](std::optional<Error> error, std::optional<URL> movie) {
@@ -147,26 +169,29 @@ int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& requ
     options.size = request.size;
     options.microphone = request.microphone;
     options.systemRecording = true;
-    recorder.start(options, [answers](client::StartAnswer answer) {
-        answers->change([&](Answers::Known& known) { known.start = std::move(answer); });
-    });
+    const auto ask = [&] {
+        answers->change([](Answers::Known& known) { known.start.reset(); });
+        recorder.start(options, [answers](client::StartAnswer answer) {
+            answers->change([&](Answers::Known& known) { known.start = std::move(answer); });
+        });
+    };
+    ask();
     LiveLine line(progress, complaints);
     line.show("The user may be asked first…");
-    while (!answers->known().start) {
-        if (!stopWished(kLook)) continue;
-        // It may begin at this moment, and would go on without anybody: the daemon is told to stop it, and does so before
-        // the connection ends.
-        recorder.stop([answers](client::StopAnswer answer) {
-            answers->change([&](Answers::Known& known) { known.stop = std::move(answer); });
-        });
-        const auto wished = Clock::now();
-        const auto isOver = [&] {
-            const auto known = answers->known();
-            return known.stop || (known.start && known.start->error);
-        };
-        while (!isOver() && Clock::now() - wished < (answers->known().start ? kStopPatience : kFarewell))
-            std::this_thread::sleep_for(kLook / 10);
-        return notRecorded(complaints, "it was stopped before it began.");
+    const auto asked = Clock::now();
+    // A busy display does not say in time who is in front: then one asks again.
+    const auto isToBeAskedAgain = [&](const client::StartAnswer& answer) {
+        return answer.error && client::recordingCodeOf(*answer.error) == RecordingErrorCode::FailedToStart &&
+               Clock::now() - asked < kInsistence;
+    };
+    while (true) {
+        const auto answer = answers->known().start;
+        if (answer && !isToBeAskedAgain(*answer)) break;
+        if (stopWished(kLook)) {
+            takeBack(recorder, answers);
+            return notRecorded(complaints, "it was stopped before it began.");
+        }
+        if (answer) ask();
     }
     line.clear();
     if (const auto error = answers->known().start.value_or(client::StartAnswer{}).error) {

@@ -215,6 +215,36 @@ TEST_F(SystemRecording, WhatThePreemptionLogs) {
     EXPECT_EQ(logged("LCRecordingSession: cleanupSessionFiles"), 1u);
 }
 
+TEST_F(SystemRecording, WhoStartsInThePlaceOfAClientThatHasGoneIsNotToldOfItsEnd) {
+    const auto client = makeSystemRecording();
+    advance(seconds(1));
+    client->connection->invalidate();
+    settle();
+    client->connect();
+    settle();
+    ASSERT_EQ(started(*client)->code(), 0);
+    EXPECT_TRUE(client->told.empty());
+    EXPECT_EQ(fakes_.photoLibrary.assets().size(), 1u);
+    // One that begins anew over its own connection is.
+    advance(seconds(1));
+    ASSERT_EQ(started(*client)->code(), 0);
+    EXPECT_EQ(client->toldOfStop(-5806), 1);
+}
+
+TEST_F(SystemRecording, ADeadSessionWithoutAClientIsReplacedByItsNextOne) {
+    const auto client = makeSystemRecording();
+    const auto dead = session(*client);
+    client->connection->invalidate();
+    settle();
+    fakes_.displayCapture.lastSource()->mediaServicesWereReset();
+    settle();
+    client->connect();
+    settle();
+    EXPECT_NE(session(*client), dead);
+    EXPECT_EQ(started(*client)->code(), 0);
+    EXPECT_EQ(fakes_.keepAlive.open(), 1);
+}
+
 TEST_F(SystemRecording, OneThatTheLibraryDoesNotTakeStaysWhereItIsUntilItIsPurged) {
     const auto client = makeSystemRecording();
     const std::string path = session(*client)->movieWriter()->outputPath();

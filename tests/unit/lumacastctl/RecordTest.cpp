@@ -113,6 +113,10 @@ TEST_F(Record, AFileThatIsThereIsNotRecordedOver) {
     EXPECT_THAT(complaintsOf(scratch_.write("film.mp4", "kept")), HasSubstr("film.mp4 is there already"));
 }
 
+TEST_F(Record, AFolderThatIsNotThereIsSaidBefore) {
+    EXPECT_THAT(complaintsOf(scratch_.path("nowhere/film.mp4")), HasSubstr("nowhere is no folder"));
+}
+
 TEST_F(Record, WithoutADisplayItSaysWhoKnowsMore) {
     const Outcome outcome = run({"record", "--display"});
     EXPECT_EQ(outcome.status, kNotRecorded);
