@@ -28,6 +28,7 @@ TEST(Sleep, IsHeldOffWhileARecordingRunsAndNoLonger) {
     EXPECT_TRUE(manager.locks().empty()) << "an idle daemon keeps nobody awake";
     (void)application->askForFrame("start");
     EXPECT_TRUE(waitUntil([&] { return bothAreHeld(manager); }));
+    ASSERT_TRUE(world.waitForElapsed(0.5));
     (void)application->askForFrame("pause");
     EXPECT_TRUE(bothAreHeld(manager)) << "a pause is part of the recording";
     (void)application->ask("resume");
