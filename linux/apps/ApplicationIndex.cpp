@@ -71,6 +71,8 @@ private:
             program = resolvedProgram(*command, searchPath_);
             if (!program && !entry->tryExec.empty()) program = resolvedProgram(entry->tryExec, searchPath_);
         }
+        // Whatever the entry calls it: what counts is what its processes run.
+        if (program && isInterpreter(*program)) program.reset();
         if (program) {
             application.program = *program;
             claims.emplace_back(*program, identifier);

@@ -67,38 +67,6 @@ std::optional<std::vector<std::string>> arguments(std::string_view exec) {
     return quoted ? std::nullopt : std::optional(std::move(result));
 }
 
-bool isInterpreter(std::string_view program) {
-    static constexpr std::array<std::string_view, 21> kNames{"sh",
-                                                             "bash",
-                                                             "dash",
-                                                             "zsh",
-                                                             "ksh",
-                                                             "busybox",
-                                                             "env",
-                                                             "node",
-                                                             "nodejs",
-                                                             "java",
-                                                             "mono",
-                                                             "flatpak",
-                                                             "snap",
-                                                             "gjs",
-                                                             "xterm",
-                                                             "x-terminal-emulator",
-                                                             "gnome-terminal",
-                                                             "konsole",
-                                                             "pkexec",
-                                                             "sudo",
-                                                             "systemd-run"};
-    static constexpr std::array<std::string_view, 8> kFamilies{"python", "perl", "ruby",     "php",
-                                                               "lua",    "wine", "electron", "guile"};
-    const std::string_view name = program.substr(program.rfind('/') + 1);
-    return std::find(kNames.begin(), kNames.end(), name) != kNames.end() ||
-           std::any_of(kFamilies.begin(), kFamilies.end(), [&](std::string_view family) {
-               return name.starts_with(family) &&
-                      name.find_first_not_of("0123456789.-", family.size()) == std::string_view::npos;
-           });
-}
-
 void setEntry(DesktopEntry& entry, std::string_view key, std::string_view value) {
     if (key == "Type") entry.isApplication = value == "Application";
     if (key == "Hidden") entry.hidden = value == "true";
@@ -112,6 +80,26 @@ void setEntry(DesktopEntry& entry, std::string_view key, std::string_view value)
 }
 
 }  // namespace
+
+bool isInterpreter(std::string_view program) {
+    // Shells and languages, containers, terminals, other users, and what starts another program in its place.
+    static constexpr auto kNames = std::to_array<std::string_view>({
+        "sh", "bash", "dash", "zsh", "ksh", "fish", "busybox", "node", "nodejs", "deno", "bun", "java", "mono",
+        "dotnet", "gjs", "awk", "gawk", "mawk", "Rscript", "expect", "flatpak", "snap", "bwrap", "firejail", "chroot",
+        "unshare", "nsenter", "xterm", "gnome-terminal", "konsole", "x-terminal-emulator", "tmux", "screen", "script",
+        "pkexec", "sudo", "su", "doas", "runuser", "setpriv", "systemd-run", "env", "nice", "ionice", "nohup",
+        "setsid", "stdbuf", "timeout", "taskset", "chrt", "xargs", "dbus-launch", "dbus-run-session", "gdb", "strace",
+        "ltrace", "valgrind", "ld.so"});
+    static constexpr std::array<std::string_view, 10> kFamilies{"python", "perl",     "ruby",  "php",   "lua",
+                                                                "wine",   "electron", "guile", "tclsh", "wish"};
+    const std::string_view name = program.substr(program.rfind('/') + 1);
+    return std::find(kNames.begin(), kNames.end(), name) != kNames.end() ||
+           (name.starts_with("ld-") && name.find(".so") != std::string_view::npos) ||  // the loader of all programs
+           std::any_of(kFamilies.begin(), kFamilies.end(), [&](std::string_view family) {
+               return name.starts_with(family) &&
+                      name.find_first_not_of("0123456789.-", family.size()) == std::string_view::npos;
+           });
+}
 
 std::optional<DesktopEntry> DesktopEntry::parse(std::string_view text) {
     if (!isValidUtf8(text)) return std::nullopt;

@@ -11,6 +11,9 @@
 
 namespace lumacast {
 
+/// Whether a program (its path, or its name) runs whatever it is given: a process that runs it is nobody's application.
+bool isInterpreter(std::string_view program);
+
 /// What this system needs of a desktop entry. A value.
 struct DesktopEntry {
     bool isApplication = false;  ///< Type=Application

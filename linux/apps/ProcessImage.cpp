@@ -15,6 +15,14 @@ namespace {
 constexpr std::size_t kMaximumPath = 4096;
 constexpr std::string_view kDeletedMark = " (deleted)";
 
+/// Any process can show any path as that of a deleted file: in a mount namespace of its own, where it removes what it
+/// runs. So the file must be gone for good, and its owner one who could have put it into that folder here.
+bool canHaveBeenAt(const std::string& path, const struct stat& file) {
+    struct stat folder = {};
+    if (file.st_nlink != 0 || ::stat(path.substr(0, path.rfind('/') + 1).c_str(), &folder) != 0) return false;
+    return file.st_uid == 0 || file.st_uid == folder.st_uid;
+}
+
 bool isSameFile(const struct stat& a, const struct stat& b) { return a.st_dev == b.st_dev && a.st_ino == b.st_ino; }
 
 }  // namespace
@@ -40,7 +48,7 @@ std::optional<ProcessImage> processImage(const FileDescriptor& process) {
     bool isHere = ::stat(image.path.c_str(), &here) == 0 && isSameFile(here, image.status);
     if (!isHere && image.path.ends_with(kDeletedMark)) {
         image.path.resize(image.path.size() - kDeletedMark.size());
-        image.deleted = isHere = true;
+        image.deleted = isHere = canHaveBeenAt(image.path, image.status);
     }
     if (!isHere || image.path.size() > kMaximumPath || !isValidUtf8(image.path)) return std::nullopt;
     return image;

@@ -92,7 +92,8 @@ TEST(DesktopEntry, EnvAndItsVariablesArePassedOver) {
 
 TEST(DesktopEntry, AnInterpreterIsNobodysProgram) {
     for (const char* exec : {"python3 /usr/share/app/main.py", "/usr/bin/python3.11 x", "sh -c player", "flatpak run x",
-                             "wine64", "java -jar x.jar"})
+                             "wine64", "java -jar x.jar", "bwrap --ro-bind / / player", "/lib64/ld-linux-x86-64.so.2 player",
+                             "tclsh8.6 player.tcl", "timeout 60 player"})
         EXPECT_EQ(program(exec), "(none)") << exec;
     EXPECT_EQ(program("pythonista"), "pythonista");
     EXPECT_EQ(program("shell"), "shell");

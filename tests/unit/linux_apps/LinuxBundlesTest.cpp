@@ -86,6 +86,18 @@ TEST(LinuxBundles, TheOwnProgramOfALauncherIsNamed) {
     EXPECT_EQ(disk.identifierOf(disk.scratch.path("bin/launcher")), std::nullopt);
 }
 
+TEST(LinuxBundles, AnInterpreterIsNobodysProgramWhateverItIsCalled) {
+    Disk disk;
+    const std::string interpreter = disk.installProgram("opt/python3.11");
+    fs::create_directories(disk.scratch.path("bin"));
+    fs::create_symlink(interpreter, disk.scratch.path("bin/player"));
+    disk.installEntry("system/applications/org.example.Player.desktop", "Exec=player\n");
+    EXPECT_EQ(disk.identifierOf(interpreter), std::nullopt);
+    disk.installEntry("home/applications/org.example.Player.desktop",
+                      "Exec=player\nX-Lumacast-Executable=" + interpreter + "\n");
+    EXPECT_EQ(disk.identifierOf(interpreter), std::nullopt);
+}
+
 TEST(LinuxBundles, TheUsersEntryCoversTheSystems) {
     Disk disk;
     const std::string mine = disk.installProgram("bin/mine");
@@ -273,6 +285,20 @@ TEST(ProcessImage, AReplacedProgramKeepsItsPathAndIsMarked) {
     ASSERT_TRUE(image);
     EXPECT_EQ(image->path, program);
     EXPECT_TRUE(image->deleted);
+}
+
+TEST(ProcessImage, AFileThatIsGoneInOneFolderOnlyIsNotTheDeletedOneOfAnother) {
+    ScratchDirectory scratch;
+    const std::string program = installExecutable(scratch.path("player"));
+    const RunningProgram running(program);
+    fs::rename(program, scratch.path("player (deleted)"));
+    // The same mark, but the file is still there: called something else.
+    ASSERT_TRUE(processImage(running.pid()));
+    fs::create_hard_link(scratch.path("player (deleted)"), scratch.path("kept"));
+    fs::remove(scratch.path("player (deleted)"));
+    EXPECT_FALSE(processImage(running.pid()));
+    fs::remove(scratch.path("kept"));
+    EXPECT_TRUE(processImage(running.pid())->deleted);
 }
 
 TEST(ProcessImage, AFileMayBeCalledDeleted) {
