@@ -9,8 +9,12 @@
 
 namespace lumacast::test {
 
-inline std::string shippedUnit() { return std::string(LC_SOURCE_DIR) + "/packaging/systemd/lumacastd@.service"; }
-inline std::string packagingText() { return std::string(LC_SOURCE_DIR) + "/packaging/README.md"; }
+inline std::string shippedUnit() {
+    return std::string(LC_SOURCE_DIR) + "/packaging/systemd/lumacastd@.service";
+}
+inline std::string packagingText() {
+    return std::string(LC_SOURCE_DIR) + "/packaging/README.md";
+}
 
 inline std::string textOf(const std::string& path) {
     std::ifstream file(path);

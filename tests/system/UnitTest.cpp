@@ -26,9 +26,7 @@ constexpr char kOverall[] = "Overall exposure level for ";
 class ServiceUnit : public ::testing::Test {
 protected:
     /// Of the instance for one user, with a program that is there.
-    ServiceUnit() {
-        std::ofstream(instance_) << withAll(textOf(shippedUnit()), "/usr/bin/lumacastd", LC_DAEMON);
-    }
+    ServiceUnit() { std::ofstream(instance_) << withAll(textOf(shippedUnit()), "/usr/bin/lumacastd", LC_DAEMON); }
     std::string analyze(std::vector<std::string> words) {
         words.insert(words.begin(), "systemd-analyze");
         words.push_back(instance_);

@@ -141,10 +141,12 @@ void World::install(const std::string& identifier, const std::string& name, cons
         << "[Desktop Entry]\nType=Application\nName=" << name << "\nExec=\"" << executable << "\"\n";
 }
 
-void World::startDaemon(const std::vector<std::string>& variables) {
+void World::startDaemon(const std::vector<std::string>& variables) { startDaemonBy({LC_DAEMON}, variables); }
+
+void World::startDaemonBy(const std::vector<std::string>& command, const std::vector<std::string>& variables) {
     std::vector<std::string> environment = environment_;
     environment.insert(environment.end(), variables.begin(), variables.end());
-    daemon_ = std::make_unique<checkers::Child>(std::vector<std::string>{LC_DAEMON}, environment, path("daemon.log"));
+    daemon_ = std::make_unique<checkers::Child>(command, environment, path("daemon.log"));
     EXPECT_TRUE(waitUntil([this] { return !status().is_null(); })) << daemonLog();
 }
 

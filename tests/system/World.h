@@ -72,6 +72,8 @@ public:
     void addVariable(const std::string& variable) { environment_.push_back(variable); }
     /// Starts the daemon and waits for its sockets. `variables` are its alone.
     void startDaemon(const std::vector<std::string>& variables = {});
+    /// The same by another command, which becomes the daemon.
+    void startDaemonBy(const std::vector<std::string>& command, const std::vector<std::string>& variables = {});
     checkers::Child& daemon() { return *daemon_; }
     /// Ends it with a signal and waits; its exit status, -1 when the signal ended it.
     int endDaemon(int signal);
