@@ -274,7 +274,7 @@ TEST_F(Threat, ARecordingOfNoWindowShowsNobodysWindows) {
 }
 
 TEST_F(Threat, TheSoundOfAnyProcessOfTheUserCanBeAskedFor) {
-    // Deliberately not prevented: message 11 names any process. A client of the sound server could listen to it as
+    // Deliberately not prevented: any process can be named. A client of the sound server could listen to it as
     // well.
     PrivateSoundServer sound;
     ASSERT_TRUE(sound.isThere());
