@@ -26,7 +26,12 @@ constexpr char kOverall[] = "Overall exposure level for ";
 class ServiceUnit : public ::testing::Test {
 protected:
     /// Of the instance for one user, with a program that is there.
-    ServiceUnit() { std::ofstream(instance_) << withAll(textOf(shippedUnit()), "/usr/bin/lumacastd", LC_DAEMON); }
+    ServiceUnit() {
+        // Its own path may have a blank, which would end it in a unit.
+        const std::string program = folder_.path() + "/lumacastd";
+        std::filesystem::create_symlink(LC_DAEMON, program);
+        std::ofstream(instance_) << withAll(textOf(shippedUnit()), "/usr/bin/lumacastd", program);
+    }
     std::string analyze(std::vector<std::string> words) {
         words.insert(words.begin(), "systemd-analyze");
         words.push_back(instance_);
