@@ -1,5 +1,7 @@
 // Movies that are saved to the user's library.
 
+#include <utility>
+
 #include "tests/unit/daemon/DaemonWorld.h"
 
 namespace lumacast {
@@ -164,6 +166,35 @@ TEST_F(Save, TheMovieOfALaterRecordingWithTheSameNameStays) {
     settle();
     EXPECT_EQ(stopped->answers, 1);
     EXPECT_NEAR(fakes_.fileSystem.movie(movie.path())->duration().seconds(), 2, 0.2);
+}
+
+TEST_F(Save, ARecordingThatTakesTheMoviesPlaceWhileItIsMixedIsNeitherRemovedNorAdded) {
+    for (const bool mixingFails : {false, true}) {
+        URL movie;
+        const auto client = makeStopped(movie);
+        bool isFirst = true;
+        fakes_.movieExporters.setWhenOpened([&](const URL&) {
+            if (!std::exchange(isFirst, false)) return;
+            client->start();
+            (void)fakes_.scheduler.semaphore(0)->waitFor(std::chrono::seconds(2));  // it records by then
+        });
+        if (mixingFails) fakes_.faults.failNext("MovieExporters.openMovie");
+        const auto asked = client->ask(DaemonMessage::SaveVideoToCameraRoll, {movie});
+        settle();
+        advance(std::chrono::seconds(4));
+        EXPECT_EQ(asked->answers, 1);
+        ASSERT_TRUE(session(*client)->isRecording());
+        EXPECT_TRUE(fakes_.fileSystem.exists(movie.path())) << "it is the newer one's";
+        for (const auto& asset : fakes_.photoLibrary.assets())
+            EXPECT_TRUE(asset.content && asset.content->finished) << asset.movie.path();
+        const auto stopped = client->ask(DaemonMessage::StopRecording);
+        settle();
+        ASSERT_TRUE(stopped->url(0));
+        EXPECT_TRUE(fakes_.fileSystem.exists(stopped->url(0)->path()));
+        client->connection.reset();
+        client->die();
+        settle();
+    }
 }
 
 TEST_F(Save, AMovieThatIsBeingRecordedIsRefusedAndGoesOn) {
