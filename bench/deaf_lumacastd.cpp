@@ -80,7 +80,8 @@ Platform withQueues(const Platform& other, AudioInputQueues& queues) {
             other.displayCapture, other.displayCloneControl, queues, other.deviceCapture, other.containerWriters,
             other.movieExporters, other.photoLibrary, other.fileSystem, other.preferences, other.deviceInfo,
             other.telemetry, other.keepAlive, other.admin, other.storagePurge,
-            other.userAlerts, other.systemSounds, other.screenReader, other.storeLookup, other.networkReachability};
+            other.userAlerts, other.systemSounds, other.screenReader, other.storeLookup, other.networkReachability,
+            other.appExtensions, other.keyedArchive};
 }
 
 }  // namespace

@@ -22,7 +22,9 @@
 #include "linux/display/X11AppStateMonitor.h"
 #include "linux/display/X11DisplayCapture.h"
 #include "linux/display/X11RenderServer.h"
+#include "linux/extensions/LinuxAppExtensions.h"
 #include "linux/ipc/LinuxIpc.h"
+#include "linux/ipc/LinuxKeyedArchive.h"
 #include "linux/library/LinuxPhotoLibrary.h"
 #include "linux/media/LinuxContainerWriters.h"
 #include "linux/media/LinuxMovieExporters.h"
@@ -114,13 +116,14 @@ public:
           screenReader_({.address = LinuxScreenReader::sessionBus(environmentVariable("DBUS_SESSION_BUS_ADDRESS"),
                                                                   environmentVariable("XDG_RUNTIME_DIR"))}),
           storeLookup_(scheduler_, LinuxStoreLookup::optionsFrom(environment)),
+          appExtensions_(scheduler_),
           platform_{log_,       scheduler_, clock_,   ipc_,
                     bundles_,   renderServer_, appState_, capture_,
                     capture_,   audioInputQueues_, deviceCapture_, writers_,
                     exporters_, photoLibrary_, fileSystem_, preferences_,
                     deviceInfo_, telemetry_, keepAlive_, admin_,
                     storagePurge_, userAlerts_, systemSounds_, screenReader_,
-                    storeLookup_, networkReachability_},
+                    storeLookup_, networkReachability_, appExtensions_, keyedArchive_},
           termination_([this] { closeMovies(); }, kTimeToEnd,
                        {[this] { keepAlive_.announceStopping(static_cast<int>(kMoreTime.count())); }, kAskForTimeEvery}) {
         admin_.addCommand("usage", usageCommand(telemetry_));
@@ -213,6 +216,8 @@ private:
     LinuxScreenReader screenReader_;
     LinuxStoreLookup storeLookup_;
     LinuxNetworkReachability networkReachability_;
+    LinuxAppExtensions appExtensions_;
+    LinuxKeyedArchive keyedArchive_;
     Platform platform_;
     Termination termination_;  // last: it touches what is above
 };

@@ -90,6 +90,8 @@ std::shared_ptr<const Bundle> LinuxBundles::withIdentifier(const BundleIdentifie
     return path ? library_->known(*path) : nullptr;
 }
 
+std::optional<Data> LinuxBundles::applicationIcon(const BundleIdentifier&, IconFormat) { return std::nullopt; }
+
 std::string LinuxBundles::frameworkBundlePath() { return options_.frameworkBundlePath; }
 
 std::vector<std::string> LinuxBundles::preferredLanguages() { return languages_; }

@@ -41,6 +41,7 @@ public:
     std::optional<std::string> bundlePathForExecutable(const std::string& path) override;
     std::shared_ptr<const Bundle> open(const std::string& path) override;
     std::shared_ptr<const Bundle> withIdentifier(const BundleIdentifier& identifier) override;
+    std::optional<Data> applicationIcon(const BundleIdentifier& identifier, IconFormat format) override;
     std::string frameworkBundlePath() override;
     std::vector<std::string> preferredLanguages() override;
     std::vector<std::string> preferredLocalizations(const std::vector<std::string>& available) override;

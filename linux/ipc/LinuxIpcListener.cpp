@@ -91,6 +91,25 @@ LinuxIpcListener::~LinuxIpcListener() {
     for (auto& [descriptor, doorbell] : doorbells_) doorbell.watch.reset();
 }
 
+void LinuxIpcListener::invalidate() {
+    struct Ears {
+        std::unique_ptr<Reactor::Watch> watch;
+        std::unordered_map<int, Doorbell> doorbells;
+    };
+    auto ears = std::make_shared<Ears>();
+    {
+        const std::lock_guard lock(mutex_);
+        isInvalid_ = true;
+        ears->watch.swap(watch_);
+        ears->doorbells.swap(doorbells_);
+    }
+    // Closed on the reactor, which may be reading from them now.
+    core_->reactor.async([ears] {
+        ears->watch.reset();
+        for (auto& [descriptor, doorbell] : ears->doorbells) doorbell.watch.reset();
+    });
+}
+
 void LinuxIpcListener::setDelegate(std::weak_ptr<IpcListenerDelegate> delegate) {
     const std::lock_guard lock(mutex_);
     delegate_.swap(delegate);
@@ -98,7 +117,7 @@ void LinuxIpcListener::setDelegate(std::weak_ptr<IpcListenerDelegate> delegate) 
 
 void LinuxIpcListener::resume() {
     const std::lock_guard lock(mutex_);
-    if (isResumed_) return;
+    if (isResumed_ || isInvalid_) return;
     isResumed_ = true;
     if (service_.descriptor() >= 0) {
         watch_ = core_->reactor.watch(service_.descriptor(), EPOLLIN, [weak = weak_from_this()](std::uint32_t) {
@@ -123,6 +142,7 @@ std::shared_ptr<IpcEndpoint> LinuxIpcListener::endpoint() {
     const int on = 1;
     setsockopt(doorbell.socket.get(), SOL_SOCKET, SO_PASSCRED, &on, sizeof on);
     const std::lock_guard lock(mutex_);
+    if (isInvalid_) return result;
     if (isResumed_) watchDoorbellLocked(doorbell);
     doorbells_.emplace(ends[1], std::move(doorbell));
     return result;
@@ -229,7 +249,7 @@ void LinuxIpcListener::ask(const std::shared_ptr<LinuxIpcConnection>& connection
     std::shared_ptr<IpcListenerDelegate> delegate;
     {
         const std::lock_guard lock(mutex_);
-        delegate = delegate_.lock();
+        if (!isInvalid_) delegate = delegate_.lock();
     }
     if (!delegate || !delegate->listenerShouldAcceptNewConnection(*this, connection)) connection->invalidate();
 }

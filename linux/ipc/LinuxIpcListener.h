@@ -23,6 +23,7 @@ public:
     void setDelegate(std::weak_ptr<IpcListenerDelegate> delegate) override;
     void resume() override;
     std::shared_ptr<IpcEndpoint> endpoint() override;
+    void invalidate() override;
 
 private:
     /// The hearing end of an endpoint. Each endpoint has its own, so a holder who misuses it spoils nobody else's.
@@ -45,7 +46,7 @@ private:
 
     std::mutex mutex_;
     std::weak_ptr<IpcListenerDelegate> delegate_;
-    bool isResumed_ = false;
+    bool isResumed_ = false, isInvalid_ = false;
     std::unique_ptr<Reactor::Watch> watch_;
     std::unordered_map<int, Doorbell> doorbells_;
 };

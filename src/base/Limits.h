@@ -23,10 +23,16 @@ enum class Limit : std::uint8_t {
     RequestsWithoutReply,
     StartsWaitingForUser,
     StartsOfApplicationWaitingForUser,
+    ArchiveBytes,
+    ArchiveDepth,
+    ExtensionsInstalled,
+    ExtensionItemsReturned,
+    ExtensionRequestsInFlight,
+    FramesAtExtension,
 };
 
 /// Who refuses what goes beyond it.
-enum class LimitKeeper : std::uint8_t { Connections, Manager };
+enum class LimitKeeper : std::uint8_t { Connections, Manager, Archives, Extensions, ExtensionProxy };
 
 struct LimitRow {
     Limit limit;
@@ -54,6 +60,15 @@ inline constexpr std::array kLimits{
              LimitKeeper::Manager},
     LimitRow{Limit::StartsOfApplicationWaitingForUser, 4,
              "start requests of one application that wait for the user's answer", LimitKeeper::Manager},
+    LimitRow{Limit::ArchiveBytes, 64 << 10, "bytes of one keyed archive", LimitKeeper::Archives},
+    LimitRow{Limit::ArchiveDepth, 8, "arrays and dictionaries nested in one keyed archive", LimitKeeper::Archives},
+    LimitRow{Limit::ExtensionsInstalled, 256, "installed extensions that are looked at", LimitKeeper::Extensions},
+    LimitRow{Limit::ExtensionItemsReturned, 16, "items that an extension returns for one request",
+             LimitKeeper::Extensions},
+    LimitRow{Limit::ExtensionRequestsInFlight, 8, "requests of one extension that it has not completed",
+             LimitKeeper::Extensions},
+    LimitRow{Limit::FramesAtExtension, 3, "frames that one extension has and has not processed",
+             LimitKeeper::ExtensionProxy},
 };
 
 /// How little space may be free where movies are written before temporary ones are asked for.

@@ -29,6 +29,10 @@ constexpr std::array kStopped{A::NullableError, A::NullableURL};
 constexpr std::array kVideoSample{A::SharedPlaneObject, A::Data};
 constexpr std::array kAudioSample{A::Data, A::Data, A::Int64, A::Int64, A::Data};
 constexpr std::array kAny{A::Any};
+constexpr std::array kPlain{A::Plain};
+constexpr std::array kError{A::NullableError};
+constexpr std::array kPayload{A::Dictionary};
+constexpr std::array kEndpoint{A::NullableEndpoint};
 
 constexpr std::span<const A> kNothing{};
 
@@ -71,10 +75,31 @@ constexpr std::array kClientMessages{
     MessageDeclaration{"recordingTimerDidUpdate:", kAny},
 };
 
+constexpr std::array kBroadcastDaemonMessages{
+    MessageDeclaration{"ping", kNothing},
+    MessageDeclaration{"updateServiceInfo:", kPlain},
+    MessageDeclaration{"updateBroadcastURL:", kNullableURL},
+    MessageDeclaration{"finishBroadcastWithError:", kError},
+};
+
+constexpr std::array kBroadcastExtensionMessages{
+    MessageDeclaration{"processPayload:completion:", kPayload, Reply::Expected, kNothing},
+};
+
+constexpr std::array kExtensionVendorMessages{
+    MessageDeclaration{"setEndpoint:completionHandler:", kEndpoint, Reply::Expected, kNothing},
+};
+
 constexpr Protocol kDaemonProtocol{"LCDaemonProtocol", kDaemonMessages};
 constexpr Protocol kClientProtocol{"LCClientProtocol", kClientMessages};
+constexpr Protocol kBroadcastDaemonProtocol{"LCBroadcastDaemonProtocol", kBroadcastDaemonMessages};
+constexpr Protocol kBroadcastExtensionProtocol{"LCBroadcastExtensionProtocol", kBroadcastExtensionMessages};
+constexpr Protocol kExtensionVendorProtocol{"LCExtensionVendorProtocol", kExtensionVendorMessages};
+constexpr Protocol kExtensionHostProtocol{"LCExtensionHostProtocol", {}};
 
 static_assert(kDaemonMessages.size() == static_cast<std::size_t>(DaemonMessage::ReportCameraUsage) + 1);
+static_assert(kBroadcastDaemonMessages.size() ==
+              static_cast<std::size_t>(BroadcastDaemonMessage::FinishBroadcastWithError) + 1);
 static_assert(kClientMessages.size() == static_cast<std::size_t>(ClientMessage::RecordingTimerDidUpdate) + 1);
 
 template <class Number, class Wide>
@@ -96,17 +121,27 @@ bool isSize(const Value& value) {
     return pair && pair->size() == 2 && (*pair)[0].as<double>() && (*pair)[1].as<double>();
 }
 
-/// Without an endpoint in it, at any depth: one travels only where a message declares it.
-bool isPlain(const Value& value) {
-    if (value.as<Value::EndpointRef>()) return false;
-    if (const Array* array = value.as<Array>()) return std::all_of(array->begin(), array->end(), isPlain);
-    const auto isPlainDictionary = [](const Dictionary& dictionary) {
+/// Whether the value and all that is in it, at any depth, are none of what `isForbidden` says.
+bool isWithout(const Value& value, bool (*isForbidden)(const Value&)) {
+    if (isForbidden(value)) return false;
+    const auto isFree = [isForbidden](const Value& inner) { return isWithout(inner, isForbidden); };
+    if (const Array* array = value.as<Array>()) return std::all_of(array->begin(), array->end(), isFree);
+    const auto isFreeDictionary = [&](const Dictionary& dictionary) {
         const auto& entries = dictionary.entries();
-        return std::all_of(entries.begin(), entries.end(), [](const auto& entry) { return isPlain(entry.second); });
+        return std::all_of(entries.begin(), entries.end(), [&](const auto& entry) { return isFree(entry.second); });
     };
-    if (const Dictionary* dictionary = value.as<Dictionary>()) return isPlainDictionary(*dictionary);
+    if (const Dictionary* dictionary = value.as<Dictionary>()) return isFreeDictionary(*dictionary);
     const Error* error = value.asError();
-    return !error || isPlainDictionary(error->userInfo());
+    return !error || isFreeDictionary(error->userInfo());
+}
+
+/// An endpoint travels only where a message declares it.
+bool isPlain(const Value& value) {
+    return isWithout(value, [](const Value& v) { return v.as<Value::EndpointRef>() != nullptr; });
+}
+
+bool isWithoutHandles(const Value& value) {
+    return isWithout(value, [](const Value& v) { return v.as<Value::EndpointRef>() || v.as<Value::PlaneRef>(); });
 }
 
 bool isOfType(const Value& value, ArgumentType type) {
@@ -130,6 +165,7 @@ bool isOfType(const Value& value, ArgumentType type) {
         case A::NullableError: return value.isNull() || (value.asError() && isPlain(value));
         case A::SharedPlaneObject: return value.isNull() || value.as<Value::PlaneRef>();
         case A::Any: return true;
+        case A::Plain: return isWithoutHandles(value);
     }
     return false;
 }
@@ -138,6 +174,10 @@ bool isOfType(const Value& value, ArgumentType type) {
 
 const Protocol& daemonProtocol() { return kDaemonProtocol; }
 const Protocol& clientProtocol() { return kClientProtocol; }
+const Protocol& broadcastDaemonProtocol() { return kBroadcastDaemonProtocol; }
+const Protocol& broadcastExtensionProtocol() { return kBroadcastExtensionProtocol; }
+const Protocol& extensionVendorProtocol() { return kExtensionVendorProtocol; }
+const Protocol& extensionHostProtocol() { return kExtensionHostProtocol; }
 
 bool matches(const Array& values, std::span<const ArgumentType> types) {
     if (values.size() != types.size()) return false;

@@ -1,5 +1,5 @@
 #pragma once
-// Every message of the two client protocols, declared once: name, arguments, reply. Both ends encode, check and
+// Every message of the client's and the extension's protocols, declared once: name, arguments, reply. Both ends encode, check and
 // dispatch from these tables; a message's number on the wire is its place in its table.
 
 #include <cstdint>
@@ -31,6 +31,7 @@ enum class ArgumentType : std::uint8_t {
     NullableError,
     SharedPlaneObject,  ///< a shared plane, or null for a frame without one
     Any,  ///< anything; arrays, dictionaries and errors of the other types hold no endpoints
+    Plain,  ///< anything without endpoints and planes
 };
 
 enum class Reply : bool { None, Expected };
@@ -83,8 +84,21 @@ enum class ClientMessage : std::uint16_t {
     RecordingTimerDidUpdate,
 };
 
+/// What an upload extension tells the daemon, in declaration order. None of them has a reply.
+enum class BroadcastDaemonMessage : std::uint16_t { Ping, UpdateServiceInfo, UpdateBroadcastURL, FinishBroadcastWithError };
+
+/// What the daemon asks of an upload extension.
+enum class BroadcastExtensionMessage : std::uint16_t { ProcessPayload };
+
+/// What the daemon tells an extension over the auxiliary connection of a request.
+enum class ExtensionVendorMessage : std::uint16_t { SetEndpoint };
+
 const Protocol& daemonProtocol();  ///< LCDaemonProtocol, 20 messages
 const Protocol& clientProtocol();  ///< LCClientProtocol, 8 messages
+const Protocol& broadcastDaemonProtocol();     ///< LCBroadcastDaemonProtocol, 4 messages
+const Protocol& broadcastExtensionProtocol();  ///< LCBroadcastExtensionProtocol, 1 message
+const Protocol& extensionVendorProtocol();     ///< LCExtensionVendorProtocol, 1 message
+const Protocol& extensionHostProtocol();       ///< LCExtensionHostProtocol, deliberately without messages
 
 /// Whether `values` are what `types` declare: the same count, each of its type and within its type's range.
 bool matches(const Array& values, std::span<const ArgumentType> types);

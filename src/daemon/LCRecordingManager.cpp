@@ -75,6 +75,7 @@ bool LCRecordingManager::listenerShouldAcceptNewConnection(IpcListener&,
     }
     session->setClientProxy(std::make_shared<LCClientProxy>(log_, *bundleID, connection));
     session->managerRecord.connection = connection;
+    session->endWaitForExtension();
     cancelOrphanedQuestions();
     connection->resume();
     expireAcknowledgementExemptionsForBundleID(*bundleID);
@@ -85,6 +86,7 @@ void LCRecordingManager::applicationDisconnectedWithBundleID(const BundleIdentif
     log_.line("LCRecordingManager: applicationDisconnected");
     const auto session = registeredSession(bundleID);
     if (!session) return;
+    session->endWaitForExtension();
     if (session->isSystemRecording() && !session->isDead()) {
         // A system recording deliberately goes on without its client, and its session stays when it has ended.
         if (const auto proxy = session->clientProxy()) proxy->setConnection(nullptr);

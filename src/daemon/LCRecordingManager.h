@@ -29,6 +29,7 @@ struct StartRequest {
     bool broadcast = false;
     bool systemRecording = false;
     bool captureEnabled = false;
+    std::shared_ptr<IpcEndpoint> listenerEndpoint;  ///< where the extension listens already; null where it does not
 };
 
 /// A start request that waits for the user's answer, or for its turn to ask. Request lane.
@@ -39,6 +40,15 @@ struct WaitingStart {
     std::uint64_t number = 0;
     std::function<void(std::optional<Error>, bool microphoneRecording, bool cameraRecording)> handler;
     std::shared_ptr<AcknowledgementAlert> alert;
+};
+
+/// What an application has set up for its next broadcast.
+struct BroadcastInfo {
+    BundleIdentifier hostBundleIdentifier;  ///< "LCBroadcastInfoHostBundleIdentifierKey"
+    std::optional<Dictionary> userInfo;     ///< "LCBroadcastInfoExtensionUserInfoKey"
+    std::optional<LCBroadcastConfiguration> configuration;  ///< "LCBroadcastInfoExtensionConfigurationKey"
+    std::int64_t processMode = 0;                           ///< "LCBroadcastInfoExtensionProcessModeKey"
+    std::shared_ptr<AppExtension> extension;                ///< "LCBroadcastInfoExtensionKey"; never null
 };
 
 /// One movie on its way to the user's library. Request lane; what does not change is read elsewhere too.
@@ -148,6 +158,9 @@ public:
     /// under "saves".
     void serveSaveCommand();
 
+    /// `currentExtensionDisplayName` — of the extension that was set up last; none once a recording was stopped.
+    const std::optional<std::string>& currentExtensionDisplayName() const { return currentExtensionDisplayName_; }
+
     // LCRecordingSessionDelegate; from any lane.
     void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
                                           const std::optional<Error>& error) override;
@@ -194,6 +207,27 @@ private:
     void clientDidResignActive();
     std::optional<Dictionary> synchronousGetCurrentState();
 
+    // Broadcasts.
+    /// `setupBroadcastWithHostBundleID:broadcastExtensionBundleID:broadcastConfigurationData:userInfo:handler:` — deliberately
+    /// for whatever host the caller names. The handler is told an error, and nothing is kept, when there is no such
+    /// extension.
+    void setupBroadcastWithHostBundleID(const BundleIdentifier& host, const std::string& broadcastExtensionBundleID,
+                                        const Data& broadcastConfigurationData,
+                                        const std::optional<Dictionary>& userInfo, SaveHandler handler);
+    using ExtensionHandler = std::function<void(const std::shared_ptr<AppExtension>&, std::int64_t processMode,
+                                                const std::optional<Error>& error)>;
+    /// `loadBroadcastUploadExtensionWithBaseIdentifier:withHandler:` — the first upload extension, else the first of the
+    /// older point; null when there is none. The handler runs on a lane of the platform's.
+    void loadBroadcastUploadExtensionWithBaseIdentifier(const BaseIdentifier& baseIdentifier, ExtensionHandler handler);
+    /// `getSystemBroadcastExtensionInfo:` — the handler runs on a lane of the platform's.
+    void getSystemBroadcastExtensionInfo(const std::function<void(Array, std::optional<Error>)>& handler);
+    /// `getCurrentBroadcastImages:` — the host's and the extension's that were set up last, by whomever.
+    void getCurrentBroadcastImages(
+        const std::function<void(std::optional<Data>, std::optional<Data>)>& handler) const;
+    void clearCurrentBroadcastImages();
+    static std::optional<Data> firstIcon(const AppExtension& extension);
+    static std::optional<std::string> displayNameOf(const AppExtension& extension);
+
     // Storage that runs short. Called on the purge service's lane; each touch of the sessions is a task on the request
     // lane that is waited for, deleting is done on that lane itself.
     void registerPurgeCallbacks();
@@ -226,6 +260,14 @@ private:
     /// Whether whoever asked for the start still is the session's client.
     bool isStillWanted(const WaitingStart& start) const;
     void beginRecording(const WaitingStartRef& start);
+    /// Waits for the extension on the session's start queue, then goes on with broadcastEnabled.
+    void enableBroadcast(const WaitingStartRef& start, std::uint64_t generation, const BroadcastInfo& info);
+    /// Whether no newer start of the session has begun. Any lane.
+    static bool isNewest(const WaitingStart& start, std::uint64_t generation);
+    void broadcastEnabled(const WaitingStartRef& start, std::uint64_t generation, bool microphone, bool camera);
+    void startEnabledRecording(const WaitingStartRef& start, std::uint64_t generation);
+    /// A start that its extension has not taken note of is answered with what ended the recording.
+    void answerPendingStart(const std::shared_ptr<LCRecordingSession>& session, const std::optional<Error>& error);
     void monitorForegroundApps(const std::shared_ptr<LCRecordingSession>& session);
     /// `checkAndPlaySystemRecordSound:isRecordingOn:`
     void checkAndPlaySystemRecordSound(const LCRecordingSession& session, bool isRecordingOn);
@@ -289,6 +331,9 @@ private:
     std::set<BundleIdentifier> exemptBundleIdentifiers_, exemptWithMicRecordingEnabledBundleIdentifiers_;
     std::map<BundleIdentifier, Date> lastBackgroundDateByBundleIdentifier_;
     std::vector<std::pair<BundleIdentifier, std::shared_ptr<LCRecordingSession>>> bundleIDToRecordingSessionLookup_;
+    std::map<BundleIdentifier, BroadcastInfo> hostBundleIDtoExtensionInfoLookup_;
+    std::optional<Data> currentHostAppImage_, currentExtensionAppImage_;  ///< PNG files
+    std::optional<std::string> currentExtensionDisplayName_;
     bool didAcceptResume_ = false;
     bool microphoneRecording_ = false, cameraRecording_ = false;
 

@@ -23,6 +23,7 @@ StartRequest startRequest(const Array& arguments) {
     request.broadcast = argument<bool>(arguments, 4);
     request.systemRecording = argument<bool>(arguments, 5);
     request.captureEnabled = argument<bool>(arguments, 6);
+    if (const auto* endpoint = arguments[7].as<Value::EndpointRef>()) request.listenerEndpoint = *endpoint;
     return request;
 }
 
@@ -48,6 +49,23 @@ void LCRecordingManager::receiveMessage(const std::shared_ptr<IpcConnection>& co
                            [reply](std::optional<Error> error, bool microphoneRecording, bool cameraRecording) {
                                reply({Value(std::move(error)), microphoneRecording, cameraRecording});
                            });
+            break;
+        case DaemonMessage::SetupBroadcast:
+            setupBroadcastWithHostBundleID(
+                BundleIdentifier(argument<std::string>(arguments, 0)), argument<std::string>(arguments, 1),
+                argument<Data>(arguments, 2),
+                arguments[3].isNull() ? std::nullopt : std::optional(argument<Dictionary>(arguments, 3)),
+                [reply](std::optional<Error> error) { reply({Value(std::move(error))}); });
+            break;
+        case DaemonMessage::GetCurrentBroadcastImages:
+            getCurrentBroadcastImages([reply](std::optional<Data> host, std::optional<Data> extension) {
+                reply({Value(std::move(host)), Value(std::move(extension))});
+            });
+            break;
+        case DaemonMessage::GetSystemBroadcastExtensionInfo:
+            getSystemBroadcastExtensionInfo([reply](Array entries, std::optional<Error> error) {
+                reply({Value(std::move(entries)), Value(std::move(error))});
+            });
             break;
         case DaemonMessage::StopRecording: stopRecordingWithHandler(stopped); break;
         case DaemonMessage::StopRecordingWithClipDurations:
@@ -88,9 +106,6 @@ void LCRecordingManager::receiveMessage(const std::shared_ptr<IpcConnection>& co
         case DaemonMessage::ClientDidBecomeActive: clientDidBecomeActive(); break;
         case DaemonMessage::ClientDidResignActive: clientDidResignActive(); break;
         case DaemonMessage::ReportCameraUsage: break;  // deliberately accepted and ignored
-        default:
-            log_.error("message %d is declared, but this daemon does not serve it", message);
-            break;
     }
 }
 

@@ -1,6 +1,7 @@
 // Starting a recording: from the request's first check to the client's reply.
 
 #include <cmath>
+#include <utility>
 
 #include "daemon/LCRecordingManager.h"
 
@@ -98,27 +99,37 @@ void LCRecordingManager::startProper(const WaitingStartRef& start) {
 void LCRecordingManager::beginRecording(const WaitingStartRef& start) {
     const auto& session = start->session;
     const StartRequest& request = start->request;
-    if (request.captureEnabled)
-        return refuse(*start, RecordingErrorCode::FailedToStart, "this daemon does not hand samples to clients");
-
     log_.line("starting...");
     resetUnansweredStops(session);
     const std::uint64_t generation = ++session->managerRecord.startGeneration;
     session->managerRecord.openTransactions.push_back(generation);
     beginTransaction();
-    if (request.broadcast) {
-        log_.line("broadcast requested");
-        log_.line("attempted to start broadcast without a session, bailing out");
-        resetStatesForSession(session, generation);
-        logRefusal(start->number, RecordingErrorCode::InvalidBroadcastSession, "no broadcast has been set up");
-        // Deliberately without user info, so without description.
-        start->handler(Error(std::string(kRecordingErrorDomain),
-                             static_cast<std::int64_t>(RecordingErrorCode::InvalidBroadcastSession)),
-                       false, false);
-        return;
+    // An older start of this application that still waits for its extension is over.
+    session->managerRecord.broadcastGeneration = generation;
+    session->endWaitForExtension();
+    if (!request.broadcast) {
+        log_.line("broadcast disabled");
+        session->disableBroadcast();
+        return startEnabledRecording(start, generation);
     }
-    log_.line("broadcast disabled");
-    session->disableBroadcast();
+    log_.line("broadcast requested");
+    const auto found = hostBundleIDtoExtensionInfoLookup_.find(session->bundleID());
+    if (found != hostBundleIDtoExtensionInfoLookup_.end()) {
+        log_.line("found broadcast info, enabling for session");
+        return enableBroadcast(start, generation, found->second);
+    }
+    log_.line("attempted to start broadcast without a session, bailing out");
+    resetStatesForSession(session, generation);
+    logRefusal(start->number, RecordingErrorCode::InvalidBroadcastSession, "no broadcast has been set up");
+    // Deliberately without user info, so without description.
+    start->handler(
+        Error(std::string(kRecordingErrorDomain), static_cast<std::int64_t>(RecordingErrorCode::InvalidBroadcastSession)),
+        false, false);
+}
+
+void LCRecordingManager::startEnabledRecording(const WaitingStartRef& start, std::uint64_t generation) {
+    const auto& session = start->session;
+    const StartRequest& request = start->request;
     session->managerRecord.startConnection = start->connection;
     session->managerRecord.user = start->connection->userIdentifier();
     session->setRecording(true);
@@ -131,10 +142,14 @@ void LCRecordingManager::beginRecording(const WaitingStartRef& start) {
     session->setDelegate(weak_from_this());
     session->setCaptureRecording(request.captureEnabled);
     frontmostSession(*session, [&](ProcessID pid) { session->setFrontmostPIDForAudioTap(pid); });
-    session->startSessionWithHandler([self = shared_from_this(), session, handler = start->handler] {
+    const auto answer = std::make_shared<StartHandler>(start->handler);
+    // An extension that fails before it has taken note of the start answers it.
+    if (request.broadcast) session->managerRecord.pendingStart = {generation, answer};
+    session->startSessionWithHandler([self = shared_from_this(), session, answer] {
         self->checkAndPlaySystemRecordSound(*session, true);
         self->log_.line("recording session started");
-        handler(std::nullopt, self->microphoneRecording_, self->cameraRecording_);
+        if (const auto handler = std::exchange(*answer, {}))
+            handler(std::nullopt, self->microphoneRecording_, self->cameraRecording_);
     });
     monitorForegroundApps(session);
 }

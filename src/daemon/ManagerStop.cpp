@@ -1,6 +1,7 @@
 // Stopping, discarding, and the reports of sessions that stopped.
 
 #include <algorithm>
+#include <utility>
 
 #include "daemon/LCRecordingManager.h"
 
@@ -24,6 +25,7 @@ void LCRecordingManager::stopRecordingSession(const std::shared_ptr<LCRecordingS
     checkAndPlaySystemRecordSound(*session, false);
     log_.line("LCRecordingManager: stopRecordingSession:handler:");
     clearSystemRecordingUI(*session);
+    clearCurrentBroadcastImages();
     if (!session->isRecording()) return;
     if (layoutMonitor_) layoutMonitor_->removeObserver(*this);
     const std::uint64_t generation = session->managerRecord.startGeneration;
@@ -80,6 +82,8 @@ void LCRecordingManager::resetStatesForSession(const std::shared_ptr<LCRecording
         session->setRecording(false);
         session->setPaused(false);
     }
+    // A set-up is used for one broadcast only.
+    hostBundleIDtoExtensionInfoLookup_.erase(session->bundleID());
     if (std::erase(session->managerRecord.openTransactions, generation) > 0) endTransaction();
 }
 
@@ -100,6 +104,7 @@ void LCRecordingManager::recordingSessionStoppedWithError(const std::shared_ptr<
     // The report of an older start that arrives after a newer one is dropped.
     onRequestLane([self = shared_from_this(), session, error, start = session->startCount()] {
         if (session->startCount() != start) return;
+        self->answerPendingStart(session, error);
         self->recordingSessionStoppedWithError(session, error, std::nullopt);
         // A session that stopped by itself is finished by nobody else.
         self->resetAfterStop(session, session->managerRecord.startGeneration);
@@ -108,6 +113,14 @@ void LCRecordingManager::recordingSessionStoppedWithError(const std::shared_ptr<
         if (std::none_of(sessions.begin(), sessions.end(), [](const auto& s) { return s.second->isRecording(); }))
             self->services_.captureManager.stopAppAudioCapture();
     });
+}
+
+void LCRecordingManager::answerPendingStart(const std::shared_ptr<LCRecordingSession>& session,
+                                            const std::optional<Error>& error) {
+    const auto pending = std::exchange(session->managerRecord.pendingStart, {});
+    if (!error || pending.generation != session->managerRecord.startGeneration) return;
+    const auto answer = pending.answer.lock();
+    if (const auto handler = answer ? std::exchange(*answer, {}) : StartHandler()) handler(error, false, false);
 }
 
 void LCRecordingManager::recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,

@@ -1,5 +1,7 @@
 #include "daemon/Process.h"
 
+#include "broadcast/LCExtensionHostContext.h"
+
 namespace lumacast {
 
 Process::Process(const Platform& platform, LCRecordingManager::SessionMaker makeSession,
@@ -11,6 +13,7 @@ Process::Process(const Platform& platform, LCRecordingManager::SessionMaker make
       storeManager_(platform_, localization_),
       captureManager_(LCCaptureManager::init(platform_)),
       alertQueue_(platform_.scheduler) {
+    platform_.appExtensions.setContextClass(LCExtensionHostContext::contextClass(platform_.log));
     manager_ = LCRecordingManager::init(
         {platform_, tempStore_, localization_, errors_, *captureManager_, &platform_.scheduler.mainQueue(),
          captureDevices},

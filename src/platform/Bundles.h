@@ -1,6 +1,7 @@
 #pragma once
 // Installed applications and resource bundles.
 
+#include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
@@ -8,6 +9,7 @@
 #include <vector>
 
 #include "base/Identifiers.h"
+#include "base/Value.h"
 
 namespace lumacast {
 
@@ -38,6 +40,9 @@ inline constexpr std::string_view kInfoName = "Name";
 /// A name of the icon theme, or an absolute path. The bundle says it of itself.
 inline constexpr std::string_view kInfoIcon = "Icon";
 
+/// Which of an application's icons is meant: how large it is shown.
+enum class IconFormat : std::int32_t { Small = 0, Medium = 1, Large = 2 };
+
 /// Finds bundles. Answers from memory or within 100 ms; callable from any lane. A missing thing answers null or none.
 class Bundles {
 public:
@@ -49,6 +54,8 @@ public:
     /// Opens the bundle, or the language folder, at a path.
     virtual std::shared_ptr<const Bundle> open(const std::string& path) = 0;
     virtual std::shared_ptr<const Bundle> withIdentifier(const BundleIdentifier& identifier) = 0;
+    /// `_applicationIconImageForBundleIdentifier:format:` — the application's icon as a PNG file, or none. Reads the disk.
+    virtual std::optional<Data> applicationIcon(const BundleIdentifier& identifier, IconFormat format) = 0;
     /// The fixed path of the client framework's resource bundle.
     virtual std::string frameworkBundlePath() = 0;
     /// The user's languages, most wanted first, as language tags ("pt-BR"). Never empty.

@@ -28,9 +28,11 @@ public:
     virtual void resume() = 0;
     /// A new endpoint that names this listener. An endpoint stays good as long as the listener lives.
     virtual std::shared_ptr<IpcEndpoint> endpoint() = 0;
+    /// Accepts nobody any more; its endpoints name nothing from now on. Connections it accepted live on.
+    virtual void invalidate() = 0;
 };
 
-/// Makes listeners and connects to them. Callable from the main queue.
+/// Makes listeners and connects to them. Callable from any lane.
 class Ipc {
 public:
     virtual ~Ipc() = default;

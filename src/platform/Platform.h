@@ -5,6 +5,7 @@
 
 #include "base/Log.h"
 #include "platform/AdminService.h"
+#include "platform/AppExtension.h"
 #include "platform/AppStateMonitor.h"
 #include "platform/AudioInputQueue.h"
 #include "platform/Bundles.h"
@@ -16,6 +17,7 @@
 #include "platform/FileSystem.h"
 #include "platform/IpcListener.h"
 #include "platform/KeepAlive.h"
+#include "platform/KeyedArchive.h"
 #include "platform/LogSink.h"
 #include "platform/MovieExporter.h"
 #include "platform/NetworkReachability.h"
@@ -60,6 +62,8 @@ struct Platform {
     ScreenReader& screenReader;
     StoreLookup& storeLookup;
     NetworkReachability& networkReachability;
+    AppExtensions& appExtensions;
+    KeyedArchive& keyedArchive;
 };
 
 /// What owns the platform's objects.

@@ -100,8 +100,11 @@ void LCRecordingSession::deliver(const SampleRef& sample, std::uint32_t transfor
         services_.captureManager.setCaptureStartTime(originalTime);
     AffineTransform transform;
     if (systemRecording_) transform = frameTransformFromFlags(log_, transformFlags);
-    const auto writer = movieWriter();
-    if (!writer || !writer->appendVideoSampleBuffer(sample, transform)) {
+    if (broadcastProcessMode_ == static_cast<std::int64_t>(BroadcastProcessMode::SampleBuffers)) {
+        _notifyExtensionOfVideoSampleBuffer(sample, SampleType::Video, orientationFromFrameTransform(transformFlags));
+    } else if (captureRecording_) {
+        packageVideoSampleBufferForCapture(sample);
+    } else if (const auto writer = movieWriter(); !writer || !writer->appendVideoSampleBuffer(sample, transform)) {
         log_.line("LCRecordingSession: failed to start writer when appending video sample");
         stopRecordingWithNotification(true, services_.errors._lcUserErrorForCode(RecordingErrorCode::FailedToSave));
     }

@@ -26,11 +26,12 @@ LCRecordingSession::LCRecordingSession(const SessionServices& services, BundleId
       bundleID_(std::move(bundleID)),
       broadcastServiceInfoQueue_(services.platform.scheduler.serialQueue("com.orvane.lumacastd.ServiceInfoQueue")),
       resetQueue_(services.platform.scheduler.serialQueue("com.orvane.lumacastd.MediaServicesReset")),
+      startQueue_(services.platform.scheduler.serialQueue("com.orvane.lumacastd.BroadcastStart")),
       shouldStopLock_(services.platform.scheduler.ownerlessLock()) {}
 
 void LCRecordingSession::setWindowSize(Size size) {
     originalWindowSize_ = size;
-    windowSize_ = _maximumSizeWithSize(size);
+    windowSize_.set(_maximumSizeWithSize(size));
 }
 
 std::string LCRecordingSession::outputPath() const {
@@ -61,7 +62,7 @@ void LCRecordingSession::startSessionWithHandler(Handler handler) {
     paused_ = false;
     reportingAgent_.set(
         std::make_shared<LCReportingAgent>(log_, services_.platform.telemetry, _serviceNameForReporting()));
-    auto [width, height] = windowSize_;
+    auto [width, height] = windowSize_.get();
     if (systemRecording_) {
         log_.line("Before windowSize w:%f h:%f", width, height);
         if (isNativeScreenOrientationPortrait() ? width > height : width <= height) std::swap(width, height);
@@ -85,11 +86,14 @@ void LCRecordingSession::startWriter(Size size, Handler continuation) {
         return;
     }
     const auto writer = std::make_shared<LCMovieWriter>(services_.platform, services_.tempStore, size, outputPath());
-    writer->setBroadcastConfig(broadcastConfiguration_);
+    writer->setBroadcastConfig(broadcastConfiguration_.get());
     writer->setSystemRecording(systemRecording_);
     pathClaim_ = services_.tempStore.claimPath(writer->outputPath());
     writer->setPathClaim(pathClaim_);
-    movieWriter_.set(writer);
+    movieWriter_.update([&](std::shared_ptr<LCMovieWriter>& current) {
+        current = writer;
+        movieIsFinishing_ = false;
+    });
     writer->startWritingHandler(std::move(onLane));
 }
 
@@ -117,12 +121,12 @@ void LCRecordingSession::_resumeOrStartSession() {
     const int rate = captureRate();
     if (const auto agent = reportingAgent())
         agent->update([&](UsageMetrics& metrics) {
-            metrics.videoCaptureSize = windowSize_;
+            metrics.videoCaptureSize = windowSize_.get();
             metrics.videoCaptureRate = rate;
         });
     auto source = screenCaptureController();
     if (!source) {
-        source = services_.platform.displayCapture.makeSource(windowSize_, MediaTime::make(1, rate));
+        source = services_.platform.displayCapture.makeSource(windowSize_.get(), MediaTime::make(1, rate));
         screenCaptureController_.set(source);
     }
     source->setDelegate(weak_from_this());
@@ -222,14 +226,22 @@ void LCRecordingSession::finishSessionWithStartClipDuration(double startClipDura
 }
 
 void LCRecordingSession::finishMovie(double startClipDuration, double endClipDuration, FinishHandler handler) {
-    const auto writer = movieWriter();
+    std::shared_ptr<LCMovieWriter> writer;
+    movieWriter_.update([&](const std::shared_ptr<LCMovieWriter>& current) {
+        writer = current;
+        movieIsFinishing_ = true;
+    });
     if (!writer) return;
     writer->finishWritingWithHandler([weak = weak_from_this(), writer, startClipDuration, endClipDuration,
                                       handler = std::move(handler)](std::optional<URL> url) {
         const auto self = weak.lock();
         if (!self) return;
         self->log_.line("LCRecordingSession: finishWritingWithHandler");
-        if (!url) {
+        if (self->broadcastExtension()) {
+            // Without a movie too: there is no token for it then.
+            self->_notifyBroadcastExtensionOfCompletedMovieWithURL(url.value_or(URL()), true);
+            handler(std::nullopt, std::nullopt);
+        } else if (!url) {
             if (self->captureRecording_)
                 handler(std::nullopt, std::nullopt);
             else

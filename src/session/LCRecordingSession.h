@@ -88,10 +88,8 @@ public:
     void setMicrophoneEnabled(bool enabled);
     /// `haveMicTap` — whether the microphone's capture has begun for this session.
     bool haveMicTap() const { return haveMicTap_; }
-    /// The first application in front of this broadcast; deliberately never forgotten. Request lane.
-    const std::optional<BundleIdentifier>& bundleIDOfFirstForegroundApp() const {
-        return bundleIDOfFirstForegroundApp_;
-    }
+    /// The first application in front of this broadcast; forgotten when the next one is enabled.
+    std::optional<BundleIdentifier> bundleIDOfFirstForegroundApp() const { return bundleIDOfFirstForegroundApp_.get(); }
     /// The process whose sound is captured; below 1 none is.
     ProcessID frontmostPIDForAudioTap() const { return frontmostPIDForAudioTap_; }
     void setFrontmostPIDForAudioTap(ProcessID pid) { frontmostPIDForAudioTap_ = pid; }
@@ -121,15 +119,17 @@ public:
         return broadcastAggregatePayloadQueue_;
     }
     const Array& pendingBroadcastExtensionPayloads() const { return pendingBroadcastExtensionPayloads_; }
-    /// What the application wants the extension to know. Request lane.
-    const Dictionary& broadcastUserInfo() const { return broadcastUserInfo_; }
-    void setBroadcastUserInfo(Dictionary info) { broadcastUserInfo_ = std::move(info); }
+    /// What the application wants the extension to know.
+    std::optional<Dictionary> broadcastUserInfo() const { return broadcastUserInfo_.get(); }
+    void setBroadcastUserInfo(std::optional<Dictionary> info) { broadcastUserInfo_.set(std::move(info)); }
+    /// Where the clip being written begins; the invalid time until its first sound.
+    MediaTime broadcastFragmentStartTime() const { return broadcastFragmentStartTime_.get(); }
     /// The number of the clip being written.
     std::int64_t broadcastFragmentIndex() const { return broadcastFragmentIndex_; }
     void setBroadcastFragmentIndex(std::int64_t index) { broadcastFragmentIndex_ = index; }
-    std::optional<LCBroadcastConfiguration> broadcastConfiguration() const { return broadcastConfiguration_; }
+    std::optional<LCBroadcastConfiguration> broadcastConfiguration() const { return broadcastConfiguration_.get(); }
     void setBroadcastConfiguration(std::optional<LCBroadcastConfiguration> configuration) {
-        broadcastConfiguration_ = std::move(configuration);
+        broadcastConfiguration_.set(std::move(configuration));
     }
     std::int64_t broadcastProcessMode() const { return broadcastProcessMode_; }
     void setBroadcastProcessMode(std::int64_t mode) { broadcastProcessMode_ = mode; }
@@ -140,7 +140,7 @@ public:
     const std::vector<ContextID>& contextIDs() const { return contextIDs_; }
     /// `setWindowSize:` — keeps the size as given and stores it capped as the capture size.
     void setWindowSize(Size size);
-    Size windowSize() const { return windowSize_; }
+    Size windowSize() const { return windowSize_.get(); }
     Size originalWindowSize() const { return originalWindowSize_; }
     std::shared_ptr<LCMovieWriter> movieWriter() const { return movieWriter_.get(); }
     void setMovieWriter(std::shared_ptr<LCMovieWriter> writer) { movieWriter_.set(std::move(writer)); }
@@ -189,6 +189,17 @@ public:
     std::uint64_t getRecordedFileSize();
     void notifyRecordingMayBeStopped();
     void notifyRecordingResumed();
+    /// `enableBroadcastWithExtension:processMode:userInfo:listenerEndpoint:` — in sample-buffer mode it waits, without a
+    /// limit, until the extension is there: on the session's start queue only. Answers 0, whatever came of it.
+    std::int64_t enableBroadcastWithExtension(std::shared_ptr<AppExtension> extension, std::int64_t mode,
+                                              std::optional<Dictionary> userInfo,
+                                              const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
+    /// Ends the wait of an enabling under way, if there is one. Any lane.
+    void endWaitForExtension();
+    /// The extension's failure that ended the last enabling; none the next time.
+    std::optional<Error> takeEnablingError();
+    /// Where broadcasts are enabled.
+    SerialQueue& startQueue() { return *startQueue_; }
     /// `disableBroadcast` — the link to the extension is left as it is.
     void disableBroadcast();
     /// `_notifyExtensionOfAction:completion:` — the completion is called at once unless samples go to an extension that
@@ -234,6 +245,13 @@ public:
         std::shared_ptr<IpcConnection> connection;
         std::weak_ptr<IpcConnection> startConnection;  ///< who began the last recording
         std::optional<UserID> user;                    ///< whose client began the last recording
+        /// The start whose broadcast may be enabled: the newest. Read on the start queue too.
+        std::atomic<std::uint64_t> broadcastGeneration{0};
+        /// The start of a broadcast whose extension has not taken note of it yet.
+        struct PendingStart {
+            std::uint64_t generation = 0;
+            std::weak_ptr<std::function<void(std::optional<Error>, bool, bool)>> answer;
+        } pendingStart;
 
         bool hasTransactionOf(std::uint64_t generation) const {
             return std::find(openTransactions.begin(), openTransactions.end(), generation) != openTransactions.end();
@@ -245,22 +263,39 @@ public:
     static bool isNativeScreenOrientationPortrait() { return true; }
 
 protected:
-    // Where sound goes that is not for a movie of this session. No recording of this daemon gets that far yet: an
-    // extension can't be set up, and starts that hand samples to the client are refused.
+    // What leaves the session as it is. Frame lane and audio queues.
+    /// `_notifyExtensionOfVideoSampleBuffer:withType:sampleOrientation:`
+    virtual void _notifyExtensionOfVideoSampleBuffer(const SampleRef& sample, SampleType type,
+                                                     std::uint32_t orientation);
     /// `_notifyExtensionOfAudioSampleBuffer:withType:`
-    virtual void _notifyExtensionOfAudioSampleBuffer(const SampleRef&, SampleType) {}
+    virtual void _notifyExtensionOfAudioSampleBuffer(const SampleRef& sample, SampleType type);
+    /// `packageVideoSampleBufferForCapture:`
+    virtual void packageVideoSampleBufferForCapture(const SampleRef& sample);
     /// `packageAudioSampleBufferForCapture:withType:`
-    virtual void packageAudioSampleBufferForCapture(const SampleRef&, SampleType) {}
-    /// `_processAudioSampleBufferForMP4ClipHandler:`
-    virtual void _processAudioSampleBufferForMP4ClipHandler(const SampleRef&) {}
+    virtual void packageAudioSampleBufferForCapture(const SampleRef& sample, SampleType type);
+    /// `_processAudioSampleBufferForMP4ClipHandler:` — appends the sound, and cuts the clip that has got too long.
+    virtual void _processAudioSampleBufferForMP4ClipHandler(const SampleRef& sample);
+    /// `_notifyBroadcastExtensionOfCompletedMovieWithURL:finished:` — hands the extension a clip, which is removed when it
+    /// has completed the request.
+    void _notifyBroadcastExtensionOfCompletedMovieWithURL(const URL& clip, bool finished);
     /// `_notifyExtensionOfFrontmostProcessBundleID:`
-    virtual void _notifyExtensionOfFrontmostProcessBundleID(const BundleIdentifier&) {}
+    virtual void _notifyExtensionOfFrontmostProcessBundleID(const BundleIdentifier& identifier);
 
 private:
     void continueStart(std::uint64_t start, std::uint64_t stops, const Handler& handler);
     void _resumeOrStartSession();
     /// `startWritingHandler:` or the extension's start, then the continuation on the request lane.
     void startWriter(Size size, Handler continuation);
+    struct ExtensionWait;
+    void connectToExtension(std::shared_ptr<AppExtension> extension);
+    void connectToListeningExtension(const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
+    void installHandlers(LCBroadcastExtensionProxy& proxy, const std::shared_ptr<ExtensionWait>& wait);
+    void extensionFailed(const std::shared_ptr<LCBroadcastExtensionProxy>& proxy, const Error& error);
+    /// The link to send over; null, and a line, when there is none.
+    std::shared_ptr<LCBroadcastExtensionProxy> readyExtensionProxy();
+    void cutClip(MediaTime time);
+    void takeReturnedItems(const std::vector<ExtensionItem>& items);
+    void takeReturnedItem(const std::string& title, const Value& item);
     int captureRate() const;
     std::uint64_t getRecordedFileSize(const LCReportingAgent& agent);
     void finishMovie(double startClipDuration, double endClipDuration, FinishHandler handler);
@@ -294,6 +329,7 @@ private:
     const std::shared_ptr<SerialQueue> broadcastAggregatePayloadQueue_;  ///< never made
     const Array pendingBroadcastExtensionPayloads_;                      ///< stays empty
     const std::shared_ptr<SerialQueue> resetQueue_;
+    const std::shared_ptr<SerialQueue> startQueue_;
 
     Guarded<std::shared_ptr<LCClientProtocol>> clientProxy_;
     Guarded<std::weak_ptr<LCRecordingSessionDelegate>> delegate_;
@@ -305,10 +341,11 @@ private:
         hasUserConsentForMicrophone_{false}, sessionWasResumed_{false}, haveMicTap_{false},
         captureHasBegun_{false};
     std::atomic<ProcessID> frontmostPIDForAudioTap_{ProcessID{0}};
-    std::optional<BundleIdentifier> bundleIDOfFirstForegroundApp_;
+    Guarded<std::optional<BundleIdentifier>> bundleIDOfFirstForegroundApp_;
     std::optional<URL> broadcastURL_, interruptedMovieURL_;
     std::vector<ContextID> contextIDs_;
-    Size windowSize_, originalWindowSize_;
+    Guarded<Size> windowSize_;
+    Size originalWindowSize_;
     Guarded<std::shared_ptr<LCMovieWriter>> movieWriter_;
     Guarded<std::shared_ptr<DisplayCaptureSource>> screenCaptureController_;
     Guarded<std::shared_ptr<LCReportingAgent>> reportingAgent_;
@@ -316,11 +353,16 @@ private:
     Guarded<MediaTime> firstSampleTimestamp_{kZeroMediaTime}, lastSampleTimestamp_{kInvalidMediaTime},
         sampleTimeOffset_{kZeroMediaTime};
     std::atomic<std::int64_t> broadcastProcessMode_{0};
-    std::optional<LCBroadcastConfiguration> broadcastConfiguration_;
+    Guarded<std::optional<LCBroadcastConfiguration>> broadcastConfiguration_;
     Guarded<std::shared_ptr<AppExtension>> broadcastExtension_;
     Guarded<std::shared_ptr<LCBroadcastExtensionProxy>> broadcastUploadExtensionProxy_;
-    Dictionary broadcastUserInfo_;
+    Guarded<std::optional<Dictionary>> broadcastUserInfo_;
+    Guarded<MediaTime> broadcastFragmentStartTime_{kInvalidMediaTime};
     std::atomic<std::int64_t> broadcastFragmentIndex_{0};
+    /// Changes under movieWriter_'s lock: the movie's end is asked for, and no clip is cut any more.
+    bool movieIsFinishing_ = false;
+    Guarded<std::shared_ptr<ExtensionWait>> extensionWait_;  ///< under way
+    Guarded<std::optional<Error>> enablingError_;
     std::int64_t chipId_ = 0;
 
     /// None at first: an application that comes back can discard what it left, but not what a writer still has.

@@ -149,11 +149,11 @@ void LCRecordingSession::beginCaptureWithoutTap() {
 }
 
 void LCRecordingSession::updateBundleIdForFirstForegroundApp() {
-    if (!isBroadcasting_ || bundleIDOfFirstForegroundApp_) return;
+    if (!isBroadcasting_ || bundleIDOfFirstForegroundApp()) return;
     const auto bundle = services_.localization.bundleWithPID(frontmostPIDForAudioTap_);
     const auto identifier = bundle ? bundle->identifier() : std::nullopt;
     if (!identifier) return;
-    bundleIDOfFirstForegroundApp_ = identifier;
+    bundleIDOfFirstForegroundApp_.set(identifier);
     _notifyExtensionOfFrontmostProcessBundleID(*identifier);
 }
 

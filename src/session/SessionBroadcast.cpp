@@ -1,41 +1,186 @@
-// A session's link to the upload extension of a broadcast. Runs on the request lane.
+// A session's link to the upload extension of a broadcast. Enabling runs on the session's start queue and may wait there;
+// samples come on the frame lane and the audio queues, the rest on the request lane.
 
+#include "broadcast/ConfigurationArchive.h"
+#include "broadcast/ExtensionDiscovery.h"
+#include "broadcast/PayloadKeys.h"
 #include "session/LCRecordingSession.h"
+#include "session/SamplePayloads.h"
 
 namespace lumacast {
+
+namespace {
+
+bool isSampleBuffers(std::int64_t mode) { return mode == static_cast<std::int64_t>(BroadcastProcessMode::SampleBuffers); }
+
+}  // namespace
+
+/// The wait for an extension. Shared with handlers that may be called when it is long over.
+struct LCRecordingSession::ExtensionWait {
+    explicit ExtensionWait(Scheduler& scheduler) : semaphore(scheduler.semaphore(0)) {}
+    const std::unique_ptr<Semaphore> semaphore;
+    Guarded<std::optional<Error>> error;  ///< the extension's failure that ended it
+};
 
 std::optional<BundleIdentifier> LCRecordingSession::broadcastExtensionID() const {
     const auto extension = broadcastExtension();
     return extension ? std::optional(extension->identifier()) : std::nullopt;
 }
 
+std::int64_t LCRecordingSession::enableBroadcastWithExtension(std::shared_ptr<AppExtension> extension, std::int64_t mode,
+                                                              std::optional<Dictionary> userInfo,
+                                                              const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
+    log_.line("LCRecordingSession: enableBroadcastWithExtension");
+    setBroadcastExtension(extension);
+    broadcastUserInfo_.set(std::move(userInfo));
+    broadcastFragmentStartTime_.set(kInvalidMediaTime);
+    broadcastFragmentIndex_ = 1;
+    broadcastProcessMode_ = mode;
+    bundleIDOfFirstForegroundApp_.set(std::nullopt);
+    if (isSampleBuffers(mode)) {
+        log_.line("setting up extension proxy");
+        if (listenerEndpoint)
+            connectToListeningExtension(listenerEndpoint);
+        else
+            connectToExtension(std::move(extension));
+    }
+    return 0;  // deliberately always: a failure shows in disableBroadcast alone
+}
+
+void LCRecordingSession::connectToListeningExtension(const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
+    const auto proxy = LCBroadcastExtensionProxy::initWithBroadcastUploadListenerEndpoint(
+        services_.platform, services_.errors, listenerEndpoint);
+    installHandlers(*proxy, std::make_shared<ExtensionWait>(services_.platform.scheduler));
+    setBroadcastUploadExtensionProxy(proxy);
+}
+
+void LCRecordingSession::connectToExtension(std::shared_ptr<AppExtension> extension) {
+    const auto proxy = LCBroadcastExtensionProxy::initWithBroadcastUploadExtension(services_.platform, services_.errors,
+                                                                                   std::move(extension));
+    const auto wait = std::make_shared<ExtensionWait>(services_.platform.scheduler);
+    installHandlers(*proxy, wait);
+    setBroadcastUploadExtensionProxy(proxy);
+    extensionWait_.set(wait);
+    proxy->establishConnectionWithHandler([weak = weak_from_this(), wait](const std::optional<Error>& error) {
+        if (const auto self = weak.lock()) {
+            if (error)
+                self->disableBroadcast();
+            else
+                self->log_.line("connection to extensions ready");
+        }
+        wait->semaphore->signal();
+    });
+    wait->semaphore->wait();  // deliberately without a limit; endWaitForExtension ends it
+    extensionWait_.update([&](std::shared_ptr<ExtensionWait>& current) {
+        if (current == wait) current = nullptr;
+    });
+    enablingError_.set(wait->error.get());
+}
+
+void LCRecordingSession::installHandlers(LCBroadcastExtensionProxy& proxy, const std::shared_ptr<ExtensionWait>& wait) {
+    proxy.setServiceInfoHandler([weak = weak_from_this()](const Value& info) {
+        const auto self = weak.lock();
+        if (const auto client = self ? self->clientProxy() : nullptr) client->updateBroadcastServiceInfo(info);
+    });
+    proxy.setBroadcastURLHandler([weak = weak_from_this()](const URL& url) {
+        const auto self = weak.lock();
+        if (const auto client = self ? self->clientProxy() : nullptr) client->updateBroadcastURL(url);
+    });
+    proxy.setErrorHandler([weak = weak_from_this(), weakProxy = proxy.weak_from_this(), wait](const Error& error) {
+        const auto self = weak.lock();
+        const auto failed = weakProxy.lock();
+        if (self && failed) self->extensionFailed(failed, error);
+        wait->error.set(error);
+        wait->semaphore->signal();
+    });
+}
+
+void LCRecordingSession::extensionFailed(const std::shared_ptr<LCBroadcastExtensionProxy>& proxy, const Error& error) {
+    const bool isCurrent = broadcastUploadExtensionProxy() == proxy;
+    // What an older broadcast's extension reports ends nothing of a newer one.
+    if (isCurrent) stopRecordingWithNotification(true, error);
+    proxy->invalidateConnection();
+    if (isCurrent) setBroadcastUploadExtensionProxy(nullptr);
+}
+
+void LCRecordingSession::endWaitForExtension() {
+    if (const auto wait = extensionWait_.get()) wait->semaphore->signal();
+}
+
+std::optional<Error> LCRecordingSession::takeEnablingError() {
+    std::optional<Error> error;
+    enablingError_.update([&](std::optional<Error>& kept) { kept.swap(error); });
+    return error;
+}
+
 void LCRecordingSession::disableBroadcast() {
     log_.line("LCRecordingSession: disableBroadcast");
     setBroadcastExtension(nullptr);
-    broadcastUserInfo_ = {};
-    broadcastConfiguration_.reset();
+    broadcastUserInfo_.set(std::nullopt);
+    broadcastConfiguration_.set(std::nullopt);
     broadcastProcessMode_ = static_cast<std::int64_t>(BroadcastProcessMode::MovieClips);
 }
 
 void LCRecordingSession::_notifyExtensionOfAction(ExtensionAction action, Handler completion) {
-    if (broadcastProcessMode_ != static_cast<std::int64_t>(BroadcastProcessMode::SampleBuffers)) {
+    if (!isSampleBuffers(broadcastProcessMode_)) {
         completion();
         return;
     }
+    const auto proxy = readyExtensionProxy();
+    if (!proxy) {
+        completion();
+        return;
+    }
+    Dictionary payload{{std::string(kPayloadActionType), static_cast<std::int64_t>(action)}};
+    if (const auto info = broadcastUserInfo_.get()) payload.set(std::string(kPayloadUserInfo), *info);
+    proxy->processPayload(std::move(payload), std::move(completion));
+}
+
+std::shared_ptr<LCBroadcastExtensionProxy> LCRecordingSession::readyExtensionProxy() {
     if (!broadcastExtension()) {
         log_.line("no broadcast extension found!");
-        completion();
-        return;
+        return nullptr;
     }
-    const auto proxy = broadcastUploadExtensionProxy();
-    if (!proxy) {
-        log_.line("broadcast extension not ready");
-        completion();
-        return;
-    }
-    proxy->processPayload({{"LCBroadcastProcessExtensionPayloadKeyActionType", static_cast<std::int64_t>(action)},
-                           {"LCBroadcastExtensionKeyExtensionUserInfo", broadcastUserInfo_}},
-                          std::move(completion));
+    auto proxy = broadcastUploadExtensionProxy();
+    if (!proxy) log_.line("broadcast extension not ready");
+    return proxy;
+}
+
+void LCRecordingSession::_notifyExtensionOfVideoSampleBuffer(const SampleRef& sample, SampleType type,
+                                                             std::uint32_t orientation) {
+    if (const auto proxy = readyExtensionProxy())
+        proxy->processPayload(videoPayload(*sample, static_cast<std::int64_t>(type), orientation), [&log = log_] {
+            log.sample("lumacastd sending video payload to broadcast extension...");
+        });
+}
+
+void LCRecordingSession::_notifyExtensionOfAudioSampleBuffer(const SampleRef& sample, SampleType type) {
+    // The sample is kept until the extension has processed it.
+    if (const auto proxy = readyExtensionProxy())
+        proxy->processPayload(audioPayload(*sample, static_cast<std::int64_t>(type)), [&log = log_, sample] {
+            log.sample("lumacastd sending audio payload to broadcast extension...");
+        });
+}
+
+void LCRecordingSession::_notifyExtensionOfFrontmostProcessBundleID(const BundleIdentifier& identifier) {
+    if (const auto proxy = readyExtensionProxy())
+        proxy->processPayload({{std::string(kPayloadFrontmostApp), identifier.text()}}, [&log = log_] {
+            log.line("lumacastd sending frontmost app bundleID to broadcast extension...");
+        });
+}
+
+void LCRecordingSession::packageVideoSampleBufferForCapture(const SampleRef& sample) {
+    const auto client = clientProxy();
+    if (!client) return;
+    const auto& image = sample->image();
+    client->captureHandlerWithSample(image ? image->plane() : nullptr, timingInfoBlock(*sample));
+}
+
+void LCRecordingSession::packageAudioSampleBufferForCapture(const SampleRef& sample, SampleType type) {
+    const auto client = clientProxy();
+    if (!client) return;
+    client->captureHandlerWithAudioSample(audioDataBlock(*sample), audioFormatBlock(*sample), sample->sampleCount(),
+                                          static_cast<std::int64_t>(type), timingInfoBlock(*sample));
 }
 
 }  // namespace lumacast

@@ -58,7 +58,13 @@ protected:
             case Limit::ConnectionsBeforeHello: return overflowSilent(peer);
             case Limit::RequestsWithoutReply: return overflowUnanswered();
             case Limit::StartsWaitingForUser:
-            case Limit::StartsOfApplicationWaitingForUser: FAIL() << "not kept by the connections";
+            case Limit::StartsOfApplicationWaitingForUser:
+            case Limit::ArchiveBytes:
+            case Limit::ArchiveDepth:
+            case Limit::ExtensionsInstalled:
+            case Limit::ExtensionItemsReturned:
+            case Limit::ExtensionRequestsInFlight:
+            case Limit::FramesAtExtension: FAIL() << "not kept by the connections";
         }
         FAIL() << "no overflow for this limit";
     }

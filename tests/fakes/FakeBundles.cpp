@@ -30,6 +30,17 @@ std::shared_ptr<const Bundle> FakeBundles::withIdentifier(const BundleIdentifier
     return found == paths_.end() ? nullptr : bundles_.at(found->second);
 }
 
+std::optional<Data> FakeBundles::applicationIcon(const BundleIdentifier& identifier, IconFormat format) {
+    const std::lock_guard lock(mutex_);
+    const auto found = icons_.find({identifier, format});
+    return found == icons_.end() ? std::nullopt : std::optional(found->second);
+}
+
+void FakeBundles::setIcon(const BundleIdentifier& identifier, IconFormat format, Data png) {
+    const std::lock_guard lock(mutex_);
+    icons_[{identifier, format}] = std::move(png);
+}
+
 std::vector<std::string> FakeBundles::preferredLanguages() {
     const std::lock_guard lock(mutex_);
     return languages_;

@@ -46,6 +46,7 @@ public:
     std::optional<std::string> bundlePathForExecutable(const std::string& path) override;
     std::shared_ptr<const Bundle> open(const std::string& path) override;
     std::shared_ptr<const Bundle> withIdentifier(const BundleIdentifier& identifier) override;
+    std::optional<Data> applicationIcon(const BundleIdentifier& identifier, IconFormat format) override;
     std::string frameworkBundlePath() override { return "/fake/Lumacast.framework"; }
     std::vector<std::string> preferredLanguages() override;
     /// A wanted language suits a localization with the same tag, and one with the tag that is left without its last
@@ -56,6 +57,8 @@ public:
     void install(FakeBundle bundle);
     /// Installs a simple application at "/fake/apps/<identifier>" whose executable lies in it.
     void installApplication(const BundleIdentifier& identifier, const std::string& displayName);
+    /// The icon that the application has in this format.
+    void setIcon(const BundleIdentifier& identifier, IconFormat format, Data png);
     void uninstall(const BundleIdentifier& identifier);
     /// This process runs the application's executable from now on.
     void run(ProcessID pid, const BundleIdentifier& identifier);
@@ -70,6 +73,7 @@ private:
     std::map<BundleIdentifier, std::string> paths_;
     std::map<ProcessID, std::string> executables_;
     std::vector<std::string> languages_{"en"};
+    std::map<std::pair<BundleIdentifier, IconFormat>, Data> icons_;
 };
 
 }  // namespace lumacast

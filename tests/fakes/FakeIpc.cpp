@@ -85,6 +85,7 @@ public:
         for (auto& connection : waiting) offer(state_, std::move(connection));
     }
     std::shared_ptr<IpcEndpoint> endpoint() override { return std::make_shared<FakeEndpoint>(state_); }
+    void invalidate() override { close(state_); }
 
 private:
     const std::shared_ptr<FakeListenerState> state_;

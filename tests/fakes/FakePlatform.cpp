@@ -25,6 +25,7 @@ FakePlatform::FakePlatform(Scheduler& itsScheduler, std::function<HostTime()> ho
       admin(scheduler),
       userAlerts(scheduler, faults),
       storeLookup(scheduler, faults),
+      appExtensions(scheduler, ipc, [this](ProcessID pid) { return makeProcess(pid); }, faults),
       storagePurge(scheduler),
       platform_{log,
                 scheduler,
@@ -51,7 +52,9 @@ FakePlatform::FakePlatform(Scheduler& itsScheduler, std::function<HostTime()> ho
                 systemSounds,
                 screenReader,
                 storeLookup,
-                networkReachability} {
+                networkReachability,
+                appExtensions,
+                keyedArchive} {
     containerWriters.setWhenMade([this] { displayCapture.deliverFrames(); });
 }
 

@@ -7,6 +7,7 @@
 
 #include "platform/Platform.h"
 #include "tests/fakes/FakeAdminService.h"
+#include "tests/fakes/FakeAppExtensions.h"
 #include "tests/fakes/FakeAppStateMonitor.h"
 #include "tests/fakes/FakeAudioInputQueue.h"
 #include "tests/fakes/FakeBundles.h"
@@ -19,6 +20,7 @@
 #include "tests/fakes/FakeFileSystem.h"
 #include "tests/fakes/FakeIpc.h"
 #include "tests/fakes/FakeKeepAlive.h"
+#include "tests/fakes/FakeKeyedArchive.h"
 #include "tests/fakes/FakeLogSink.h"
 #include "tests/fakes/FakeMovieExporter.h"
 #include "tests/fakes/FakeNetworkReachability.h"
@@ -81,6 +83,8 @@ public:
     FakeScreenReader screenReader;
     FakeStoreLookup storeLookup;
     FakeNetworkReachability networkReachability;
+    FakeAppExtensions appExtensions;
+    FakeKeyedArchive keyedArchive;
     FakeStoragePurgeService storagePurge;  ///< last: it holds who has registered
 
 private:

@@ -224,7 +224,7 @@ TEST(StartUp, TheDirectoryAndTheListenerComeBeforeThePurgeServiceAndNobodyIsServ
                             p.systemSounds,
                             p.screenReader,
                             p.storeLookup,
-                            p.networkReachability};
+                            p.networkReachability, p.appExtensions, p.keyedArchive};
     Process process(platform);
     EXPECT_TRUE(purge.directoryWasThere);
     EXPECT_EQ(purge.lines, std::vector<std::string>{"_srSetupTempDirectory"});

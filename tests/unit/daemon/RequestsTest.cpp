@@ -83,28 +83,6 @@ TEST_F(Requests, TheCameraUsageIsAcceptedAndIgnored) {
     EXPECT_FALSE(session(*client)->reportingAgent()->metrics().frontCameraUsed);
 }
 
-TEST_F(Requests, WhatIsNotServedIsOnlyLogged) {
-    const std::vector<std::pair<DaemonMessage, Array>> unserved{
-        {DaemonMessage::SetupBroadcast, {"a", "b", Data(), Value()}},
-        {DaemonMessage::GetCurrentBroadcastImages, {}},
-        {DaemonMessage::GetSystemBroadcastExtensionInfo, {}}};
-    const auto client = makeRecording();
-    for (const auto& [message, arguments] : unserved) {
-        fakes_.logSink.clear();
-        const int losses = client->losses;
-        if (daemonProtocol().messages[static_cast<std::size_t>(message)].reply == Reply::Expected)
-            EXPECT_EQ(client->ask(message, arguments)->answers, 0);
-        else
-            client->tell(message, arguments);
-        settle();
-        const FakeLogSink::Line expected{LogLevel::Error, "message " + std::to_string(static_cast<int>(message)) +
-                                                              " is declared, but this daemon does not serve it"};
-        EXPECT_EQ(fakes_.logSink.lines(), std::vector<FakeLogSink::Line>{expected});
-        EXPECT_EQ(client->losses, losses);
-        EXPECT_TRUE(session(*client)->isRecording());
-    }
-}
-
 TEST_F(Requests, AStartAfterTheApplicationWasUninstalledIsRefusedAndTheRestIgnored) {
     const auto client = makeConnected(), other = makeRecording("Editor", 501, 8);
     fakes_.bundles.uninstall(client->id);

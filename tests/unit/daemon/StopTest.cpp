@@ -1,5 +1,6 @@
 // Stopping, discarding, pausing and resuming, and the reports of sessions that stopped by themselves.
 
+#include "tests/fakes/StubExtension.h"
 #include "tests/unit/daemon/DaemonWorld.h"
 
 namespace lumacast {
@@ -73,10 +74,10 @@ TEST_F(Stop, AClipThatFailsAfterItsApplicationHasLeftIsReset) {
     EXPECT_EQ(fakes_.keepAlive.open(), 0);
 }
 
-/// An extension whose link takes every payload at once.
-class Uploader final : public AppExtension, public LCBroadcastExtensionProxy {
+/// A link that takes every payload at once.
+class Uploader final : public LCBroadcastExtensionProxy {
 public:
-    BundleIdentifier identifier() const override { return BundleIdentifier("org.example.Uploader.upload"); }
+    Uploader(const Platform& platform, const RecordingErrors& errors) : LCBroadcastExtensionProxy(platform, errors) {}
     void processPayload(Dictionary, std::function<void()> completion) override { completion(); }
     void invalidateConnection() override { ++invalidations; }
     int invalidations = 0;
@@ -84,9 +85,11 @@ public:
 
 TEST_F(Stop, ABroadcastThatNobodyWaitsForIsFinishedNotThrownAway) {
     const auto client = makeRecording();
-    const auto uploader = std::make_shared<Uploader>();
+    Localization texts(fakes_.bundles);
+    const RecordingErrors errors(texts);
+    const auto uploader = std::make_shared<Uploader>(fakes_.platform(), errors);
     const auto kept = session(*client);
-    kept->setBroadcastExtension(uploader);
+    kept->setBroadcastExtension(std::make_shared<StubExtension>(BundleIdentifier("org.example.Uploader.upload")));
     kept->setBroadcastUploadExtensionProxy(uploader);
     kept->setBroadcastProcessMode(1);
     client->die();

@@ -1,5 +1,6 @@
 // What a session does with a broadcast extension set: its pace, its names, and what the extension is told.
 
+#include "tests/fakes/StubExtension.h"
 #include "tests/unit/session/SessionWorld.h"
 
 namespace lumacast {
@@ -7,14 +8,10 @@ namespace {
 
 using std::chrono::milliseconds;
 
-class Extension final : public AppExtension {
-public:
-    BundleIdentifier identifier() const override { return BundleIdentifier("org.example.Uploader.upload"); }
-};
-
 /// A link to an extension that answers when the test says so.
 class Link final : public LCBroadcastExtensionProxy {
 public:
+    explicit Link(const SessionServices& services) : LCBroadcastExtensionProxy(services.platform, services.errors) {}
     void processPayload(Dictionary payload, std::function<void()> completion) override {
         payloads.push_back(std::move(payload));
         if (whenTold) whenTold();
@@ -39,9 +36,9 @@ protected:
     ~ExtensionActions() override { link_->pending.clear(); }
 
     void sendSamples(std::int64_t mode = 1) {
-        session_->setBroadcastExtension(std::make_shared<Extension>());
+        session_->setBroadcastExtension(std::make_shared<StubExtension>(BundleIdentifier("org.example.Uploader.upload")));
         session_->setBroadcastUploadExtensionProxy(link_);
-        session_->setBroadcastUserInfo({{"title", "Game night"}});
+        session_->setBroadcastUserInfo(Dictionary{{"title", "Game night"}});
         session_->setBroadcastProcessMode(mode);
     }
     static Dictionary payload(std::int64_t action) {
@@ -56,12 +53,12 @@ protected:
     }
     using Actions = std::vector<std::int64_t>;
 
-    const std::shared_ptr<Link> link_ = std::make_shared<Link>();
+    const std::shared_ptr<Link> link_ = std::make_shared<Link>(services_);
 };
 
 TEST_F(ExtensionActions, TheIdentifierIsTheExtensionsOwn) {
     EXPECT_FALSE(session_->broadcastExtensionID());
-    session_->setBroadcastExtension(std::make_shared<Extension>());
+    session_->setBroadcastExtension(std::make_shared<StubExtension>(BundleIdentifier("org.example.Uploader.upload")));
     EXPECT_EQ(session_->broadcastExtensionID(), BundleIdentifier("org.example.Uploader.upload"));
 }
 
@@ -204,7 +201,7 @@ TEST_F(ExtensionActions, AWriterOfAnEarlierRecordingIsNotGivenTheFramesOfAnUnkno
 }
 
 TEST_F(ExtensionActions, AClipIsNamedAfterTheApplicationTheTimeAndItsNumber) {
-    session_->setBroadcastExtension(std::make_shared<Extension>());
+    session_->setBroadcastExtension(std::make_shared<StubExtension>(BundleIdentifier("org.example.Uploader.upload")));
     session_->setSystemRecording(true);  // the extension decides first
     session_->setBroadcastFragmentIndex(3);
     // 2026-01-15 12:00:00 UTC
@@ -220,7 +217,7 @@ TEST_F(ExtensionActions, DisablingForgetsTheExtensionButLeavesItsLink) {
     session_->setBroadcastConfiguration(LCBroadcastConfiguration{2.0, {}});
     session_->disableBroadcast();
     EXPECT_FALSE(session_->broadcastExtension());
-    EXPECT_EQ(session_->broadcastUserInfo(), Dictionary());
+    EXPECT_FALSE(session_->broadcastUserInfo());
     EXPECT_FALSE(session_->broadcastConfiguration());
     EXPECT_EQ(session_->broadcastProcessMode(), 0);
     EXPECT_EQ(session_->broadcastUploadExtensionProxy(), link_);

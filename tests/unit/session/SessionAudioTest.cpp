@@ -1,5 +1,6 @@
 // Where a session's sound comes from, and where it goes.
 
+#include "tests/fakes/StubExtension.h"
 #include "tests/unit/session/SessionWorld.h"
 
 namespace lumacast {
@@ -33,11 +34,6 @@ protected:
     void _notifyExtensionOfFrontmostProcessBundleID(const BundleIdentifier& id) override {
         announced.push_back(id.text());
     }
-};
-
-class NamedExtension final : public AppExtension {
-public:
-    BundleIdentifier identifier() const override { return BundleIdentifier("org.example.Upload"); }
 };
 
 class SessionAudio : public SessionWorld {
@@ -127,7 +123,7 @@ TEST_F(SessionAudio, AMicrophoneThatIsOffIsRecordedAsSilenceAndCounted) {
 }
 
 TEST_F(SessionAudio, AMutedBroadcastStillSendsTheMicrophoneAllZero) {
-    session_->setBroadcastExtension(std::make_shared<NamedExtension>());
+    session_->setBroadcastExtension(std::make_shared<StubExtension>(BundleIdentifier("org.example.Upload")));
     start();
     advance(std::chrono::milliseconds(100));
     session_->setBroadcastProcessMode(1);
@@ -147,7 +143,7 @@ TEST_F(SessionAudio, TheMicrophoneIsTappedOnlyWhereThereIsOneAndItIsWanted) {
     devices_.there = true;
     session_->setMicrophoneEnabled(false);
     session_->setSystemRecording(true);
-    session_->setBroadcastExtension(std::make_shared<NamedExtension>());
+    session_->setBroadcastExtension(std::make_shared<StubExtension>(BundleIdentifier("org.example.Upload")));
     start();
     EXPECT_EQ(logged("starting mic capture"), 0u) << "a system recording is not sent silence";
 }
@@ -214,7 +210,7 @@ TEST_F(SessionAudio, EachKindOfRecordingSendsItsSoundItsOwnWay) {
     session_->setMicrophoneEnabled(true);
     startTapped();
     for (const Case& c : cases) {
-        session_->setBroadcastExtension(c.extension ? std::make_shared<NamedExtension>() : nullptr);
+        session_->setBroadcastExtension(c.extension ? std::make_shared<StubExtension>(BundleIdentifier("org.example.Upload")) : nullptr);
         session_->setBroadcastProcessMode(c.mode);
         session_->setCaptureRecording(c.capture);
         const auto way = [&](const std::function<void()>& deliver) {

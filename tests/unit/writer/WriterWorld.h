@@ -47,7 +47,7 @@ protected:
                 p.preferences,   p.deviceInfo,     p.telemetry,       p.keepAlive,
                 p.admin,
                 p.storagePurge,  p.userAlerts,     p.systemSounds,    p.screenReader,
-                p.storeLookup,   p.networkReachability};
+                p.storeLookup,   p.networkReachability, p.appExtensions, p.keyedArchive};
     }
     void settle() { world_.scheduler.runUntilIdle(); }
 

@@ -1,0 +1,147 @@
+// Setting a broadcast up, and starting one. Request lane, but for the waits on a session's start queue.
+
+#include "broadcast/ConfigurationArchive.h"
+#include "broadcast/ExtensionDiscovery.h"
+#include "daemon/LCRecordingManager.h"
+
+namespace lumacast {
+
+void LCRecordingManager::setupBroadcastWithHostBundleID(const BundleIdentifier& host,
+                                                        const std::string& broadcastExtensionBundleID,
+                                                        const Data& broadcastConfigurationData,
+                                                        const std::optional<Dictionary>& userInfo,
+                                                        SaveHandler handler) {
+    loadBroadcastUploadExtensionWithBaseIdentifier(
+        Localization::baseIdentifier(broadcastExtensionBundleID),
+        [self = shared_from_this(), host, broadcastConfigurationData, userInfo, handler = std::move(handler)](
+            const std::shared_ptr<AppExtension>& extension, std::int64_t processMode, const std::optional<Error>& error) {
+            if (!extension) {
+                handler(error ? *error
+                              : self->services_.errors._lcUserErrorForCode(RecordingErrorCode::InvalidBroadcastSession));
+                return;
+            }
+            // A configuration that does not decode fails nothing: the broadcast goes without.
+            auto configuration = configurationIn(self->platform_.keyedArchive, broadcastConfigurationData);
+            // Here, off the request lane: the disk is asked.
+            auto extensionImage = firstIcon(*extension);
+            auto hostImage = self->platform_.bundles.applicationIcon(host, IconFormat::Large);
+            self->onRequestLane([=, configuration = std::move(configuration), extensionImage = std::move(extensionImage),
+                                 hostImage = std::move(hostImage)] {
+                self->hostBundleIDtoExtensionInfoLookup_[host] = {host, userInfo, configuration, processMode, extension};
+                self->currentExtensionAppImage_ = extensionImage;
+                self->currentExtensionDisplayName_ = displayNameOf(*extension);
+                self->currentHostAppImage_ = hostImage;
+                handler(std::nullopt);
+            });
+        });
+}
+
+void LCRecordingManager::loadBroadcastUploadExtensionWithBaseIdentifier(const BaseIdentifier& baseIdentifier,
+                                                                        ExtensionHandler handler) {
+    log_.line("looking for upload extension");
+    using Found = std::vector<std::shared_ptr<AppExtension>>;
+    const auto answerFirst = [handler](const Found& found, const std::optional<Error>& error) {
+        if (found.empty()) return handler(nullptr, 0, error);
+        handler(found.front(), ExtensionDiscovery::processMode(*found.front()), std::nullopt);
+    };
+    ExtensionDiscovery(log_, platform_.appExtensions)
+        .extensionsWithMatchingPointName(
+            kBroadcastUploadPoint, baseIdentifier,
+            [self = shared_from_this(), baseIdentifier, answerFirst](const Found& found,
+                                                                     const std::optional<Error>& error) {
+                if (!error && !found.empty()) return answerFirst(found, error);
+                ExtensionDiscovery(self->log_, self->platform_.appExtensions)
+                    .extensionsWithMatchingPointName(kBroadcastServicesPoint, baseIdentifier,
+                                                     UnwantedActivationRule{std::string(kSupportsStreamingRule)},
+                                                     answerFirst);
+            });
+}
+
+std::optional<Data> LCRecordingManager::firstIcon(const AppExtension& extension) {
+    auto icons = extension.icons();
+    return icons.empty() ? std::nullopt : std::optional(std::move(icons.front()));
+}
+
+std::optional<std::string> LCRecordingManager::displayNameOf(const AppExtension& extension) {
+    const Value* name = extension.infoDictionary().find(kExtensionDisplayName);
+    const std::string* text = name ? name->as<std::string>() : nullptr;
+    return text ? std::optional(*text) : std::nullopt;
+}
+
+void LCRecordingManager::getSystemBroadcastExtensionInfo(
+    const std::function<void(Array, std::optional<Error>)>& handler) {
+    ExtensionDiscovery(log_, platform_.appExtensions)
+        .extensionsWithMatchingPointName(
+            kBroadcastUploadPoint, [handler](const std::vector<std::shared_ptr<AppExtension>>& found,
+                                             const std::optional<Error>& error) {
+                Array entries;
+                if (!error)
+                    for (const auto& extension : found)
+                        entries.emplace_back(Dictionary{{"displayName", Value(displayNameOf(*extension))},
+                                                        {"extBundleID", extension->identifier().text()},
+                                                        {"extAppImgData", Value(firstIcon(*extension))}});
+                handler(std::move(entries), error);
+            });
+}
+
+void LCRecordingManager::getCurrentBroadcastImages(
+    const std::function<void(std::optional<Data>, std::optional<Data>)>& handler) const {
+    handler(currentHostAppImage_, currentExtensionAppImage_);
+}
+
+void LCRecordingManager::clearCurrentBroadcastImages() {
+    currentHostAppImage_.reset();
+    currentExtensionAppImage_.reset();
+    currentExtensionDisplayName_.reset();
+}
+
+void LCRecordingManager::enableBroadcast(const WaitingStartRef& start, std::uint64_t generation,
+                                         const BroadcastInfo& info) {
+    const auto& session = start->session;
+    session->setBroadcastConfiguration(info.configuration);
+    session->startQueue().async([self = shared_from_this(), start, generation, info,
+                                 microphone = microphoneRecording_, camera = cameraRecording_] {
+        // A newer start has taken this one's place while it waited its turn.
+        if (self->isNewest(*start, generation))
+            start->session->enableBroadcastWithExtension(info.extension, info.processMode, info.userInfo,
+                                                         start->request.listenerEndpoint);
+        self->onRequestLane([self, start, generation, microphone, camera] {
+            self->broadcastEnabled(start, generation, microphone, camera);
+        });
+    });
+}
+
+bool LCRecordingManager::isNewest(const WaitingStart& start, std::uint64_t generation) {
+    return start.session->managerRecord.broadcastGeneration == generation;
+}
+
+void LCRecordingManager::broadcastEnabled(const WaitingStartRef& start, std::uint64_t generation, bool microphone,
+                                          bool camera) {
+    const auto& session = start->session;
+    const auto failure = session->takeEnablingError();
+    const bool isWanted = isStillWanted(*start) && session->managerRecord.startGeneration == generation;
+    if (isWanted && !failure) {
+        microphoneRecording_ = microphone;
+        cameraRecording_ = camera;
+        // Another start of the application has been faster.
+        if (session->isRecording()) {
+            stopCurrentRecordingSessionWithHandler(*start, {});
+        }
+        return startEnabledRecording(start, generation);
+    }
+    if (const auto proxy = session->managerRecord.startGeneration == generation
+                               ? session->broadcastUploadExtensionProxy()
+                               : nullptr) {
+        proxy->invalidateConnection();
+        session->setBroadcastUploadExtensionProxy(nullptr);
+    }
+    resetStatesForSession(session, generation);
+    if (failure && isWanted) {
+        logRefusal(start->number, RecordingErrorCode::InvalidBroadcastSession, "the broadcast extension has failed");
+        start->handler(*failure, false, false);
+        return;
+    }
+    refuse(*start, RecordingErrorCode::FailedToStart, "the client has gone, or has started anew, meanwhile");
+}
+
+}  // namespace lumacast
