@@ -50,6 +50,10 @@ std::shared_ptr<IpcConnection> LinuxIpc::connectToEndpoint(const std::shared_ptr
     return connectionOver(std::move(call.socket), std::move(call.peer));
 }
 
+std::shared_ptr<IpcConnection> LinuxIpc::adopt(Fd socket, Peer peer) {
+    return connectionOver(std::move(socket), std::move(peer));
+}
+
 std::shared_ptr<IpcConnection> LinuxIpc::connectionOver(Fd socket, Peer peer) {
     auto connection = std::make_shared<LinuxIpcConnection>(core_, std::move(socket), std::move(peer), std::nullopt);
     connection->sendHello();

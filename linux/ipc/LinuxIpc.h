@@ -43,6 +43,10 @@ public:
     std::shared_ptr<IpcConnection> connectToService(const std::string& name) override;
     std::shared_ptr<IpcConnection> connectToEndpoint(const std::shared_ptr<IpcEndpoint>& endpoint) override;
 
+    /// A connection over a stream socket whose other end a process has or will have: launched with it, or inherited.
+    /// `peer` is that process where the kernel would name another (the maker of the pair). Owned by the caller.
+    std::shared_ptr<IpcConnection> adopt(Fd socket, Peer peer);
+
     /// What came of one attempt to reach a service.
     struct Attempt {
         std::shared_ptr<IpcConnection> connection;  ///< null when the service was not reached
