@@ -206,6 +206,10 @@ public:
     /// can be told; then when it has taken note, and never when it can't be reached.
     void _notifyExtensionOfAction(ExtensionAction action, Handler completion);
 
+    /// `_notifyBroadcastExtensionOfCompletedMovieWithURL:finished:` — hands the extension a clip, which is removed when it
+    /// has completed the request.
+    void _notifyBroadcastExtensionOfCompletedMovieWithURL(const URL& clip, bool finished);
+
     // Usage reporting.
     std::string _serviceNameForReporting() const;
     /// `reportSummaryEvent:` — sends the summary of the recording that `agent` has counted, and lets the agent go.
@@ -275,9 +279,6 @@ protected:
     virtual void packageAudioSampleBufferForCapture(const SampleRef& sample, SampleType type);
     /// `_processAudioSampleBufferForMP4ClipHandler:` — appends the sound, and cuts the clip that has got too long.
     virtual void _processAudioSampleBufferForMP4ClipHandler(const SampleRef& sample);
-    /// `_notifyBroadcastExtensionOfCompletedMovieWithURL:finished:` — hands the extension a clip, which is removed when it
-    /// has completed the request.
-    void _notifyBroadcastExtensionOfCompletedMovieWithURL(const URL& clip, bool finished);
     /// `_notifyExtensionOfFrontmostProcessBundleID:`
     virtual void _notifyExtensionOfFrontmostProcessBundleID(const BundleIdentifier& identifier);
 

@@ -192,7 +192,8 @@ void FakeAppExtension::crash() {
     std::shared_ptr<Process> process;
     const std::lock_guard lock(mutex_);
     process_.swap(process);
-    if (process) queue_->async([process] { process->ipc->kill(); });
+    // Not on the lane of the handlers: one may be waiting there.
+    if (process) process->queue->async([process] { process->ipc->kill(); });
 }
 
 void FakeAppExtension::complete(ExtensionRequestID request, std::vector<ExtensionItem> returned) {

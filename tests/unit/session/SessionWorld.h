@@ -22,13 +22,16 @@ public:
         wasOnWhenTold |= session->isRecording() || session->isBroadcasting();
         stops.push_back(error ? error->code() : 0);
     }
-    void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<LCRecordingSession>&, const Value&) override {}
+    void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<LCRecordingSession>&, const Value& info) override {
+        infos.push_back(info);
+    }
     void broadcastSessionDidUpdateDuration(LCRecordingSession&, double seconds) override {
         durations.push_back(seconds);
     }
 
     std::vector<std::int64_t> stops;  ///< the codes of the errors, 0 for none
     std::vector<double> durations;
+    std::vector<Value> infos;
     bool wasOnWhenTold = false;  ///< the session still counted as recording or broadcasting when it told of a stop
 };
 
