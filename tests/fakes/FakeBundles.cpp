@@ -26,6 +26,7 @@ std::shared_ptr<const Bundle> FakeBundles::open(const std::string& path) {
 
 std::shared_ptr<const Bundle> FakeBundles::withIdentifier(const BundleIdentifier& identifier) {
     const std::lock_guard lock(mutex_);
+    ++identifiersLookedUp_;
     const auto found = paths_.find(identifier);
     return found == paths_.end() ? nullptr : bundles_.at(found->second);
 }
@@ -43,6 +44,7 @@ void FakeBundles::setIcon(const BundleIdentifier& identifier, IconFormat format,
 
 std::vector<std::string> FakeBundles::preferredLanguages() {
     const std::lock_guard lock(mutex_);
+    ++languagesLookedUp_;
     return languages_;
 }
 
@@ -103,6 +105,16 @@ void FakeBundles::processEnded(ProcessID pid) {
 void FakeBundles::setPreferredLanguages(std::vector<std::string> languages) {
     const std::lock_guard lock(mutex_);
     languages_ = std::move(languages);
+}
+
+std::size_t FakeBundles::identifiersLookedUp() const {
+    const std::lock_guard lock(mutex_);
+    return identifiersLookedUp_;
+}
+
+std::size_t FakeBundles::languagesLookedUp() const {
+    const std::lock_guard lock(mutex_);
+    return languagesLookedUp_;
 }
 
 }  // namespace lumacast

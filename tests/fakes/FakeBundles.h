@@ -1,4 +1,5 @@
 #pragma once
+#include <cstddef>
 #include <map>
 #include <mutex>
 
@@ -66,6 +67,10 @@ public:
     void runExecutable(ProcessID pid, const std::string& path);
     void processEnded(ProcessID pid);
     void setPreferredLanguages(std::vector<std::string> languages);
+    /// How often bundles were asked for by their identifiers, as for an application's name.
+    std::size_t identifiersLookedUp() const;
+    /// How often the user's languages were asked for, as for every text.
+    std::size_t languagesLookedUp() const;
 
 private:
     mutable std::mutex mutex_;
@@ -74,6 +79,7 @@ private:
     std::map<ProcessID, std::string> executables_;
     std::vector<std::string> languages_{"en"};
     std::map<std::pair<BundleIdentifier, IconFormat>, Data> icons_;
+    std::size_t identifiersLookedUp_ = 0, languagesLookedUp_ = 0;
 };
 
 }  // namespace lumacast

@@ -1,4 +1,5 @@
 #pragma once
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <utility>
@@ -27,13 +28,16 @@ public:
         if (faults_.fails("UserAlerts.show")) return nullptr;
         auto alert = std::make_shared<Alert>(state_);
         User user;
+        std::function<void()> whenShowing;
         {
             const std::lock_guard lock(state_->mutex);
             state_->shown.push_back(content);
             state_->standing.push_back({content, alert.get()});
             if (state_->standing.size() > state_->mostStanding) state_->mostStanding = state_->standing.size();
             user = state_->user;
+            whenShowing = state_->whenShowing;
         }
+        if (whenShowing) whenShowing();
         // The user takes a while: the answer comes later even when it is certain.
         if (user)
             state_->queue->async([weak = std::weak_ptr(alert), user, content] {
@@ -48,6 +52,11 @@ public:
     void setUser(User user) {
         const std::lock_guard lock(state_->mutex);
         state_->user = std::move(user);
+    }
+    /// Called on the lane that shows an alert, while it does: the alert stands, but nobody has it yet.
+    void setWhenShowing(std::function<void()> whenShowing) {
+        const std::lock_guard lock(state_->mutex);
+        state_->whenShowing = std::move(whenShowing);
     }
     /// Answers the oldest alert that stands; false when there is none.
     bool answer(Response response) {
@@ -88,6 +97,7 @@ private:
         mutable std::mutex mutex;
         std::shared_ptr<SerialQueue> queue;
         User user;
+        std::function<void()> whenShowing;
         std::vector<AlertContent> shown;
         std::vector<Standing> standing;
         std::size_t mostStanding = 0;

@@ -3,61 +3,14 @@
 #include <algorithm>
 
 #include "base/Limits.h"
-#include "tests/unit/daemon/DaemonWorld.h"
+#include "tests/unit/daemon/AcknowledgementWorld.h"
 
 namespace lumacast {
 namespace {
 
-using std::chrono::seconds;
-using Response = UserAlert::Response;
-
 constexpr char kShow[] = "LCRecordingManager:showAcknowledgementAlert";
 
-class Acknowledgement : public DaemonWorld {
-protected:
-    Acknowledgement() : Acknowledgement(&installTexts) {}
-    explicit Acknowledgement(void (*prepare)(FakePlatform&)) : DaemonWorld(prepare) {
-        fakes_.preferences.set(kPreferenceDomain, "LCSuppressAlert", false);
-    }
-    /// Texts that show where they stand.
-    static void installTexts(FakePlatform& fakes) {
-        FakeBundle framework;
-        framework.path = fakes.bundles.frameworkBundlePath();
-        auto& texts = framework.tables["Localizable"];
-        for (const char* key :
-             {"ACKNOWLEDGEMENT_ALERT_BODY_TV", "ACKNOWLEDGEMENT_CAPTURE_ALERT_BODY_TV",
-              "ACKNOWLEDGEMENT_ALERT_BODY_CAMERA", "ACKNOWLEDGEMENT_ALERT_BODY_MIC",
-              "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_MICROPHONE_DISABLED", "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1",
-              "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_CAMERA", "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_2",
-              "ACKNOWLEDGEMENT_ALERT_DECLINE_BUTTON"})
-            texts[key] = std::string("text of ") + key;
-        texts["ACKNOWLEDGEMENT_ALERT_TITLE"] = "Record %@?";
-        texts["ACKNOWLEDGEMENT_CAPTURE_ALERT_TITLE"] = "Capture %@?";
-        fakes.bundles.install(std::move(framework));
-    }
-    static std::string textOf(const std::string& key) { return "text of ACKNOWLEDGEMENT_ALERT_" + key; }
-    void always(Response response) {
-        fakes_.userAlerts.setUser([response](const AlertContent&) { return response; });
-    }
-    TestClient::AskedRef started(TestClient& client, TestClient::Flags flags = {}) {
-        fakes_.logSink.clear();
-        auto asked = client.start({client.window}, flags);
-        settle();
-        return asked;
-    }
-    void answer(Response response) {
-        ASSERT_TRUE(fakes_.userAlerts.answer(response));
-        settle();
-    }
-    bool isExempt(const TestClient& client) {
-        bool result = false;
-        world_.scheduler.mainQueue().sync([&] {
-            result = process_->manager().isExemptFromAcknowledgementAlertSession(*session(client));
-        });
-        return result;
-    }
-    std::vector<AlertContent> shown() const { return fakes_.userAlerts.shown(); }
-};
+class Acknowledgement : public AcknowledgementWorld {};
 
 TEST_F(Acknowledgement, WithNeitherMicrophoneNorCameraThereAreTwoButtons) {
     always(Response::DefaultButton);
@@ -351,9 +304,9 @@ TEST_F(Acknowledgement, AnAnswerThatIsUnderWayWhenTheClientGoesCountsForNothing)
     EXPECT_EQ(fakes_.keepAlive.open(), 0);
 }
 
-class AcknowledgementWithoutTexts : public Acknowledgement {
+class AcknowledgementWithoutTexts : public AcknowledgementWorld {
 protected:
-    AcknowledgementWithoutTexts() : Acknowledgement(nullptr) {}
+    AcknowledgementWithoutTexts() : AcknowledgementWorld(nullptr) {}
 };
 
 TEST_F(AcknowledgementWithoutTexts, TheKeysStandInTheirPlaces) {
