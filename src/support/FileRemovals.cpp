@@ -30,6 +30,8 @@ void FileRemovals::remove(std::string path, std::optional<std::uint64_t> claim, 
     bool isFirst = false;
     {
         const std::lock_guard lock(mutex_);
+        // Until its turn: whoever writes there now may have gone by then, and its file is still not the removal's.
+        if (claim) ++claims_[key].remembered;
         const auto [place, isNew] = waiting_.try_emplace(key);
         place->second.push_back({std::move(path), claim, std::move(completion), user});
         isFirst = isNew && makeReady(key);
@@ -80,7 +82,10 @@ void FileRemovals::work() {
 std::optional<Error> FileRemovals::perform(const std::string& key, const Removal& removal) {
     if (removal.claim) {
         const std::lock_guard lock(mutex_);
-        if (isClaimedAfterLocked(key, *removal.claim)) return std::nullopt;
+        const bool isLaterOnes = isClaimedAfterLocked(key, *removal.claim);
+        --claims_.at(key).remembered;
+        forgetIfUnused(key);
+        if (isLaterOnes) return std::nullopt;
     }
     auto error = removal.user ? fileSystem_.removeForUser(*removal.user, removal.path) : fileSystem_.remove(removal.path);
     if (error && saysNothingIsThere(*error)) return std::nullopt;

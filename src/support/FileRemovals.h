@@ -35,7 +35,7 @@ public:
     static bool isSamePath(const std::string& path, const std::string& other);
 
     /// Removes what is at `path`, on the background queue, and completes there: with none when nothing was there, or
-    /// when a claim later than `claim` is on the path at that moment.
+    /// when a claim later than `claim` is on the path at that moment or was when it was asked for.
     /// With `user` given the file may be anywhere, and is removed with that user's rights.
     void remove(std::string path, std::optional<std::uint64_t> claim, Completion completion,
                 std::optional<UserID> user = {});

@@ -197,6 +197,35 @@ TEST_F(Save, ARecordingThatTakesTheMoviesPlaceWhileItIsMixedIsNeitherRemovedNorA
     }
 }
 
+TEST_F(Save, AMovieThatTookThePlaceIsNobodyElsesWhenItsClientHasGoneTooMeanwhile) {
+    URL movie;
+    const auto client = makeStopped(movie);
+    const auto goOn = std::shared_ptr<Semaphore>(fakes_.scheduler.semaphore(0));
+    fakes_.movieExporters.setWhenOpened([goOn](const URL&) { goOn->wait(); });
+    fakes_.faults.failNext("MovieExporters.openMovie");
+    client->ask(DaemonMessage::SaveVideoToCameraRoll, {movie});
+    settle();
+    client->start();
+    settle();
+    advance(std::chrono::seconds(2));
+    const auto stopped = client->ask(DaemonMessage::StopRecording);
+    settle();
+    ASSERT_TRUE(stopped->url(0));
+    ASSERT_EQ(*stopped->url(0), movie) << "the same name";
+    client->connection.reset();
+    client->die();
+    settle();
+    goOn->signal();
+    settle();
+    const Array list = saves();
+    ASSERT_EQ(list.size(), 1u);
+    EXPECT_EQ(*list[0].as<Dictionary>()->find("state"), Value("failed"));
+    EXPECT_TRUE(fakes_.photoLibrary.assets().empty()) << "nobody has asked for this one to be saved";
+    ASSERT_TRUE(fakes_.fileSystem.movie(movie.path()));
+    EXPECT_NEAR(fakes_.fileSystem.movie(movie.path())->duration().seconds(), 2, 0.2);
+    EXPECT_EQ(process_->tempStore().claimedPathCount(), 0u) << "what was remembered is forgotten with the save";
+}
+
 TEST_F(Save, AMovieThatIsBeingRecordedIsRefusedAndGoesOn) {
     URL movie;
     const auto client = makeStopped(movie);

@@ -196,6 +196,18 @@ TEST_F(TempStoreTest, WhatCountsIsTheClaimWhenItIsTheRemovalsTurn) {
     EXPECT_TRUE(exists(path));
 }
 
+TEST_F(TempStoreTest, ALaterWriterThatHasGoneWhenItIsTheRemovalsTurnLeavesItsFile) {
+    const std::string path = (ready(), addFile("a.mp4"));
+    const std::uint64_t older = store_.claimPath(path);
+    auto holdOlder = store_.holdClaim(path, older), holdLater = store_.holdClaim(path, store_.claimPath(path));
+    store_.removeFileOfClaim(URL::file(path), older, {});
+    holdOlder.reset();
+    holdLater.reset();
+    settle();
+    EXPECT_TRUE(exists(path));
+    EXPECT_EQ(store_.claimedPathCount(), 0u) << "forgotten once nobody can ask any more";
+}
+
 TEST_F(TempStoreTest, AClaimOnAnotherPathChangesNothing) {
     const std::string path = (ready(), addFile("a.mp4"));
     const std::uint64_t claim = store_.claimPath(path);
