@@ -60,6 +60,27 @@ TEST(InterruptionTest, WhatAnswersAFinishIsToldOfItAndReset) {
     EXPECT_EQ(of.world.fakes.keepAlive.ended(), 0) << "a reset without a beginning ends nothing";
 }
 
+TEST(InterruptionTest, OneThatIsToldOfItIsOnlyTold) {
+    Interruption of([](const SessionServices& services, const BundleIdentifier& id) {
+        std::shared_ptr<LCRecordingSession> session;
+        if (id.text() == "org.example.Editor")
+            session = std::make_shared<AnsweringSession>(services, id);
+        else
+            session = std::make_shared<LCRecordingSession>(services, id);
+        return session;
+    });
+    // Of one that has recorded the display, a report would log more and clear the watch.
+    of.process.manager().registeredSession(of.editor.id)->setSystemRecording(true);
+    of.start();
+    ASSERT_EQ(of.editor.told.size(), 1u);
+    EXPECT_EQ(of.editor.told[0].message, ClientMessage::StopRecordingWithError);
+    const FakeLogSink& log = of.world.fakes.logSink;
+    EXPECT_EQ(log.count("LCClientProxy:stopRecordingWithError:movieURL:"), 1u);
+    EXPECT_EQ(log.count("LCRecordingManager:recordingSessionStoppedWithError:movieURL:"), 0u);
+    EXPECT_EQ(log.count("stop monitoring foreground apps"), 0u);
+    EXPECT_TRUE(of.world.fakes.userAlerts.shown().empty());
+}
+
 TEST(InterruptionTest, AnIdleSessionStaysSilent) {
     Interruption of;
     of.start();

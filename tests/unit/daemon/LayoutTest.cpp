@@ -106,6 +106,79 @@ TEST_F(Layout, TheStopIsNotTheStopProcedure) {
     EXPECT_EQ(logged("LCRecordingManager:recordingSessionStoppedWithError:movieURL:"), 1u);
 }
 
+TEST_F(Layout, TheClientIsToldBeforeTheStateIsReset) {
+    const auto client = makeRecording();
+    show({1, 1});
+    const Lines lines = fakes_.logSink.logged();
+    ASSERT_GE(lines.size(), 3u);
+    EXPECT_EQ(Lines(lines.end() - 3, lines.end()),
+              (Lines{"LCRecordingManager:recordingSessionStoppedWithError:movieURL:",
+                     "LCClientProxy:stopRecordingWithError:movieURL:", "LCRecordingManager:resetStatesForSession:"}));
+}
+
+TEST_F(Layout, LevelsBelowNothingCountAsLow) {
+    const auto client = makeRecording();
+    show({-1, 1, 2});
+    EXPECT_TRUE(isStillRecording(*client));
+    show({0});
+    EXPECT_FALSE(isStillRecording(*client));
+}
+
+TEST_F(Layout, ElementsAboveAloneAreNotCounted) {
+    const auto client = makeRecording();
+    show({2, 2});
+    show({1});
+    EXPECT_TRUE(isStillRecording(*client));
+}
+
+TEST_F(Layout, OneElementCountsAsAReturnOnlyOnce) {
+    const auto client = makeRecording();
+    show({0, 1, 2});
+    show({0});
+    ASSERT_FALSE(isStillRecording(*client));
+    client->start();
+    settle();
+    show({0});
+    EXPECT_TRUE(isStillRecording(*client));
+}
+
+TEST_F(Layout, APausedRecordingIsStoppedWithItsMovie) {
+    const auto client = makeRecording();
+    advance(std::chrono::seconds(1));
+    client->tell(DaemonMessage::PauseRecording);
+    settle();
+    ASSERT_TRUE(session(*client)->isPaused());
+    show({1, 1});
+    EXPECT_FALSE(isStillRecording(*client));
+    EXPECT_FALSE(session(*client)->isPaused());
+    EXPECT_EQ(client->toldOfStop(-5807), 1);
+    ASSERT_EQ(client->told.size(), 1u);
+    EXPECT_TRUE(client->told[0].arguments[1].as<URL>());
+    EXPECT_EQ(fakes_.keepAlive.open(), 0);
+}
+
+TEST_F(Layout, ARecordingThatHasNotBegunYetIsStoppedAndItsStartAnswered) {
+    const auto client = makeConnected();
+    const auto goOn = std::shared_ptr<Semaphore>(world_.scheduler.semaphore(0));
+    fakes_.containerWriters.setWhenMade([goOn] { goOn->wait(); });
+    const auto asked = client->start();
+    settle();
+    ASSERT_TRUE(isStillRecording(*client));
+    ASSERT_EQ(asked->answers, 0) << "the writer is being made";
+    show({1, 1});
+    fakes_.containerWriters.setWhenMade({});
+    goOn->signal();
+    settle();
+    EXPECT_EQ(asked->answers, 1);
+    EXPECT_FALSE(isStillRecording(*client));
+    EXPECT_EQ(client->toldOfStop(-5807), 1);
+    EXPECT_FALSE(fakes_.displayCapture.lastSource() && fakes_.displayCapture.lastSource()->isRunning());
+    EXPECT_EQ(fakes_.keepAlive.open(), 0);
+    const auto again = client->start();
+    settle();
+    EXPECT_EQ(again->code(), 0);
+}
+
 TEST_F(Layout, AMonitorIsObservedUntilAStop) {
     const auto monitor = std::make_shared<TestLayoutMonitor>();
     const auto client = makeRecording();

@@ -106,6 +106,23 @@ TEST_F(Store, ALookupThatFailsIsAnsweredToo) {
     EXPECT_EQ(infoOf("org.example.Game").appName, std::nullopt);
 }
 
+TEST_F(Store, TheAnswerComesOnTheMainQueueAlsoToOtherLanes) {
+    int calls = 0;
+    bool wasOnMainQueue = false;
+    const auto lane = fakes_.scheduler.serialQueue("asks");
+    lane->async([&] {
+        store_.loadItemDetailsForBundleIdentifier(BundleIdentifier("org.example.Game"), [&](const LCStoreInfo& info) {
+            ++calls;
+            EXPECT_EQ(info.bundleID, BundleIdentifier("org.example.Game"));
+            wasOnMainQueue = fakes_.scheduler.mainQueue().isCurrent();
+        });
+        EXPECT_EQ(calls, 0);
+    });
+    world_.scheduler.runUntilIdle();
+    EXPECT_EQ(calls, 1);
+    EXPECT_TRUE(wasOnMainQueue);
+}
+
 class Network : public Descriptions {};
 
 TEST_F(Network, IsAvailableWhenTheHostIsReachableWithoutAConnectionToBeBroughtUp) {
@@ -123,8 +140,12 @@ TEST_F(Network, IsAvailableWhenTheHostIsReachableWithoutAConnectionToBeBroughtUp
 class CountingAssertion final : public LCStatusBarAssertion {
 public:
     using LCStatusBarAssertion::LCStatusBarAssertion;
-    void updateStatusStringWithTimer() override { ++updates; }
-    int updates = 0;
+    void updateStatusStringWithTimer() override {
+        ++updates;
+        if (main && !main->isCurrent()) ++elsewhere;
+    }
+    const SerialQueue* main = nullptr;
+    int updates = 0, elsewhere = 0;
 };
 
 class StatusBar : public Descriptions {
@@ -173,6 +194,35 @@ TEST_F(StatusBar, ThereIsOneTimerHoweverOftenItIsStarted) {
     EXPECT_EQ(assertion_->updates, 3);
     ASSERT_TRUE(first && assertion_->timerStartDate());
     EXPECT_NEAR(secondsBetween(*first, *assertion_->timerStartDate()), 0.75, 0.01);
+}
+
+TEST_F(StatusBar, ItsTimerIsTheMainQueuesWhoeverStartsIt) {
+    assertion_->main = &fakes_.scheduler.mainQueue();
+    const auto lane = fakes_.scheduler.serialQueue("starts");
+    lane->async([&] {
+        assertion_->startRepeatingTimer();
+        EXPECT_FALSE(assertion_->hasTimer());
+    });
+    world_.scheduler.runUntilIdle();
+    world_.scheduler.advance(std::chrono::seconds(2));
+    EXPECT_EQ(assertion_->updates, 4);
+    EXPECT_EQ(assertion_->elsewhere, 0);
+}
+
+TEST_F(StatusBar, ItOwnsNoneOfItsDelegatesAndShowsNothing) {
+    class Delegate final : public LCStatusBarAssertionDelegate {};
+    auto one = std::make_shared<Delegate>(), two = std::make_shared<Delegate>();
+    assertion_->delegate = one;
+    assertion_->assertionDelegate = two;
+    EXPECT_EQ(one.use_count() + two.use_count(), 2);
+    assertion_->showDoubleHeightStatusBarWithPid(ProcessID{500});
+    assertion_->updateDoubleHeightStatusBarWithDuration(5, true);
+    assertion_->invalidateDoubleHeightStatusBar();
+    assertion_->LCStatusBarAssertion::updateStatusStringWithTimer();
+    world_.scheduler.runUntilIdle();
+    EXPECT_FALSE(assertion_->assertion || assertion_->coordinator || assertion_->hasTimer());
+    EXPECT_FALSE(assertion_->paused);
+    EXPECT_TRUE(fakes_.logSink.lines().empty());
 }
 
 TEST_F(StatusBar, ItsTimerEndsWithIt) {
