@@ -175,6 +175,7 @@ private:
             return bundle ? bundle->info(kInfoIcon) : std::nullopt;
         };
         options.explain = [this](std::string_view reason) { log_.error("the user can't be asked: %s", reason); };
+        options.note = [this](std::string_view what) { log_.error("%s", what); };
         return options;
     }
 

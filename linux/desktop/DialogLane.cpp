@@ -75,17 +75,22 @@ bool DialogLane::start(std::shared_ptr<AlertAnswer> answer, std::shared_ptr<Dial
 }
 
 UserAlert::Response DialogLane::ask() {
-    for (int tries = 0; tries < kMostTries; ++tries)
-        if (const auto response = askOnce()) return *response;
-    return Response::OtherButton;
+    std::optional<Response> response;
+    for (int tries = 0; tries < kMostTries && !response; ++tries) response = askOnce();
+    if (!answer_.wasShown() && !answer_.over() && question_.explain) question_.explain(trouble_);
+    return response.value_or(Response::OtherButton);
 }
 
 std::optional<UserAlert::Response> DialogLane::askOnce() {
     const auto dialog = DialogProcess::start(question_.command);
-    if (!dialog) return Response::OtherButton;
+    if (!dialog) {
+        trouble_ = "the dialog program can't be run";
+        return Response::OtherButton;
+    }
     watch_.follow(dialog->pid());
     const auto end = waitForEnd(*dialog);
     const auto ended = steady_clock::now();
+    if (watch_.seen()) answer_.noteShown();
     if (!end || answer_.over()) return Response::OtherButton;
     const Response response = responseOf(question_.program, question_.texts, *end);
     if (response == Response::OtherButton) return response;
@@ -107,7 +112,10 @@ std::optional<DialogEnd> DialogLane::waitForEnd(DialogProcess& dialog) {
         int timeout = -1;
         if (deadline) {
             const auto left = std::chrono::ceil<milliseconds>(*deadline - steady_clock::now());
-            if (left <= milliseconds::zero()) return std::nullopt;
+            if (left <= milliseconds::zero()) {
+                trouble_ = "the dialog program shows no window";
+                return std::nullopt;
+            }
             timeout = static_cast<int>(left.count());
         }
         std::array<pollfd, 3> polled{{{answer_.changes().descriptor(), POLLIN, 0},

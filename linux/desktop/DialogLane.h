@@ -1,12 +1,14 @@
 #pragma once
 // One alert's thread, and what it shares with those who wait for it.
 
+#include <atomic>
 #include <chrono>
 #include <condition_variable>
 #include <functional>
 #include <memory>
 #include <mutex>
 #include <optional>
+#include <string_view>
 
 #include "linux/desktop/DialogProcess.h"
 #include "linux/desktop/DialogProgram.h"
@@ -32,12 +34,15 @@ public:
     const x11::Wake& changes() const { return wake_; }
     /// Cancelled or abandoned.
     bool over() const;
+    void noteShown() { shown_ = true; }
+    bool wasShown() const { return shown_; }
     /// Waits for the handler and calls it; returns at once when nobody wants to know. A cancelled alert's answer is the
     /// other button, whatever `response` says.
     void deliver(Response response);
 
 private:
     const x11::Wake wake_;
+    std::atomic<bool> shown_{false};
     mutable std::mutex mutex_;  // guards the rest
     std::condition_variable changed_;
     Handler handler_;
@@ -53,6 +58,8 @@ public:
         DialogTexts texts;
         DialogProcess::Command command;
         std::chrono::milliseconds tooSoon, windowPatience;
+        /// Told why the user has not been asked.
+        std::function<void(std::string_view reason)> explain;
     };
     /// The thread that does it, and that the dialog dies with; it ends when the answer is delivered, and ends the
     /// watch. False when there is none to be had.
@@ -70,6 +77,7 @@ private:
 
     AlertAnswer& answer_;
     DialogWatch& watch_;
+    std::string_view trouble_ = "the dialog program ended without showing a window";
     const Question& question_;
 };
 

@@ -4,6 +4,7 @@
 #include <array>
 #include <utility>
 
+#include "linux/accessibility/BusAnswers.h"
 #include "linux/desktop/DialogLane.h"
 #include "linux/desktop/DialogWatch.h"
 
@@ -12,6 +13,19 @@ namespace {
 
 constexpr std::array<std::string_view, 5> kPassedOn{"HOME", "PATH", "XAUTHORITY", "USER", "DBUS_SESSION_BUS_ADDRESS"};
 constexpr std::string_view kFamilyPassedOn = "XDG_";
+constexpr std::string_view kBus = "DBUS_SESSION_BUS_ADDRESS=", kNoBus = "DBUS_SESSION_BUS_ADDRESS=disabled:",
+                           kNoBridge = "NO_AT_BRIDGE=1";
+
+/// The dialog would wait for a bus that doesn't answer, before it shows anything.
+void leaveOutSilentBus(std::vector<std::string>& environment, const LinuxUserAlerts::Options& options) {
+    const auto bus = std::find_if(environment.begin(), environment.end(), [](const std::string& variable) {
+        return variable.starts_with(kBus) && variable != kNoBus;
+    });
+    if (bus == environment.end() || busAnswers(bus->substr(kBus.size()), options.busPatience)) return;
+    *bus = kNoBus;
+    environment.emplace_back(kNoBridge);
+    if (options.note) options.note("the session bus does not answer: the dialog does without it, and screen readers");
+}
 
 class LinuxUserAlert final : public UserAlert {
 public:
@@ -19,6 +33,7 @@ public:
     ~LinuxUserAlert() override { answer_->abandon(); }
     void receiveResponse(std::function<void(Response)> handler) override { answer_->receive(std::move(handler)); }
     void cancel() override { answer_->cancel(); }
+    bool wasShown() const override { return answer_->wasShown(); }
 
 private:
     const std::shared_ptr<AlertAnswer> answer_;
@@ -50,7 +65,9 @@ std::shared_ptr<UserAlert> LinuxUserAlerts::show(const AlertContent& content) {
         .texts = *texts,
         .command = {program->path, dialogArguments(*program, *texts, options_.styleDirectory), options_.environment},
         .tooSoon = options_.tooSoon,
-        .windowPatience = options_.windowPatience};
+        .windowPatience = options_.windowPatience,
+        .explain = options_.explain};
+    leaveOutSilentBus(question.command.environment, options_);
     // zenity takes its style from the user's configuration only.
     if (program->kind == DialogProgram::Kind::Zenity) {
         auto& environment = question.command.environment;
@@ -78,7 +95,10 @@ std::vector<std::string> dialogEnvironment(const char* const* variables, const s
         environment.emplace_back(variable);
     }
     // Without one the library would start a bus of its own, which outlives the dialog.
-    if (!hasBus) environment.insert(environment.end(), {"NO_AT_BRIDGE=1", "DBUS_SESSION_BUS_ADDRESS=disabled:"});
+    if (!hasBus) {
+        environment.emplace_back(kNoBridge);
+        environment.emplace_back(kNoBus);
+    }
     return environment;
 }
 

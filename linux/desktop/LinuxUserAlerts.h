@@ -31,14 +31,18 @@ public:
         std::chrono::milliseconds tooSoon{500};
         /// How long the display may take to answer, and the program to show its window.
         std::chrono::milliseconds displayPatience{5'000}, windowPatience{20'000};
+        /// How long the session bus may take to let the dialog in; a dialog without one is none to screen readers.
+        std::chrono::milliseconds busPatience{1'000};
         IconLookup icon;
-        /// Told why an alert could not be shown.
+        /// Told why an alert could not be shown, from any thread.
         std::function<void(std::string_view reason)> explain;
+        /// Told what else is worth a line of the log.
+        std::function<void(std::string_view what)> note;
     };
 
     explicit LinuxUserAlerts(Options options);
     /// Null when there is no dialog program, no display of this machine, or no buttons that can be told apart. Waits
-    /// for the display, not for the program.
+    /// for the display and the session bus, not for the program.
     std::shared_ptr<UserAlert> show(const AlertContent& content) override;
 
 private:

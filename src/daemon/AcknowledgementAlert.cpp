@@ -58,6 +58,7 @@ std::optional<UserAlert::Response> AcknowledgementAlert::ask(const AlertContent&
     answer->came->wait();
     const std::lock_guard lock(mutex_);
     alert_ = nullptr;
+    if (!cancelled_ && !alert->wasShown()) return std::nullopt;
     return answer->response;
 }
 

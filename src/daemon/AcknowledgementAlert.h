@@ -28,8 +28,8 @@ class AcknowledgementAlert final {
 public:
     explicit AcknowledgementAlert(const Platform& platform) : platform_(platform) {}
 
-    /// Shows the alert and waits for the user without limit: on the alert queue only. None when it can't be shown; the
-    /// other button, shown or not, when it was cancelled.
+    /// Shows the alert and waits for the user without limit: on the alert queue only. None when it can't be shown,
+    /// or turns out not to have been; the other button, shown or not, when it was cancelled.
     std::optional<UserAlert::Response> ask(const AlertContent& content);
     /// Takes the alert down; one that is about to be shown may be seen for a moment. Any lane; does not block.
     void cancel();

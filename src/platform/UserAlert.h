@@ -38,6 +38,9 @@ public:
     /// Takes the alert down; it is answered with the other button unless it has been answered already. Any lane; does
     /// not block.
     virtual void cancel() = 0;
+    /// Whether the user had it on the screen; known once it has been answered. Where something went wrong before that,
+    /// the answer is the other button, but nobody's refusal.
+    virtual bool wasShown() const = 0;
 };
 
 /// Makes alerts. Callable from any lane; may take as long as a program takes to start.

@@ -108,6 +108,7 @@ TEST_P(UserAlertContract, AnAlertStandsUntilItIsAnsweredAndIsGoneThen) {
     EXPECT_EQ(answer.count(), 0u);
     world_->press(Response::DefaultButton);
     EXPECT_EQ(answer.wait(), Response::DefaultButton);
+    EXPECT_TRUE(alert->wasShown());
     EXPECT_TRUE(holdsSoon([this] { return world_->standing() == 0; }));
 }
 

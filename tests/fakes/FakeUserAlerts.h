@@ -1,4 +1,5 @@
 #pragma once
+#include <atomic>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -60,17 +61,11 @@ public:
     }
     /// Answers the oldest alert that stands; false when there is none.
     bool answer(Response response) {
-        Alert* oldest = nullptr;
-        std::shared_ptr<Alert> alert;
-        {
-            const std::lock_guard lock(state_->mutex);
-            if (state_->standing.empty()) return false;
-            oldest = state_->standing.front().alert;
-            alert = oldest->weak_from_this().lock();
-        }
-        if (alert) alert->answer(response);
-        return alert != nullptr;
+        return withOldest([response](Alert& alert) { alert.answer(response); });
     }
+
+    /// The oldest alert that stands ends as one that never got as far as the screen; false when there is none.
+    bool failToShow() { return withOldest([](Alert& alert) { alert.failToShow(); }); }
 
     /// Every alert that was shown, oldest first.
     std::vector<AlertContent> shown() const {
@@ -103,6 +98,18 @@ private:
         std::size_t mostStanding = 0;
     };
 
+    template <class Act>
+    bool withOldest(const Act& act) {
+        std::shared_ptr<Alert> alert;
+        {
+            const std::lock_guard lock(state_->mutex);
+            if (state_->standing.empty()) return false;
+            alert = state_->standing.front().alert->weak_from_this().lock();
+        }
+        if (alert) act(*alert);
+        return alert != nullptr;
+    }
+
     class Alert final : public UserAlert, public std::enable_shared_from_this<Alert> {
     public:
         explicit Alert(std::shared_ptr<State> state) : state_(std::move(state)) {}
@@ -117,6 +124,11 @@ private:
             if (response) tell();
         }
         void cancel() override { answer(Response::OtherButton); }
+        bool wasShown() const override { return !failed_; }
+        void failToShow() {
+            failed_ = true;
+            answer(Response::OtherButton);
+        }
         void answer(Response response) {
             takeDown();
             {
@@ -145,6 +157,7 @@ private:
         }
 
         const std::shared_ptr<State> state_;
+        std::atomic<bool> failed_{false};
         std::mutex mutex_;
         std::function<void(Response)> handler_;
         std::optional<Response> response_;
