@@ -149,6 +149,7 @@ private:
         for (const media::ClosedMovie& movie : std::vector(first, closed.end()))
             reportEndedWithProcess(telemetry_, {movie.seconds, movie.width, movie.height, movie.pictures, movie.bytes});
         telemetry_.flush(kTimeToNote);
+        sink_.flush();
     }
 
     std::optional<BundleIdentifier> applicationOf(ProcessID pid) {

@@ -18,7 +18,7 @@ namespace lumacast {
 
 namespace {
 
-/// With its level and a note before it below PIPE_BUF: such a write to a pipe is whole or not at all.
+/// With its level and what is said before it below PIPE_BUF: such a write to a pipe is whole or not at all.
 constexpr std::size_t kMaximumText = 4000;
 
 std::string_view levelName(LogLevel level) {
@@ -125,21 +125,30 @@ bool LinuxLogSink::Stream::write(std::string_view bytes) const {
 }
 
 LinuxLogSink::LinuxLogSink(const LogSinkTargets& targets)
-    : error_(targets.standardError), output_(targets.standardOutput) {
+    : error_(targets.standardError), output_(targets.standardOutput), now_(targets.now) {
     if (leadsToJournal(targets)) journal_ = connectToJournal(targets.journalSocket);
 }
 
 void LinuxLogSink::write(LogLevel level, std::string_view text) {
     const std::string line = presentable(text);
-    bool delivered = false;
     if (level == LogLevel::Print) {
-        delivered = output_.write(line + "\n");
-    } else {
-        const std::uint64_t missed = unreported_.exchange(0);
-        delivered = journal_ ? sendToJournal(level, line, missed) : writeToError(level, line, missed);
-        if (!delivered) unreported_ += missed + 1;
+        if (!output_.write(line + "\n")) ++dropped_;
+        return;
     }
-    if (!delivered) ++dropped_;
+    const auto folded = repeated_.take(level, line, now_());
+    if (folded.before) writeToLog(folded.before->level, folded.before->text);
+    if (folded.isWritten) writeToLog(level, line);
+}
+
+void LinuxLogSink::flush() {
+    if (const auto last = repeated_.end()) writeToLog(last->level, last->text);
+}
+
+void LinuxLogSink::writeToLog(LogLevel level, const std::string& line) {
+    const std::uint64_t missed = unreported_.exchange(0);
+    if (journal_ ? sendToJournal(level, line, missed) : writeToError(level, line, missed)) return;
+    unreported_ += missed + 1;
+    ++dropped_;
 }
 
 bool LinuxLogSink::writeToError(LogLevel level, const std::string& text, std::uint64_t missed) const {

@@ -1,10 +1,13 @@
 #pragma once
 #include <atomic>
+#include <chrono>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <string>
 
 #include "linux/system/FileDescriptor.h"
+#include "linux/system/RepeatedLines.h"
 #include "platform/LogSink.h"
 
 namespace lumacast {
@@ -15,17 +18,22 @@ struct LogSinkTargets {
     int standardOutput = 1;
     std::string journalStream;  ///< $JOURNAL_STREAM: "device:inode" of the standard error that leads to the journal
     std::string journalSocket = "/run/systemd/journal/socket";
+    std::function<std::chrono::steady_clock::time_point()> now = std::chrono::steady_clock::now;
 };
 
 /// Log lines to standard error as `level text`, or, when standard error leads to the journal, as datagrams of its
 /// native protocol with PRIORITY and MESSAGE; `Print` lines to standard output. Never waits: a line the reader has no
 /// room for is dropped, and the next one that gets through is preceded by how many were. Lines are cut at 4000 bytes;
-/// control characters become blanks, so that no text can pretend to be a line of its own. Callable from any lane.
+/// control characters become blanks, so that no text can pretend to be a line of its own. A line that comes again and
+/// again is written once; how often it came is told when another comes, and every ten seconds while it goes on ("repeated 500
+/// times: the line"). `Print` lines are not folded. Callable from any lane.
 class LinuxLogSink final : public LogSink {
 public:
     explicit LinuxLogSink(const LogSinkTargets& targets);
 
     void write(LogLevel level, std::string_view text) override;
+    /// Tells what is still to be told of a line that was repeated: at the end of the process.
+    void flush();
 
     /// Lines dropped since the start.
     std::uint64_t droppedLines() const { return dropped_; }
@@ -44,6 +52,7 @@ private:
         FileDescriptor reopened_;
     };
 
+    void writeToLog(LogLevel level, const std::string& line);
     /// `missed` lines were dropped before this one. False when it was dropped too.
     bool writeToError(LogLevel level, const std::string& text, std::uint64_t missed) const;
     bool sendToJournal(LogLevel level, const std::string& text, std::uint64_t missed) const;
@@ -51,6 +60,8 @@ private:
     const Stream error_;
     const Stream output_;
     FileDescriptor journal_;
+    const std::function<std::chrono::steady_clock::time_point()> now_;
+    RepeatedLines repeated_;
     std::atomic<std::uint64_t> dropped_{0};
     std::atomic<std::uint64_t> unreported_{0};  ///< those of the log that no note has told of
 };

@@ -5,7 +5,7 @@
 
 namespace lumacast {
 
-/// Where log lines leave the process. Callable from any lane; must not block on its reader.
+/// Where log lines leave the process; repeats of one may stand as a count. Any lane; must not block on its reader.
 class LogSink {
 public:
     virtual ~LogSink() = default;

@@ -102,13 +102,16 @@ TEST_P(LogSinkContract, ManyLanesWriteWholeLines) {
     std::vector<std::thread> lanes;
     for (int lane = 0; lane < 4; ++lane)
         lanes.emplace_back([this, lane] {
-            for (int i = 0; i < 50; ++i) sink_.write(LogLevel::Default, "lane " + std::to_string(lane));
+            for (int i = 0; i < 50; ++i)
+                sink_.write(LogLevel::Default, "lane " + std::to_string(lane) + " line " + std::to_string(i));
         });
     for (std::thread& lane : lanes) lane.join();
     const auto lines = world_->logged();
     ASSERT_EQ(lines.size(), 200u);
     for (int lane = 0; lane < 4; ++lane)
-        EXPECT_EQ(std::count(lines.begin(), lines.end(), "lane " + std::to_string(lane)), 50);
+        for (int i = 0; i < 50; ++i)
+            EXPECT_EQ(std::count(lines.begin(), lines.end(),
+                                 "lane " + std::to_string(lane) + " line " + std::to_string(i)), 1);
 }
 
 INSTANTIATE_TEST_SUITE_P(Fake, LogSinkContract,
