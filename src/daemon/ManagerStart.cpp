@@ -132,6 +132,8 @@ void LCRecordingManager::startEnabledRecording(const WaitingStartRef& start, std
     const StartRequest& request = start->request;
     session->managerRecord.startConnection = start->connection;
     session->managerRecord.user = start->connection->userIdentifier();
+    const auto source = session->screenCaptureController();
+    session->managerRecord.countersBefore = source ? source->counters() : DisplayCaptureSource::Counters{};
     session->setRecording(true);
     session->setIsBroadcasting(request.broadcast);
     interruptOtherRecordingSessionAgainstSession(session);

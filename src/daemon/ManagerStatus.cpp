@@ -19,9 +19,10 @@ Dictionary describeRecording(const LCRecordingSession& session) {
     }
     if (const auto agent = session.reportingAgent()) recording.set("frames", agent->metrics().videoFrameCount);
     if (const auto source = session.screenCaptureController()) {
-        const auto counters = source->counters();
-        recording.set("framesDelivered", counters.delivered);
-        recording.set("framesDropped", counters.dropped);
+        // The source is older than the recording.
+        const auto counters = source->counters(), before = session.managerRecord.countersBefore;
+        recording.set("framesDelivered", counters.delivered - before.delivered);
+        recording.set("framesDropped", counters.dropped - before.dropped);
     }
     return recording;
 }

@@ -256,6 +256,7 @@ public:
             std::uint64_t generation = 0;
             std::weak_ptr<std::function<void(std::optional<Error>, bool, bool)>> answer;
         } pendingStart;
+        DisplayCaptureSource::Counters countersBefore;  ///< the capture source's when the last recording began
 
         bool hasTransactionOf(std::uint64_t generation) const {
             return std::find(openTransactions.begin(), openTransactions.end(), generation) != openTransactions.end();
