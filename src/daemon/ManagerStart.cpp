@@ -201,7 +201,8 @@ void LCRecordingManager::interruptOtherRecordingSessionAgainstSession(
     const auto sessions = bundleIDToRecordingSessionLookup_;
     for (const auto& [id, other] : sessions) {
         if (id == session->bundleID()) continue;
-        // Idle sessions are asked too: they stay silent.
+        // Idle sessions are asked too: they stay silent. Deliberately one way for all: room was made before the user was
+        // asked, so a recording of the whole display that began meanwhile ends without sound and library as well.
         other->finishSessionWithHandler(
             [self = shared_from_this(), other = other, generation = other->managerRecord.startGeneration](
                 const std::optional<URL>& url, const std::optional<Error>& error) {

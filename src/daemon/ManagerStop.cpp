@@ -106,6 +106,12 @@ void LCRecordingManager::recordingSessionStoppedWithError(const std::shared_ptr<
         if (session->startCount() != start) return;
         self->answerPendingStart(session, error);
         self->recordingSessionStoppedWithError(session, error, std::nullopt);
+        // Deliberately it stays where it is: only a recording that another one takes the place of goes to the library.
+        const auto proxy = session->clientProxy();
+        const auto writer = session->movieWriter();
+        if (session->isSystemRecording() && writer && !(proxy && proxy->connection()))
+            self->log_.line("nobody hears of the end of a recording of the whole display: its movie is %@",
+                            writer->outputPath());
         // A session that stopped by itself is finished by nobody else.
         self->resetAfterStop(session, session->managerRecord.startGeneration);
         // A tap may have been started while the session stopped.
@@ -127,13 +133,19 @@ void LCRecordingManager::recordingSessionStoppedWithError(const std::shared_ptr<
                                                           const std::optional<Error>& error,
                                                           const std::optional<URL>& movieURL) {
     log_.line("LCRecordingManager:recordingSessionStoppedWithError:movieURL:");
-    if (session->isSystemRecording())
-        lumaAlertQueue().async([session, error] {
+    if (session->isSystemRecording()) {
+        const auto show = [session, error] {
             if (session->broadcastExtension())
                 showAlertForBroadcastSession(*session, error);
             else
                 showAlertForRecordingSession(*session, error);
-        });
+        };
+        // While the user is asked the queue stands still, perhaps for ever, and the session would wait in it.
+        if (isAsking_)
+            show();
+        else
+            lumaAlertQueue().async(show);
+    }
     clearSystemRecordingUI(*session);
     if (const auto proxy = session->clientProxy()) proxy->stopRecordingWithError(error, movieURL);
 }
