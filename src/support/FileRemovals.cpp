@@ -87,7 +87,8 @@ std::optional<Error> FileRemovals::perform(const std::string& key, const Removal
         forgetIfUnused(key);
         if (isLaterOnes) return std::nullopt;
     }
-    auto error = removal.user ? fileSystem_.removeForUser(*removal.user, removal.path) : fileSystem_.remove(removal.path);
+    auto error =
+        removal.user ? fileSystem_.removeForUser(*removal.user, removal.path) : fileSystem_.remove(removal.path);
     if (error && saysNothingIsThere(*error)) return std::nullopt;
     if (error) log_.line("_lxRemoveFile error: %i", error->code());
     return error;

@@ -90,7 +90,8 @@ TEST_F(Acknowledgement, AnAcknowledgedRecordingGoesOnWithoutMicrophoneAndCamera)
         const char* device;
     };
     for (const Case& wanted : {Case{{}, "microphone"}, Case{{.microphone = true}, "microphone"},
-                               Case{{.camera = true}, "camera"}, Case{{.microphone = true, .camera = true}, "camera"}}) {
+                               Case{{.camera = true}, "camera"},
+                               Case{{.microphone = true, .camera = true}, "camera"}}) {
         const auto fresh = makeConnected(std::string("P") + wanted.device + std::to_string(wanted.flags.microphone),
                                          wanted.flags.microphone ? 700 : 600);
         const auto asked = started(*fresh, wanted.flags);

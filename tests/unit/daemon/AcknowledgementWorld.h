@@ -23,12 +23,11 @@ protected:
         FakeBundle framework;
         framework.path = fakes.bundles.frameworkBundlePath();
         auto& texts = framework.tables["Localizable"];
-        for (const char* key :
-             {"ACKNOWLEDGEMENT_ALERT_BODY_TV", "ACKNOWLEDGEMENT_CAPTURE_ALERT_BODY_TV",
-              "ACKNOWLEDGEMENT_ALERT_BODY_CAMERA", "ACKNOWLEDGEMENT_ALERT_BODY_MIC",
-              "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_MICROPHONE_DISABLED", "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1",
-              "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_CAMERA", "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_2",
-              "ACKNOWLEDGEMENT_ALERT_DECLINE_BUTTON"})
+        for (const char* key : {"ACKNOWLEDGEMENT_ALERT_BODY_TV", "ACKNOWLEDGEMENT_CAPTURE_ALERT_BODY_TV",
+                                "ACKNOWLEDGEMENT_ALERT_BODY_CAMERA", "ACKNOWLEDGEMENT_ALERT_BODY_MIC",
+                                "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_MICROPHONE_DISABLED",
+                                "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1", "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_CAMERA",
+                                "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_2", "ACKNOWLEDGEMENT_ALERT_DECLINE_BUTTON"})
             texts[key] = std::string("text of ") + key;
         texts["ACKNOWLEDGEMENT_ALERT_TITLE"] = "Record %@?";
         texts["ACKNOWLEDGEMENT_CAPTURE_ALERT_TITLE"] = "Capture %@?";
@@ -50,9 +49,8 @@ protected:
     }
     bool isExempt(const TestClient& client) {
         bool result = false;
-        world_.scheduler.mainQueue().sync([&] {
-            result = process_->manager().isExemptFromAcknowledgementAlertSession(*session(client));
-        });
+        world_.scheduler.mainQueue().sync(
+            [&] { result = process_->manager().isExemptFromAcknowledgementAlertSession(*session(client)); });
         return result;
     }
     std::vector<AlertContent> shown() const { return fakes_.userAlerts.shown(); }

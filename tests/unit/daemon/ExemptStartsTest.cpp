@@ -26,8 +26,8 @@ protected:
 TEST_F(ExemptStarts, AnExemptionIsForEveryKindOfRecording) {
     always(Response::DefaultButton);
     for (const bool displayFirst : {false, true}) {
-        const auto client = makeConnected(displayFirst ? "Player" : "Editor", displayFirst ? 500 : 501,
-                                          displayFirst ? 7 : 8);
+        const auto client =
+            makeConnected(displayFirst ? "Player" : "Editor", displayFirst ? 500 : 501, displayFirst ? 7 : 8);
         fakes_.ipc.grant(client->pid, "com.orvane.private.luma-cast", true);
         const auto before = shown().size();
         ASSERT_EQ(started(*client, {.system = displayFirst})->code(), 0);
@@ -96,11 +96,11 @@ TEST_F(ExemptStarts, TheLinesOfAQuestionThatIsAcknowledgedUpToTheStart) {
     Lines lines = fakes_.logSink.logged();
     ASSERT_GE(lines.size(), 7u);
     lines.resize(7);
-    EXPECT_EQ(lines,
-              (Lines{kHead, "LCRecordingManager:stopCurrentRecordingSession:", "LCRecordingManager: suppressAlert=0",
-                     "LCRecordingManager:showAcknowledgementAlert",
-                     "user acknowledged recording, but camera recording is disabled", "starting...",
-                     "broadcast disabled"}));
+    EXPECT_EQ(
+        lines,
+        (Lines{kHead, "LCRecordingManager:stopCurrentRecordingSession:", "LCRecordingManager: suppressAlert=0",
+               "LCRecordingManager:showAcknowledgementAlert",
+               "user acknowledged recording, but camera recording is disabled", "starting...", "broadcast disabled"}));
 }
 
 }  // namespace

@@ -14,6 +14,12 @@ public:
     }
 };
 
+/// The editor's session is one of those.
+std::shared_ptr<LCRecordingSession> makeAnsweringEditor(const SessionServices& services, const BundleIdentifier& id) {
+    if (id.text() == "org.example.Editor") return std::make_shared<AnsweringSession>(services, id);
+    return std::make_shared<LCRecordingSession>(services, id);
+}
+
 /// Two applications, of which the player starts to record.
 struct Interruption {
     explicit Interruption(LCRecordingManager::SessionMaker makeSession = {})
@@ -40,14 +46,7 @@ struct Interruption {
 };
 
 TEST(InterruptionTest, WhatAnswersAFinishIsToldOfItAndReset) {
-    Interruption of([](const SessionServices& services, const BundleIdentifier& id) {
-        std::shared_ptr<LCRecordingSession> session;
-        if (id.text() == "org.example.Editor")
-            session = std::make_shared<AnsweringSession>(services, id);
-        else
-            session = std::make_shared<LCRecordingSession>(services, id);
-        return session;
-    });
+    Interruption of(&makeAnsweringEditor);
     const auto other = of.process.manager().registeredSession(of.editor.id);
     other->setPaused(true);
     of.start();
@@ -61,14 +60,7 @@ TEST(InterruptionTest, WhatAnswersAFinishIsToldOfItAndReset) {
 }
 
 TEST(InterruptionTest, OneThatIsToldOfItIsOnlyTold) {
-    Interruption of([](const SessionServices& services, const BundleIdentifier& id) {
-        std::shared_ptr<LCRecordingSession> session;
-        if (id.text() == "org.example.Editor")
-            session = std::make_shared<AnsweringSession>(services, id);
-        else
-            session = std::make_shared<LCRecordingSession>(services, id);
-        return session;
-    });
+    Interruption of(&makeAnsweringEditor);
     // Of one that has recorded the display, a report would log more and clear the watch.
     of.process.manager().registeredSession(of.editor.id)->setSystemRecording(true);
     of.start();

@@ -135,6 +135,17 @@ TEST_F(SystemRecordingEnds, ItsIdleSessionIsThereForItsClientsNextConnection) {
     EXPECT_EQ(started(*client)->code(), 0);
 }
 
+TEST_F(SystemRecordingEnds, ThatTheDisplaysMayBeStoppedCutsNoApplicationsRecording) {
+    fakes_.displayCapture.setAutomatic(true);
+    const auto player = makeRecording("Player", 500, 7);
+    advance(seconds(1));
+    onRequestLane([](LCRecordingManager& manager) { manager.notifySystemRecordingMayBeStopped(); });
+    advance(seconds(1));
+    const auto whole = stopped(*player);
+    ASSERT_TRUE(whole->url(0));
+    EXPECT_NEAR(fakes_.fileSystem.movie(whole->url(0)->path())->duration().seconds(), 2, 0.1);
+}
+
 /// A session that always counts as a system recording under way, with a movie of its own name.
 class AlwaysRecording final : public LCRecordingSession {
 public:
