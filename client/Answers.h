@@ -9,6 +9,7 @@
 
 #include "base/Identifiers.h"
 #include "base/Value.h"
+#include "broadcast/LCBroadcastConfiguration.h"
 #include "writer/media/AudioFormat.h"
 #include "writer/media/PixelBuffer.h"
 #include "writer/media/SampleBuffer.h"
@@ -22,9 +23,41 @@ struct StartOptions {
     Size size;
     bool microphone = false;
     bool camera = false;
+    /// Through the extension that was set up last, see Recorder::setUpBroadcast. There is no movie then.
     bool broadcast = false;
     bool systemRecording = false;
+    /// Pictures and sound are handed to the application (Events::videoSample, audioSample). There is no movie then.
     bool capture = false;
+};
+
+/// What the application's next broadcast goes through.
+struct BroadcastSetup {
+    /// The bundle identifier of the application that is going to broadcast: its own.
+    BundleIdentifier host;
+    /// An upload extension, or anything with its prefix: the last component does not count.
+    std::string extension;
+    /// How long a clip is, and how it is compressed, where the extension takes clips; none: as the daemon does it.
+    std::optional<LCBroadcastConfiguration> configuration;
+    /// Whatever the extension wants to know: what it is to be called, where it goes.
+    Dictionary userInfo;
+};
+
+/// One installed upload extension.
+struct BroadcastExtension {
+    std::string displayName;  ///< in the user's language; may be empty
+    BundleIdentifier identifier;
+    Data icon;  ///< a PNG file, or nothing
+};
+
+struct BroadcastExtensionsAnswer {
+    std::vector<BroadcastExtension> extensions;
+    std::optional<Error> error;
+};
+
+/// PNG files; empty where there is none.
+struct BroadcastImagesAnswer {
+    Data host, extension;
+    std::optional<Error> error;  ///< a connection error
 };
 
 struct StartAnswer {
@@ -96,10 +129,6 @@ struct Events {
     /// at the daemon: start again what is to go on.
     std::function<void()> connected = {};
 
-    // Of the messages below today's daemon sends none; they are delivered when it does.
-
-    /// Recording is now on or off.
-    std::function<void(bool isOn)> recordingStateChanged = {};
     /// What the broadcast's extension tells of itself.
     std::function<void(const Value& info)> broadcastServiceInfo = {};
     /// Where the broadcast can be watched.
@@ -107,6 +136,11 @@ struct Events {
     /// Pictures that come twice with one stamp (the last one before a pause is repeated after it) are told once.
     std::function<void(const VideoSample& sample)> videoSample = {};
     std::function<void(const AudioSample& sample)> audioSample = {};
+
+    // Of the messages below today's daemon sends none; they are delivered when it does.
+
+    /// Recording is now on or off.
+    std::function<void(bool isOn)> recordingStateChanged = {};
     /// The device was locked.
     std::function<void(const Value& details)> interrupted = {};
     /// How long the recording has been going on, as the daemon shows it.

@@ -7,7 +7,9 @@
 #include <utility>
 
 #include "base/MessageTables.h"
+#include "broadcast/ConfigurationArchive.h"
 #include "client/Link.h"
+#include "linux/ipc/LinuxKeyedArchive.h"
 
 namespace lumacast::client {
 
@@ -42,6 +44,36 @@ StateAnswer stateAnswer(const Error* error, const Array& values) {
     if (error) return {std::nullopt, *error};
     const Dictionary* state = values[0].as<Dictionary>();
     return {state ? std::optional(*state) : std::nullopt, std::nullopt};
+}
+
+std::optional<Error> setupAnswer(const Error* error, const Array& values) { return saveAnswer(error, values); }
+
+Data bytesIn(const Value* value) {
+    const Data* bytes = value ? value->as<Data>() : nullptr;
+    return bytes ? *bytes : Data();
+}
+
+std::string textIn(const Value* value) {
+    const std::string* text = value ? value->as<std::string>() : nullptr;
+    return text ? *text : std::string();
+}
+
+BroadcastExtensionsAnswer extensionsAnswer(const Error* error, const Array& values) {
+    if (error) return {{}, *error};
+    BroadcastExtensionsAnswer answer{{}, errorIn(values[1])};
+    for (const Value& value : *values[0].as<Array>()) {
+        const Dictionary* entry = value.as<Dictionary>();
+        if (!entry) continue;
+        answer.extensions.push_back({textIn(entry->find("displayName")),
+                                     BundleIdentifier(textIn(entry->find("extBundleID"))),
+                                     bytesIn(entry->find("extAppImgData"))});
+    }
+    return answer;
+}
+
+BroadcastImagesAnswer imagesAnswer(const Error* error, const Array& values) {
+    if (error) return {{}, {}, *error};
+    return {bytesIn(&values[0]), bytesIn(&values[1]), std::nullopt};
 }
 
 template <class Answer>
@@ -107,6 +139,24 @@ void Recorder::state(std::function<void(StateAnswer)> answered) {
     link_->ask(DaemonMessage::SynchronousGetCurrentState, {}, read(stateAnswer, std::move(answered)));
 }
 
+void Recorder::setUpBroadcast(const BroadcastSetup& setup, std::function<void(std::optional<Error>)> answered) {
+    LinuxKeyedArchive archives;
+    // A configuration that no archive can hold is none.
+    Data configuration =
+        archiveOf(archives, setup.configuration.value_or(LCBroadcastConfiguration())).value_or(Data());
+    link_->ask(DaemonMessage::SetupBroadcast,
+               {setup.host.text(), setup.extension, std::move(configuration), setup.userInfo},
+               read(setupAnswer, std::move(answered)));
+}
+
+void Recorder::broadcastExtensions(std::function<void(BroadcastExtensionsAnswer)> answered) {
+    link_->ask(DaemonMessage::GetSystemBroadcastExtensionInfo, {}, read(extensionsAnswer, std::move(answered)));
+}
+
+void Recorder::broadcastImages(std::function<void(BroadcastImagesAnswer)> answered) {
+    link_->ask(DaemonMessage::GetCurrentBroadcastImages, {}, read(imagesAnswer, std::move(answered)));
+}
+
 void Recorder::pause() { link_->send(DaemonMessage::PauseRecording, {}); }
 
 void Recorder::resume(ContextID window) { link_->send(DaemonMessage::ResumeRecording, {number(window)}); }
@@ -162,6 +212,18 @@ std::optional<Error> Recorder::saveAndWait(const URL& movie, std::chrono::millis
 
 StateAnswer Recorder::stateAndWait(std::chrono::milliseconds limit) {
     return waitFor(*link_, limit, stateAnswer, [&](auto answered) { state(std::move(answered)); });
+}
+
+std::optional<Error> Recorder::setUpBroadcastAndWait(const BroadcastSetup& setup, std::chrono::milliseconds limit) {
+    return waitFor(*link_, limit, setupAnswer, [&](auto answered) { setUpBroadcast(setup, std::move(answered)); });
+}
+
+BroadcastExtensionsAnswer Recorder::broadcastExtensionsAndWait(std::chrono::milliseconds limit) {
+    return waitFor(*link_, limit, extensionsAnswer, [&](auto answered) { broadcastExtensions(std::move(answered)); });
+}
+
+BroadcastImagesAnswer Recorder::broadcastImagesAndWait(std::chrono::milliseconds limit) {
+    return waitFor(*link_, limit, imagesAnswer, [&](auto answered) { broadcastImages(std::move(answered)); });
 }
 
 std::string Recorder::defaultRuntimeDirectory() {

@@ -78,6 +78,14 @@ public:
     /// asked before.
     void state(std::function<void(StateAnswer)> answered);
 
+    /// Chooses the extension of the application's next broadcast, which its start consumes; a newer one replaces it. An
+    /// error (InvalidBroadcastSession, or why extensions can't be looked up) when there is no such extension.
+    void setUpBroadcast(const BroadcastSetup& setup, std::function<void(std::optional<Error>)> answered);
+    /// The upload extensions that are installed.
+    void broadcastExtensions(std::function<void(BroadcastExtensionsAnswer)> answered);
+    /// The icons of the application and the extension that were set up last, by whomever.
+    void broadcastImages(std::function<void(BroadcastImagesAnswer)> answered);
+
     // Without an answer; ignored where they don't apply.
 
     /// Pauses a running recording. What happens until the resume is not in the movie.
@@ -110,6 +118,9 @@ public:
     std::optional<Error> discardAndWait(std::chrono::milliseconds limit = kPatience);
     std::optional<Error> saveAndWait(const URL& movie, std::chrono::milliseconds limit = kNoLimit);
     StateAnswer stateAndWait(std::chrono::milliseconds limit = kNoLimit);
+    std::optional<Error> setUpBroadcastAndWait(const BroadcastSetup& setup, std::chrono::milliseconds limit = kPatience);
+    BroadcastExtensionsAnswer broadcastExtensionsAndWait(std::chrono::milliseconds limit = kPatience);
+    BroadcastImagesAnswer broadcastImagesAndWait(std::chrono::milliseconds limit = kPatience);
 
     /// "$XDG_RUNTIME_DIR/lumacast", or "/run/user/UID/lumacast" without that variable.
     static std::string defaultRuntimeDirectory();

@@ -12,10 +12,14 @@
 #include <optional>
 #include <string>
 #include <thread>
+#include <utility>
+#include <vector>
 
 #include "client/lumacastctl/ExitStatus.h"
+#include "client/lumacastctl/broadcast/ExtensionsCommand.h"
 #include "client/lumacastctl/doctor/Display.h"
 #include "client/lumacastctl/doctor/Doctor.h"
+#include "client/lumacastctl/doctor/Identity.h"
 #include "client/lumacastctl/record/RecordCommand.h"
 #include "client/lumacastctl/record/StopWish.h"
 #include "client/lumacastctl/save/SaveCommand.h"
@@ -108,6 +112,34 @@ int runRecord(const std::string& directory, RecordRequest request) {
         });
 }
 
+/// What "title=Game night" says; a text without "=" is a flag that is true.
+std::pair<std::string, Value> entryIn(const std::string& text) {
+    const auto at = text.find('=');
+    if (at == std::string::npos) return {text, true};
+    return {text.substr(0, at), text.substr(at + 1)};
+}
+
+int runBroadcast(RecordRequest request, const std::string& extension, const std::vector<std::string>& entries,
+                 double clipSeconds) {
+    const LinuxEnvironment environment = LinuxEnvironment::ofThisProcess();
+    const LinuxBundles::Options options = LinuxBundles::optionsFrom(environment);
+    LinuxBundles bundles(options);
+    const IdentityFacts own = probeIdentity(bundles, options, {.pid = ProcessID{::getpid()}});
+    if (!own.identifier) {
+        std::fprintf(stderr, "lumacastctl: the tool is no installed application; `lumacastctl doctor` says more.\n");
+        return kNotRecorded;
+    }
+    // The last component of what is set up does not count: the extension itself is named.
+    client::BroadcastSetup setup{BundleIdentifier(*own.identifier), extension + ".x", std::nullopt, {}};
+    for (const std::string& text : entries) {
+        auto [key, value] = entryIn(text);
+        setup.userInfo.set(std::move(key), std::move(value));
+    }
+    if (clipSeconds > 0) setup.configuration = LCBroadcastConfiguration{clipSeconds, {}};
+    request.broadcast = std::move(setup);
+    return runRecord(environment.runtimeDirectory, std::move(request));
+}
+
 int runDoctor(const IdentityQuestion& question) {
     const Findings findings = examine(LinuxEnvironment::ofThisProcess(), variable, question);
     std::fputs(findingsText(findings).c_str(), stdout);
@@ -181,6 +213,29 @@ int main(int argc, char** argv) {
         ->type_name("FILE");
     record->add_flag("--microphone", wanted.microphone, "Ask for the microphone too");
 
+    CLI::App* extensions = app.add_subcommand("extensions", "Show the upload extensions that a broadcast can go through");
+    extensions->footer(exitStatuses);
+    extensions->add_flag("--json", json, "Answer one line of JSON");
+    CLI::App* broadcast = app.add_subcommand(
+        "broadcast", "Broadcast the whole display through an upload extension, until q, Enter, the space bar or Ctrl-C");
+    broadcast->footer(exitStatuses);
+    std::string extension;
+    std::vector<std::string> entries;
+    double clipSeconds = 0;
+    broadcast->add_flag("--display", display, "What to broadcast: the whole display")->required();
+    broadcast->add_option("--extension", extension, "The extension, as `extensions` shows it")
+        ->type_name("IDENTIFIER")
+        ->required();
+    broadcast->add_option("--set", entries, "What the extension is to know, once for each; its documentation says what")
+        ->type_name("KEY=VALUE");
+    broadcast->add_option("--clip", clipSeconds, "How long a clip is, where the extension takes clips")
+        ->type_name("SECONDS")
+        ->check(CLI::Range(0.5, 600.0));
+    broadcast->add_option("--duration", duration, "End after so many seconds")
+        ->type_name("SECONDS")
+        ->check(CLI::Range(0.1, 86'400.0));
+    broadcast->add_flag("--microphone", wanted.microphone, "Ask for the microphone too");
+
     try {
         app.parse(argc, argv);
     } catch (const CLI::ParseError& error) {
@@ -205,6 +260,12 @@ int main(int argc, char** argv) {
         result = showUsage(directory, json ? Form::Json : Form::Text, stdout, stderr);
     } else if (save->parsed()) {
         result = runSave(LinuxEnvironment::ofThisProcess().runtimeDirectory, movie, json ? Form::Json : Form::Text);
+    } else if (extensions->parsed()) {
+        result = showExtensions(LinuxEnvironment::ofThisProcess().runtimeDirectory, json ? Form::Json : Form::Text,
+                                stdout, stderr);
+    } else if (broadcast->parsed()) {
+        wanted.duration = std::chrono::milliseconds(std::llround(duration * 1000));
+        result = runBroadcast(wanted, extension, entries, clipSeconds);
     } else if (record->parsed()) {
         wanted.duration = std::chrono::milliseconds(std::llround(duration * 1000));
         result = runRecord(LinuxEnvironment::ofThisProcess().runtimeDirectory, wanted);

@@ -8,6 +8,8 @@
 #include <atomic>
 
 #include "base/Limits.h"
+#include "broadcast/ConfigurationArchive.h"
+#include "linux/ipc/LinuxKeyedArchive.h"
 #include "tests/checkers/tests/Child.h"
 #include "tests/client/StandInService.h"
 #include "tests/client/WaitUntil.h"
@@ -113,6 +115,49 @@ TEST_F(ClientAnswers, OfAnIdleServiceComeWithTheirValues) {
                                             false, Value()}));
     EXPECT_EQ(received[2].arguments, (Array{1.0, 2.0}));
     EXPECT_EQ(received[3].arguments, (Array{URL::file("/m.mp4")}));
+}
+
+TEST_F(ClientAnswers, OfBroadcastsComeWithTheirValues) {
+    const Error none(std::string(kRecordingErrorDomain), -5808);
+    const auto daemon = service([&](DaemonMessage message, const Array& arguments, const IpcReply& reply) {
+        switch (message) {
+            case DaemonMessage::SetupBroadcast:
+                return reply({arguments[1] == Value("org.example.Uploader.x") ? Value() : Value(none)});
+            case DaemonMessage::GetSystemBroadcastExtensionInfo:
+                return reply({Array{Dictionary{{"displayName", "Uploader"},
+                                               {"extBundleID", "org.example.Uploader"},
+                                               {"extAppImgData", Data{1, 2}}},
+                                    7, Dictionary{{"extBundleID", "org.example.Nameless"}}},
+                              Value(none)});
+            case DaemonMessage::GetCurrentBroadcastImages: return reply({Value(), Data{3}});
+            default: return;
+        }
+    });
+    Recorder recorder({}, runtime());
+    client::BroadcastSetup setup{BundleIdentifier("org.example.Player"), "org.example.Uploader.x",
+                                 LCBroadcastConfiguration{2.5, {}}, {{"title", "Game night"}}};
+    EXPECT_EQ(recorder.setUpBroadcastAndWait(setup), std::nullopt);
+    setup.extension = "org.example.Missing.x";
+    EXPECT_EQ(keyIn(recorder.setUpBroadcastAndWait(setup)), "RECORDING_ERROR_INVALID_BROADCAST_SESSION");
+    const auto list = recorder.broadcastExtensionsAndWait();
+    ASSERT_EQ(list.extensions.size(), 2u);
+    EXPECT_EQ(list.extensions[0].displayName, "Uploader");
+    EXPECT_EQ(list.extensions[0].identifier, BundleIdentifier("org.example.Uploader"));
+    EXPECT_EQ(list.extensions[0].icon, (Data{1, 2}));
+    EXPECT_EQ(list.extensions[1].displayName, "");
+    EXPECT_TRUE(list.error);
+    const auto images = recorder.broadcastImagesAndWait();
+    EXPECT_TRUE(images.host.empty());
+    EXPECT_EQ(images.extension, Data{3});
+
+    const auto received = daemon->received();
+    ASSERT_EQ(received.size(), 4u);
+    EXPECT_EQ(received[0].arguments[0], Value("org.example.Player"));
+    EXPECT_EQ(received[0].arguments[3], Value(Dictionary{{"title", "Game night"}}));
+    LinuxKeyedArchive archives;
+    const auto configuration = configurationIn(archives, *received[0].arguments[2].as<Data>());
+    ASSERT_TRUE(configuration);
+    EXPECT_EQ(configuration->clipDuration, 2.5);
 }
 
 TEST_F(ClientAnswers, ComeOnceWhenTheDaemonIsKilled) {

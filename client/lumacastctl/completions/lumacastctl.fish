@@ -9,11 +9,22 @@ complete -c lumacastctl -n __fish_use_subcommand -a storage -d 'Show the tempora
 complete -c lumacastctl -n __fish_use_subcommand -a save -d 'Save a movie to the Videos folder'
 complete -c lumacastctl -n __fish_use_subcommand -a usage -d 'Show the recordings that have ended'
 complete -c lumacastctl -n __fish_use_subcommand -a record -d 'Record the whole display'
+complete -c lumacastctl -n __fish_use_subcommand -a extensions -d 'Show the upload extensions'
+complete -c lumacastctl -n __fish_use_subcommand -a broadcast -d 'Broadcast the whole display'
 
 complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l display -d 'Record the whole display'
 complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l duration -x -d 'End after so many seconds'
 complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l output -r -F -d 'Where the movie goes'
 complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l microphone -d 'Ask for the microphone too'
+
+complete -c lumacastctl -n '__fish_seen_subcommand_from extensions' -l json -d 'Answer one line of JSON'
+
+complete -c lumacastctl -n '__fish_seen_subcommand_from broadcast' -l display -d 'Broadcast the whole display'
+complete -c lumacastctl -n '__fish_seen_subcommand_from broadcast' -l extension -x -d 'The upload extension'
+complete -c lumacastctl -n '__fish_seen_subcommand_from broadcast' -l set -x -d 'What the extension is to know'
+complete -c lumacastctl -n '__fish_seen_subcommand_from broadcast' -l clip -x -d 'How long a clip is'
+complete -c lumacastctl -n '__fish_seen_subcommand_from broadcast' -l duration -x -d 'End after so many seconds'
+complete -c lumacastctl -n '__fish_seen_subcommand_from broadcast' -l microphone -d 'Ask for the microphone too'
 
 complete -c lumacastctl -n '__fish_seen_subcommand_from save' -F
 complete -c lumacastctl -n '__fish_seen_subcommand_from save' -l json -d 'Answer lines of JSON'

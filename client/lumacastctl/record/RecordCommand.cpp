@@ -43,6 +43,7 @@ public:
         std::optional<Error> stopError;
         std::optional<URL> stopMovie;
         bool isDisconnected = false;
+        std::string viewURL;  ///< of a broadcast
     };
     Known known() const {
         const std::lock_guard lock(mutex_);
@@ -109,6 +110,14 @@ private:
 
 }  // namespace
 
+std::string viewURLIn(const Value& serviceInfo) {
+    const Dictionary* info = serviceInfo.as<Dictionary>();
+    const Value* url = info ? info->find("viewURL") : nullptr;
+    if (const URL* address = url ? url->as<URL>() : nullptr) return address->text();
+    const std::string* text = url ? url->as<std::string>() : nullptr;
+    return text ? *text : std::string();
+}
+
 std::optional<RunningRecording> displayRecording(const DaemonStatus& status) {
     for (const ApplicationSession& session : status.sessions)
         if (session.wholeDisplay && session.recording) return session.recording;
@@ -163,9 +172,19 @@ int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& requ
         });
     };
     events.disconnected = [answers] { answers->change([](Answers::Known& known) { known.isDisconnected = true; }); };
+    const auto tellView = [answers](const std::string& url) {
+        if (!url.empty()) answers->change([&](Answers::Known& known) { known.viewURL = url; });
+    };
+    events.broadcastURL = [tellView](std::optional<URL> url) { tellView(url ? url->text() : std::string()); };
+    events.broadcastServiceInfo = [tellView](const Value& info) { tellView(viewURLIn(info)); };
     client::Recorder recorder(std::move(events), runtimeDirectory);
 
+    if (request.broadcast)
+        if (const auto error = recorder.setUpBroadcastAndWait(*request.broadcast))
+            return notRecorded(complaints, client::textOf(*error) +
+                                               "\n`lumacastctl extensions` shows the upload extensions.");
     client::StartOptions options;
+    options.broadcast = request.broadcast.has_value();
     options.size = request.size;
     options.microphone = request.microphone;
     options.systemRecording = true;
@@ -206,8 +225,16 @@ int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& requ
     auto nextLine = begun;
     bool isWished = false;
     std::string path;  ///< where the daemon writes it
+    std::string viewURL;
+    const auto printView = [&](const std::string& url) {
+        if (url.empty() || std::exchange(viewURL, url) == url) return;
+        line.clear();
+        std::fprintf(out, "%s\n", printable(url).c_str());
+        std::fflush(out);
+    };
     while (!isWished) {
         const auto known = answers->known();
+        printView(known.viewURL);
         if (known.hasStopped || known.isDisconnected) break;
         const auto now = Clock::now();
         if (request.duration.count() > 0 && now - begun >= request.duration) break;
@@ -245,6 +272,11 @@ int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& requ
     while (!(known = answers->known()).stop && !known.hasStopped && !known.isDisconnected &&
            Clock::now() - stopped < kStopPatience)
         stopWished(milliseconds(10));
+    printView(known.viewURL);
+    if (request.broadcast && known.stop && !known.stop->error) {
+        recorder.didResignActive();
+        return kGood;
+    }
     if (!known.stop || !known.stop->movie) {
         const std::string reason = known.stop && known.stop->error ? client::textOf(*known.stop->error)
                                    : known.stopError               ? client::textOf(*known.stopError)

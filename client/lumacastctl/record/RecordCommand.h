@@ -6,6 +6,7 @@
 #include <string>
 
 #include "base/Identifiers.h"
+#include "client/Answers.h"
 #include "client/lumacastctl/Form.h"
 #include "client/lumacastctl/status/Status.h"
 
@@ -16,6 +17,8 @@ struct RecordRequest {
     std::chrono::milliseconds duration{0};  ///< how long to record; 0 until the user stops it
     bool microphone = false;
     std::string output;              ///< where the movie goes, absolute; empty for the user's library
+    /// Where it is broadcast instead; none: it is recorded.
+    std::optional<client::BroadcastSetup> broadcast = std::nullopt;
 };
 
 /// The recording of the whole display in the daemon's status, if there is one.
@@ -28,9 +31,13 @@ std::string recordLine(const RunningRecording& recording);
 /// people; then the movie stays where it is.
 std::optional<std::string> moveMovie(const std::string& from, const std::string& to);
 
-/// `lumacastctl record --display`: has the daemon whose sockets are in this directory record the whole display until
+/// What there is to tell of a broadcast's service information: its "viewURL", or an empty text.
+std::string viewURLIn(const Value& serviceInfo);
+
+/// `lumacastctl record --display` and `lumacastctl broadcast --display`: has the daemon whose sockets are in this directory record the whole display until
 /// `stopWished` answers true or the duration is over, shows on `complaints` how far it is (a line that changes where that
-/// is a terminal), and prints to `out` where the movie is. `stopWished` waits at most that long for a wish. `save` saves
+/// is a terminal), and prints to `out` where the movie is, or where the broadcast
+/// can be watched as soon as its extension says so. `stopWished` waits at most that long for a wish. `save` saves
 /// the movie to the library and answers the exit status. Answers the process's exit status. Blocks meanwhile.
 int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& request, Screen progress, std::FILE* out,
                   std::FILE* complaints, const std::function<bool(std::chrono::milliseconds)>& stopWished,

@@ -83,8 +83,8 @@ private:
 
 TEST_F(Completion, TheHelpIsReadAsItStands) {
     const auto all = helps();
-    EXPECT_EQ(all.size(), 10u);
-    EXPECT_THAT(all.at({}), UnorderedElementsAre("-h", "--help", "status", "doctor", "storage", "save", "usage", "record"));
+    EXPECT_EQ(all.size(), 12u);
+    EXPECT_THAT(all.at({}), UnorderedElementsAre("-h", "--help", "status", "doctor", "storage", "save", "usage", "record", "extensions", "broadcast"));
     EXPECT_THAT(all.at({"save"}), UnorderedElementsAre("-h", "--help", "--json"));
     EXPECT_THAT(all.at({"status"}), UnorderedElementsAre("-h", "--help", "--json", "--watch"));
     EXPECT_THAT(all.at({"storage"}), UnorderedElementsAre("-h", "--help", "--json", "list", "purgeable", "purge"));
