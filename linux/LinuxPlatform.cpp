@@ -55,6 +55,8 @@ namespace {
 /// What the end may take: closing the open movies, and noting them.
 constexpr std::chrono::seconds kTimeToEnd = LinuxContainerWriters::kClosingLimit + std::chrono::seconds(5);
 constexpr std::chrono::seconds kTimeToNote{1};
+/// What an export may take to see that it is cancelled, and to take its file away itself.
+constexpr std::chrono::milliseconds kTimeToCancel{500};
 /// How much more time the service manager is asked for, and how often.
 constexpr std::chrono::seconds kMoreTime{10}, kAskForTimeEvery{2};
 /// What a device that is about to sleep waits for the movies: a second less than its login manager lets it.
@@ -142,6 +144,7 @@ public:
 private:
     /// At the end of the process, waiting for no lane.
     void closeMovies() {
+        exporters_.forgetAll();  // an export can be made again
         // A recording that ended by itself, whose movie nobody has asked for, has had its summary: only the newest ones run.
         const auto running = static_cast<std::size_t>(keepAlive_.openTransactions());
         const auto closed = writers_.closeOpenMovies();
@@ -149,6 +152,7 @@ private:
         for (const media::ClosedMovie& movie : std::vector(first, closed.end()))
             reportEndedWithProcess(telemetry_, {movie.seconds, movie.width, movie.height, movie.pictures, movie.bytes});
         telemetry_.flush(kTimeToNote);
+        exporters_.removeUnfinished(kTimeToCancel);
         sink_.flush();
     }
 

@@ -1,10 +1,7 @@
 #include "linux/library/LinuxPhotoLibrary.h"
 
 #include <fcntl.h>
-#include <linux/ioprio.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
 #include <time.h>
 #include <unistd.h>
 
@@ -15,6 +12,7 @@
 #include "linux/library/LibraryFolder.h"
 #include "linux/library/VideosFolder.h"
 #include "linux/storage/BeneathDirectory.h"
+#include "linux/system/LowPriority.h"
 #include "linux/system/SystemError.h"
 #include "linux/system/Threads.h"
 
@@ -23,14 +21,6 @@ namespace lumacast {
 namespace {
 
 constexpr int kMaximumNumber = 10'000;  // of movies of the same second
-constexpr int kLowestPriority = 19;
-
-/// The calling thread is served after everybody else, by the disk and by the processor. A wish: where it is refused the
-/// copying goes on as it is.
-void stepBack() {
-    ::syscall(SYS_ioprio_set, IOPRIO_WHO_PROCESS, 0, IOPRIO_PRIO_VALUE(IOPRIO_CLASS_IDLE, 0));
-    ::setpriority(PRIO_PROCESS, static_cast<id_t>(::gettid()), kLowestPriority);
-}
 
 using OpenedFile = std::variant<FileDescriptor, int>;
 
@@ -130,7 +120,7 @@ Result<URL> LinuxPhotoLibrary::addVideo(const URL& movie, UserID userID) {
 
     std::string saved;
     const int error = performOnOwnThread([&] {
-        stepBack();
+        runAtLowPriority();
         if (account)
             if (const int refusal = becomeUser(*account); refusal != 0) return refusal;
         if (std::holds_alternative<int>(source)) source = openForUser(path, user);

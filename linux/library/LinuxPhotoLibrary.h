@@ -8,7 +8,7 @@
 
 namespace lumacast {
 
-/// The folder Lumacast in the user's Videos folder. Each movie is copied on a thread of its own, at idle priority, with
+/// The folder Lumacast in the user's Videos folder. Each movie is copied on a thread of its own, at low priority, with
 /// the rights of the user; any number at a time. EPERM for a user this process can't act for; EINVAL for what is not a
 /// file URL; what is not a regular file, or is reached through somebody else's link, is refused (EACCES, ELOOP). Its
 /// name has the local time of the movie's last change.

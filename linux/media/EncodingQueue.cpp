@@ -5,6 +5,8 @@
 #include <algorithm>
 #include <utility>
 
+#include "linux/system/LowPriority.h"
+
 namespace lumacast::media {
 
 EncodingQueue::EncodingQueue(std::shared_ptr<MovieFiles> files, EncodingPriority priority)
@@ -27,6 +29,13 @@ void EncodingQueue::add(std::shared_ptr<LinuxMovieExport> job) {
     changed_.notify_all();
 }
 
+std::shared_ptr<LinuxMovieExport> EncodingQueue::forgetAll() {
+    std::deque<std::shared_ptr<LinuxMovieExport>> forgotten;  // ends without the lock
+    const std::lock_guard lock(mutex_);
+    forgotten.swap(waiting_);
+    return running_;
+}
+
 bool EncodingQueue::remove(const std::shared_ptr<LinuxMovieExport>& job) {
     const std::lock_guard lock(mutex_);
     return std::erase(waiting_, job) > 0;
@@ -34,13 +43,13 @@ bool EncodingQueue::remove(const std::shared_ptr<LinuxMovieExport>& job) {
 
 void EncodingQueue::run() {
     pthread_setname_np(pthread_self(), "lc-mixing");
-    bool isIdle = false;
+    bool isLow = false;
     std::unique_lock lock(mutex_);
     for (;;) {
         changed_.wait(lock, [this] { return stopping_ || !waiting_.empty(); });
         if (waiting_.empty()) return;
         // Not before there is something to do: on a busy machine the end of the process would wait for it.
-        if (priority_ == EncodingPriority::Idle && !std::exchange(isIdle, true)) runAtIdlePriority();
+        if (priority_ == EncodingPriority::Low && !std::exchange(isLow, true)) runAtLowPriority();
         running_ = std::move(waiting_.front());
         waiting_.pop_front();
         auto job = running_;

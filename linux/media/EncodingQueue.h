@@ -6,12 +6,12 @@
 #include <mutex>
 #include <thread>
 
-#include "linux/media/IdlePriority.h"
+#include "linux/media/EncodingPriority.h"
 #include "linux/media/LinuxMovieExport.h"
 
 namespace lumacast::media {
 
-/// The thread on which encoding exports run one after the other, at idle priority, which their encoder's threads
+/// The thread on which encoding exports run one after the other, at low priority, which their encoder's threads
 /// inherit. It sleeps nearly always. Every call from any thread; none waits but the end.
 class EncodingQueue final {
 public:
@@ -25,6 +25,8 @@ public:
     void add(std::shared_ptr<LinuxMovieExport> job);
     /// Takes a job out that has not begun; whether it was there.
     bool remove(const std::shared_ptr<LinuxMovieExport>& job);
+    /// Forgets those that wait, untold, and answers the one that runs, or null.
+    std::shared_ptr<LinuxMovieExport> forgetAll();
 
 private:
     void run();

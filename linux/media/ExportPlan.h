@@ -1,7 +1,10 @@
 #pragma once
 #include <atomic>
+#include <chrono>
+#include <condition_variable>
 #include <cstdint>
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <string>
 #include <variant>
@@ -25,6 +28,8 @@ struct ExportResult {
     std::optional<Error> error;
 };
 
+class MovieFile;
+
 /// What its owner and a running export tell each other; on any thread.
 class ExportState final {
 public:
@@ -36,9 +41,18 @@ public:
         if (progress > this->progress() && progress <= 1) progress_.store(progress, std::memory_order_relaxed);
     }
 
+    /// What is being written, from its creation until it is finished or removed. Called on the export's thread.
+    void beginFile(MovieFile& file);
+    void endFile();
+    /// Waits until then for the file's end, and takes its name away if that hasn't come.
+    void removeUnfinished(const std::string& path, std::chrono::steady_clock::time_point deadline);
+
 private:
     std::atomic<bool> cancelled_ = false;
     std::atomic<double> progress_ = 0;
+    std::mutex mutex_;  // guards the file
+    std::condition_variable changed_;
+    MovieFile* file_ = nullptr;
 };
 
 /// A range in nanoseconds of the movie.

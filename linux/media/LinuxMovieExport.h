@@ -1,5 +1,6 @@
 #pragma once
 #include <atomic>
+#include <chrono>
 #include <memory>
 #include <optional>
 #include <system_error>
@@ -48,20 +49,30 @@ public:
         lane_.post([self = shared_from_this(), status, error = std::move(error)] { self->tell(status, error); });
     }
     void cancel() { state_.cancel(); }
+    /// Cancels it, and nobody is told how it ends.
+    void forget() {
+        isForgotten_ = true;
+        cancel();
+    }
+    /// Waits until then for its file to be finished or removed, and takes the file's name away if it is neither.
+    void removeUnfinished(std::chrono::steady_clock::time_point deadline) {
+        state_.removeUnfinished(plan_.destination, deadline);
+    }
     double progress() const { return state_.progress(); }
     /// Whether the thread has nothing left to do but end.
     bool hasEnded() const { return ended_.load(std::memory_order_acquire); }
 
 private:
     void tell(ExportStatus status, const std::optional<Error>& error) {
-        if (const auto completion = std::exchange(completion_, nullptr)) completion(status, error);
+        const auto completion = std::exchange(completion_, nullptr);
+        if (completion && !isForgotten_) completion(status, error);
     }
 
     const media::ExportPlan plan_;
     MovieExporter::Completion completion_;  ///< the thread's once started, else the lane's
     media::CompletionLane& lane_;
     media::ExportState state_;
-    std::atomic<bool> ended_ = false;
+    std::atomic<bool> ended_ = false, isForgotten_ = false;
     std::thread thread_;
 };
 

@@ -134,6 +134,7 @@ std::shared_ptr<MovieExporter> LinuxMovieExporters::makeExporter(std::shared_ptr
 
 void LinuxMovieExporters::run(const std::shared_ptr<LinuxMovieExport>& job, std::optional<Error> refusal) {
     const std::lock_guard lock(mutex_);
+    if (isEnding_) return job->forget();
     // Joining a thread that has ended takes no time.
     std::erase_if(running_, [](const auto& other) { return other->hasEnded(); });
     if (!refusal && job->isEncoding()) return encodings_->add(job);
@@ -144,6 +145,24 @@ void LinuxMovieExporters::run(const std::shared_ptr<LinuxMovieExport>& job, std:
         refusal = media::systemError(EAGAIN);
     }
     job->tellLater(ExportStatus::Failed, std::move(refusal));
+}
+
+void LinuxMovieExporters::forgetAll() {
+    const std::lock_guard lock(mutex_);
+    isEnding_ = true;
+    ending_ = running_;
+    if (auto encoding = encodings_->forgetAll()) ending_.push_back(std::move(encoding));
+    for (const auto& job : ending_) job->forget();
+}
+
+void LinuxMovieExporters::removeUnfinished(std::chrono::milliseconds patience) {
+    std::vector<std::shared_ptr<LinuxMovieExport>> ending;
+    {
+        const std::lock_guard lock(mutex_);
+        ending = ending_;
+    }
+    const auto deadline = std::chrono::steady_clock::now() + patience;
+    for (const auto& job : ending) job->removeUnfinished(deadline);
 }
 
 /// One that waits for its turn ends at once; one that runs sees it soon.

@@ -1,10 +1,11 @@
 #pragma once
+#include <chrono>
 #include <memory>
 #include <mutex>
 #include <vector>
 
 #include "linux/media/CompletionLane.h"
-#include "linux/media/IdlePriority.h"
+#include "linux/media/EncodingPriority.h"
 #include "linux/media/MovieFile.h"
 #include "platform/MovieExporter.h"
 
@@ -16,14 +17,14 @@ class EncodingQueue;
 }
 
 /// Opens movies by libavformat, and copies or encodes ranges of them into files of our own box writer. Callable from
-/// any lane. Copies run on threads of their own, encoding exports one after the other on one that is idle otherwise. To
+/// any lane. Copies run on threads of their own, encoding exports one after the other on one of low priority. To
 /// be destroyed after its exporters; that cancels exports that still run, and waits for them.
 class LinuxMovieExporters final : public MovieExporters {
 public:
     LinuxMovieExporters();
     /// With files from elsewhere.
     explicit LinuxMovieExporters(std::shared_ptr<media::MovieFiles> files,
-                                 media::EncodingPriority priority = media::EncodingPriority::Idle);
+                                 media::EncodingPriority priority = media::EncodingPriority::Low);
     LinuxMovieExporters(const LinuxMovieExporters&) = delete;
     LinuxMovieExporters& operator=(const LinuxMovieExporters&) = delete;
     ~LinuxMovieExporters() override;
@@ -38,11 +39,18 @@ public:
     void cancel(const std::shared_ptr<LinuxMovieExport>& job);
     media::CompletionLane& lane() { return lane_; }
 
+    /// At the end of the process: exports that run are cancelled, and nobody hears how any ends. Doesn't wait.
+    void forgetAll();
+    /// After that: waits for them so long at most, and takes the names of the files away that are not finished by then.
+    void removeUnfinished(std::chrono::milliseconds patience);
+
 private:
     const std::shared_ptr<media::MovieFiles> files_;
     media::CompletionLane lane_;
     std::mutex mutex_;
     std::vector<std::shared_ptr<LinuxMovieExport>> running_;  ///< whose threads have not been joined
+    std::vector<std::shared_ptr<LinuxMovieExport>> ending_;   ///< with the process
+    bool isEnding_ = false;
     std::unique_ptr<media::EncodingQueue> encodings_;          ///< last: it is told on the lane
 };
 

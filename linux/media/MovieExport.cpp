@@ -18,6 +18,7 @@ ExportResult exportMovie(const ExportPlan& plan, MovieFiles& files, ExportState&
     auto made = files.create(plan.destination);
     if (auto* const error = std::get_if<int>(&made)) return {ExportStatus::Failed, systemError(*error)};
     MovieFile& file = *std::get<0>(made);
+    state.beginFile(file);
     ExportSink sink(file);
     ExportResult result = plan.preset == ExportPreset::PassThrough
                               ? exportPassThrough(source, sink, std::get<0>(span), state)
@@ -32,6 +33,7 @@ ExportResult exportMovie(const ExportPlan& plan, MovieFiles& files, ExportState&
     } else {
         state.advance(1);
     }
+    state.endFile();
     return result;
 }
 

@@ -194,6 +194,35 @@ TEST(TerminationOfASave, WhileAMovieIsCopiedLeavesTheMovieAndItCanBeSavedLater) 
     expectAllFrames(world.onlySaved());
 }
 
+TEST(TerminationOfASave, WhileAMovieIsMixedLeavesNoHalfMadeFileAndTheMovieWhole) {
+    SavingWorld world;
+    world.startDaemon();
+    // Of a size and length that takes a while to encode anew.
+    checkers::MoviePlan plan;
+    plan.width = 1280;
+    plan.height = 720;
+    plan.halfSize = false;
+    plan.bitRate = 2'000'000;
+    plan.pictures = checkers::steadyPictures(1, 300, 30);
+    plan.soundSeconds = 10;
+    plan.sound = tone(440);
+    plan.moreSounds = {tone(880)};
+    const std::string movie = world.path("movies/long.mp4");
+    ASSERT_EQ(checkers::makeMovie(plan, movie), "");
+    auto saved = std::async(std::launch::async, [&] { return world.save(movie); });
+    ASSERT_TRUE(waitUntil([&] { return !world.temporaryFiles().empty(); }));
+    ASSERT_EQ(world.saveStates(), std::vector<std::string>{"mixing"});
+    const auto before = std::chrono::steady_clock::now();
+    EXPECT_EQ(world.endDaemon(SIGTERM), 0);
+    std::printf("    ended after %.2f s\n",
+                std::chrono::duration<double>(std::chrono::steady_clock::now() - before).count());
+    EXPECT_NE(saved.get(), 0) << "the one who waits is told";
+    EXPECT_TRUE(world.temporaryFiles().empty()) << world.temporaryFiles().front();
+    EXPECT_TRUE(world.library().empty());
+    EXPECT_EQ(picturesOf(movie).size(), 300u);
+    EXPECT_EQ(world.countInLog("Error Mixing video Audio tracks"), 0u) << "nobody goes on without the mix";
+}
+
 TEST(TerminationOfASave, AtAnyMomentLeavesTheMovieInOnePlaceAtLeast) {
     SavingWorld world;
     for (int i = 0; i < 4; ++i) {
