@@ -25,8 +25,8 @@ struct LogSinkTargets {
 /// native protocol with PRIORITY and MESSAGE; `Print` lines to standard output. Never waits: a line the reader has no
 /// room for is dropped, and the next one that gets through is preceded by how many were. Lines are cut at 4000 bytes;
 /// control characters become blanks, so that no text can pretend to be a line of its own. A line that comes again and
-/// again is written once; how often it came is told when another comes, and every ten seconds while it goes on ("repeated 500
-/// times: the line"). `Print` lines are not folded. Callable from any lane.
+/// again is written once; how often it came is told when another comes, and every ten seconds while it goes on
+/// ("repeated 500 times: the line"). `Print` lines are not folded. Callable from any lane.
 class LinuxLogSink final : public LogSink {
 public:
     explicit LinuxLogSink(const LogSinkTargets& targets);
