@@ -13,8 +13,7 @@
 
 #include "tests/checkers/ToneChecker.h"
 #include "tests/dialog/DialogUser.h"
-#include "tests/sound/PrivateSoundServer.h"
-#include "tests/system/World.h"
+#include "tests/system/DisplayTool.h"
 
 namespace lumacast::test {
 namespace {
@@ -23,36 +22,8 @@ namespace fs = std::filesystem;
 using ::testing::HasSubstr;
 using ::testing::StartsWith;
 
-constexpr char kIdentifier[] = "org.lumacast.lumacastctl";
-
-class DisplayRecording : public ::testing::Test {
+class DisplayRecording : public DisplayTool {
 protected:
-    DisplayRecording() {
-        world_.addVariable("PULSE_SERVER=" + sound_.address());
-        world_.addVariable("DBUS_SESSION_BUS_ADDRESS=");
-        world_.addVariable("XDG_CONFIG_DIRS=" + world_.path("system"));
-        world_.addVariable("XDG_VIDEOS_DIR=" + world_.path("videos"));
-        fs::copy_file(LC_CTL, world_.path("lumacastctl"));
-        world_.install(kIdentifier, "Screen Recorder", world_.path("lumacastctl"));
-        fs::create_directories(world_.path("system/lumacast/entitlements.d"));
-    }
-    void entitle() {
-        std::ofstream(world_.path("system/lumacast/entitlements.d/lumacastctl.conf"))
-            << "[" << kIdentifier << "]\ncom.orvane.private.luma-cast=true\n";
-    }
-    std::unique_ptr<checkers::Child> tool(const std::vector<std::string>& options) {
-        std::vector<std::string> command{world_.path("lumacastctl"), "record", "--display"};
-        command.insert(command.end(), options.begin(), options.end());
-        return std::make_unique<checkers::Child>(command, world_.environment(), world_.path("tool.log"));
-    }
-    std::string complaints() const {
-        std::ifstream file(world_.path("tool.log"));
-        return {std::istreambuf_iterator<char>(file), {}};
-    }
-    double elapsed() {
-        const auto current = world_.recording();
-        return current.is_null() ? 0 : current["elapsedSeconds"].get<double>();
-    }
     /// What a player shows of the movie there, as a movie of its own.
     std::string shownAt(const std::string& movie, int x, int y, int width, int height) {
         const std::string part = world_.path("part.mp4");
@@ -63,9 +34,6 @@ protected:
         EXPECT_EQ(std::system(command.c_str()), 0);
         return part;
     }
-
-    const PrivateSoundServer sound_;
-    World world_{World::Consent::Asked, "1920x1080x24"};
 };
 
 /// How much louder one tone is than another in a stretch of a movie's sound, in dB.
@@ -142,7 +110,7 @@ TEST_F(DisplayRecording, IsUprightAndHasTheSoundOfWhatIsInFront) {
 
 TEST_F(DisplayRecording, EndsWithItsDurationAndIsSavedToTheLibrary) {
     entitle();
-    std::ofstream(world_.path("config/lumacast/com.orvane.lumacastd.conf")) << "LCSuppressAlert=true\n";
+    askNobody();
     world_.startDaemon();
     const auto recorder = tool({"--duration", "2"});
     EXPECT_EQ(recorder->wait(), 0) << complaints() << world_.daemonLog();
@@ -156,7 +124,7 @@ TEST_F(DisplayRecording, EndsWithItsDurationAndIsSavedToTheLibrary) {
 
 TEST_F(DisplayRecording, EndsWithAKeyAndShowsHowFarItIs) {
     entitle();
-    std::ofstream(world_.path("config/lumacast/com.orvane.lumacastd.conf")) << "LCSuppressAlert=true\n";
+    askNobody();
     world_.startDaemon();
     const std::string movie = world_.path("display.mp4");
     // A terminal between: what is sent to it are keys.
@@ -183,7 +151,7 @@ TEST_F(DisplayRecording, IsRefusedWithoutTheDropIn) {
 
 TEST_F(DisplayRecording, OutlivesAToolThatIsKilledAndIsKeptWhenAnotherRecordingTakesItsPlace) {
     entitle();
-    std::ofstream(world_.path("config/lumacast/com.orvane.lumacastd.conf")) << "LCSuppressAlert=true\n";
+    askNobody();
     world_.startDaemon();
     const auto recorder = tool({});
     ASSERT_TRUE(waitUntil([&] { return elapsed() > 1; })) << world_.daemonLog();
