@@ -137,7 +137,7 @@ const char* readFrameHeader(Bytes bytes, FrameHeader& header) {
     header.handles = at[9];
     header.message = load<std::uint16_t>(at + 10);
     header.sequence = load<std::uint64_t>(at + 16);
-    if (at[8] < 1 || at[8] > static_cast<std::uint8_t>(FrameKind::NoReply)) return "a frame of an unknown kind";
+    if (at[8] < 1 || at[8] > static_cast<std::uint8_t>(FrameKind::TokenExchanged)) return "a frame of an unknown kind";
     if (load<std::uint32_t>(at + 12) != 0) return "a frame with reserved bits";
     if (std::uint64_t{header.valueBytes} + header.recordBytes + kFrameHeaderBytes > limitOf(Limit::MessageBytes))
         return "a message over the size limit";
@@ -145,6 +145,13 @@ const char* readFrameHeader(Bytes bytes, FrameHeader& header) {
     if ((header.handles == 0) != (header.recordBytes == 0)) return "descriptors and their records differ";
     const bool isTransport = header.kind == FrameKind::PlaneReturned || header.kind == FrameKind::NoReply;
     if (isTransport && (header.valueBytes != 0 || header.handles != 0)) return "a transport frame with contents";
+    if (header.kind == FrameKind::ExchangeToken &&
+        (header.valueBytes == 0 || header.valueBytes > kMaximumTokenBytes || header.handles != 0 || header.message != 0))
+        return "a token that can be none";
+    if (header.kind == FrameKind::TokenExchanged &&
+        (header.valueBytes != 0 || header.handles > 1 || header.recordBytes > 1 ||
+         (header.handles == 1) != (header.message == 0)))
+        return "a token frame with other contents";
     const bool isReply = header.kind == FrameKind::Reply || header.kind == FrameKind::PlaneReturned;
     if (isReply && header.message != 0) return "a reply with a message number";
     return nullptr;

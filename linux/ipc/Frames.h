@@ -44,6 +44,10 @@ enum class FrameKind : std::uint8_t {
     /// transport: the request `sequence` gets no reply; `message` is the system's error number, or 0 when the receiver
     /// deliberately gives none
     NoReply = 5,
+    ExchangeToken = 6,  ///< transport: the value is the token's bytes, `sequence` counts the asker's exchanges
+    /// transport: the exchange `sequence` is over; with one descriptor, the file's, or with `message`, the system's
+    /// error number
+    TokenExchanged = 7,
 };
 
 /// valueBytes u32 · recordBytes u32 · kind u8 · handles u8 · message u16 · zero u32 · sequence u64
@@ -62,6 +66,10 @@ inline constexpr std::size_t kFrameHeaderBytes = 24;
 
 /// Writes the header over the first kFrameHeaderBytes of `frame`.
 void writeFrameHeader(const FrameHeader& header, std::span<std::uint8_t> frame);
+
+/// The longest token that can be exchanged, and the record of a file's descriptor (one byte, this one).
+inline constexpr std::size_t kMaximumTokenBytes = 128;
+inline constexpr std::uint8_t kFileRecord = 3;
 
 /// Reads kFrameHeaderBytes. Answers null and sets `header`, or answers why the frame must be refused.
 const char* readFrameHeader(Bytes bytes, FrameHeader& header);

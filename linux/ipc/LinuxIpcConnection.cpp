@@ -42,6 +42,7 @@ LinuxIpcConnection::~LinuxIpcConnection() {
     if (budget_) budget_->give(heldBytes_);
     for (const ErrorHandler& errorHandler : unanswered_) fail(errorHandler, EPIPE);
     for (auto& [sequence, pending] : pending_) fail(pending.errorHandler, EPIPE);
+    for (auto& [sequence, handler] : exchanges_) failExchange(std::move(handler), EPIPE);
     for (OutgoingFrame& frame : outgoing_.takeAll()) fail(frame.onLost, EPIPE);
 }
 
@@ -138,8 +139,12 @@ void LinuxIpcConnection::deliverLoss() {
     std::deque<ErrorHandler> unanswered;
     std::unordered_map<std::uint64_t, PendingReply> pending;
     std::unordered_map<std::uint64_t, std::shared_ptr<SharedPlane>> leases;
+    std::unordered_map<std::uint64_t, FileHandler> exchanges;
+    std::shared_ptr<TokenKeeper> keeper;
     {
         const std::lock_guard lock(mutex_);
+        exchanges.swap(exchanges_);
+        keeper.swap(tokenKeeper_);
         socket = std::move(socket_);
         if (seat_) seat.emplace(std::move(*seat_));
         seat_.reset();
@@ -161,6 +166,7 @@ void LinuxIpcConnection::deliverLoss() {
     for (const ErrorHandler& errorHandler : unanswered) errorHandler(error);
     for (auto& [sequence, waiting] : pending)
         if (waiting.errorHandler) waiting.errorHandler(error);
+    for (auto& [sequence, handler] : exchanges) handler(Fd(), error);
     for (OutgoingFrame& frame : unsent)
         if (frame.onLost) frame.onLost(error);
     {

@@ -9,6 +9,7 @@
 #include <utility>
 #include <vector>
 
+#include "linux/ipc/FileTokens.h"
 #include "linux/ipc/Handles.h"
 #include "linux/ipc/IncomingFrames.h"
 #include "linux/ipc/IpcCore.h"
@@ -65,6 +66,10 @@ public:
     /// The request `sequence` will have no reply. Callable from any lane.
     void leaveUnanswered(std::uint64_t sequence);
 
+    /// See keepFileTokens and exchangeFileToken.
+    void keepTokens(TokenKeeper keeper);
+    void exchangeToken(Bytes token, FileHandler handler);
+
 private:
     struct PendingReply {
         const MessageDeclaration* declaration;
@@ -80,6 +85,7 @@ private:
     void flush();
     void waitForRoomLocked();
     void fail(const ErrorHandler& errorHandler, int error);
+    void failExchange(FileHandler handler, int error);
 
     // The way in (the reactor; LinuxIpcConnectionReceive.cpp).
     Reactor::Again turn(std::uint32_t events);
@@ -90,6 +96,8 @@ private:
     const char* receiveReply(IncomingFrames::Frame& frame);
     const char* receivePlaneReturned(const FrameHeader& header);
     const char* receiveNoReply(const FrameHeader& header);
+    const char* receiveExchange(const IncomingFrames::Frame& frame);
+    const char* receiveExchanged(IncomingFrames::Frame& frame);
     bool finishRequest();
     bool startWatching();
     [[nodiscard]] bool hold(std::uint64_t bytes);
@@ -120,6 +128,9 @@ private:
     std::unordered_map<std::uint64_t, PendingReply> pending_;
     std::deque<ErrorHandler> unanswered_;  ///< of requests without a reply, oldest first; to be told of the loss
     std::unordered_map<std::uint64_t, std::shared_ptr<SharedPlane>> leases_;
+    std::shared_ptr<TokenKeeper> tokenKeeper_;
+    std::unordered_map<std::uint64_t, FileHandler> exchanges_;  ///< that wait for their answer
+    std::uint64_t nextExchange_ = 1;
     std::uint64_t requestsToAnswer_ = 0;  ///< the peer's whose reply is neither given nor released
 
     // The reactor's own.

@@ -166,6 +166,8 @@ void LinuxIpcConnection::dispatch(IncomingFrames::Frame& frame) {
         case FrameKind::Reply: reason = receiveReply(frame); break;
         case FrameKind::PlaneReturned: reason = receivePlaneReturned(frame.header); break;
         case FrameKind::NoReply: reason = receiveNoReply(frame.header); break;
+        case FrameKind::ExchangeToken: reason = receiveExchange(frame); break;
+        case FrameKind::TokenExchanged: reason = receiveExchanged(frame); break;
     }
     if (reason) drop(reason);
 }
