@@ -42,7 +42,8 @@ inline Value sampleFor(ArgumentType type) {
         case ArgumentType::NullableEndpoint: return Value();
         case ArgumentType::NullableError: return Error("domain", -5803, {{"LocalizedDescription", "no"}});
         case ArgumentType::SharedPlaneObject: return Value();
-        case ArgumentType::Any: return 1.5;
+        case ArgumentType::Any:
+        case ArgumentType::Plain: return 1.5;
     }
     return Value();
 }

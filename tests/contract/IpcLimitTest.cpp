@@ -245,7 +245,13 @@ std::string limitName(const ::testing::TestParamInfo<LimitRow>& info) {
         case Limit::ConnectionsBeforeHello: return "ConnectionsBeforeHello";
         case Limit::RequestsWithoutReply: return "RequestsWithoutReply";
         case Limit::StartsWaitingForUser:
-        case Limit::StartsOfApplicationWaitingForUser: break;
+        case Limit::StartsOfApplicationWaitingForUser:
+        case Limit::ArchiveBytes:
+        case Limit::ArchiveDepth:
+        case Limit::ExtensionsInstalled:
+        case Limit::ExtensionItemsReturned:
+        case Limit::ExtensionRequestsInFlight:
+        case Limit::FramesAtExtension: break;
     }
     return "None";
 }
