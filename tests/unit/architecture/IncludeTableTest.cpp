@@ -14,7 +14,7 @@ namespace {
 constexpr std::string_view kFolders[] = {"src/base",    "src/writer/media", "src/platform", "src/support",
                                          "src/broadcast", "src/writer",     "src/capture",  "src/session",
                                          "src/daemon",  "linux/ipc",        "linux",        "client/lumacastctl",
-                                         "client",      "extensions",       "examples",     "tests"};
+                                         "client/extension", "client",      "extensions",   "examples",     "tests"};
 
 /// What each layer may include besides itself: layers, and single headers.
 const std::map<std::string_view, std::set<std::string_view>> kMayInclude{
@@ -40,10 +40,12 @@ const std::map<std::string_view, std::set<std::string_view>> kMayInclude{
     // The administrator's tool is no client of the daemon: it asks the admin service and looks at what the port looks
     // at.
     {"client/lumacastctl", {"client", "linux", "linux/ipc", "src/platform", "src/writer/media", "src/base"}},
-    {"extensions",
-     {"client", "src/base", "src/writer/media", "src/broadcast/LCBroadcastConfiguration.h", "linux/ipc",
-      "src/platform/IpcConnection.h", "src/platform/IpcEndpoint.h", "src/platform/IpcListener.h",
-      "src/platform/Scheduler.h"}},
+    // What the daemon and an extension tell each other, besides.
+    {"client/extension",
+     {"src/base", "src/writer/media", "src/broadcast/LCBroadcastConfiguration.h",
+      "src/broadcast/ConfigurationArchive.h", "src/broadcast/PayloadKeys.h", "linux/ipc",
+      "src/platform/IpcConnection.h", "src/platform/IpcEndpoint.h", "src/platform/IpcListener.h"}},
+    {"extensions", {"client/extension", "src/base", "src/writer/media"}},
 };
 
 std::string_view layerOf(std::string_view path) {
@@ -106,6 +108,11 @@ TEST(IncludeTable, AForbiddenEdgeIsSeen) {
     EXPECT_EQ(edge("client/Planted.cpp", "linux/system/IniFile.h"), 1u);
     EXPECT_EQ(edge("client/Planted.cpp", "platform/Platform.h"), 1u);
     EXPECT_EQ(edge("client/Planted.cpp", "linux/ipc/LinuxIpc.h"), 0u);
+    EXPECT_EQ(edge("client/extension/Planted.cpp", "broadcast/PayloadKeys.h"), 0u);
+    EXPECT_EQ(edge("client/extension/Planted.cpp", "client/Recorder.h"), 1u);
+    EXPECT_EQ(edge("client/extension/Planted.cpp", "broadcast/LCBroadcastExtensionProxy.h"), 1u);
+    EXPECT_EQ(edge("extensions/planted/Planted.cpp", "linux/media/AvHandles.h"), 1u);
+    EXPECT_EQ(edge("extensions/planted/Planted.cpp", "client/extension/Extension.h"), 0u);
     EXPECT_EQ(edge("src/base/Planted.h", "Value.h"), 1u) << "not written from a root";
     EXPECT_EQ(edge("src/other/Planted.h", "base/Value.h"), 1u) << "a folder that is no layer";
 }
