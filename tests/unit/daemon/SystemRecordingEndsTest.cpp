@@ -135,6 +135,35 @@ TEST_F(SystemRecordingEnds, ItsIdleSessionIsThereForItsClientsNextConnection) {
     EXPECT_EQ(started(*client)->code(), 0);
 }
 
+TEST_F(SystemRecordingEnds, ADeadSessionGoesWithItsClient) {
+    const auto client = makeSystemRecording();
+    fakes_.displayCapture.lastSource()->mediaServicesWereReset();
+    settle();
+    ASSERT_TRUE(session(*client));
+    client->connection->invalidate();
+    settle();
+    EXPECT_FALSE(session(*client)) << "it can't deliver anything any more";
+}
+
+TEST_F(SystemRecordingEnds, WhatTookItsNameIsNotItsMovieEvenWhenBothHaveBegunAnewMeanwhile) {
+    const auto client = makeSystemRecording();
+    const auto first = fakes_.containerWriters.recordings().back();
+    const std::string path = session(*client)->movieWriter()->outputPath();
+    first->holdFinish(true);
+    const auto other = makeSystemRecording("Remote", 601, 61);
+    ASSERT_EQ(session(*other)->movieWriter()->outputPath(), path) << "they began in the same second";
+    advance(seconds(2));
+    ASSERT_TRUE(stopped(*other)->url(0));
+    ASSERT_EQ(started(*other)->code(), 0);
+    advance(seconds(2));
+    ASSERT_EQ(started(*client)->code(), 0);
+    first->holdFinish(false);
+    settle();
+    EXPECT_EQ(client->toldOfStop(-5806), 1);
+    for (const auto& asset : fakes_.photoLibrary.assets()) EXPECT_NE(asset.movie.path(), path);
+    EXPECT_TRUE(fakes_.fileSystem.exists(path)) << "it is the other one's";
+}
+
 TEST_F(SystemRecordingEnds, ThatTheDisplaysMayBeStoppedCutsNoApplicationsRecording) {
     fakes_.displayCapture.setAutomatic(true);
     const auto player = makeRecording("Player", 500, 7);
