@@ -17,6 +17,12 @@ namespace fs = std::filesystem;
 using checkers::Child;
 using ::testing::HasSubstr;
 
+struct FreeReply {
+    void operator()(void* reply) const { std::free(reply); }
+};
+template <class Of>
+using Reply = std::unique_ptr<Of, FreeReply>;
+
 class DisplayEndings : public DisplayTool {
 protected:
     DisplayEndings() : DisplayTool("800x600x24") { entitle(); }
@@ -49,6 +55,22 @@ protected:
         EXPECT_EQ(payload["VideoCaptureWidth"], 800) << events;
         EXPECT_EQ(payload["VideoCaptureHeight"], 600) << events;
         EXPECT_GE(payload["ActiveDuration"].get<int>(), 1) << events;
+    }
+    /// Whether a window manager has the display by now.
+    bool waitForManager() {
+        const std::unique_ptr<xcb_connection_t, decltype(&xcb_disconnect)> display(
+            xcb_connect(world_.display().name().c_str(), nullptr), &xcb_disconnect);
+        const xcb_window_t root = xcb_setup_roots_iterator(xcb_get_setup(display.get())).data->root;
+        const std::string name = "_NET_SUPPORTING_WM_CHECK";
+        const Reply<xcb_intern_atom_reply_t> atom(xcb_intern_atom_reply(
+            display.get(), xcb_intern_atom(display.get(), 0, static_cast<std::uint16_t>(name.size()), name.c_str()),
+            nullptr));
+        return atom && waitUntil([&] {
+            const Reply<xcb_get_property_reply_t> manager(xcb_get_property_reply(
+                display.get(),
+                xcb_get_property(display.get(), 0, root, atom->atom, XCB_GET_PROPERTY_TYPE_ANY, 0, 1), nullptr));
+            return manager && manager->type != XCB_ATOM_NONE;
+        });
     }
     /// As a locked screen does.
     void blankTheScreen() {
@@ -132,8 +154,11 @@ TEST_F(DisplayEndings, AScreenThatIsLockedWhenTheToolHasGoneLeavesTheMovieWhereT
 
 TEST_F(DisplayEndings, UnderAWindowManagerTheSoundIsThatOfWhatCameInFrontWhileTheUserWasAsked) {
     world_.startDaemon();
-    std::vector<std::string> environment = world_.environment();
-    const Child manager({"openbox", "--config-file", "/dev/null"}, environment, world_.path("openbox.log"));
+    // Without one that it can read it opens a window to say so, which would be in front.
+    const std::string configuration = world_.path("openbox.xml");
+    std::ofstream(configuration) << "<openbox_config xmlns=\"http://openbox.org/3.4/rc\"></openbox_config>\n";
+    const Child manager({"openbox", "--config-file", configuration}, world_.environment(), world_.path("openbox.log"));
+    ASSERT_TRUE(waitForManager());
     const std::string movie = world_.path("display.mp4");
     const auto recorder = tool({"--output", movie});
     DialogUser user(world_.display().name());
