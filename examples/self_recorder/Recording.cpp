@@ -3,6 +3,7 @@
 #include <sys/eventfd.h>
 #include <unistd.h>
 
+#include <sstream>
 #include <utility>
 
 #include "examples/self_recorder/CommandReader.h"
@@ -15,24 +16,46 @@ std::string inWords(const Error& error) {
     return std::to_string(error.code()) + (text ? " " + *text : "");
 }
 
+/// "a=b,c=d" as texts under their keys; "-" is none.
+Dictionary entriesIn(const std::string& text) {
+    Dictionary entries;
+    std::istringstream stream(text == "-" ? "" : text);
+    for (std::string entry; std::getline(stream, entry, ',');)
+        if (const auto at = entry.find('='); at != std::string::npos) entries.set(entry.substr(0, at), entry.substr(at + 1));
+    return entries;
+}
+
 }  // namespace
 
 Recording::Recording(Loop& loop, CommandTable& commands, SceneWindow& window, Painter& painter)
     : loop_(loop), window_(window), painter_(painter), wake_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
     loop_.watch(wake_.get(), [this] { runPosted(); });
 
-    commands.add("start", "record this window", [this](const Arguments&, const Reply& reply) {
-        client::StartOptions options;
-        options.windows = {ContextID{window_.identifier()}};
-        const auto picture = window_.picture();
-        options.size = {static_cast<double>(picture.width), static_cast<double>(picture.height)};
-        recorder().start(options, [this, reply](const client::StartAnswer& answer) {
-            onLoop([this, reply, answer] {
-                reply(answer.error ? "error " + inWords(*answer.error)
-                                   : "started frame " + std::to_string(painter_.frame()));
-            });
-        });
-    });
+    commands.add("start", "record this window", [this](const Arguments&, const Reply& reply) { start({}, reply); });
+    commands.add("broadcast HOST EXTENSION INFO",
+                 "broadcast this window through an extension; INFO is key=value,key=value or -",
+                 [this](const Arguments& arguments, const Reply& reply) {
+                     client::BroadcastSetup setup{BundleIdentifier(arguments[0]), arguments[1] + ".x", std::nullopt,
+                                                  entriesIn(arguments[2])};
+                     recorder().setUpBroadcast(setup, [this, reply](const std::optional<Error>& error) {
+                         onLoop([this, reply, error] {
+                             if (error) return reply("error " + inWords(*error));
+                             client::StartOptions options;
+                             options.broadcast = true;
+                             start(options, reply);
+                         });
+                     });
+                 });
+    commands.add("capture", "be handed the pictures and sounds of this window",
+                 [this](const Arguments&, const Reply& reply) {
+                     client::StartOptions options;
+                     options.capture = true;
+                     start(options, reply);
+                 });
+    commands.add("captured", "print how many pictures and sounds have been handed over",
+                 [this](const Arguments&, const Reply& reply) {
+                     reply("captured " + std::to_string(pictures_) + " pictures " + std::to_string(sounds_) + " sounds");
+                 });
     commands.add("pause", "pause the recording", [this](const Arguments&, const Reply& reply) {
         recorder().pause();
         replyWhenHandled("paused", reply);
@@ -68,6 +91,18 @@ Recording::Recording(Loop& loop, CommandTable& commands, SceneWindow& window, Pa
                  });
 }
 
+void Recording::start(client::StartOptions options, const Reply& reply) {
+    options.windows = {ContextID{window_.identifier()}};
+    const auto picture = window_.picture();
+    options.size = {static_cast<double>(picture.width), static_cast<double>(picture.height)};
+    recorder().start(options, [this, reply](const client::StartAnswer& answer) {
+        onLoop([this, reply, answer] {
+            reply(answer.error ? "error " + inWords(*answer.error)
+                               : "started frame " + std::to_string(painter_.frame()));
+        });
+    });
+}
+
 Recording::~Recording() {
     recorder_.reset();  // its thread posts no more
     loop_.unwatch(wake_.get());
@@ -82,6 +117,14 @@ client::Recorder& Recording::recorder() {
                           (movie ? " " + movie->path() : ""));
             });
         };
+        events.broadcastServiceInfo = [this](const Value& info) {
+            onLoop([info] { printLine("event service info " + describe(info)); });
+        };
+        events.broadcastURL = [this](const std::optional<URL>& url) {
+            onLoop([url] { printLine("event broadcast URL " + (url ? url->text() : "none")); });
+        };
+        events.videoSample = [this](const client::VideoSample&) { ++pictures_; };
+        events.audioSample = [this](const client::AudioSample&) { ++sounds_; };
         events.disconnected = [this] { onLoop([] { printLine("event disconnected"); }); };
         recorder_ = std::make_unique<client::Recorder>(std::move(events));
     }

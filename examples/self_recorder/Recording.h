@@ -1,5 +1,7 @@
 #pragma once
 
+#include <atomic>
+#include <cstdint>
 #include <deque>
 #include <functional>
 #include <memory>
@@ -14,7 +16,8 @@
 
 namespace lumacast::example {
 
-/// The commands with which the application records its own window: start, pause, resume, stop, clip, discard, state.
+/// The commands with which the application records its own window: start, broadcast, capture, pause, resume,
+/// stop, clip, discard, state.
 /// Connects to the daemon at the first of them. Lives on the loop; the library's answers are brought there.
 class Recording final {
 public:
@@ -26,6 +29,8 @@ public:
 
 private:
     client::Recorder& recorder();
+    /// Starts with these options, for this window.
+    void start(client::StartOptions options, const Reply& reply);
     /// Runs `task` on the loop. Callable from any thread.
     void onLoop(std::function<void()> task);
     void runPosted();
@@ -39,6 +44,7 @@ private:
     UniqueFd wake_;
     std::mutex mutex_;
     std::deque<std::function<void()>> posted_;
+    std::atomic<std::uint64_t> pictures_{0}, sounds_{0};  ///< handed over
     std::unique_ptr<client::Recorder> recorder_;
 };
 

@@ -72,7 +72,6 @@ std::vector<std::string> Sandbox::insideBubblewrap(const std::string& folder, co
     if (!isProbe) {
         append(words, {"--ro-bind", folder, folder, "--bind", places.data, places.data});
         for (const std::string& directory : places.writable) append(words, {"--bind", directory, directory});
-        append(words, {"--info-fd", std::to_string(kInformationDescriptor)});
     }
     append(words, {"--ro-bind", options_.launcher, kLauncherInside, "--chdir", places.data, "--remount-ro", "/", "--",
                    kLauncherInside});

@@ -141,6 +141,21 @@ void World::install(const std::string& identifier, const std::string& name, cons
         << "[Desktop Entry]\nType=Application\nName=" << name << "\nExec=\"" << executable << "\"\n";
 }
 
+std::string World::installExtension(const std::string& identifier, const std::string& program, bool takesSamples) {
+    const fs::path folder = path("data/lumacast/extensions/" + identifier);
+    fs::create_directories(folder);
+    fs::copy_file(program, folder / "program", fs::copy_options::overwrite_existing);
+    nlohmann::json manifest{{"identifier", identifier},
+                            {"displayName", "Test extension"},
+                            {"extensionPoint", "com.orvane.broadcast-services-upload"},
+                            {"executable", "program"}};
+    if (takesSamples) manifest["processMode"] = "LCBroadcastProcessModeSampleBuffer";
+    std::ofstream(folder / "manifest.json") << manifest.dump();
+    const std::string data = path("data/lumacast/extension-data/" + identifier);
+    fs::create_directories(data);
+    return data;
+}
+
 void World::startDaemon(const std::vector<std::string>& variables) { startDaemonBy({LC_DAEMON}, variables); }
 
 void World::startDaemonBy(const std::vector<std::string>& command, const std::vector<std::string>& variables) {

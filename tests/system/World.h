@@ -106,6 +106,8 @@ public:
     const PrivateDisplay& display() const { return display_; }
     /// Installs a program as an application.
     void install(const std::string& identifier, const std::string& name, const std::string& executable);
+    /// Installs a program as an upload extension that takes clips, or samples. Answers the folder where it may write.
+    std::string installExtension(const std::string& identifier, const std::string& program, bool takesSamples);
 
 private:
     void setFlag(const std::string& name, bool on) const;
