@@ -77,26 +77,34 @@ void LCBroadcastExtensionProxy::establishConnectionWithHandler(ReadyHandler hand
     if (!extension) return;
     extension->beginExtensionRequestWithInputItems(
         {ExtensionItem{}},
-        [weak = weak_from_this(), handler = std::move(handler)](std::optional<ExtensionRequestID> request,
-                                                                const std::optional<Error>& error) {
-            const auto self = weak.lock();
-            if (!self) return;
+        [weak = weak_from_this(), launched = std::weak_ptr(extension), handler = std::move(handler)](
+            std::optional<ExtensionRequestID> request, const std::optional<Error>& error) {
+            auto self = weak.lock();
+            if (!self || !self->broadcastUploadExtension()) {
+                // Torn down before the extension was there to be killed.
+                if (const auto late = launched.lock()) late->kill(kKillSignal);
+                return;
+            }
             if (error || !request) {
                 self->log_.line("Error beginning extension request: %i", error ? error->code() : std::int64_t{0});
                 handler(error);
                 return;
             }
             self->log_.line("beginExtensionRequestWithInputItems returned");
-            self->setEndpoint(*request, handler);
+            const auto isSet = self->setEndpoint(*request, handler);
+            // The wait keeps nobody alive: whoever lets the proxy go ends it.
+            self.reset();
+            if (isSet) isSet->wait();
         });
 }
 
-void LCBroadcastExtensionProxy::setEndpoint(ExtensionRequestID request, const ReadyHandler& handler) {
+std::shared_ptr<Semaphore> LCBroadcastExtensionProxy::setEndpoint(ExtensionRequestID request,
+                                                                  const ReadyHandler& handler) {
     const auto extension = extension_.get();
     const auto context = extension ? extension->extensionContextForRequest(request) : nullptr;
     const auto auxiliary = context ? context->auxiliaryConnection() : nullptr;
     // The wait outlives this call where the answer comes twice, and the other way round.
-    const std::shared_ptr<Semaphore> isSet = platform_.scheduler.semaphore(0);
+    std::shared_ptr<Semaphore> isSet = platform_.scheduler.semaphore(0);
     auto remote = auxiliary ? auxiliary->remoteProxy([weak = weak_from_this(), isSet](const Error&) {
         // It has gone before it had the endpoint: it can't come.
         if (const auto self = weak.lock()) self->reportUnreachable();
@@ -106,14 +114,14 @@ void LCBroadcastExtensionProxy::setEndpoint(ExtensionRequestID request, const Re
     if (!remote) {
         log_.line("Error setting listenerEndpoint");
         handler(std::nullopt);  // deliberately no error: a ping may still come
-        return;
+        return nullptr;
     }
     remote->send(static_cast<std::uint16_t>(ExtensionVendorMessage::SetEndpoint), {Value(listenerEndpoint_.get())},
                  [&log = log_, isSet](Array) {
                      log.line("Remote endpoint set.");
                      isSet->signal();
                  });
-    isSet->wait();
+    return isSet;
 }
 
 bool LCBroadcastExtensionProxy::listenerShouldAcceptNewConnection(IpcListener&,

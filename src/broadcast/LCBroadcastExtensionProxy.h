@@ -82,8 +82,9 @@ private:
     };
     class PendingPayload;
 
-    /// On the extension's lane; waits without a limit, but for the end of the auxiliary connection.
-    void setEndpoint(ExtensionRequestID request, const ReadyHandler& handler);
+    /// Hands the endpoint over. On the extension's lane, which then waits for what is answered: without a limit, but for
+    /// the end of the auxiliary connection. Null when there is nothing to wait for.
+    std::shared_ptr<Semaphore> setEndpoint(ExtensionRequestID request, const ReadyHandler& handler);
     void accept(const std::shared_ptr<IpcConnection>& connection);
     void reportUnreachable();
     void tearDown();

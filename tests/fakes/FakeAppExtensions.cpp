@@ -23,6 +23,16 @@ struct FakeAppExtensions::Shared {
     std::vector<std::string> lookups;
     std::vector<std::weak_ptr<FakeAppExtension>> extensions;
     std::int32_t nextPid = 5000;
+
+    // No lock is held over a call of another role: the simulation may go on elsewhere there.
+    ExtensionContextClass contextOf() {
+        const std::lock_guard lock(mutex);
+        return contextClass;
+    }
+    ProcessID takePid() {
+        const std::lock_guard lock(mutex);
+        return ProcessID{nextPid++};
+    }
 };
 
 /// The extension's end of the auxiliary connection.
@@ -118,10 +128,7 @@ void FakeAppExtension::setRequestCompletionHandler(RequestCompletionHandler hand
 
 std::shared_ptr<FakeAppExtension::Process> FakeAppExtension::launch() {
     auto process = std::make_shared<Process>();
-    {
-        const std::lock_guard lock(shared_->mutex);
-        process->ipc = shared_->makeProcess(ProcessID{shared_->nextPid++});
-    }
+    process->ipc = shared_->makeProcess(shared_->takePid());
     process->queue = shared_->scheduler.serialQueue("program of " + installed_.identifier.text());
     process->program = installed_.program ? installed_.program() : std::make_shared<FakeExtensionProgram>();
     process->vendor = std::make_shared<Vendor>(*process->ipc, process->program);
@@ -130,9 +137,9 @@ std::shared_ptr<FakeAppExtension::Process> FakeAppExtension::launch() {
     process->listener->setDelegate(process->vendor);
     process->listener->resume();
     process->auxiliary = shared_->daemon.connectToEndpoint(process->listener->endpoint());
-    const std::lock_guard lock(shared_->mutex);
-    process->auxiliary->setExportedInterface(*shared_->contextClass.auxiliaryHostProtocol);
-    process->auxiliary->setRemoteInterface(*shared_->contextClass.auxiliaryVendorProtocol);
+    const ExtensionContextClass contextClass = shared_->contextOf();
+    process->auxiliary->setExportedInterface(*contextClass.auxiliaryHostProtocol);
+    process->auxiliary->setRemoteInterface(*contextClass.auxiliaryVendorProtocol);
     process->auxiliary->resume();
     return process;
 }
@@ -147,7 +154,7 @@ void FakeAppExtension::beginExtensionRequestWithInputItems(std::vector<Extension
         }
         if (!process) process = self->launch();
         const bool hasVendor = !self->shared_->faults.fails("AppExtension.vendor");
-        auto context = self->shared_->contextClass.make(hasVendor ? process->auxiliary : nullptr);
+        auto context = self->shared_->contextOf().make(hasVendor ? process->auxiliary : nullptr);
         ExtensionRequestID request{};
         {
             const std::lock_guard lock(self->mutex_);
@@ -190,8 +197,10 @@ void FakeAppExtension::kill(int signal) {
 
 void FakeAppExtension::crash() {
     std::shared_ptr<Process> process;
-    const std::lock_guard lock(mutex_);
-    process_.swap(process);
+    {
+        const std::lock_guard lock(mutex_);
+        process_.swap(process);
+    }
     // Not on the lane of the handlers: one may be waiting there.
     if (process) process->queue->async([process] { process->ipc->kill(); });
 }

@@ -2,9 +2,14 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/stat.h>
 
 #include <algorithm>
 #include <filesystem>
+#include <fstream>
+#include <set>
+#include <sstream>
 
 #include "tests/system/World.h"
 
@@ -53,6 +58,189 @@ TEST(Broadcast, ClipsReachTheirExtensionWithEveryFrameInOrderAndLeaveNothingBehi
         }
     }
     EXPECT_LE(missing, static_cast<int>(moviesIn(folder).size()) - 1) << "one at each cut at most";
+}
+
+constexpr char kTaker[] = "org.lumacast.SampleTaker";
+
+/// What an extension that notes its samples has noted so far.
+struct Samples {
+    struct Frame {
+        std::uint32_t number = 0;
+        std::int64_t presentation = 0, arrived = 0;
+        ino_t memory = 0;
+    };
+    std::vector<Frame> frames;
+    std::vector<std::string> events;
+    std::size_t sounds = 0;
+
+    explicit Samples(const std::string& folder) {
+        std::ifstream log(folder + "/samples.log");
+        for (std::string line; std::getline(log, line);) {
+            std::istringstream words(line);
+            std::string kind;
+            words >> kind;
+            Frame frame;
+            if (kind == "frame") {
+                words >> frame.number >> frame.presentation >> frame.arrived >> frame.memory;
+                frames.push_back(frame);
+            } else if (kind == "sound") {
+                ++sounds;
+            } else {
+                events.push_back(line);
+            }
+        }
+    }
+    std::size_t missing() const {
+        std::size_t count = 0;
+        for (std::size_t i = 1; i < frames.size(); ++i)
+            if (frames[i].number > frames[i - 1].number + 1) count += frames[i].number - frames[i - 1].number - 1;
+        return count;
+    }
+};
+
+/// The memory that a process has open without a name in the file system.
+std::set<ino_t> memoryOf(pid_t pid) {
+    std::set<ino_t> all;
+    for (const auto& entry : fs::directory_iterator("/proc/" + std::to_string(pid) + "/fd")) {
+        std::error_code gone;
+        struct stat status {};
+        if (fs::read_symlink(entry.path(), gone).string().starts_with("/memfd:") &&
+            ::stat(entry.path().c_str(), &status) == 0)
+            all.insert(status.st_ino);
+    }
+    return all;
+}
+
+/// The innermost process of a running extension; 0 when there is none.
+pid_t processOf(const World& world, const std::string& identifier) {
+    const std::string program = world.path("data/lumacast/extensions/" + identifier + "/program");
+    for (const auto& entry : fs::directory_iterator("/proc")) {
+        const std::string name = entry.path().filename().string();
+        if (name.find_first_not_of("0123456789") != std::string::npos) continue;
+        std::ifstream file(entry.path() / "cmdline");
+        std::string first;
+        std::getline(file, first, '\0');
+        if (first == program) return static_cast<pid_t>(std::stol(name));
+    }
+    return 0;
+}
+
+struct SampleBroadcast {
+    explicit SampleBroadcast(const std::string& info = "view=https://example.org/live",
+                             const std::vector<std::string>& options = {"--size", "640x360", "--fps", "30",
+                                                                        "--beep-every", "15"},
+                             const std::string& screen = "1280x800x24")
+        : world(World::Consent::Suppressed, screen),
+          folder(world.installExtension(kTaker, LC_SAMPLE_TAKER, true)) {
+        world.startDaemon();
+        app = world.application(options);
+        begin(info);
+    }
+    void begin(const std::string& info) {
+        answer = app->ask("broadcast org.lumacast.SelfRecorder " + std::string(kTaker) + " " + info);
+        EXPECT_THAT(answer, StartsWith("started frame")) << world.daemonLog();
+    }
+    bool waitForFrames(std::size_t count) {
+        return waitUntil([&] { return Samples(folder).frames.size() >= count; });
+    }
+    World world;
+    const std::string folder;
+    std::unique_ptr<Application> app;
+    std::string answer;
+};
+
+TEST(Broadcast, SamplesReachTheirExtensionWithoutACopyAndWithoutALoss) {
+    SampleBroadcast broadcast;
+    ASSERT_TRUE(broadcast.waitForFrames(60)) << broadcast.world.daemonLog();
+    const auto memory = memoryOf(broadcast.world.daemon().pid());
+    EXPECT_THAT(broadcast.app->ask("stop"), HasSubstr("without movie"));
+    ASSERT_TRUE(waitUntil([&] { return processOf(broadcast.world, kTaker) == 0; }));
+    const Samples samples(broadcast.folder);
+    EXPECT_EQ(samples.missing(), 0u);
+    EXPECT_GT(samples.sounds, 20u);
+    EXPECT_THAT(samples.events, ::testing::ElementsAre("started", "finished"));
+    for (const auto& frame : samples.frames) {
+        EXPECT_NE(frame.number, 0u);
+        EXPECT_TRUE(memory.contains(frame.memory)) << "the daemon has other memory";
+    }
+    EXPECT_EQ(broadcast.app->nextEvent(), "event broadcast URL https://example.org/live");
+    EXPECT_THAT(broadcast.app->nextEvent(), HasSubstr("taking samples"));
+}
+
+/// How much longer than the fastest a frame took to its extension, of all but the slowest hundredth.
+double slownessMs(const Samples& samples) {
+    std::vector<std::int64_t> delays;
+    for (const auto& frame : samples.frames) delays.push_back(frame.arrived - frame.presentation);
+    std::sort(delays.begin(), delays.end());
+    return static_cast<double>(delays[delays.size() * 99 / 100] - delays.front()) / 1e6;
+}
+
+TEST(Broadcast, AMinuteOfFullSizeReachesItsExtensionWithoutALoss) {
+    if (!longTests()) GTEST_SKIP() << "a long run: LC_LONG_TESTS=1";
+    SampleBroadcast broadcast("-", {"--size", "1920x1080", "--fps", "30", "--beep-every", "15"}, "1920x1080x24");
+    ASSERT_TRUE(waitUntil([&] { return Samples(broadcast.folder).frames.size() >= 1800; }, std::chrono::seconds(90)));
+    EXPECT_THAT(broadcast.app->ask("stop"), HasSubstr("without movie"));
+    const Samples samples(broadcast.folder);
+    std::printf("%zu frames, %zu missing, all but the slowest hundredth within %.2f ms of the fastest\n",
+                samples.frames.size(), samples.missing(), slownessMs(samples));
+    EXPECT_EQ(samples.missing(), 0u);
+}
+
+TEST(Broadcast, AnExtensionThatIsKilledEndsItsBroadcastAndTheNextOneWorks) {
+    SampleBroadcast broadcast("-");
+    ASSERT_TRUE(broadcast.waitForFrames(10));
+    const pid_t pid = processOf(broadcast.world, kTaker);
+    ASSERT_GT(pid, 1);
+    ::kill(pid, SIGKILL);
+    EXPECT_THAT(broadcast.app->nextEvent(), HasSubstr("taking samples"));
+    EXPECT_THAT(broadcast.app->nextEvent(), HasSubstr("stopped -5808"));
+    const auto before = Samples(broadcast.folder).frames.size();
+    broadcast.begin("-");
+    EXPECT_TRUE(broadcast.waitForFrames(before + 10)) << broadcast.world.daemonLog();
+}
+
+TEST(Broadcast, AnExtensionThatStandsStillCostsNoMemoryAndEndsItsBroadcastAlone) {
+    SampleBroadcast broadcast("-");
+    ASSERT_TRUE(broadcast.waitForFrames(10));
+    const pid_t pid = processOf(broadcast.world, kTaker);
+    ASSERT_GT(pid, 1);
+    const std::size_t before = broadcast.world.daemonNumber("VmRSS");
+    ::kill(pid, SIGSTOP);
+    // Others are served meanwhile.
+    auto other = broadcast.world.otherApplication("Other", {"--size", "320x240", "--fps", "10"});
+    EXPECT_THAT(other->ask("state"), StartsWith("state"));
+    EXPECT_THAT(broadcast.app->nextEvent(), HasSubstr("taking samples"));
+    EXPECT_THAT(broadcast.app->nextEvent(), HasSubstr("stopped -5808"));
+    EXPECT_LT(broadcast.world.daemonNumber("VmRSS"), before + 20'000) << "kB";
+    EXPECT_TRUE(waitUntil([&] { return processOf(broadcast.world, kTaker) == 0; })) << "it is killed";
+    other.reset();  // it was in front
+    broadcast.begin("-");
+    EXPECT_TRUE(broadcast.waitForFrames(Samples(broadcast.folder).frames.size() + 10)) << broadcast.world.daemonLog();
+}
+
+TEST(Broadcast, AnExtensionThatIsSlowIsGivenFewerFramesAndGoesOn) {
+    SampleBroadcast broadcast("slow=150");
+    ASSERT_TRUE(broadcast.waitForFrames(20));
+    const Samples samples(broadcast.folder);
+    EXPECT_GT(samples.missing(), 20u);
+    EXPECT_GT(samples.sounds, 20u);
+    EXPECT_THAT(broadcast.app->ask("stop"), HasSubstr("without movie")) << broadcast.world.daemonLog();
+}
+
+TEST(Capture, AnApplicationIsHandedItsOwnPicturesAndSounds) {
+    World world;
+    world.startDaemon();
+    const auto app = world.application({"--size", "640x360", "--fps", "30", "--beep-every", "15"});
+    ASSERT_THAT(app->ask("capture"), StartsWith("started frame")) << world.daemonLog();
+    const auto counts = [&] {
+        std::istringstream words(app->ask("captured"));
+        std::string word;
+        std::size_t pictures = 0, sounds = 0;
+        words >> word >> pictures >> word >> sounds;
+        return std::pair(pictures, sounds);
+    };
+    EXPECT_TRUE(waitUntil([&] { return counts().first > 30 && counts().second > 20; }));
+    EXPECT_THAT(app->ask("stop"), HasSubstr("without movie"));
 }
 
 }  // namespace

@@ -265,6 +265,26 @@ TEST_F(Proxy, ADeliberateEndIsReportedToNobodyAndKillsTheExtension) {
     EXPECT_EQ(completions_, 0);
 }
 
+TEST_F(Proxy, AnExtensionThatIsLaunchedAfterTheEndIsKilledToo) {
+    proxy_->establishConnectionWithHandler([](const auto&) {});
+    proxy_->invalidateConnection();
+    EXPECT_TRUE(extension_->signals().empty());
+    settle();
+    EXPECT_EQ(extension_->signals(), std::vector<int>{9});
+    EXPECT_FALSE(extension_->isRunning());
+}
+
+TEST_F(Proxy, OneWhoseExtensionNeverTakesTheEndpointCanBeLetGoOf) {
+    plan_->answersEndpoint = plan_->connects = false;
+    establish();
+    std::weak_ptr<LCBroadcastExtensionProxy> weak = proxy_;
+    proxy_.reset();
+    EXPECT_TRUE(weak.expired());
+    settle();
+    EXPECT_FALSE(extension_->isRunning());
+    EXPECT_TRUE(reported_.empty());
+}
+
 TEST_F(Proxy, DestroyingItClosesTheLinkQuietly) {
     establish();
     fakes_.logSink.clear();

@@ -1,0 +1,221 @@
+// Broadcasts against extensions that are slow, die, answer twice or never, with set-ups that race with starts and stops of
+// two applications, in every interleaving that a seed gives. LC_SEED=n replays one seed; LC_SEEDS=n runs so many.
+
+#include <gtest/gtest.h>
+
+#include <map>
+#include <set>
+
+#include "broadcast/ConfigurationArchive.h"
+#include "tests/fakes/FakeUploader.h"
+#include "tests/simulation/Seeds.h"
+#include "tests/simulation/SimulatedApplication.h"
+#include "tests/simulation/SimulatedDaemon.h"
+
+namespace lumacast {
+namespace {
+
+using std::chrono::milliseconds;
+using std::chrono::seconds;
+
+/// What the seeds did all together: a run that goes nowhere proves nothing.
+struct Tally {
+    int begun = 0, clips = 0, frames = 0, crashes = 0, finished = 0;
+    std::map<std::int64_t, int> refused, told;
+};
+
+class Studio {
+public:
+    Studio(std::uint64_t seed, Tally& tally) : daemon_(seed), random_(daemon_.world.scheduler.fork()), tally_(tally) {
+        for (const bool takesSamples : {false, true}) {
+            auto installed = uploadExtension(plan_, takesSamples,
+                                             takesSamples ? "org.example.Live.upload" : "org.example.Clips.upload");
+            installed.program = [this] {
+                misbehave();
+                return std::make_shared<FakeUploader>(plan_);
+            };
+            fakes().appExtensions.install(std::move(installed));
+        }
+        for (const auto& [name, pid, window] : {std::tuple{"Alpha", 500, 7u}, {"Beta", 600, 8u}})
+            applications_.push_back(std::make_unique<SimulatedApplication>(
+                fakes(), BundleIdentifier(std::string("org.example.") + name), name, ProcessID{pid}, ContextID{window}));
+        if (random_.below(3) == 0) fakes().faults.failAtRandom(random_.next(), 1, 60);
+    }
+
+    void run() {
+        for (const auto& application : applications_) application->connect();
+        const std::uint64_t steps = 8 + random_.below(40);
+        for (std::uint64_t i = 0; i < steps && !::testing::Test::HasFailure(); ++i) {
+            random_.below(4) == 0 ? disturb() : act(*applications_[random_.below(2)]);
+            goOn();
+        }
+        end();
+    }
+
+private:
+    FakePlatform& fakes() { return daemon_.world.fakes; }
+    bool oneIn(std::uint64_t n) { return random_.below(n) == 0; }
+
+    /// How the next process of an extension behaves.
+    void misbehave() {
+        plan_->pings = oneIn(5) ? 0 : oneIn(5) ? 2 : 1;
+        plan_->answersEndpoint = !oneIn(6);
+        plan_->connects = !oneIn(8);
+        plan_->diesBeforePing = oneIn(8);
+        plan_->completesPayloads = !oneIn(5);
+        plan_->completesRequests = !oneIn(5);
+        plan_->keepsPlanes = oneIn(6);
+        plan_->returned.clear();
+        if (oneIn(3))
+            plan_->returned.push_back(
+                {"LCBroadcastExtensionKeyBroadcastConfiguration",
+                 {ItemProvider{std::string(kGenericDataType),
+                               oneIn(2) ? Value(Data{1, 2}) : Value(*archiveOf(fakes().keyedArchive, {1.0, {}})), {}}}});
+        if (oneIn(3))
+            plan_->returned.push_back({"LCBroadcastExtensionKeyExtensionServiceInfo",
+                                       {ItemProvider{std::string(kGenericDataType), Dictionary{{"viewers", 1}}, {}}}});
+    }
+
+    void act(SimulatedApplication& application) {
+        if (!application.isAlive()) {
+            application.startAgain(ProcessID{static_cast<std::int32_t>(1000 + ++incarnation_)});
+            application.connect();
+            return;
+        }
+        const std::string point = oneIn(2) ? "org.example.Live.x" : oneIn(6) ? "org.example.Missing.x" : "org.example.Clips.x";
+        switch (random_.below(12)) {
+            case 0:
+            case 1:
+            case 2:
+                application.ask(DaemonMessage::SetupBroadcast,
+                                {application.identifier.text(), point, *archiveOf(fakes().keyedArchive, {1.0, {}}),
+                                 oneIn(4) ? Value() : Value(Dictionary{{"title", "x"}})});
+                break;
+            case 3:
+            case 4:
+            case 5:
+            case 6: application.start({application.window}, {.broadcast = true}); break;
+            case 7: application.start({application.window}, {.capture = oneIn(2)}); break;
+            case 8:
+            case 9: application.ask(DaemonMessage::StopRecording); break;
+            case 10: application.tell(DaemonMessage::PauseRecording); break;
+            case 11: application.ask(DaemonMessage::GetSystemBroadcastExtensionInfo); break;
+        }
+    }
+
+    void disturb() {
+        const auto extensions = fakes().appExtensions.extensions();
+        switch (random_.below(6)) {
+            case 0:
+                if (!extensions.empty()) {
+                    extensions[random_.below(extensions.size())]->crash();
+                    ++tally_.crashes;
+                }
+                break;
+            case 1: plan_->tell(BroadcastDaemonMessage::Ping); break;
+            case 2: plan_->tell(BroadcastDaemonMessage::FinishBroadcastWithError, {Value(Error("org.example", 7))}); break;
+            case 3: completeLate(); break;
+            case 4: applications_[random_.below(2)]->die(); break;
+            case 5: plan_->tell(BroadcastDaemonMessage::UpdateServiceInfo, {Dictionary{{"viewers", 3}}}); break;
+        }
+    }
+    /// What was left uncompleted is completed now, perhaps twice.
+    void completeLate() {
+        auto payloads = std::move(plan_->uncompleted);
+        plan_->uncompleted.clear();
+        const int times = oneIn(3) ? 2 : 1;
+        for (int i = 0; i < times; ++i) {
+            for (const auto& complete : payloads) complete();
+            for (const auto& [weak, request] : plan_->uncompletedRequests)
+                if (const auto extension = weak.lock()) extension->complete(request, plan_->returned);
+        }
+        plan_->uncompletedRequests.clear();
+    }
+    void goOn() {
+        switch (random_.below(3)) {
+            case 0:
+                for (std::uint64_t i = random_.below(60); i > 0; --i)
+                    if (!daemon_.world.scheduler.step()) break;
+                break;
+            case 1: daemon_.world.scheduler.runUntilIdle(); break;
+            case 2: daemon_.world.scheduler.advance(milliseconds(random_.below(1500))); break;
+        }
+        if (const auto tap = fakes().audioInputQueues.lastQueue())
+            tap->deliver(Data(1764, 1), static_cast<std::uint64_t>(daemon_.world.scheduler.now().nanoseconds));
+    }
+
+    void end() {
+        fakes().faults.clear();
+        completeLate();
+        daemon_.world.scheduler.advance(seconds(1));
+        for (const auto& application : applications_) {
+            for (const auto& asked : application->asked()) {
+                EXPECT_LE(asked->answers, 1);
+                if (asked->message != DaemonMessage::StartRecording || asked->answers == 0) continue;
+                if (const Error* error = asked->values.at(0).asError())
+                    ++tally_.refused[error->code()];
+                else
+                    ++tally_.begun;
+            }
+            for (const auto& told : application->told())
+                if (told.message == ClientMessage::StopRecordingWithError && told.arguments[0].asError())
+                    ++tally_.told[told.arguments[0].asError()->code()];
+            application->die();
+        }
+        // Extensions that hang are given up.
+        daemon_.world.scheduler.advance(seconds(30));
+        completeLate();
+        daemon_.world.scheduler.advance(seconds(1));
+        EXPECT_EQ(fakes().keepAlive.open(), 0) << "a transaction stays open";
+        EXPECT_EQ(daemon_.sessionCount(), 0u);
+        for (const auto& extension : fakes().appExtensions.extensions())
+            EXPECT_FALSE(extension->isRunning() && extension->begun().back().items.size() == 1)
+                << "an extension of samples runs on";
+        if (::testing::Test::HasFailure())
+            for (const auto& line : fakes().logSink.logged()) std::printf("%s\n", line.c_str());
+        tally_.clips += static_cast<int>(plan_->requests.size());
+        tally_.frames += static_cast<int>(plan_->samples(1));
+        for (const std::int64_t action : plan_->actions()) tally_.finished += action == 4;
+        // The daemon records as if nothing had been.
+        SimulatedApplication last(fakes(), BundleIdentifier("org.example.Last"), "Last", ProcessID{900}, ContextID{11});
+        last.connect();
+        const auto start = last.start();
+        daemon_.world.scheduler.advance(milliseconds(500));
+        ASSERT_EQ(start->answers, 1);
+        EXPECT_FALSE(start->values.at(0).asError());
+        const auto stop = last.ask(DaemonMessage::StopRecording);
+        daemon_.world.scheduler.advance(milliseconds(500));
+        ASSERT_EQ(stop->answers, 1);
+        EXPECT_TRUE(stop->values.at(0).as<URL>());
+    }
+
+    const std::shared_ptr<UploaderPlan> plan_ = std::make_shared<UploaderPlan>();
+    SimulatedDaemon daemon_;
+    SimRandom random_;
+    Tally& tally_;
+    std::vector<std::unique_ptr<SimulatedApplication>> applications_;
+    int incarnation_ = 0;
+};
+
+TEST(SimulatedBroadcasts, ExtensionsMayDoWhatTheyLike) {
+    const Seeds seeds(1000);
+    Tally tally;
+    for (std::uint64_t seed = seeds.first; seed <= seeds.last; ++seed) {
+        SCOPED_TRACE("seed " + std::to_string(seed));
+        Studio(seed, tally).run();
+        if (HasFailure()) return;
+    }
+    if (seeds.isOne()) return;
+    EXPECT_GT(tally.begun, 100);
+    EXPECT_GT(tally.clips, 50);
+    EXPECT_GT(tally.frames, 500);
+    EXPECT_GT(tally.crashes, 50);
+    EXPECT_GT(tally.finished, 20);
+    EXPECT_GT(tally.refused[-5808], 50);
+    EXPECT_GT(tally.refused[-5803], 5);
+    EXPECT_GT(tally.told[-5808], 10);
+    EXPECT_GT(tally.told[-5806], 20);
+}
+
+}  // namespace
+}  // namespace lumacast
