@@ -61,9 +61,6 @@ public:
     /// The directory that is the extension's home.
     std::string dataDirectoryOf(const InstalledExtension& extension) const;
 
-    /// The descriptor on which bubblewrap says which process its sandbox begins with.
-    static constexpr int kInformationDescriptor = 5;
-
 private:
     struct Places {
         std::string data;

@@ -13,7 +13,7 @@ std::vector<std::string> platformRoles() {
             "DisplayCapture", "DisplayCloneControl", "ContainerWriter", "MovieExporter", "FileSystem", "Preferences",
             "DeviceInfo", "Telemetry",   "KeepAlive",   "LogSink",    "AdminService", "StoragePurgeService", "PhotoLibrary",
             "AudioInputQueue", "DeviceCapture", "UserAlert", "SystemSounds", "ScreenReader", "StoreLookup",
-            "NetworkReachability"};
+            "NetworkReachability", "AppExtension", "KeyedArchive"};
 }
 
 RoleMatrix::RoleMatrix(std::vector<std::string> roles, const std::vector<ContractOutcome>& outcomes)

@@ -3,12 +3,14 @@
 #include <algorithm>
 #include <utility>
 
+#include "base/Limits.h"
 #include "tests/fakes/FakeError.h"
 
 namespace lumacast {
 
 namespace {
 constexpr int kNoSuchThing = 2;  // ENOENT
+constexpr int kTryAgain = 11;    // EAGAIN
 }
 
 struct FakeAppExtensions::Shared {
@@ -20,6 +22,7 @@ struct FakeAppExtensions::Shared {
     std::mutex mutex;
     ExtensionContextClass contextClass;
     std::vector<FakeInstalledExtension> installed;
+    std::function<bool(const std::string&)> isFile;
     std::vector<std::string> lookups;
     std::vector<std::weak_ptr<FakeAppExtension>> extensions;
     std::int32_t nextPid = 5000;
@@ -65,7 +68,7 @@ struct FakeAppExtension::Process {
 };
 
 FakeAppExtensions::FakeAppExtensions(Scheduler& scheduler, FakeIpc& daemon, MakeProcess makeProcess, FaultPlan& faults)
-    : shared_(new Shared{scheduler, daemon, std::move(makeProcess), faults, {}, {}, {}, {}, {}}),
+    : shared_(new Shared{scheduler, daemon, std::move(makeProcess), faults, {}, {}, {}, {}, {}, {}}),
       lookupQueue_(scheduler.serialQueue("extension lookups")) {}
 
 FakeAppExtensions::~FakeAppExtensions() = default;
@@ -99,6 +102,11 @@ void FakeAppExtensions::install(FakeInstalledExtension extension) {
 void FakeAppExtensions::uninstall(const BundleIdentifier& identifier) {
     const std::lock_guard lock(shared_->mutex);
     std::erase_if(shared_->installed, [&](const auto& installed) { return installed.identifier == identifier; });
+}
+
+void FakeAppExtensions::setFiles(std::function<bool(const std::string& path)> isFile) {
+    const std::lock_guard lock(shared_->mutex);
+    shared_->isFile.swap(isFile);
 }
 
 std::vector<std::string> FakeAppExtensions::lookups() const {
@@ -148,10 +156,13 @@ void FakeAppExtension::beginExtensionRequestWithInputItems(std::vector<Extension
     queue_->async([self = shared_from_this(), items = std::move(items), handler = std::move(handler)] {
         if (self->shared_->faults.fails("AppExtension.begin")) return handler(std::nullopt, fakeSystemError(kNoSuchThing));
         std::shared_ptr<Process> process;
+        bool isTooMany = false;
         {
             const std::lock_guard lock(self->mutex_);
             process = self->process_;
+            isTooMany = self->contexts_.size() >= limitOf(Limit::ExtensionRequestsInFlight);
         }
+        if (isTooMany) return handler(std::nullopt, fakeSystemError(kTryAgain));
         if (!process) process = self->launch();
         const bool hasVendor = !self->shared_->faults.fails("AppExtension.vendor");
         auto context = self->shared_->contextOf().make(hasVendor ? process->auxiliary : nullptr);
@@ -164,9 +175,9 @@ void FakeAppExtension::beginExtensionRequestWithInputItems(std::vector<Extension
             self->begun_.push_back({request, items});
         }
         if (hasVendor) context->didConnectToVendor();
-        process->queue->async([weak = std::weak_ptr(self), program = process->program, request, items] {
-            const auto extension = weak.lock();
-            if (extension && extension->isRunning()) program->beginRequest(*extension, request, items);
+        // Held until then: what it was begun with goes on when its object has gone.
+        process->queue->async([self, program = process->program, request, items] {
+            if (self->isRunning()) program->beginRequest(*self, request, items);
         });
         handler(request, std::nullopt);
     });
@@ -181,6 +192,10 @@ std::shared_ptr<ExtensionContext> FakeAppExtension::extensionContextForRequest(E
 std::optional<std::string> FakeAppExtension::issueReadOnlyFileToken(std::string_view tokenClass,
                                                                     const std::string& path) {
     if (path.empty() || shared_->faults.fails("AppExtension.token")) return std::nullopt;
+    {
+        const std::lock_guard lock(shared_->mutex);
+        if (shared_->isFile && !shared_->isFile(path)) return std::nullopt;
+    }
     const std::lock_guard lock(mutex_);
     tokens_.push_back({std::string(tokenClass), path, "token " + std::to_string(tokens_.size() + 1)});
     return tokens_.back().text;
@@ -197,23 +212,38 @@ void FakeAppExtension::kill(int signal) {
 
 void FakeAppExtension::crash() {
     std::shared_ptr<Process> process;
+    std::map<ExtensionRequestID, std::shared_ptr<ExtensionContext>> left;
     {
         const std::lock_guard lock(mutex_);
         process_.swap(process);
+        contexts_.swap(left);  // what it leaves is never told
     }
     // Not on the lane of the handlers: one may be waiting there.
     if (process) process->queue->async([process] { process->ipc->kill(); });
 }
 
 void FakeAppExtension::complete(ExtensionRequestID request, std::vector<ExtensionItem> returned) {
+    if (returned.size() > limitOf(Limit::ExtensionItemsReturned))
+        returned.resize(limitOf(Limit::ExtensionItemsReturned));
     queue_->async([self = shared_from_this(), request, returned = std::move(returned)] {
         RequestCompletionHandler handler;
         {
             const std::lock_guard lock(self->mutex_);
-            self->contexts_.erase(request);
+            if (self->contexts_.erase(request) == 0) return;
             handler = self->completionHandler_;
         }
         if (handler) handler(request, returned);
+    });
+}
+
+void FakeAppExtension::cancel(ExtensionRequestID request) {
+    queue_->async([self = shared_from_this(), request] {
+        std::shared_ptr<ExtensionContext> context;
+        const std::lock_guard lock(self->mutex_);
+        const auto found = self->contexts_.find(request);
+        if (found == self->contexts_.end()) return;
+        context = std::move(found->second);
+        self->contexts_.erase(found);
     });
 }
 

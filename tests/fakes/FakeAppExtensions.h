@@ -57,6 +57,8 @@ public:
 
     void install(FakeInstalledExtension extension);
     void uninstall(const BundleIdentifier& identifier);
+    /// Which files are there for tokens. At first every path names one.
+    void setFiles(std::function<bool(const std::string& path)> isFile);
     /// What the lookups asked for, oldest first.
     std::vector<std::string> lookups() const;
     /// The objects that lookups have answered with and somebody still holds, oldest first.
@@ -95,7 +97,10 @@ public:
     void kill(int signal) override;
 
     /// The extension completes the request: the handler of that moment is called later, on the extension's lane.
+    /// A second completion of a request is ignored; more items than the limits table allows are cut.
     void complete(ExtensionRequestID request, std::vector<ExtensionItem> returned);
+    /// The extension gives the request up: nobody is told.
+    void cancel(ExtensionRequestID request);
     /// The process ends by itself.
     void crash();
     bool isRunning() const;
