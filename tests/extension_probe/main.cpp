@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
+#include <sys/socket.h>
 #include <unistd.h>
 
 #include <array>
@@ -120,6 +121,12 @@ private:
             return complete(request, {});
         }
         if (command == "leave-child") return leaveChild(request, textOf(items.front()));
+        if (command == "connect") {
+            const int socket = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+            const std::string answer = socket >= 0 ? "0" : ::strerrorname_np(errno);
+            if (socket >= 0) ::close(socket);
+            return complete(request, {textItem("socket", answer)});
+        }
         if (command == "forks") return forkMany(request);
         if (command == "memory") return takeMemory(request);
         if (command == "garbage") {
