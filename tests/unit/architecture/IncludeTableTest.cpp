@@ -34,7 +34,8 @@ const std::map<std::string_view, std::set<std::string_view>> kMayInclude{
     {"linux", {"linux/ipc", "src/platform", "src/writer/media", "src/base", "src/support/ThreadScheduler.h"}},
     {"linux/ipc", {"linux", "src/platform", "src/writer/media", "src/base"}},
     {"client",
-     {"src/base", "src/writer/media", "src/broadcast/LCBroadcastConfiguration.h", "linux/ipc",
+     {"src/base", "src/writer/media", "src/broadcast/LCBroadcastConfiguration.h",
+      "src/broadcast/ConfigurationArchive.h", "linux/ipc",
       "src/platform/IpcConnection.h", "src/platform/IpcEndpoint.h", "src/platform/IpcListener.h",
       "src/platform/Scheduler.h"}},
     // The administrator's tool is no client of the daemon: it asks the admin service and looks at what the port looks
