@@ -39,6 +39,8 @@ struct FrameExpectation {
     /// repeat.
     std::size_t allowedRepeats = 0;
     std::size_t allowedUnreadable = 0;
+    /// How many numbers may be missing, each between two that are there.
+    std::size_t allowedMissing = 0;
     /// No two consecutive pictures are further apart.
     std::optional<std::chrono::nanoseconds> largestHole;
     /// When each frame was drawn: the pictures must keep that time line.

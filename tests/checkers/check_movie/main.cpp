@@ -48,6 +48,7 @@ int main(int argc, char** argv) {
     app.add_option("--forbid", forbidden, "numbers drawn during a pause; may be given several times")->check(isRange);
     app.add_option("--expect", expected, "numbers that must all be there")->check(isRange);
     app.add_flag("--expect-all", frames.withoutGaps, "no number between the movie's lowest and highest is missing");
+    app.add_option("--allow-missing", frames.allowedMissing, "how many numbers may be missing, no two in a row");
     app.add_option("--allow-repeats", frames.allowedRepeats, "how often numbers may be repeated");
     app.add_option("--allow-unreadable", frames.allowedUnreadable, "how many pictures may have no readable number");
     auto* hole = app.add_option("--max-hole-ms", largestHole, "the largest step from one picture to the next");

@@ -91,6 +91,20 @@ TEST_F(MovieCheck, RejectsADroppedFrame) {
     EXPECT_NEAR(static_cast<double>(report.largestHole.count()), 66.7e6, 0.1e6);
 }
 
+TEST_F(MovieCheck, AllowsForSingleFramesThatAreMissingButNotForTwoInARow) {
+    expectation_.largestHole.reset();
+    expectation_.allowedMissing = 2;
+    plan_.pictures.erase(plan_.pictures.begin() + 20);
+    plan_.pictures.erase(plan_.pictures.begin() + 30);
+    expectOnly(judge(), {});
+    EXPECT_EQ(judge().missing.size(), 2U);
+    expectation_.allowedMissing = 1;
+    expectOnly(judge(), {Kind::Missing});
+    expectation_.allowedMissing = 5;
+    plan_.pictures.erase(plan_.pictures.begin() + 30);
+    expectOnly(judge(), {Kind::Missing, Kind::Missing});
+}
+
 TEST_F(MovieCheck, RejectsALostEndWhenTheWholeSetIsExpected) {
     plan_.pictures.pop_back();
     expectOnly(judge(), {Kind::Missing});
