@@ -100,6 +100,7 @@ Value argument(ArgumentType type, std::span<const ContextID> windows, Input& in)
         case A::NullableError: return in.flag() ? Value(Error(text(in), in.byte(), dictionary(in))) : Value();
         case A::SharedPlaneObject:
             return Value(Value::PlaneRef(std::make_shared<FakePlane>(1, 1, 1, std::vector<PixelRect>())));
+        case A::Plain: return in.flag() ? Value(dictionary(in)) : Value(text(in));
         case A::Any: return Value(text(in));
     }
     return Value();
