@@ -2,7 +2,9 @@
 // A web and media server of the test's own: a process on this machine's loopback, ended with the test.
 
 #include <netinet/in.h>
+#include <signal.h>
 #include <sys/socket.h>
+#include <unistd.h>
 
 #include <memory>
 #include <string>
@@ -19,13 +21,19 @@ namespace lumacast::test {
 class PrivateNginx final {
 public:
     PrivateNginx() : httpPort_(freePort()), rtmpPort_(freePort()) {
-        for (const char* folder : {"www", "temp", "recordings"}) scratch_.makeDirectory(folder);
-        scratch_.write("nginx.conf", configuration());
+        for (const char* folder : {"www", "temp"}) scratch_.makeDirectory(folder);
         start();
     }
 
+    ~PrivateNginx() { stop(); }
+    PrivateNginx(const PrivateNginx&) = delete;
+    PrivateNginx& operator=(const PrivateNginx&) = delete;
+
     /// After stop(): the same server on the same ports.
     void start() {
+        ++starts_;
+        scratch_.makeDirectory("recordings-" + std::to_string(starts_));
+        scratch_.write("nginx.conf", configuration());
         process_ = std::make_unique<checkers::Child>(
             std::vector<std::string>{"/usr/sbin/nginx", "-p", scratch_.path(), "-c", scratch_.path("nginx.conf"), "-e",
                                      scratch_.path("error.log")},
@@ -33,14 +41,21 @@ public:
         EXPECT_TRUE(waitUntil([&] { return isListening(httpPort_) && isListening(rtmpPort_); })) << log();
     }
     /// Ends it, and every connection with it.
-    void stop() { process_ = nullptr; }
+    void stop() {
+        if (process_) ::kill(process_->pid(), SIGKILL);
+        process_ = nullptr;
+    }
+
+    /// It does nothing any more, and its connections stay.
+    void hang() { ::kill(process_->pid(), SIGSTOP); }
 
     std::string url() const { return "http://127.0.0.1:" + std::to_string(httpPort_) + "/live/"; }
     std::string rtmpURL(const std::string& name) const {
         return "rtmp://127.0.0.1:" + std::to_string(rtmpPort_) + "/live/" + name;
     }
     std::string files() const { return scratch_.path("www/live"); }
-    std::string recordings() const { return scratch_.path("recordings"); }
+    /// Since the last start: recordings of the same second would have the same name.
+    std::string recordings() const { return scratch_.path("recordings-" + std::to_string(starts_)); }
     std::string log() const { return ScratchDirectory::read(scratch_.path("error.log")); }
 
     /// A port that nobody listens on.
@@ -84,11 +99,12 @@ private:
                std::to_string(rtmpPort_) +
                ";\n    application live {\n      live on;\n      record all;\n      record_unique on;\n      "
                "record_path " +
-               scratch_.path("recordings") + ";\n    }\n  }\n}\n";
+               recordings() + ";\n    }\n  }\n}\n";
     }
 
     ScratchDirectory scratch_;
     const int httpPort_, rtmpPort_;
+    int starts_ = 0;
     std::unique_ptr<checkers::Child> process_;
 };
 
