@@ -83,7 +83,7 @@ Ring readRing(int doorbell) {
 }  // namespace
 
 LinuxIpcListener::LinuxIpcListener(std::shared_ptr<IpcCore> core, ServiceSocket service)
-    : core_(std::move(core)), service_(std::move(service)) {}
+    : core_(std::move(core)), service_(std::in_place, std::move(service)) {}
 
 LinuxIpcListener::~LinuxIpcListener() {
     watch_.reset();
@@ -103,9 +103,10 @@ void LinuxIpcListener::invalidate() {
         ears->watch.swap(watch_);
         ears->doorbells.swap(doorbells_);
     }
-    // Closed on the reactor, which may be reading from them now.
-    core_->reactor.async([ears] {
+    // Closed on the reactor, which may be reading from them now. So is the name: who calls it is refused at once.
+    core_->reactor.async([self = shared_from_this(), ears] {
         ears->watch.reset();
+        self->service_.reset();
         for (auto& [descriptor, doorbell] : ears->doorbells) doorbell.watch.reset();
     });
 }
@@ -119,8 +120,8 @@ void LinuxIpcListener::resume() {
     const std::lock_guard lock(mutex_);
     if (isResumed_ || isInvalid_) return;
     isResumed_ = true;
-    if (service_.descriptor() >= 0) {
-        watch_ = core_->reactor.watch(service_.descriptor(), EPOLLIN, [weak = weak_from_this()](std::uint32_t) {
+    if (service_ && service_->descriptor() >= 0) {
+        watch_ = core_->reactor.watch(service_->descriptor(), EPOLLIN, [weak = weak_from_this()](std::uint32_t) {
             const auto self = weak.lock();
             return self ? self->acceptFromService() : Reactor::Again::No;
         });
@@ -158,7 +159,7 @@ void LinuxIpcListener::watchDoorbellLocked(Doorbell& doorbell) {
 
 Reactor::Again LinuxIpcListener::acceptFromService() {
     for (int i = 0; i < kAcceptsPerTurn; ++i) {
-        Fd socket(accept4(service_.descriptor(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+        Fd socket(accept4(service_->descriptor(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
         if (socket) {
             admit(std::move(socket));
         } else if (errno == EMFILE || errno == ENFILE) {
@@ -174,7 +175,7 @@ Reactor::Again LinuxIpcListener::acceptFromService() {
 /// Without this the connection would stay at the door and keep the loop awake for nothing.
 void LinuxIpcListener::refuseForLackOfDescriptors() {
     core_->spare.reset();
-    Fd refused(accept4(service_.descriptor(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+    Fd refused(accept4(service_->descriptor(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
     if (refused && core_->noDescriptorLeft.begins(std::chrono::steady_clock::now(), kBurstEndsAfter))
         core_->log.error("IPC: a connection was refused: no descriptor is left");
     refused.reset();

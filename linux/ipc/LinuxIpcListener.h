@@ -1,6 +1,7 @@
 #pragma once
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <unordered_map>
 #include <vector>
 
@@ -42,7 +43,7 @@ private:
     void watchDoorbellLocked(Doorbell& doorbell);
 
     const std::shared_ptr<IpcCore> core_;
-    const ServiceSocket service_;
+    std::optional<ServiceSocket> service_;  ///< the reactor's own once the listener is resumed; none when it is invalid
 
     std::mutex mutex_;
     std::weak_ptr<IpcListenerDelegate> delegate_;

@@ -313,5 +313,61 @@ TEST_P(IpcContract, TheExportedObjectIsHeldWeakly) {
     }));
 }
 
+TEST_P(IpcContract, AnInvalidatedListenerAcceptsNobodyAnyMoreAndItsConnectionsLiveOn) {
+    const Link l = link();
+    world->on(Side::Daemon, [&] { listener->invalidate(); });
+    const auto late = connect();
+    EXPECT_TRUE(until([&] { return clientLoss.invalidations.get() == 1; })) << "the name is closed";
+    tell(*l.client, DaemonMessage::PauseRecording, {}, ignored);
+    EXPECT_TRUE(until([&] { return daemonObject->count() == 1; }));
+    EXPECT_EQ(delegate->accepted.get().size(), 1u);
+    world->on(Side::Daemon, [&] {
+        listener->invalidate();  // again does nothing
+        listener.reset();
+    });
+    startListener();
+    const auto next = connect();
+    tell(*next, DaemonMessage::PauseRecording, {}, ignored);
+    EXPECT_TRUE(until([&] { return daemonObject->count() == 2; })) << "the name is free again";
+}
+
+TEST_P(IpcContract, AnInvalidatedListenersEndpointsNameNothing) {
+    std::shared_ptr<IpcEndpoint> before, after;
+    world->on(Side::Daemon, [&] {
+        listener = world->ipc(Side::Daemon).anonymousListener();
+        listener->setDelegate(delegate);
+        listener->resume();
+        before = listener->endpoint();
+    });
+    const auto accepted = connectTo(before, Side::Client);
+    tell(*accepted, DaemonMessage::PauseRecording, {}, ignored);
+    ASSERT_TRUE(until([&] { return daemonObject->count() == 1; }));
+    world->on(Side::Daemon, [&] {
+        listener->invalidate();
+        after = listener->endpoint();
+    });
+    const auto viaOld = connectTo(before, Side::Client), viaNew = connectTo(after, Side::Client);
+    EXPECT_TRUE(until([&] { return clientLoss.invalidations.get() == 2; }));
+    tell(*accepted, DaemonMessage::PauseRecording, {}, ignored);
+    EXPECT_TRUE(until([&] { return daemonObject->count() == 2; })) << "what it has accepted goes on";
+    EXPECT_EQ(delegate->accepted.get().size(), 1u);
+}
+
+TEST_P(IpcContract, AListenerThatIsInvalidatedBeforeItsResumeNeverAccepts) {
+    std::shared_ptr<IpcEndpoint> endpoint;
+    world->on(Side::Daemon, [&] {
+        listener = world->ipc(Side::Daemon).anonymousListener();
+        listener->setDelegate(delegate);
+        endpoint = listener->endpoint();
+    });
+    const auto waiting = connectTo(endpoint, Side::Client);
+    world->on(Side::Daemon, [&] {
+        listener->invalidate();
+        listener->resume();
+    });
+    EXPECT_TRUE(until([&] { return clientLoss.invalidations.get() == 1; }));
+    EXPECT_EQ(delegate->accepted.get().size(), 0u);
+}
+
 }  // namespace
 }  // namespace lumacast
