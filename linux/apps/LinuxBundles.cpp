@@ -8,6 +8,16 @@ namespace lumacast {
 
 namespace {
 
+/// Pixels of a side.
+int sizeOf(IconFormat format) {
+    switch (format) {
+        case IconFormat::Small: return 32;
+        case IconFormat::Medium: return 64;
+        case IconFormat::Large: return 128;
+    }
+    return 64;
+}
+
 std::string withoutTrailingSlashes(std::string path) {
     while (path.size() > 1 && path.ends_with('/')) path.pop_back();
     return path;
@@ -21,6 +31,7 @@ LinuxBundles::Options LinuxBundles::optionsFrom(const LinuxEnvironment& environm
     options.searchPath = environment.searchPath;
     options.frameworkBundlePath = environment.resourceBundle;
     options.locales = userLocales(environment.languageList, environment.messageLocale);
+    options.icons = {environment.home, environment.dataDirectories, environment.configDirectories};
     options.freshness = std::chrono::seconds(1);
     return options;
 }
@@ -90,7 +101,17 @@ std::shared_ptr<const Bundle> LinuxBundles::withIdentifier(const BundleIdentifie
     return path ? library_->known(*path) : nullptr;
 }
 
-std::optional<Data> LinuxBundles::applicationIcon(const BundleIdentifier&, IconFormat) { return std::nullopt; }
+std::optional<Data> LinuxBundles::applicationIcon(const BundleIdentifier& identifier, IconFormat format) {
+    const auto answer = ask<std::optional<Data>>(
+        [name = identifier.text(), icons = options_.icons, size = sizeOf(format)](BundleLibrary& library)
+            -> std::optional<Data> {
+            const auto path = library.pathForIdentifier(name);
+            const auto bundle = path ? library.open(*path) : nullptr;
+            const auto icon = bundle ? bundle->info(kInfoIcon) : std::nullopt;
+            return icon ? icons.png(*icon, size) : std::nullopt;
+        });
+    return answer ? *answer : std::nullopt;
+}
 
 std::string LinuxBundles::frameworkBundlePath() { return options_.frameworkBundlePath; }
 

@@ -4,6 +4,7 @@
 #include <string>
 #include <vector>
 
+#include "linux/apps/IconThemes.h"
 #include "linux/apps/Languages.h"
 #include "linux/system/DiskLane.h"
 #include "linux/system/LinuxEnvironment.h"
@@ -28,6 +29,7 @@ public:
         std::vector<std::string> searchPath;              ///< where the commands of desktop entries are found
         std::string frameworkBundlePath;
         std::vector<Locale> locales;  ///< the user's, see userLocales
+        IconThemes icons;
         std::chrono::milliseconds patience{100};
         std::chrono::milliseconds freshness{0};  ///< how long a look at the disk counts; what was not found never does
         std::function<void()> beforeEachQuestion;  ///< tests put a slow disk here; runs on the disk's thread

@@ -32,6 +32,8 @@ public:
     virtual Bundles& bundles() = 0;
     virtual void install(const Application& application) = 0;
     virtual void uninstall(const BundleIdentifier& identifier) = 0;
+    /// Gives the application's icon in this format.
+    virtual void setIcon(const BundleIdentifier& identifier, IconFormat format, const Data& png) = 0;
     /// Starts the application; nothing when that is not possible.
     virtual std::optional<ProcessID> run(const BundleIdentifier& identifier) = 0;
     virtual void end(ProcessID pid) = 0;
@@ -56,6 +58,9 @@ public:
         bundles_.install(std::move(bundle));
     }
     void uninstall(const BundleIdentifier& identifier) override { bundles_.uninstall(identifier); }
+    void setIcon(const BundleIdentifier& identifier, IconFormat format, const Data& png) override {
+        bundles_.setIcon(identifier, format, png);
+    }
     std::optional<ProcessID> run(const BundleIdentifier& identifier) override {
         bundles_.run(ProcessID(++last_), identifier);
         return ProcessID(last_);
@@ -99,6 +104,11 @@ public:
     void uninstall(const BundleIdentifier& identifier) override {
         std::filesystem::remove(scratch_.path("applications/" + identifier.text() + ".desktop"));
     }
+    void setIcon(const BundleIdentifier&, IconFormat format, const Data& png) override {
+        const char* const sizes[] = {"32x32", "64x64", "128x128"};
+        scratch_.write("data/icons/hicolor/" + std::string(sizes[static_cast<int>(format)]) + "/apps/the-icon.png",
+                       std::string(png.begin(), png.end()));
+    }
     std::optional<ProcessID> run(const BundleIdentifier& identifier) override {
         return start(scratch_.path("bin/" + identifier.text()));
     }
@@ -119,6 +129,7 @@ private:
         result.searchPath = {scratch_.makeDirectory("bin")};
         result.frameworkBundlePath = scratch_.path("Framework.bundle");
         result.locales = userLocales("de:en", "");
+        result.icons = {scratch_.path("home"), {scratch_.path("data")}, {}};
         result.patience = std::chrono::seconds(30);
         return result;
     }
@@ -247,6 +258,19 @@ TEST_P(BundlesContract, TheUsersLanguagesAreInTheirOrder) {
     EXPECT_THAT(bundles_.preferredLocalizations({"en", "fr", "de"}), ElementsAre("de", "en"));
     EXPECT_THAT(bundles_.preferredLocalizations({"fr", "it"}), IsEmpty());
     EXPECT_THAT(bundles_.preferredLocalizations({}), IsEmpty());
+}
+
+TEST_P(BundlesContract, AnApplicationsIconIsThePngOfItsFormat) {
+    world_->install({kPlayer, "Player", std::nullopt});
+    EXPECT_EQ(bundles_.applicationIcon(kPlayer, IconFormat::Medium), std::nullopt);
+    const std::pair<IconFormat, std::uint8_t> formats[] = {
+        {IconFormat::Small, 1}, {IconFormat::Medium, 2}, {IconFormat::Large, 3}};
+    const auto png = [](std::uint8_t contents) { return Data{0x89, 'P', 'N', 'G', '\r', '\n', 0x1a, '\n', contents}; };
+    for (const auto& [format, contents] : formats) world_->setIcon(kPlayer, format, png(contents));
+    for (const auto& [format, contents] : formats) EXPECT_EQ(bundles_.applicationIcon(kPlayer, format), png(contents));
+    EXPECT_EQ(bundles_.applicationIcon(BundleIdentifier("org.example.Other"), IconFormat::Large), std::nullopt);
+    world_->uninstall(kPlayer);
+    EXPECT_EQ(bundles_.applicationIcon(kPlayer, IconFormat::Large), std::nullopt);
 }
 
 INSTANTIATE_TEST_SUITE_P(Fake, BundlesContract,

@@ -82,6 +82,7 @@ void FakeBundles::installApplication(const BundleIdentifier& identifier, const s
 
 void FakeBundles::uninstall(const BundleIdentifier& identifier) {
     const std::lock_guard lock(mutex_);
+    std::erase_if(icons_, [&](const auto& icon) { return icon.first.first == identifier; });
     const auto found = paths_.find(identifier);
     if (found == paths_.end()) return;
     bundles_.erase(found->second);
