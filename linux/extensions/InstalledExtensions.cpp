@@ -105,7 +105,7 @@ InstalledExtensions::InstalledExtensions(Log& log, std::vector<std::string> data
     : log_(log), directories_(std::move(dataDirectories)), locales_(std::move(locales)) {}
 
 std::variant<std::shared_ptr<const InstalledExtension>, std::string> InstalledExtensions::read(
-    const std::string& path) const {
+    const std::string& path, std::string& executable) const {
     const FileDescriptor folder(::open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
     struct stat folderStatus = {}, manifestStatus = {}, programStatus = {};
     if (!folder || ::fstat(folder.get(), &folderStatus) != 0) return "its folder can't be opened";
@@ -123,6 +123,7 @@ std::variant<std::shared_ptr<const InstalledExtension>, std::string> InstalledEx
     auto extension = std::make_shared<InstalledExtension>();
     extension->manifest = std::move(std::get<ExtensionManifest>(parsed));
     const ExtensionManifest& manifest = extension->manifest;
+    executable = manifest.executable;
     extension->folder = realPath(folder.get());
     const FileDescriptor program = openWithin(folder.get(), manifest.executable, O_PATH);
     if (!program || ::fstat(program.get(), &programStatus) != 0) return "its executable is not in its folder";
@@ -150,21 +151,22 @@ std::variant<std::shared_ptr<const InstalledExtension>, std::string> InstalledEx
 InstalledExtensions::Known& InstalledExtensions::known(const std::string& folder) {
     Known& known = known_[folder];
     const FileDescriptor opened(::open(folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-    std::string stamp = opened ? stampOf(opened.get(), std::string(kManifest)) + " " + stampOf(opened.get(), ".")
-                               : std::to_string(errno);
-    if (opened && known.extension)
-        stamp += " " + stampOf(opened.get(), known.extension->manifest.executable);
-    if (known.stamp == stamp) return known;
-    auto found = read(folder);
+    const auto stamp = [&opened, &known] {
+        if (!opened) return std::string("none");
+        std::string text = stampOf(opened.get(), std::string(kManifest)) + " " + stampOf(opened.get(), ".");
+        if (!known.executable.empty()) text += " " + stampOf(opened.get(), known.executable);
+        return text;
+    };
+    if (known.stamp == stamp()) return known;
+    known.executable.clear();
+    auto found = read(folder, known.executable);
     if (const auto* reason = std::get_if<std::string>(&found)) {
         known.extension = nullptr;
         log_.error("the extension in %s is passed over: %s", folder, *reason);
     } else {
         known.extension = std::get<std::shared_ptr<const InstalledExtension>>(std::move(found));
-        stamp = stampOf(opened.get(), std::string(kManifest)) + " " + stampOf(opened.get(), ".") + " " +
-                stampOf(opened.get(), known.extension->manifest.executable);
     }
-    known.stamp = std::move(stamp);
+    known.stamp = stamp();
     return known;
 }
 

@@ -41,11 +41,14 @@ public:
 
 private:
     struct Known {
+        std::string executable;  ///< as its manifest says; empty when it says nothing good
         std::string stamp;
         std::shared_ptr<const InstalledExtension> extension;  ///< null: passed over
     };
     Known& known(const std::string& folder);
-    std::variant<std::shared_ptr<const InstalledExtension>, std::string> read(const std::string& folder) const;
+    /// Sets `executable` where there is a good manifest.
+    std::variant<std::shared_ptr<const InstalledExtension>, std::string> read(const std::string& folder,
+                                                                              std::string& executable) const;
 
     Log& log_;
     const std::vector<std::string> directories_;

@@ -3,6 +3,8 @@
 #include <mutex>
 #include <string>
 
+#include "base/Limits.h"
+#include "base/Wire.h"
 #include "platform/KeyedArchive.h"
 
 namespace lumacast {
@@ -12,7 +14,10 @@ namespace lumacast {
 class FakeKeyedArchive final : public KeyedArchive {
 public:
     std::optional<Data> archivedData(const ArchivedObject& root) override {
-        if (!isArchivable(Value(root.fields))) return std::nullopt;
+        if (!isArchivable(Value(root.fields), limitOf(Limit::ArchiveDepth))) return std::nullopt;
+        WireBody body;
+        if (!encode(Value(root.fields), body) || body.bytes.size() + kWrapping > limitOf(Limit::ArchiveBytes))
+            return std::nullopt;
         const std::lock_guard lock(mutex_);
         const std::string name = "archive " + std::to_string(archives_.size() + 1);
         archives_[name] = root;
@@ -26,14 +31,19 @@ public:
     }
 
 private:
-    static bool isArchivable(const Value& value) {
+    /// About what an archive has beside the fields.
+    static constexpr std::size_t kWrapping = 64;
+
+    /// With `depth` levels of arrays and dictionaries at most.
+    static bool isArchivable(const Value& value, std::uint64_t depth) {
         if (value.as<Value::EndpointRef>() || value.as<Value::PlaneRef>() || value.asError()) return false;
+        if ((value.as<Array>() || value.as<Dictionary>()) && depth-- == 0) return false;
         if (const Array* array = value.as<Array>())
             for (const Value& inner : *array)
-                if (!isArchivable(inner)) return false;
+                if (!isArchivable(inner, depth)) return false;
         if (const Dictionary* dictionary = value.as<Dictionary>())
             for (const auto& [key, inner] : dictionary->entries())
-                if (!isArchivable(inner)) return false;
+                if (!isArchivable(inner, depth)) return false;
         return true;
     }
 
