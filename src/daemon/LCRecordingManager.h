@@ -264,7 +264,8 @@ private:
     void enableBroadcast(const WaitingStartRef& start, std::uint64_t generation, const BroadcastInfo& info);
     /// Whether no newer start of the session has begun. Any lane.
     static bool isNewest(const WaitingStart& start, std::uint64_t generation);
-    void broadcastEnabled(const WaitingStartRef& start, std::uint64_t generation, bool microphone, bool camera);
+    void broadcastEnabled(const WaitingStartRef& start, std::uint64_t generation,
+                          const std::shared_ptr<LCBroadcastExtensionProxy>& link, bool microphone, bool camera);
     void startEnabledRecording(const WaitingStartRef& start, std::uint64_t generation);
     /// A start that its extension has not taken note of is answered with what ended the recording.
     void answerPendingStart(const std::shared_ptr<LCRecordingSession>& session, const std::optional<Error>& error);

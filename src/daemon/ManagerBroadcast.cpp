@@ -99,14 +99,16 @@ void LCRecordingManager::enableBroadcast(const WaitingStartRef& start, std::uint
                                          const BroadcastInfo& info) {
     const auto& session = start->session;
     session->setBroadcastConfiguration(info.configuration);
+    session->prepareBroadcast(info.extension, info.processMode, info.userInfo);
     session->startQueue().async([self = shared_from_this(), start, generation, info,
                                  microphone = microphoneRecording_, camera = cameraRecording_] {
         // A newer start has taken this one's place while it waited its turn.
-        if (self->isNewest(*start, generation))
-            start->session->enableBroadcastWithExtension(info.extension, info.processMode, info.userInfo,
-                                                         start->request.listenerEndpoint);
-        self->onRequestLane([self, start, generation, microphone, camera] {
-            self->broadcastEnabled(start, generation, microphone, camera);
+        const auto link = isNewest(*start, generation)
+                              ? start->session->connectBroadcast(info.extension, info.processMode,
+                                                                 start->request.listenerEndpoint)
+                              : nullptr;
+        self->onRequestLane([self, start, generation, link, microphone, camera] {
+            self->broadcastEnabled(start, generation, link, microphone, camera);
         });
     });
 }
@@ -115,7 +117,8 @@ bool LCRecordingManager::isNewest(const WaitingStart& start, std::uint64_t gener
     return start.session->managerRecord.broadcastGeneration == generation;
 }
 
-void LCRecordingManager::broadcastEnabled(const WaitingStartRef& start, std::uint64_t generation, bool microphone,
+void LCRecordingManager::broadcastEnabled(const WaitingStartRef& start, std::uint64_t generation,
+                                          const std::shared_ptr<LCBroadcastExtensionProxy>& link, bool microphone,
                                           bool camera) {
     const auto& session = start->session;
     const auto failure = session->takeEnablingError();
@@ -124,16 +127,12 @@ void LCRecordingManager::broadcastEnabled(const WaitingStartRef& start, std::uin
         microphoneRecording_ = microphone;
         cameraRecording_ = camera;
         // Another start of the application has been faster.
-        if (session->isRecording()) {
-            stopCurrentRecordingSessionWithHandler(*start, {});
-        }
+        if (session->isRecording()) stopCurrentRecordingSessionWithHandler(*start, {});
         return startEnabledRecording(start, generation);
     }
-    if (const auto proxy = session->managerRecord.startGeneration == generation
-                               ? session->broadcastUploadExtensionProxy()
-                               : nullptr) {
-        proxy->invalidateConnection();
-        session->setBroadcastUploadExtensionProxy(nullptr);
+    if (link) {
+        link->invalidateConnection();
+        if (session->broadcastUploadExtensionProxy() == link) session->setBroadcastUploadExtensionProxy(nullptr);
     }
     resetStatesForSession(session, generation);
     if (failure && isWanted) {

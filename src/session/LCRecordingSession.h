@@ -194,6 +194,13 @@ public:
     std::int64_t enableBroadcastWithExtension(std::shared_ptr<AppExtension> extension, std::int64_t mode,
                                               std::optional<Dictionary> userInfo,
                                               const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
+    /// Its two halves: what the session is from now on, on the request lane, and the connection, which may wait, on the
+    /// start queue. Answers the link that it made; null in movie-clip mode.
+    void prepareBroadcast(std::shared_ptr<AppExtension> extension, std::int64_t mode,
+                          std::optional<Dictionary> userInfo);
+    std::shared_ptr<LCBroadcastExtensionProxy> connectBroadcast(std::shared_ptr<AppExtension> extension,
+                                                                std::int64_t mode,
+                                                                const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
     /// Ends the wait of an enabling under way, if there is one. Any lane.
     void endWaitForExtension();
     /// The extension's failure that ended the last enabling; none the next time.
@@ -289,8 +296,9 @@ private:
     /// `startWritingHandler:` or the extension's start, then the continuation on the request lane.
     void startWriter(Size size, Handler continuation);
     struct ExtensionWait;
-    void connectToExtension(std::shared_ptr<AppExtension> extension);
-    void connectToListeningExtension(const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
+    std::shared_ptr<LCBroadcastExtensionProxy> connectToExtension(std::shared_ptr<AppExtension> extension);
+    std::shared_ptr<LCBroadcastExtensionProxy> connectToListeningExtension(
+        const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
     void installHandlers(LCBroadcastExtensionProxy& proxy, const std::shared_ptr<ExtensionWait>& wait);
     void extensionFailed(const std::shared_ptr<LCBroadcastExtensionProxy>& proxy, const Error& error);
     /// The link to send over; null, and a line, when there is none.

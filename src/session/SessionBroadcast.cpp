@@ -30,31 +30,40 @@ std::optional<BundleIdentifier> LCRecordingSession::broadcastExtensionID() const
 std::int64_t LCRecordingSession::enableBroadcastWithExtension(std::shared_ptr<AppExtension> extension, std::int64_t mode,
                                                               std::optional<Dictionary> userInfo,
                                                               const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
+    prepareBroadcast(std::move(extension), mode, std::move(userInfo));
+    connectBroadcast(broadcastExtension(), mode, listenerEndpoint);
+    return 0;  // deliberately always: a failure shows in disableBroadcast alone
+}
+
+void LCRecordingSession::prepareBroadcast(std::shared_ptr<AppExtension> extension, std::int64_t mode,
+                                          std::optional<Dictionary> userInfo) {
     log_.line("LCRecordingSession: enableBroadcastWithExtension");
-    setBroadcastExtension(extension);
+    setBroadcastExtension(std::move(extension));
     broadcastUserInfo_.set(std::move(userInfo));
     broadcastFragmentStartTime_.set(kInvalidMediaTime);
     broadcastFragmentIndex_ = 1;
     broadcastProcessMode_ = mode;
     bundleIDOfFirstForegroundApp_.set(std::nullopt);
-    if (isSampleBuffers(mode)) {
-        log_.line("setting up extension proxy");
-        if (listenerEndpoint)
-            connectToListeningExtension(listenerEndpoint);
-        else
-            connectToExtension(std::move(extension));
-    }
-    return 0;  // deliberately always: a failure shows in disableBroadcast alone
 }
 
-void LCRecordingSession::connectToListeningExtension(const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
+std::shared_ptr<LCBroadcastExtensionProxy> LCRecordingSession::connectBroadcast(
+    std::shared_ptr<AppExtension> extension, std::int64_t mode, const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
+    if (!isSampleBuffers(mode)) return nullptr;
+    log_.line("setting up extension proxy");
+    return listenerEndpoint ? connectToListeningExtension(listenerEndpoint) : connectToExtension(std::move(extension));
+}
+
+std::shared_ptr<LCBroadcastExtensionProxy> LCRecordingSession::connectToListeningExtension(
+    const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
     const auto proxy = LCBroadcastExtensionProxy::initWithBroadcastUploadListenerEndpoint(
         services_.platform, services_.errors, listenerEndpoint);
     installHandlers(*proxy, std::make_shared<ExtensionWait>(services_.platform.scheduler));
     setBroadcastUploadExtensionProxy(proxy);
+    return proxy;
 }
 
-void LCRecordingSession::connectToExtension(std::shared_ptr<AppExtension> extension) {
+std::shared_ptr<LCBroadcastExtensionProxy> LCRecordingSession::connectToExtension(
+    std::shared_ptr<AppExtension> extension) {
     const auto proxy = LCBroadcastExtensionProxy::initWithBroadcastUploadExtension(services_.platform, services_.errors,
                                                                                    std::move(extension));
     const auto wait = std::make_shared<ExtensionWait>(services_.platform.scheduler);
@@ -63,9 +72,10 @@ void LCRecordingSession::connectToExtension(std::shared_ptr<AppExtension> extens
     extensionWait_.set(wait);
     proxy->establishConnectionWithHandler([weak = weak_from_this(), wait](const std::optional<Error>& error) {
         if (const auto self = weak.lock()) {
-            if (error)
+            // A newer start has its own broadcast by then.
+            if (error && self->extensionWait_.get() == wait)
                 self->disableBroadcast();
-            else
+            else if (!error)
                 self->log_.line("connection to extensions ready");
         }
         wait->semaphore->signal();
@@ -75,6 +85,7 @@ void LCRecordingSession::connectToExtension(std::shared_ptr<AppExtension> extens
         if (current == wait) current = nullptr;
     });
     enablingError_.set(wait->error.get());
+    return proxy;
 }
 
 void LCRecordingSession::installHandlers(LCBroadcastExtensionProxy& proxy, const std::shared_ptr<ExtensionWait>& wait) {
@@ -97,8 +108,8 @@ void LCRecordingSession::installHandlers(LCBroadcastExtensionProxy& proxy, const
 
 void LCRecordingSession::extensionFailed(const std::shared_ptr<LCBroadcastExtensionProxy>& proxy, const Error& error) {
     const bool isCurrent = broadcastUploadExtensionProxy() == proxy;
-    // What an older broadcast's extension reports ends nothing of a newer one.
-    if (isCurrent) stopRecordingWithNotification(true, error);
+    // What an older broadcast's extension reports ends nothing that came after it.
+    if (isCurrent && isSampleBuffers(broadcastProcessMode_)) stopRecordingWithNotification(true, error);
     proxy->invalidateConnection();
     if (isCurrent) setBroadcastUploadExtensionProxy(nullptr);
 }

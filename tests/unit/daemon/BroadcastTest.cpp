@@ -280,7 +280,28 @@ TEST_F(Broadcast, ANewerStartOfTheApplicationEndsTheWaitAndRefusesTheOlderOne) {
     EXPECT_EQ(newer->code(), 0);
     EXPECT_TRUE(session(*client)->isRecording());
     EXPECT_FALSE(session(*client)->isBroadcasting());
+    EXPECT_FALSE(session(*client)->broadcastUploadExtensionProxy());
+    EXPECT_EQ(session(*client)->broadcastProcessMode(), 0);
     EXPECT_EQ(fakes_.keepAlive.open(), 1);
+    // The older one's extension has gone, and nothing of it ends the newer recording.
+    for (const auto& one : fakes_.appExtensions.extensions()) EXPECT_FALSE(one->isRunning());
+    advance(seconds(30));
+    EXPECT_TRUE(session(*client)->isRecording());
+}
+
+TEST_F(Broadcast, AnExtensionThatNeverAnswersTheFinishEndsNothingThatComesAfterIt) {
+    const auto client = makeBroadcasting(true);
+    plan_->completesPayloads = false;
+    const auto stop = client->ask(DaemonMessage::StopRecording);
+    settle();
+    EXPECT_EQ(stop->answers, 0);
+    const auto start = client->start();
+    settle();
+    EXPECT_EQ(start->code(), 0);
+    advance(seconds(30));  // it is given up meanwhile
+    EXPECT_EQ(extension()->signals(), std::vector<int>{9});
+    EXPECT_TRUE(session(*client)->isRecording());
+    EXPECT_EQ(client->toldOfStop(-5808), 0);
 }
 
 TEST_F(Broadcast, AnExtensionThatDiesBeforeItsPingAnswersTheStartWithItsError) {
