@@ -171,15 +171,14 @@ private:
 
     std::shared_ptr<SimulatedApplication::Asked> startOfAnotherKind(SimulatedApplication& application) {
         const std::vector<ContextID> own{application.window};
-        switch (random_.below(9)) {
+        switch (random_.below(8)) {
             case 0: return application.start({ContextID{99}}, {});  // nobody's window
             case 1: return application.start({}, {});
             case 2: return application.start({own[0], own[0]}, {.microphone = true});
             case 3: return application.start(own, {.camera = true});
             case 4: return application.start(own, {.broadcast = true});
             case 5: return application.start(own, {.system = true});
-            case 6: return application.start(own, {.capture = true});
-            case 7: return application.start(own, {.width = std::numeric_limits<double>::quiet_NaN()});
+            case 6: return application.start(own, {.width = std::numeric_limits<double>::quiet_NaN()});
             default: return application.start(own, {.width = 1e9});
         }
     }

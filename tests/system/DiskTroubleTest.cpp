@@ -4,6 +4,7 @@
 #include <poll.h>
 
 #include <algorithm>
+#include <cstdio>
 #include <filesystem>
 #include <map>
 #include <sstream>
@@ -121,7 +122,15 @@ TEST(DiskTrouble, AQuotaThatIsUsedUpLeavesAMovieThatPlaysAndTheNextOneWorks) {
     // The prescribed line for each frame and each buffer of sound, and nothing else that repeats or comes from the port.
     std::map<std::string, std::size_t> lines;
     std::istringstream log(world.daemonLog());
-    for (std::string line; std::getline(log, line);) ++lines[line];
+    for (std::string line; std::getline(log, line);) {
+        // A line that comes again and again is written once, and then how often it came.
+        unsigned again = 0;
+        int at = 0;
+        if (std::sscanf(line.c_str(), "info repeated %u times: %n", &again, &at) == 1 && at > 0)
+            lines["info " + line.substr(static_cast<std::size_t>(at))] += again;
+        else
+            ++lines[line];
+    }
     for (const auto& [line, count] : lines) {
         if (line == "info ERROR starting asset writer") {
             // Sound comes fifty times a second.
