@@ -160,10 +160,13 @@ TEST(Broadcast, SamplesReachTheirExtensionWithoutACopyAndWithoutALoss) {
     const Samples samples(broadcast.folder);
     EXPECT_EQ(samples.missing(), 0u);
     EXPECT_GT(samples.sounds, 20u);
-    EXPECT_THAT(samples.events, ::testing::ElementsAre("started", "finished"));
+    // It is killed when it has taken note of the end; whether it sees the daemon go before that is a race.
+    ASSERT_GE(samples.events.size(), 2u);
+    EXPECT_EQ(samples.events[0], "started");
+    EXPECT_EQ(samples.events[1], "finished");
     for (const auto& frame : samples.frames) {
         // Until the window has repainted itself, its first picture has whatever the screen showed.
-        if (&frame != &samples.frames.front()) EXPECT_NE(frame.number, 0u);
+        EXPECT_TRUE(frame.number != 0 || &frame == &samples.frames.front());
         EXPECT_TRUE(memory.contains(frame.memory)) << "the daemon has other memory";
     }
     EXPECT_EQ(broadcast.app->nextEvent(), "event broadcast URL https://example.org/live");
