@@ -24,6 +24,11 @@ Dictionary describeRecording(const LCRecordingSession& session) {
         recording.set("framesDelivered", counters.delivered - before.delivered);
         recording.set("framesDropped", counters.dropped - before.dropped);
     }
+    if (const auto extension = session.broadcastExtensionID()) {
+        recording.set("broadcastExtension", extension->text());
+        if (const auto proxy = session.broadcastUploadExtensionProxy())
+            recording.set("framesLeftOut", proxy->framesLeftOut());
+    }
     return recording;
 }
 

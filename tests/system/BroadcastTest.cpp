@@ -35,6 +35,7 @@ TEST(Broadcast, ClipsReachTheirExtensionWithEveryFrameInOrderAndLeaveNothingBehi
     const std::string folder = world.installExtension(kKeeper, LC_MINIMAL_EXTENSION, false);
     world.startDaemon();
     const auto app = world.application({"--size", "640x360", "--fps", "30", "--beep-every", "15"});
+    ASSERT_TRUE(app->waitForFrame(1));  // until then the window is black
     const std::string answer =
         app->ask("broadcast org.lumacast.SelfRecorder " + std::string(kKeeper) + " directory=" + folder);
     ASSERT_THAT(answer, StartsWith("started frame")) << world.daemonLog();
@@ -51,8 +52,6 @@ TEST(Broadcast, ClipsReachTheirExtensionWithEveryFrameInOrderAndLeaveNothingBehi
         const auto pictures = picturesOf(clip);
         ASSERT_FALSE(pictures.empty()) << clip;
         for (const auto& picture : pictures) {
-            // Until the window has repainted itself, its first picture has whatever the screen showed.
-            if (last == 0 && &picture == &pictures.front() && !picture.number) continue;
             ASSERT_TRUE(picture.number) << clip;
             if (last && *picture.number > last + 1) missing += static_cast<int>(*picture.number - last - 1);
             EXPECT_GE(*picture.number, last) << clip;
@@ -136,14 +135,15 @@ struct SampleBroadcast {
           folder(world.installExtension(kTaker, LC_SAMPLE_TAKER, true)) {
         world.startDaemon();
         app = world.application(options);
+        EXPECT_TRUE(app->waitForFrame(1));  // until then the window is black
         begin(info);
     }
     void begin(const std::string& info) {
         answer = app->ask("broadcast org.lumacast.SelfRecorder " + std::string(kTaker) + " " + info);
         EXPECT_THAT(answer, StartsWith("started frame")) << world.daemonLog();
     }
-    bool waitForFrames(std::size_t count) {
-        return waitUntil([&] { return Samples(folder).frames.size() >= count; });
+    bool waitForFrames(std::size_t count, std::chrono::seconds patience = std::chrono::seconds(30)) {
+        return waitUntil([&] { return Samples(folder).frames.size() >= count; }, patience);
     }
     World world;
     const std::string folder;
@@ -158,22 +158,22 @@ TEST(Broadcast, SamplesReachTheirExtensionWithoutACopyAndWithoutALoss) {
     EXPECT_THAT(broadcast.app->ask("stop"), HasSubstr("without movie"));
     ASSERT_TRUE(waitUntil([&] { return processOf(broadcast.world, kTaker) == 0; }));
     const Samples samples(broadcast.folder);
-    EXPECT_LE(samples.missing(), samples.frames.size() / 50);  // see below
+    EXPECT_LE(samples.missing(), samples.frames.size() / 20);  // see below
     EXPECT_GT(samples.sounds, 20u);
     // It is killed when it has taken note of the end; whether it sees the daemon go before that is a race.
     ASSERT_GE(samples.events.size(), 2u);
     EXPECT_EQ(samples.events[0], "started");
     EXPECT_EQ(samples.events[1], "finished");
     for (const auto& frame : samples.frames) {
-        // Until the window has repainted itself, its first picture has whatever the screen showed.
-        EXPECT_TRUE(frame.number != 0 || &frame == &samples.frames.front());
+        EXPECT_NE(frame.number, 0u);
         EXPECT_TRUE(memory.contains(frame.memory)) << "the daemon has other memory";
     }
     EXPECT_EQ(broadcast.app->nextEvent(), "event broadcast URL https://example.org/live");
     EXPECT_THAT(broadcast.app->nextEvent(), HasSubstr("taking samples"));
 }
 
-/// How much longer than the fastest a frame took to its extension, of all but the slowest hundredth.
+/// How much longer than the fastest a frame took from the look at the window to the extension, of all but the slowest
+/// hundredth.
 double slownessMs(const Samples& samples) {
     std::vector<std::int64_t> delays;
     for (const auto& frame : samples.frames) delays.push_back(frame.arrived - frame.presentation);
@@ -184,13 +184,21 @@ double slownessMs(const Samples& samples) {
 TEST(Broadcast, FullSizeReachesItsExtensionWithoutALoss) {
     const std::size_t count = longTests() ? 1800 : 90;
     SampleBroadcast broadcast("-", {"--size", "1920x1080", "--fps", "30", "--beep-every", "15"}, "1920x1080x24");
-    ASSERT_TRUE(waitUntil([&] { return Samples(broadcast.folder).frames.size() >= count; }, std::chrono::seconds(90)));
+    ASSERT_TRUE(broadcast.waitForFrames(count, std::chrono::seconds(120)));
+    // A pause ends the stream of frames without ending the figures.
+    EXPECT_THAT(broadcast.app->ask("pause"), StartsWith("paused"));
+    const auto status = broadcast.world.recording();
+    const std::size_t captured = status["frames"], leftOut = status["framesLeftOut"];
+    EXPECT_EQ(status["broadcastExtension"], kTaker);
+    ASSERT_TRUE(broadcast.waitForFrames(captured - leftOut)) << captured << " captured, " << leftOut << " left out";
     EXPECT_THAT(broadcast.app->ask("stop"), HasSubstr("without movie"));
     const Samples samples(broadcast.folder);
-    std::printf("%zu frames, %zu missing, all but the slowest hundredth within %.2f ms of the fastest\n",
-                samples.frames.size(), samples.missing(), slownessMs(samples));
-    // The application draws at the pace at which it is captured: now and then two drawings fall into one interval.
-    EXPECT_LE(samples.missing(), count / 50);
+    EXPECT_EQ(samples.frames.size(), captured - leftOut);
+    std::printf("%zu frames captured, %zu left out; %zu drawn and not seen; all but the slowest hundredth within %.2f ms\n",
+                captured, leftOut, samples.missing() - leftOut, slownessMs(samples));
+    // A machine that stands still for a tenth of a second costs frames here: the extension has three then.
+    EXPECT_LE(leftOut, count / 20);
+    EXPECT_LE(samples.missing(), count / 5) << "drawn and not seen: as above, and two drawings in one interval";
 }
 
 TEST(Broadcast, AnExtensionThatIsKilledEndsItsBroadcastAndTheNextOneWorks) {

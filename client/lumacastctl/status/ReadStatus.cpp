@@ -18,6 +18,8 @@ RunningRecording readRecording(const Dictionary& entry) {
     result.recorded = countIn(entry, "framesRecorded");
     result.delivered = countIn(entry, "framesDelivered");
     result.dropped = countIn(entry, "framesDropped");
+    result.extension = textIn(entry, "broadcastExtension");
+    result.leftOut = countIn(entry, "framesLeftOut");
     return result;
 }
 

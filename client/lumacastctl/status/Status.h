@@ -20,6 +20,8 @@ struct RunningRecording {
     std::optional<std::uint64_t> frames;    ///< that the recording took from the capture
     std::optional<std::uint64_t> recorded;  ///< of them, those that are in the movie
     std::optional<std::uint64_t> delivered, dropped;  ///< by the capture
+    std::optional<std::string> extension;             ///< that carries it as a broadcast
+    std::optional<std::uint64_t> leftOut;             ///< frames that the extension was too slow for
 };
 
 /// An application the daemon knows.

@@ -40,6 +40,11 @@ std::string recordingText(const ApplicationSession& session, const RunningRecord
         text += row("picture", std::to_string(std::llround(*recording.width)) + " x " +
                                    std::to_string(std::llround(*recording.height)) + " pixels");
     text += row("frames", framesText(recording));
+    if (recording.extension) {
+        text += row("to", printable(*recording.extension));
+        if (recording.leftOut.value_or(0) > 0)
+            text += row("", std::to_string(*recording.leftOut) + " frames left out: it was too slow for them");
+    }
     if (recording.bytes) text += row("size", bytesText(*recording.bytes));
     if (recording.path) text += row("file", printable(*recording.path));
     return text;

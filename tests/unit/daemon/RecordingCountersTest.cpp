@@ -1,5 +1,6 @@
 // The figures of a recording that runs, as the administrator sees them.
 
+#include "tests/fakes/FakeUploader.h"
 #include "tests/unit/daemon/DaemonWorld.h"
 
 namespace lumacast {
@@ -39,6 +40,24 @@ TEST_F(RecordingCounters, AreThatRecordingsThoughItsSourceIsOlder) {
     EXPECT_LT(figure("framesDelivered"), first.delivered / 2);
     EXPECT_EQ(figure("framesDelivered"), source->counters().delivered - first.delivered);
     EXPECT_EQ(figure("framesDropped"), source->counters().dropped - first.dropped);
+}
+
+TEST_F(RecordingCounters, OfABroadcastSayWhatItsExtensionWasTooSlowFor) {
+    const auto plan = std::make_shared<UploaderPlan>();
+    fakes_.appExtensions.install(uploadExtension(plan, true));
+    fakes_.displayCapture.setAutomatic(true);
+    const auto client = makeConnected();
+    client->ask(DaemonMessage::SetupBroadcast, {client->id.text(), "org.example.Uploader.setup", Data{}, Dictionary{}});
+    settle();
+    client->start({client->window}, {.broadcast = true});
+    settle();
+    advance(seconds(1));
+    EXPECT_EQ(figure("framesLeftOut"), 0u);
+    plan->completesPayloads = false;
+    advance(seconds(1));
+    const std::uint64_t leftOut = figure("framesLeftOut");
+    EXPECT_GT(leftOut, 10u);
+    EXPECT_EQ(figure("framesDelivered"), plan->samples(1) + leftOut);
 }
 
 }  // namespace

@@ -1,11 +1,14 @@
 #include "client/lumacastctl/status/Status.h"
 
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include "tests/unit/lumacastctl/Snapshots.h"
 
 namespace lumacast::ctl {
 namespace {
+
+using ::testing::HasSubstr;
 
 DaemonStatus read(const Dictionary& snapshot) {
     const auto result = readStatus(jsonText(snapshot));
@@ -29,6 +32,17 @@ TEST(Status, OfARecordingIsWrittenForPeople) {
               "  org.example.Gone    no process  not connected\n"
               "\n"
               "Free space: 81.6 GB in /root/private/var/mobile/Library/Lumacast/\n");
+}
+
+TEST(Status, OfABroadcastNamesItsExtensionAndTheFramesThatItWasTooSlowFor) {
+    DaemonStatus status = read(snapshotOfARecording());
+    status.sessions.at(0).recording->extension = "org.example.Live";
+    EXPECT_THAT(statusText(status), HasSubstr("dropped)\n  to       org.example.Live\n  size"));
+    status.sessions.at(0).recording->leftOut = 0;
+    EXPECT_THAT(statusText(status), HasSubstr("dropped)\n  to       org.example.Live\n  size"));
+    status.sessions.at(0).recording->leftOut = 12;
+    EXPECT_THAT(statusText(status), HasSubstr("  to       org.example.Live\n"
+                                              "           12 frames left out: it was too slow for them\n"));
 }
 
 TEST(Status, OfAPausedRecordingSaysSoTwice) {
