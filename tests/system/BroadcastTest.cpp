@@ -242,21 +242,5 @@ TEST(Broadcast, AnExtensionThatIsSlowIsGivenFewerFramesAndGoesOn) {
     EXPECT_THAT(broadcast.app->ask("stop"), HasSubstr("without movie")) << broadcast.world.daemonLog();
 }
 
-TEST(Capture, AnApplicationIsHandedItsOwnPicturesAndSounds) {
-    World world;
-    world.startDaemon();
-    const auto app = world.application({"--size", "640x360", "--fps", "30", "--beep-every", "15"});
-    ASSERT_THAT(app->ask("capture"), StartsWith("started frame")) << world.daemonLog();
-    const auto counts = [&] {
-        std::istringstream words(app->ask("captured"));
-        std::string word;
-        std::size_t pictures = 0, sounds = 0;
-        words >> word >> pictures >> word >> sounds;
-        return std::pair(pictures, sounds);
-    };
-    EXPECT_TRUE(waitUntil([&] { return counts().first > 30 && counts().second > 20; }));
-    EXPECT_THAT(app->ask("stop"), HasSubstr("without movie"));
-}
-
 }  // namespace
 }  // namespace lumacast::test
