@@ -21,7 +21,7 @@ public:
     virtual void remove(const std::string& name) = 0;
 };
 
-/// A folder, made if need be (not its parents).
+/// A folder, made if need be.
 std::unique_ptr<Destination> makeFolder(std::string path);
 
 /// A web server that takes PUT and DELETE below `url`. `isGivenUp` is asked during a transfer; when it says so the

@@ -1,10 +1,10 @@
 #include <fcntl.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <filesystem>
 
 #include "extensions/hls-clips/Destination.h"
 #include "linux/ipc/Fd.h"
@@ -18,7 +18,8 @@ public:
     explicit Folder(std::string path) : path_(std::move(path)) {}
 
     std::string put(const std::string& name, const Data& contents, std::string_view) override {
-        ::mkdir(path_.c_str(), 0755);
+        std::error_code ignored;  // what is missing shows when the file is made
+        std::filesystem::create_directories(path_, ignored);
         const std::string target = path_ + "/" + name, temporary = path_ + "/." + name + ".new";
         std::string error = write(temporary, contents);
         if (error.empty() && std::rename(temporary.c_str(), target.c_str()) != 0) error = std::strerror(errno);

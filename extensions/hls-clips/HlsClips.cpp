@@ -2,6 +2,7 @@
 
 #include <cmath>
 #include <cstdio>
+#include <cstdlib>
 #include <utility>
 
 #include "extensions/media/Settings.h"
@@ -15,6 +16,13 @@ constexpr double kMostKept = 100'000;
 constexpr std::string_view kErrorDomain = "org.lumacast.hls-clips";
 enum class ErrorCode : std::int64_t { NoDestination = 1, Unreadable = 2 };
 
+/// Extensions are at home in a folder that is theirs.
+std::string absolute(const std::string& directory) {
+    if (directory.starts_with('/')) return directory;
+    const char* home = std::getenv("HOME");
+    return home && *home == '/' ? std::string(home) + "/" + directory : std::string();
+}
+
 Error errorOf(ErrorCode code, std::string text) {
     return Error(std::string(kErrorDomain), static_cast<std::int64_t>(code),
                  {{std::string(kLocalizedDescriptionKey), std::move(text)}});
@@ -24,7 +32,7 @@ Error errorOf(ErrorCode code, std::string text) {
 
 HlsSettings HlsSettings::from(const Dictionary& info) {
     HlsSettings settings;
-    settings.directory = textIn(info, "directory");
+    settings.directory = absolute(textIn(info, "directory").value_or("live"));
     settings.url = textIn(info, "url");
     settings.viewURL = textIn(info, "viewURL");
     if (const auto keep = numberIn(info, "keep"); keep && *keep >= 1 && *keep <= kMostKept)
@@ -47,12 +55,12 @@ std::int64_t HlsSettings::longestSeconds() const {
 std::string HlsSettings::whereToView() const {
     if (viewURL) return *viewURL;
     if (url) return *url + (url->ends_with('/') ? "" : "/") + Publisher::kPlaylistName;
-    return URL::file(*directory + "/" + Publisher::kPlaylistName).text();
+    return URL::file(directory + "/" + Publisher::kPlaylistName).text();
 }
 
 bool HlsClips::begin(const Dictionary& info) {
     const HlsSettings settings = HlsSettings::from(info);
-    if (!settings.url && !settings.directory) return false;
+    if (!settings.url && settings.directory.empty()) return false;
     Publisher::Options options;
     using std::chrono::system_clock, std::chrono::milliseconds;
     const auto now = std::chrono::duration_cast<milliseconds>(system_clock::now().time_since_epoch());
@@ -63,14 +71,14 @@ bool HlsClips::begin(const Dictionary& info) {
         settings, Segmenter(settings.longestSeconds()), {options, [&](std::function<bool()> isGivenUp) {
                                                              return settings.url ? makeUpload(*settings.url,
                                                                                               std::move(isGivenUp))
-                                                                                 : makeFolder(*settings.directory);
+                                                                                 : makeFolder(settings.directory);
                                                          }}});
     return true;
 }
 
 void HlsClips::clip(extension::Clip clip) {
     if (!stream_ && !begin(clip.userInfo.value_or(Dictionary()))) {
-        std::fputs("hls-clips: the user info names neither a \"directory\" nor a \"url\"\n", stderr);
+        std::fputs("hls-clips: there is neither a \"url\" nor a home for its \"directory\"\n", stderr);
         return clip.answer.fail(errorOf(ErrorCode::NoDestination, "The broadcast has no destination."));
     }
     std::string error;

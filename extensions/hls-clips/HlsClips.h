@@ -13,7 +13,8 @@ namespace lumacast::extensions {
 
 /// What an application asks for in its user info; README.md has the keys.
 struct HlsSettings {
-    std::optional<std::string> directory, url, viewURL;
+    std::optional<std::string> url, viewURL;
+    std::string directory;  ///< absolute; empty when it can't be told
     std::size_t keep = 0;
     double clipDuration = 0;  ///< seconds; 0: the daemon's own
     std::optional<Dictionary> compression;

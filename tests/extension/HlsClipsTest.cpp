@@ -118,7 +118,35 @@ TEST(HlsClips, OldSegmentsGoSoMuchLaterThatSlowPlayersStillFindThem) {
     EXPECT_EQ(filesIn(host.scratch.path("live")), 6u);
 }
 
+/// The variable for as long as it lives; without a value it is not there.
+class Home final {
+public:
+    explicit Home(const char* value) {
+        const char* before = std::getenv("HOME");
+        if (before) before_ = before;
+        set(value);
+    }
+    Home(const Home&) = delete;
+    Home& operator=(const Home&) = delete;
+    ~Home() { set(before_ ? before_->c_str() : nullptr); }
+
+private:
+    static void set(const char* value) { value ? ::setenv("HOME", value, 1) : ::unsetenv("HOME"); }
+    std::optional<std::string> before_;
+};
+
+TEST(HlsClips, ARelativeFolderIsTheExtensionsOwn) {
+    ScratchDirectory home;
+    Home own(home.path().c_str());
+    ClipHost host;
+    EXPECT_TRUE(host.broadcast({}, true, {.frames = 15}));
+    expectFrames(home.path("live/index.m3u8"), 0, 14);
+    EXPECT_TRUE(host.broadcast({{"directory", "a/b"}}, true, {.frames = 15}));
+    expectFrames(home.path("a/b/index.m3u8"), 15, 29);
+}
+
 TEST(HlsClips, ABroadcastWithoutADestinationIsGivenUpClipByClip) {
+    Home none(nullptr);
     ClipHost host;
     EXPECT_FALSE(host.broadcast({}));
     EXPECT_FALSE(host.broadcast({{"directory", std::int64_t{5}}}));

@@ -1,7 +1,11 @@
 #pragma once
 // The daemon's side of an extension's process, in the test: both ends in one process, each with a loop of its own.
 
+#include <fcntl.h>
+#include <gtest/gtest.h>
 #include <sys/socket.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include <atomic>
 #include <condition_variable>
@@ -37,7 +41,8 @@ public:
     /// The next one that was not taken yet; none when none comes within half a minute.
     std::optional<T> next() {
         std::unique_lock lock(mutex_);
-        if (!changed_.wait_for(lock, std::chrono::seconds(30), [this] { return !values_.empty(); })) return std::nullopt;
+        if (!changed_.wait_for(lock, std::chrono::seconds(30), [this] { return !values_.empty(); }))
+            return std::nullopt;
         T value = std::move(values_.front());
         values_.pop_front();
         return value;
@@ -63,24 +68,36 @@ public:
     };
 
     explicit StandInHost(extension::Handler& handler, extension::TokenExchange exchange = {}) {
-        int requests[2], auxiliary[2];
-        EXPECT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0, requests), 0);
-        EXPECT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0, auxiliary), 0);
-        requests_ = ipc_.adopt(Fd(requests[0]), Peer::of(requests[0]));
-        requests_->setExportedInterface(extensionRequestHostProtocol());
-        requests_->setExportedObject(answers_);
-        requests_->setRemoteInterface(extensionRequestProtocol());
-        requests_->resume();
-        auxiliary_ = ipc_.adopt(Fd(auxiliary[0]), Peer::of(auxiliary[0]));
-        auxiliary_->setExportedInterface(extensionHostProtocol());
-        auxiliary_->setRemoteInterface(extensionVendorProtocol());
-        auxiliary_->resume();
-        loop_ = std::thread([this] { reactor_.run(); });
+        const Ends ends = open();
         extension::Options options;
-        options.requestsDescriptor = requests[1];
-        options.auxiliaryDescriptor = auxiliary[1];
+        options.requestsDescriptor = ends.requests;
+        options.auxiliaryDescriptor = ends.auxiliary;
         if (exchange) options.exchange = std::move(exchange);
-        process_ = std::thread([this, &handler, options = std::move(options)] { status_ = extension::run(handler, options); });
+        process_ =
+            std::thread([this, &handler, options = std::move(options)] { status_ = extension::run(handler, options); });
+    }
+    /// Launches a program, as a daemon does but for the confinement.
+    explicit StandInHost(const std::string& program) {
+        Ends ends = open();
+        const pid_t pid = ::fork();
+        EXPECT_GE(pid, 0);
+        if (pid == 0) {
+            // Away from where they go, so that neither is closed by the other's coming.
+            const int requests = ::fcntl(ends.requests, F_DUPFD, 10), auxiliary = ::fcntl(ends.auxiliary, F_DUPFD, 10);
+            ::dup2(requests, kExtensionRequestsDescriptor);
+            ::dup2(auxiliary, kExtensionAuxiliaryDescriptor);
+            ::close(requests);
+            ::close(auxiliary);
+            ::execl(program.c_str(), program.c_str(), nullptr);
+            ::_exit(127);
+        }
+        ::close(ends.requests);
+        ::close(ends.auxiliary);
+        process_ = std::thread([this, pid] {
+            int status = -1;
+            ::waitpid(pid, &status, 0);
+            status_ = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+        });
     }
     ~StandInHost() override {
         hangUp();
@@ -123,8 +140,9 @@ public:
         const auto item = [](std::string_view title, Value value) {
             return ExtensionItem{std::string(title), {{std::string(kGenericDataType), std::move(value), std::nullopt}}};
         };
-        return {item(kItemRequestedFinish, isLast ? "1" : "0"), item(kItemSandboxToken, Data(token.begin(), token.end())),
-                item(kItemUserInfo, std::move(userInfo)), item(kItemMovieClipURL, "file:///clips/" + token + ".mp4")};
+        return {item(kItemRequestedFinish, isLast ? "1" : "0"),
+                item(kItemSandboxToken, Data(token.begin(), token.end())), item(kItemUserInfo, std::move(userInfo)),
+                item(kItemMovieClipURL, "file:///clips/" + token + ".mp4")};
     }
 
     /// Makes a broadcast of samples: listens, hands over the endpoint, waits for the ping.
@@ -134,8 +152,9 @@ public:
             listener_ = ipc_.anonymousListener();
             listener_->setDelegate(delegate_);
             listener_->resume();
-            auxiliary_->remoteProxy([](const Error&) {})
-                ->send(0, {Value(listener_->endpoint())}, [this](Array) { endpointSet.add(true); });
+            auxiliary_->remoteProxy([](const Error&) {})->send(0, {Value(listener_->endpoint())}, [this](Array) {
+                endpointSet.add(true);
+            });
         });
         const auto ping = reports_->messages.next();
         ASSERT_TRUE(ping);
@@ -143,7 +162,8 @@ public:
         EXPECT_TRUE(endpointSet.next());
     }
     /// Sends a payload; `processed` is called on the host's loop when it was.
-    void send(Dictionary payload, std::function<void()> processed = [] {}) {
+    void send(
+        Dictionary payload, std::function<void()> processed = [] {}) {
         onLoop([&] {
             daemon_->remoteProxy([](const Error&) {})
                 ->send(0, {Value(std::move(payload))}, [processed = std::move(processed)](Array) { processed(); });
@@ -181,6 +201,27 @@ private:
         }
         Told<Message> messages;
     };
+
+    /// The other ends of the two sockets; whoever gets them owns them.
+    struct Ends {
+        int requests, auxiliary;
+    };
+    Ends open() {
+        int requests[2], auxiliary[2];
+        EXPECT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0, requests), 0);
+        EXPECT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0, auxiliary), 0);
+        requests_ = ipc_.adopt(Fd(requests[0]), Peer::of(requests[0]));
+        requests_->setExportedInterface(extensionRequestHostProtocol());
+        requests_->setExportedObject(answers_);
+        requests_->setRemoteInterface(extensionRequestProtocol());
+        requests_->resume();
+        auxiliary_ = ipc_.adopt(Fd(auxiliary[0]), Peer::of(auxiliary[0]));
+        auxiliary_->setExportedInterface(extensionHostProtocol());
+        auxiliary_->setRemoteInterface(extensionVendorProtocol());
+        auxiliary_->resume();
+        loop_ = std::thread([this] { reactor_.run(); });
+        return {requests[1], auxiliary[1]};
+    }
 
     void onLoop(const std::function<void()>& task) { reactor_.sync(task); }
 

@@ -40,10 +40,11 @@ inline checkers::Sound soundOf(const std::string& path) {
     return sound.value_or(checkers::Sound{48'000, {}});
 }
 
-/// The tone is there all the time, and nothing clicks: `quiet` is a frequency that nobody plays.
+/// The tone is there all the time, at this level at least (dB), and nothing clicks: `quiet` is a frequency that nobody
+/// plays.
 inline void expectUnbrokenTone(const checkers::Sound& sound, double frequency, double quiet,
-                               const checkers::Stretch& stretch) {
-    for (const std::string& finding : checkTonePresent(sound, frequency, -20, stretch)) ADD_FAILURE() << finding;
+                               const checkers::Stretch& stretch, double level = -20) {
+    for (const std::string& finding : checkTonePresent(sound, frequency, level, stretch)) ADD_FAILURE() << finding;
     for (const std::string& finding : checkToneAbsent(sound, quiet, -55, stretch)) ADD_FAILURE() << finding;
 }
 
