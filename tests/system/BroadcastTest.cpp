@@ -114,16 +114,7 @@ std::set<ino_t> memoryOf(pid_t pid) {
 
 /// The innermost process of a running extension; 0 when there is none.
 pid_t processOf(const World& world, const std::string& identifier) {
-    const std::string program = world.path("data/lumacast/extensions/" + identifier + "/program");
-    for (const auto& entry : fs::directory_iterator("/proc")) {
-        const std::string name = entry.path().filename().string();
-        if (name.find_first_not_of("0123456789") != std::string::npos) continue;
-        std::ifstream file(entry.path() / "cmdline");
-        std::string first;
-        std::getline(file, first, '\0');
-        if (first == program) return static_cast<pid_t>(std::stol(name));
-    }
-    return 0;
+    return processRunning(world.path("data/lumacast/extensions/" + identifier + "/program"));
 }
 
 struct SampleBroadcast {

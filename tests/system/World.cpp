@@ -26,6 +26,18 @@ bool waitUntil(const std::function<bool()>& condition, std::chrono::seconds limi
     return true;
 }
 
+pid_t processRunning(const std::string& program) {
+    for (const auto& entry : fs::directory_iterator("/proc")) {
+        const std::string name = entry.path().filename().string();
+        if (name.find_first_not_of("0123456789") != std::string::npos) continue;
+        std::ifstream file(entry.path() / "cmdline");
+        std::string first;
+        std::getline(file, first, '\0');
+        if (first == program) return static_cast<pid_t>(std::stol(name));
+    }
+    return 0;
+}
+
 bool longTests() {
     const char* wanted = ::getenv("LC_LONG_TESTS");
     return wanted && std::strcmp(wanted, "1") == 0;
@@ -154,6 +166,13 @@ std::string World::installExtension(const std::string& identifier, const std::st
     const std::string data = path("data/lumacast/extension-data/" + identifier);
     fs::create_directories(data);
     return data;
+}
+
+std::string World::installExtensionFolder(const std::string& folder) {
+    const fs::path name = fs::path(folder).filename(), installed = path("data/lumacast/extensions") / name;
+    fs::create_directories(installed);
+    fs::copy(folder, installed, fs::copy_options::recursive);
+    return (installed / name).string();
 }
 
 void World::startDaemon(const std::vector<std::string>& variables) { startDaemonBy({LC_DAEMON}, variables); }

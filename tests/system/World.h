@@ -14,12 +14,16 @@
 #include "tests/checkers/FramesLog.h"
 #include "tests/checkers/MovieReader.h"
 #include "tests/checkers/tests/Child.h"
+#include "tests/client/WaitUntil.h"
 #include "tests/contract/PrivateDisplay.h"
 
 namespace lumacast::test {
 
 /// Asks again and again until `condition` holds; false when it did not within `limit`.
-bool waitUntil(const std::function<bool()>& condition, std::chrono::seconds limit = std::chrono::seconds(30));
+bool waitUntil(const std::function<bool()>& condition, std::chrono::seconds limit);
+
+/// The innermost process that runs a program; 0 when there is none.
+pid_t processRunning(const std::string& program);
 
 /// Whether the long runs were asked for (LC_LONG_TESTS=1).
 bool longTests();
@@ -108,6 +112,8 @@ public:
     void install(const std::string& identifier, const std::string& name, const std::string& executable);
     /// Installs a program as an upload extension that takes clips, or samples. Answers the folder where it may write.
     std::string installExtension(const std::string& identifier, const std::string& program, bool takesSamples);
+    /// Installs an upload extension as it is built, a folder with its manifest. Answers where its program is then.
+    std::string installExtensionFolder(const std::string& folder);
 
 private:
     void setFlag(const std::string& name, bool on) const;
