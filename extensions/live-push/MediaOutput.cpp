@@ -1,9 +1,13 @@
 #include "extensions/live-push/MediaOutput.h"
 
+#include <thread>
+
 namespace lumacast::extensions {
 
 namespace {
 
+/// The usual latency is 0.12 s; a receiver may ask for more.
+constexpr std::chrono::milliseconds kPlayout{1000};
 constexpr AVRational kNanoseconds{1, 1'000'000'000};
 
 AVStream* addTrack(AVFormatContext& format, const AVCodecParameters& parameters, AVRational base) {
@@ -23,6 +27,7 @@ int MediaOutput::interrupt(void* opaque) {
 
 std::string MediaOutput::open(const std::string& url, const char* format, const StreamTracks& tracks) {
     expectProgress();
+    isSrt_ = url.starts_with("srt://");
     avformat_alloc_output_context2(&format_, nullptr, format, url.c_str());
     if (!format_) return "no memory";
     format_->interrupt_callback = {&interrupt, this};
@@ -57,13 +62,22 @@ std::string MediaOutput::write(const AVPacket& packet, bool isVideo) {
     copy->dts -= zero;
     av_packet_rescale_ts(copy.get(), base, format_->streams[copy->stream_index]->time_base);
     const int status = av_interleaved_write_frame(format_, copy.get());
-    return status < 0 ? avErrorText(status) : std::string();
+    isBroken_ = status < 0;
+    return isBroken_ ? avErrorText(status) : std::string();
+}
+
+/// SRT ends a connection at once, with what the receiver holds back for its latency.
+void MediaOutput::waitForPlayout() const {
+    const auto until = std::chrono::steady_clock::now() + kPlayout;
+    while (!isGivenUp_() && std::chrono::steady_clock::now() < until)
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
 }
 
 MediaOutput::~MediaOutput() {
     if (!format_) return;
     expectProgress();
-    if (hasHeader_) av_write_trailer(format_);
+    const bool isWhole = hasHeader_ && av_write_trailer(format_) >= 0 && !isBroken_;
+    if (isWhole && isSrt_) waitForPlayout();
     if (format_->pb) avio_closep(&format_->pb);
     avformat_free_context(format_);
 }

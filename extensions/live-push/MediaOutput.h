@@ -38,13 +38,14 @@ public:
 
 private:
     static int interrupt(void* self);
+    void waitForPlayout() const;
     void expectProgress() { deadline_ = std::chrono::steady_clock::now() + patience_; }
 
     const std::chrono::milliseconds patience_;
     const std::function<bool()> isGivenUp_;
     std::chrono::steady_clock::time_point deadline_;
     AVFormatContext* format_ = nullptr;
-    bool hasHeader_ = false;
+    bool hasHeader_ = false, isSrt_ = false, isBroken_ = false;
     AVRational videoBase_{1, 1}, soundBase_{1, 1};
     std::optional<std::int64_t> zero_;  ///< nanoseconds
 };
