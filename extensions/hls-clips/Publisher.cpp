@@ -3,12 +3,15 @@
 #include <cstdio>
 #include <utility>
 
+#include "extensions/hls-clips/WatchPage.h"
+
 namespace lumacast::extensions {
 
 namespace {
 
 constexpr int kAttempts = 3;
-constexpr std::string_view kSegmentType = "video/mp4", kPlaylistType = "audio/mpegurl";
+constexpr std::string_view kSegmentType = "video/mp4", kPlaylistType = "audio/mpegurl",
+                           kPageType = "text/html; charset=utf-8";
 
 }  // namespace
 
@@ -92,6 +95,7 @@ void Publisher::publish(Segment segment) {
     const bool isDiscontinuous = std::exchange(isGap_, false) || segment.isDiscontinuous;
     auto gone = playlist_.add({name, initName_, segment.ticks, isDiscontinuous});
     putPlaylist(tries);
+    if (!hasPage_) hasPage_ = put(kPageName, Data(watchPage().begin(), watchPage().end()), kPageType, 1);
     removeExpired(std::move(gone));
 }
 

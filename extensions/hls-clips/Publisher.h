@@ -16,11 +16,13 @@ namespace lumacast::extensions {
 
 /// Brings segments and the playlist to their destination, on a thread of its own: whoever hands a segment over never
 /// waits. A segment that doesn't get there in three attempts is left out of the playlist; while the destination is dead
-/// each gets one. At most kMostWaiting segments wait: one more, and the oldest is left out.
+/// each gets one. A page that plays the stream lies beside the playlist. At most kMostWaiting segments wait: one more,
+/// and the oldest is left out.
 class Publisher final {
 public:
     static constexpr std::size_t kMostWaiting = 12;
     static constexpr const char* kPlaylistName = "index.m3u8";
+    static constexpr const char* kPageName = "watch.html";
 
     struct Options {
         std::string streamName;  ///< part of the files' names, so that no cache mixes streams up
@@ -65,6 +67,7 @@ private:
     // The thread's own.
     std::unique_ptr<Destination> destination_;
     Playlist playlist_;
+    bool hasPage_ = false;
     bool isGap_ = false;  ///< the last segment was left out
     Data init_;
     std::string initName_;

@@ -5,54 +5,13 @@
 #include <filesystem>
 
 #include "broadcast/ConfigurationArchive.h"
-#include "extensions/hls-clips/HlsClips.h"
 #include "linux/ipc/LinuxKeyedArchive.h"
+#include "tests/extension/ClipHost.h"
 #include "tests/extension/PrivateNginx.h"
-#include "tests/extension/StandInHost.h"
 #include "tests/extension/StreamJudge.h"
-#include "tests/extension/TestClips.h"
 
 namespace lumacast::test {
 namespace {
-
-/// The host of an extension that takes clips.
-class ClipHost final {
-public:
-    explicit ClipHost(std::chrono::milliseconds patience = std::chrono::seconds(20)) : extension(patience) {
-        host.keepTokens([this](std::span<const std::uint8_t> token) {
-            TokenAnswer answer;
-            answer.file = Fd(::open(std::string(token.begin(), token.end()).c_str(), O_RDONLY | O_CLOEXEC));
-            answer.error = answer.file ? 0 : EACCES;
-            return answer;
-        });
-    }
-    /// Hands over the next clip and waits for its answer: the returned items by their titles; none when it was given
-    /// up.
-    std::optional<Dictionary> broadcast(const Dictionary& userInfo, bool isLast = false, const ClipPlan& plan = {}) {
-        return handOver(clips.nextFile(plan), userInfo, isLast);
-    }
-    std::optional<Dictionary> handOver(const std::string& file, const Dictionary& userInfo, bool isLast = false) {
-        host.beginClip(++requests, file, isLast, userInfo);
-        const auto answer = host.answers().next();
-        if (!answer || answer->number != static_cast<std::uint16_t>(ExtensionRequestHostMessage::CompleteRequest))
-            return std::nullopt;
-        Dictionary returned;
-        const auto items = decodeItems(*answer->arguments[1].as<Array>());
-        for (const ExtensionItem& item : items.value()) returned.set(item.attributedTitle, item.attachments.at(0).item);
-        return returned;
-    }
-    static Dictionary infoOf(const std::optional<Dictionary>& returned) {
-        const Value* info = returned ? returned->find(kItemServiceInfo) : nullptr;
-        const auto* dictionary = info ? info->as<Dictionary>() : nullptr;
-        return dictionary ? *dictionary : Dictionary();
-    }
-
-    ScratchDirectory scratch;
-    TestClips clips{scratch};
-    extensions::HlsClips extension;
-    StandInHost host{extension};
-    std::int64_t requests = 0;
-};
 
 std::string textOf(const std::string& path) {
     return ScratchDirectory::read(path);
@@ -79,7 +38,8 @@ TEST(HlsClips, AFoldersPlaylistPlaysTheWholeBroadcast) {
     EXPECT_EQ(*last.find("segments"), Value(std::uint64_t{3}));
     EXPECT_EQ(*last.find("lostSegments"), Value(std::uint64_t{0}));
     EXPECT_TRUE(textOf(playlist).ends_with("#EXT-X-ENDLIST\n"));
-    EXPECT_EQ(filesIn(host.scratch.path("live")), 5u) << "three segments, a header, a playlist, and no temporary file";
+    EXPECT_EQ(filesIn(host.scratch.path("live")), 6u)
+        << "three segments, a header, a playlist, a page, and no temporary file";
     expectFrames(playlist, 0, host.clips.frames() - 1);
     const auto sound = soundOf(playlist);
     expectUnbrokenTone(sound, kApplicationTone, kQuietTone,
@@ -114,8 +74,8 @@ TEST(HlsClips, OldSegmentsGoSoMuchLaterThatSlowPlayersStillFindThem) {
     EXPECT_NE(text.find("#EXT-X-MEDIA-SEQUENCE:4\n"), std::string::npos) << text;
     EXPECT_EQ(text.find("-4.m4s"), std::string::npos);
     EXPECT_NE(text.find("-5.m4s"), std::string::npos);
-    // Two in the list, two that have left it, the header and the list.
-    EXPECT_EQ(filesIn(host.scratch.path("live")), 6u);
+    // Two in the list, two that have left it, the header, the list and the page.
+    EXPECT_EQ(filesIn(host.scratch.path("live")), 7u);
 }
 
 /// The variable for as long as it lives; without a value it is not there.
@@ -196,7 +156,7 @@ TEST(HlsClips, AWebServerGetsTheStreamByPut) {
             EXPECT_EQ(*told.find("segments"), Value(std::uint64_t{6})) << server.log();
         }
     }
-    EXPECT_EQ(filesIn(server.files()), 6u) << "old ones are deleted";
+    EXPECT_EQ(filesIn(server.files()), 7u) << "old ones are deleted";
     // Watched where it is.
     expectFrames(server.url() + "index.m3u8", 60, 89);
 }
