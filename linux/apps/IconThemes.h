@@ -20,9 +20,9 @@ struct IconThemes {
     std::string currentTheme() const;
 
     /// The icon as a PNG file: of the current theme in the size (pixels of a side) or the one nearest to it, else of
-    /// those it inherits from, of "hicolor", or outside themes. `icon` is a name, with or without ".png", or an absolute
-    /// path. None for a name that would lead out of its folder, and for files that are not PNG, larger than 1 MiB, or
-    /// that belong to somebody other than this user and the administrator or may be written by everybody.
+    /// those it inherits from, of "hicolor", or outside themes. `icon` is a name, with or without ".png", or an
+    /// absolute path. None for a name that would lead out of its folder, and for files that are not PNG, larger than 1
+    /// MiB, or that belong to somebody other than this user and the administrator or may be written by everybody.
     std::optional<Data> png(const std::string& icon, int size) const;
 
     /// The file at an absolute path, under the same conditions.

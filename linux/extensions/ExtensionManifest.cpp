@@ -14,9 +14,8 @@ constexpr std::size_t kMaximumGrants = 32;
 constexpr std::size_t kMaximumPath = 1024;
 
 bool isPlainText(std::string_view text) {
-    return text.size() <= kMaximumPath && std::none_of(text.begin(), text.end(), [](unsigned char c) {
-        return c < 0x20 || c == 0x7f;
-    });
+    return text.size() <= kMaximumPath &&
+           std::none_of(text.begin(), text.end(), [](unsigned char c) { return c < 0x20 || c == 0x7f; });
 }
 
 bool isVariableName(std::string_view name) {
@@ -78,7 +77,9 @@ const std::string* textIn(const Dictionary& entries, std::string_view key) {
     return value ? value->as<std::string>() : nullptr;
 }
 
-bool isPathInFolder(std::string_view path) { return isPlainText(path) && isPathWithin(path); }
+bool isPathInFolder(std::string_view path) {
+    return isPlainText(path) && isPathWithin(path);
+}
 
 }  // namespace
 

@@ -23,11 +23,11 @@ struct ExtensionGrants {
 struct ExtensionManifest {
     std::string identifier;
     std::string extensionPoint;
-    std::string executable;          ///< a path within the folder
-    std::vector<std::string> icons;  ///< paths within the folder, the best one first
-    std::string processMode;         ///< as written; may be empty
+    std::string executable;               ///< a path within the folder
+    std::vector<std::string> icons;       ///< paths within the folder, the best one first
+    std::string processMode;              ///< as written; may be empty
     std::optional<Value> activationRule;  ///< as written: one that is no dictionary counts as none to whoever reads it
-    Manifest names;                  ///< displayName and its translations
+    Manifest names;                       ///< displayName and its translations
     ExtensionGrants grants;
 
     /// A pure parser of the whole file. The text says why a manifest is none.

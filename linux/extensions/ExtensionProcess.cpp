@@ -69,7 +69,9 @@ ExtensionProcess::ExtensionProcess(Reactor& reactor, Log& log, std::string name,
       events_(std::move(events)),
       lines_([this](const std::string& line) { log_.line("%s: %s", name_, line); }) {}
 
-ExtensionProcess::~ExtensionProcess() { endNow(); }
+ExtensionProcess::~ExtensionProcess() {
+    endNow();
+}
 
 void ExtensionProcess::start(LaunchLane& lane, const ConfinedCommand& command) {
     self_ = shared_from_this();
@@ -87,9 +89,10 @@ void ExtensionProcess::start(LaunchLane& lane, const ConfinedCommand& command) {
     struct Theirs {
         Fd output, requests, auxiliary;
     };
-    const auto theirs =
-        std::make_shared<Theirs>(Theirs{Fd(pipe[1]), std::move(requests[1]), std::move(auxiliary[1])});
-    Start start{command.arguments, command.environment, theirs->output.get(),
+    const auto theirs = std::make_shared<Theirs>(Theirs{Fd(pipe[1]), std::move(requests[1]), std::move(auxiliary[1])});
+    Start start{command.arguments,
+                command.environment,
+                theirs->output.get(),
                 {theirs->requests.get(), theirs->auxiliary.get()}};
     lane.start(std::move(start), [self = shared_from_this(), theirs](Started started) {
         *theirs = Theirs();

@@ -41,8 +41,8 @@ public:
     void start(LaunchLane& lane, const ConfinedCommand& command);
 
     /// Sends the signal to the extension's own process; the ones that no process can refuse to end by go to the whole
-    /// sandbox. By descriptors, never by number. Before the start is through SIGKILL is kept for it, others are dropped.
-    /// Callable from any lane.
+    /// sandbox. By descriptors, never by number. Before the start is through SIGKILL is kept for it, others are
+    /// dropped. Callable from any lane.
     void signal(int signal);
 
     /// Ends it and waits for that, at most two seconds. For the end of this process's work with extensions; no event

@@ -11,7 +11,9 @@ namespace lumacast {
 
 namespace {
 
-Error systemError(int number) { return Error(std::string(kSystemErrorDomain), number); }
+Error systemError(int number) {
+    return Error(std::string(kSystemErrorDomain), number);
+}
 
 }  // namespace
 
@@ -49,7 +51,9 @@ std::shared_ptr<ExtensionContext> ExtensionRun::context(ExtensionRequestID reque
     return found == requests_.end() ? nullptr : found->second.context;
 }
 
-std::optional<std::string> ExtensionRun::issueToken(const std::string& path) { return tokens_.issue(path); }
+std::optional<std::string> ExtensionRun::issueToken(const std::string& path) {
+    return tokens_.issue(path);
+}
 
 void ExtensionRun::kill(int signal) {
     if (signal <= 0) return;
@@ -136,8 +140,10 @@ void ExtensionRun::greeted(const std::shared_ptr<Session>& session, ExtensionPro
         session->requests = requestsConnection;
         session->auxiliary = auxiliaryConnection;
     }
-    if (contextClass.auxiliaryHostProtocol) auxiliaryConnection->setExportedInterface(*contextClass.auxiliaryHostProtocol);
-    if (contextClass.auxiliaryVendorProtocol) auxiliaryConnection->setRemoteInterface(*contextClass.auxiliaryVendorProtocol);
+    if (contextClass.auxiliaryHostProtocol)
+        auxiliaryConnection->setExportedInterface(*contextClass.auxiliaryHostProtocol);
+    if (contextClass.auxiliaryVendorProtocol)
+        auxiliaryConnection->setRemoteInterface(*contextClass.auxiliaryVendorProtocol);
     const std::weak_ptr weakSession = session;
     auxiliaryConnection->setInvalidationHandler([weak = weak_from_this(), weakSession] {
         const auto self = weak.lock();

@@ -96,10 +96,10 @@ void ExtensionRun::abandon() {
     }
     services_->reactor.async([self = shared_from_this()] {
         if (self->services_->isOver) return;
-        self->end_ = self->services_->reactor.after(self->services_->options.lastRequests,
-                                                    [weak = self->weak_from_this()] {
-                                                        if (const auto late = weak.lock()) late->letGo();
-                                                    });
+        self->end_ =
+            self->services_->reactor.after(self->services_->options.lastRequests, [weak = self->weak_from_this()] {
+                if (const auto late = weak.lock()) late->letGo();
+            });
         self->endIfAbandoned();
     });
 }

@@ -45,8 +45,8 @@ int openToRead(const std::string& directory, const std::string& path) {
     const auto place = resolveBeneath(directory, path, availableResolution());
     const auto* name = std::get_if<ResolvedName>(&place);
     if (!name || withSingleSlashes(path) == withSingleSlashes(directory)) return -1;
-    Fd file(::openat(name->directory.get(), name->name.c_str(),
-                     O_RDONLY | O_NOFOLLOW | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+    Fd file(
+        ::openat(name->directory.get(), name->name.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
     struct stat status = {};
     if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode) || status.st_uid != ::geteuid())
         return -1;
@@ -67,9 +67,8 @@ FileTokens::FileTokens(std::string directory, std::shared_ptr<DiskLane> disk)
     : directory_(std::move(directory)), disk_(std::move(disk)) {}
 
 std::optional<std::string> FileTokens::issue(const std::string& path) {
-    const auto answer = disk_->ask<std::shared_ptr<Fd>>(kPatience, [directory = directory_, path] {
-        return std::make_shared<Fd>(openToRead(directory, path));
-    });
+    const auto answer = disk_->ask<std::shared_ptr<Fd>>(
+        kPatience, [directory = directory_, path] { return std::make_shared<Fd>(openToRead(directory, path)); });
     if (!answer || !**answer) return std::nullopt;
     auto text = randomToken();
     if (!text) return std::nullopt;

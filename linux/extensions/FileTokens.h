@@ -19,8 +19,8 @@ public:
     /// Files beneath `directory` only.
     FileTokens(std::string directory, std::shared_ptr<DiskLane> disk);
 
-    /// A token for the file: 256 random bits as 64 digits. None when it is not a regular file of this user's beneath the
-    /// directory, a link is on the way, or the disk has not answered within 100 ms.
+    /// A token for the file: 256 random bits as 64 digits. None when it is not a regular file of this user's beneath
+    /// the directory, a link is on the way, or the disk has not answered within 100 ms.
     std::optional<std::string> issue(const std::string& path);
     /// The tokens issued since the last call belong to this request.
     void handOver(ExtensionRequestID request);

@@ -110,8 +110,7 @@ std::variant<std::shared_ptr<const InstalledExtension>, std::string> InstalledEx
     struct stat folderStatus = {}, manifestStatus = {}, programStatus = {};
     if (!folder || ::fstat(folder.get(), &folderStatus) != 0) return "its folder can't be opened";
     if (auto reason = whyNotSafe(folderStatus, "its folder")) return *reason;
-    const FileDescriptor file =
-        openWithin(folder.get(), std::string(kManifest), O_RDONLY | O_NONBLOCK | O_NOCTTY);
+    const FileDescriptor file = openWithin(folder.get(), std::string(kManifest), O_RDONLY | O_NONBLOCK | O_NOCTTY);
     if (!file || ::fstat(file.get(), &manifestStatus) != 0 || !S_ISREG(manifestStatus.st_mode))
         return "it has no manifest";
     if (auto reason = whyNotSafe(manifestStatus, "its manifest")) return *reason;
@@ -184,9 +183,8 @@ std::variant<std::vector<std::shared_ptr<const InstalledExtension>>, int> Instal
             present.insert(folder);
             if (auto extension = known(folder).extension) here.push_back(std::move(extension));
         }
-        std::stable_sort(here.begin(), here.end(), [](const auto& a, const auto& b) {
-            return a->manifest.identifier < b->manifest.identifier;
-        });
+        std::stable_sort(here.begin(), here.end(),
+                         [](const auto& a, const auto& b) { return a->manifest.identifier < b->manifest.identifier; });
         for (auto& extension : here)
             if (identifiers.insert(extension->manifest.identifier).second) found.push_back(std::move(extension));
     }

@@ -17,9 +17,9 @@ namespace lumacast {
 /// One installed extension, as a look at the disk found it. Immutable; shared.
 struct InstalledExtension {
     ExtensionManifest manifest;
-    std::string folder;              ///< absolute
-    std::string program;             ///< the absolute path of its executable, without links
-    bool isAdministrators = false;   ///< its folder, manifest and program are the administrator's
+    std::string folder;             ///< absolute
+    std::string program;            ///< the absolute path of its executable, without links
+    bool isAdministrators = false;  ///< its folder, manifest and program are the administrator's
     Dictionary attributes;
     Dictionary information;
 };
@@ -35,8 +35,8 @@ public:
     InstalledExtensions(Log& log, std::vector<std::string> dataDirectories, std::vector<Locale> locales);
 
     /// All there are: in the order of the directories, then of their identifiers; of those with the same identifier the
-    /// first. At most Limit::ExtensionsInstalled. Each that is malformed or not safe is passed over, with one line until
-    /// it changes. The error number when a directory that is there can't be read.
+    /// first. At most Limit::ExtensionsInstalled. Each that is malformed or not safe is passed over, with one line
+    /// until it changes. The error number when a directory that is there can't be read.
     std::variant<std::vector<std::shared_ptr<const InstalledExtension>>, int> look();
 
 private:

@@ -25,7 +25,9 @@ std::vector<char*> pointersTo(const std::vector<std::string>& words) {
     return pointers;
 }
 
-FileDescriptor moved(int descriptor) { return FileDescriptor(::fcntl(descriptor, F_DUPFD_CLOEXEC, kLowestOwn)); }
+FileDescriptor moved(int descriptor) {
+    return FileDescriptor(::fcntl(descriptor, F_DUPFD_CLOEXEC, kLowestOwn));
+}
 
 Started perform(const Start& start) {
     Started started;
@@ -48,8 +50,7 @@ Started perform(const Start& start) {
     ::posix_spawn_file_actions_adddup2(&actions, given[1].get(), STDOUT_FILENO);
     ::posix_spawn_file_actions_adddup2(&actions, given[1].get(), STDERR_FILENO);
     int next = kFirst;
-    for (std::size_t i = 2; i < given.size(); ++i)
-        ::posix_spawn_file_actions_adddup2(&actions, given[i].get(), next++);
+    for (std::size_t i = 2; i < given.size(); ++i) ::posix_spawn_file_actions_adddup2(&actions, given[i].get(), next++);
     ::posix_spawn_file_actions_addclosefrom_np(&actions, next);  // should a library have forgotten one
     sigset_t none, all;
     ::sigemptyset(&none);

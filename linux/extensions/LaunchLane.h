@@ -28,8 +28,8 @@ struct Started {
 };
 
 /// The thread that starts the processes of extensions. Those that want to end with this process end with the thread
-/// that has started them, so it lives as long as they may. A program is started by the launcher, which is on a disk that
-/// answers; what else it runs does not hold up this thread.
+/// that has started them, so it lives as long as they may. A program is started by the launcher, which is on a disk
+/// that answers; what else it runs does not hold up this thread.
 class LaunchLane final {
 public:
     LaunchLane();

@@ -58,10 +58,20 @@ std::shared_ptr<ExtensionServices> servicesWith(Reactor& reactor, Scheduler& sch
                                                 LinuxAppExtensions::Options options) {
     auto installed = std::make_shared<InstalledExtensions>(log, options.dataDirectories, options.locales);
     auto sandbox = std::make_shared<Sandbox>(log, options.sandbox);
-    return std::shared_ptr<ExtensionServices>(
-        new ExtensionServices{reactor, scheduler, ipc, log, std::move(options), std::move(installed),
-                              std::move(sandbox), scheduler.serialQueue("extension lookups"),
-                              std::make_shared<DiskLane>(), {}, {}, {}, {}, std::make_unique<LaunchLane>()});
+    return std::shared_ptr<ExtensionServices>(new ExtensionServices{reactor,
+                                                                    scheduler,
+                                                                    ipc,
+                                                                    log,
+                                                                    std::move(options),
+                                                                    std::move(installed),
+                                                                    std::move(sandbox),
+                                                                    scheduler.serialQueue("extension lookups"),
+                                                                    std::make_shared<DiskLane>(),
+                                                                    {},
+                                                                    {},
+                                                                    {},
+                                                                    {},
+                                                                    std::make_unique<LaunchLane>()});
 }
 
 std::optional<std::string> variable(const std::string& name) {
@@ -86,11 +96,17 @@ LinuxAppExtensions::Options LinuxAppExtensions::optionsFrom(const LinuxEnvironme
         return unsandboxedExtensionsAllowed(directories);
     };
     options.sandbox.dataHome = environment.dataHome;
-    options.sandbox.forbidden = {environment.runtimeDirectory, environment.stateDirectory, environment.cacheDirectory,
-                                 temporaryDirectory,           "/proc",                    "/sys",
-                                 "/dev",                       "/run"};
+    options.sandbox.forbidden = {environment.runtimeDirectory,
+                                 environment.stateDirectory,
+                                 environment.cacheDirectory,
+                                 temporaryDirectory,
+                                 "/proc",
+                                 "/sys",
+                                 "/dev",
+                                 "/run"};
     for (const char* name : {"LANG", "LC_ALL", "LC_MESSAGES", "LANGUAGE", "TZ"})
-        if (const auto value = variable(name)) options.sandbox.baseEnvironment.push_back(std::string(name) + "=" + *value);
+        if (const auto value = variable(name))
+            options.sandbox.baseEnvironment.push_back(std::string(name) + "=" + *value);
     options.sandbox.variable = variable;
     return options;
 }
@@ -127,8 +143,7 @@ void LinuxAppExtensions::extensionsWithMatchingPoint(const std::string& point, M
         const auto answer =
             services->disk->ask<Found>(kLookPatience, [installed = services->installed] { return installed->look(); });
         const int* error = answer ? std::get_if<int>(&*answer) : nullptr;
-        if (!answer || error)
-            return handler({}, Error(std::string(kSystemErrorDomain), error ? *error : ETIMEDOUT));
+        if (!answer || error) return handler({}, Error(std::string(kSystemErrorDomain), error ? *error : ETIMEDOUT));
         std::vector<std::shared_ptr<AppExtension>> matching;
         for (const auto& installed : std::get<std::vector<std::shared_ptr<const InstalledExtension>>>(*answer))
             if (installed->manifest.extensionPoint == point)

@@ -94,8 +94,10 @@ bool Sandbox::works(Confinement confinement) const {
 void Sandbox::sayOnce(std::string_view line, bool isError) {
     if (said_ == line) return;
     said_ = line;
-    if (isError) log_.error("%s", line);
-    else log_.line("%s", line);
+    if (isError)
+        log_.error("%s", line);
+    else
+        log_.line("%s", line);
 }
 
 std::optional<Confinement> Sandbox::confinement() {
@@ -109,19 +111,22 @@ std::optional<Confinement> Sandbox::confinement() {
                                  : "extensions run in namespaces of their own, with a system call filter",
                     false);
         else
-            sayOnce("extensions run with file rules and a system call filter alone: bubblewrap does not work here", true);
+            sayOnce("extensions run with file rules and a system call filter alone: bubblewrap does not work here",
+                    true);
         return found_;
     }
     // Not remembered: the administrator may change it.
     if (options_.isUnsandboxedAllowed && options_.isUnsandboxedAllowed()) {
-        sayOnce("extensions run WITHOUT a sandbox: neither bubblewrap nor Landlock works here, and the administrator has "
-                "allowed it",
-                true);
+        sayOnce(
+            "extensions run WITHOUT a sandbox: neither bubblewrap nor Landlock works here, and the administrator has "
+            "allowed it",
+            true);
         return Confinement::None;
     }
-    sayOnce("extensions are not launched: neither bubblewrap nor Landlock works here, and the administrator has not "
-            "allowed to run them without a sandbox (AllowUnsandboxedExtensions)",
-            true);
+    sayOnce(
+        "extensions are not launched: neither bubblewrap nor Landlock works here, and the administrator has not "
+        "allowed to run them without a sandbox (AllowUnsandboxedExtensions)",
+        true);
     return std::nullopt;
 }
 

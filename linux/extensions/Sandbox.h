@@ -44,8 +44,8 @@ public:
         bool landlock = true;    ///< whether the kernel's is used
         /// Whether the administrator has allowed to run extensions without a sandbox. Asked when nothing else is left.
         std::function<bool()> isUnsandboxedAllowed;
-        std::string dataHome;  ///< extensions' own directories are in lumacast/extension-data of it
-        std::vector<std::string> forbidden;  ///< directories that no grant may touch
+        std::string dataHome;                      ///< extensions' own directories are in lumacast/extension-data of it
+        std::vector<std::string> forbidden;        ///< directories that no grant may touch
         std::vector<std::string> baseEnvironment;  ///< "NAME=value", for every extension
         /// The daemon's variable of that name, for those it is granted to.
         std::function<std::optional<std::string>(const std::string&)> variable;

@@ -18,13 +18,17 @@ constexpr const char* kLauncherInside = "/lumacast-extension-launcher";
 constexpr const char* kSystemFolders[] = {"/bin", "/sbin", "/lib", "/lib32", "/lib64", "/libx32"};
 /// What the C library and the ones for the network read.
 constexpr const char* kSettings[] = {
-    "/etc/alternatives", "/etc/ca-certificates", "/etc/gai.conf", "/etc/host.conf", "/etc/hosts", "/etc/ld.so.cache",
-    "/etc/ld.so.conf", "/etc/ld.so.conf.d", "/etc/localtime", "/etc/nsswitch.conf", "/etc/pki", "/etc/protocols",
-    "/etc/resolv.conf", "/etc/services", "/etc/ssl/certs", "/etc/ssl/openssl.cnf", "/etc/timezone"};
+    "/etc/alternatives", "/etc/ca-certificates", "/etc/gai.conf",   "/etc/host.conf",
+    "/etc/hosts",        "/etc/ld.so.cache",     "/etc/ld.so.conf", "/etc/ld.so.conf.d",
+    "/etc/localtime",    "/etc/nsswitch.conf",   "/etc/pki",        "/etc/protocols",
+    "/etc/resolv.conf",  "/etc/services",        "/etc/ssl/certs",  "/etc/ssl/openssl.cnf",
+    "/etc/timezone"};
 constexpr const char* kDevices[] = {"/dev/null", "/dev/zero", "/dev/full", "/dev/random", "/dev/urandom"};
 constexpr std::uint64_t kSharedMemoryBytes = 64 << 20;
 
-void append(Words& words, const Words& more) { words.insert(words.end(), more.begin(), more.end()); }
+void append(Words& words, const Words& more) {
+    words.insert(words.end(), more.begin(), more.end());
+}
 
 void appendLimit(Words& words, const char* name, std::uint64_t value) {
     if (value > 0) append(words, {"--limit", std::string(name) + "=" + std::to_string(value)});

@@ -57,9 +57,8 @@ void LinuxIpcConnection::exchangeToken(Bytes token, FileHandler handler) {
 
 /// Later, on the reactor.
 void LinuxIpcConnection::failExchange(FileHandler handler, int error) {
-    core_->reactor.async([handler = std::move(handler), error] {
-        handler(Fd(), Error(std::string(kSystemErrorDomain), error));
-    });
+    core_->reactor.async(
+        [handler = std::move(handler), error] { handler(Fd(), Error(std::string(kSystemErrorDomain), error)); });
 }
 
 const char* LinuxIpcConnection::receiveExchange(const IncomingFrames::Frame& frame) {
@@ -106,7 +105,8 @@ const char* LinuxIpcConnection::receiveExchanged(IncomingFrames::Frame& frame) {
 }
 
 void keepFileTokens(const std::shared_ptr<IpcConnection>& connection, TokenKeeper keeper) {
-    if (const auto ours = std::dynamic_pointer_cast<LinuxIpcConnection>(connection)) ours->keepTokens(std::move(keeper));
+    if (const auto ours = std::dynamic_pointer_cast<LinuxIpcConnection>(connection))
+        ours->keepTokens(std::move(keeper));
 }
 
 void exchangeFileToken(const std::shared_ptr<IpcConnection>& connection, Bytes token, FileHandler handler) {

@@ -45,7 +45,9 @@ std::uint64_t filesOf(int version) {
 }
 
 /// How much of the attributes a version knows.
-std::size_t sizeFor(int version) { return version >= 6 ? 24 : version >= 4 ? 16 : 8; }
+std::size_t sizeFor(int version) {
+    return version >= 6 ? 24 : version >= 4 ? 16 : 8;
+}
 
 bool allow(int ruleset, const std::string& path, std::uint64_t rights) {
     const FileDescriptor place(::open(path.c_str(), O_PATH | O_CLOEXEC));
@@ -72,8 +74,7 @@ bool restrictFiles(const FileRules& rules) {
     RulesetAttributes attributes;
     attributes.files = filesOf(version);
     if (version >= 6) attributes.scoped = kScopeAbstractSockets | kScopeSignals;
-    const FileDescriptor ruleset(
-        static_cast<int>(::syscall(kCreateRuleset, &attributes, sizeFor(version), 0)));
+    const FileDescriptor ruleset(static_cast<int>(::syscall(kCreateRuleset, &attributes, sizeFor(version), 0)));
     if (!ruleset) return false;
     for (const std::string& path : rules.readable)
         if (!allow(ruleset.get(), path, kExecute | kReadFile | kReadDirectory)) return false;

@@ -23,13 +23,14 @@ constexpr const char* kAlwaysTaken[] = {
     "move_pages", "migrate_pages", "lookup_dcookie",
     // mounts, roots, namespaces
     "mount", "umount", "umount2", "pivot_root", "chroot", "setns", "unshare", "move_mount", "open_tree", "fsopen",
-    "fsconfig", "fsmount", "fspick", "mount_setattr", "open_by_handle_at", "name_to_handle_at", "statmount", "listmount",
+    "fsconfig", "fsmount", "fspick", "mount_setattr", "open_by_handle_at", "name_to_handle_at", "statmount",
+    "listmount",
     // the kernel and the machine
     "kexec_load", "kexec_file_load", "init_module", "finit_module", "delete_module", "create_module", "bpf",
     "perf_event_open", "userfaultfd", "reboot", "swapon", "swapoff", "acct", "syslog", "quotactl", "quotactl_fd",
     "settimeofday", "stime", "clock_settime", "clock_settime64", "clock_adjtime", "clock_adjtime64", "adjtimex",
-    "sethostname", "setdomainname", "iopl", "ioperm", "modify_ldt", "vm86", "vm86old", "vhangup", "nfsservctl", "uselib",
-    "sysfs", "_sysctl", "ustat", "fanotify_init", "fanotify_mark", "personality",
+    "sethostname", "setdomainname", "iopl", "ioperm", "modify_ldt", "vm86", "vm86old", "vhangup", "nfsservctl",
+    "uselib", "sysfs", "_sysctl", "ustat", "fanotify_init", "fanotify_mark", "personality",
     // keys
     "keyctl", "add_key", "request_key",
     // rings, which do what other calls do without asking this filter
@@ -39,21 +40,39 @@ constexpr const char* kAlwaysTaken[] = {
 
 /// Where nothing else does: objects that all processes of the user share, and what the file rules don't cover.
 constexpr const char* kTakenWhenShared[] = {
-    "shmget", "shmat", "shmctl", "semget", "semop", "semtimedop", "semctl", "msgget", "msgsnd", "msgrcv", "msgctl",
-    "mq_open", "mq_unlink", "mq_timedsend", "mq_timedreceive", "mq_notify",
-    "pidfd_open", "pidfd_send_signal", "rt_sigqueueinfo", "rt_tgsigqueueinfo", "tkill",
-    "setpriority", "ioprio_set", "sched_setattr",
-    "chmod", "fchmod", "fchmodat", "fchmodat2", "chown", "fchown", "lchown", "fchownat",
-    "setxattr", "lsetxattr", "fsetxattr", "setxattrat", "removexattr", "lremovexattr", "fremovexattr", "removexattrat",
-    "utime", "utimes", "futimesat", "utimensat", "file_setattr",
-    "fork", "vfork", "setpgid", "setsid",
+    "shmget",          "shmat",
+    "shmctl",          "semget",
+    "semop",           "semtimedop",
+    "semctl",          "msgget",
+    "msgsnd",          "msgrcv",
+    "msgctl",          "mq_open",
+    "mq_unlink",       "mq_timedsend",
+    "mq_timedreceive", "mq_notify",
+    "pidfd_open",      "pidfd_send_signal",
+    "rt_sigqueueinfo", "rt_tgsigqueueinfo",
+    "tkill",           "setpriority",
+    "ioprio_set",      "sched_setattr",
+    "chmod",           "fchmod",
+    "fchmodat",        "fchmodat2",
+    "chown",           "fchown",
+    "lchown",          "fchownat",
+    "setxattr",        "lsetxattr",
+    "fsetxattr",       "setxattrat",
+    "removexattr",     "lremovexattr",
+    "fremovexattr",    "removexattrat",
+    "utime",           "utimes",
+    "futimesat",       "utimensat",
+    "file_setattr",    "fork",
+    "vfork",           "setpgid",
+    "setsid",
 };
 
 class Filter final {
 public:
     Filter() : context_(seccomp_init(SCMP_ACT_ALLOW)) {
         // As the library would, but in so many words: a call of another architecture ends the process.
-        if (!context_ || seccomp_attr_set(context_, SCMP_FLTATR_ACT_BADARCH, SCMP_ACT_KILL_PROCESS) != 0) error_ = ENOMEM;
+        if (!context_ || seccomp_attr_set(context_, SCMP_FLTATR_ACT_BADARCH, SCMP_ACT_KILL_PROCESS) != 0)
+            error_ = ENOMEM;
     }
     Filter(const Filter&) = delete;
     Filter& operator=(const Filter&) = delete;
@@ -93,9 +112,10 @@ scmp_arg_cmp isInt(unsigned index, std::uint32_t value) {
 }
 
 void takeNamespaces(Filter& filter) {
-    for (const std::uint64_t flag : {std::uint64_t{CLONE_NEWNS}, std::uint64_t{CLONE_NEWCGROUP}, std::uint64_t{CLONE_NEWUTS},
-                                     std::uint64_t{CLONE_NEWIPC}, std::uint64_t{CLONE_NEWUSER}, std::uint64_t{CLONE_NEWPID},
-                                     std::uint64_t{CLONE_NEWNET}})
+    for (const std::uint64_t flag :
+         {std::uint64_t{CLONE_NEWNS}, std::uint64_t{CLONE_NEWCGROUP}, std::uint64_t{CLONE_NEWUTS},
+          std::uint64_t{CLONE_NEWIPC}, std::uint64_t{CLONE_NEWUSER}, std::uint64_t{CLONE_NEWPID},
+          std::uint64_t{CLONE_NEWNET}})
         filter.take("clone", {has(0, flag)});
     // Its flags are in memory, which a filter can't read. Programs then use the older call.
     filter.take("clone3", {}, ENOSYS);

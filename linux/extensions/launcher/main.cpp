@@ -82,14 +82,22 @@ std::optional<Order> orderFrom(std::vector<char*> words) {
         if (++i == words.size()) return std::nullopt;
         const std::string value = words[i];
         const auto number = wholeNumber(value);
-        if (word == "--parent" && number) order.parent = static_cast<pid_t>(*number);
-        else if (word == "--oom" && number) order.badness = static_cast<int>(*number);
-        else if (word == "--limit") order.limits.push_back(value);
-        else if (word == "--read") order.files.readable.push_back(value);
-        else if (word == "--write") order.files.writable.push_back(value);
-        else if (word == "--calls" && value == "namespaces") order.calls.emplace(CallRules{Surroundings::Namespaces, true});
-        else if (word == "--calls" && value == "shared") order.calls.emplace(CallRules{Surroundings::Shared, true});
-        else return std::nullopt;
+        if (word == "--parent" && number)
+            order.parent = static_cast<pid_t>(*number);
+        else if (word == "--oom" && number)
+            order.badness = static_cast<int>(*number);
+        else if (word == "--limit")
+            order.limits.push_back(value);
+        else if (word == "--read")
+            order.files.readable.push_back(value);
+        else if (word == "--write")
+            order.files.writable.push_back(value);
+        else if (word == "--calls" && value == "namespaces")
+            order.calls.emplace(CallRules{Surroundings::Namespaces, true});
+        else if (word == "--calls" && value == "shared")
+            order.calls.emplace(CallRules{Surroundings::Shared, true});
+        else
+            return std::nullopt;
     }
     return std::nullopt;
 }
@@ -130,6 +138,16 @@ bool limit(const std::string& order) {
     return ::setrlimit(static_cast<__rlimit_resource>(*resource), &both) == 0;
 }
 
+/// Whether there are none to drop: then a service's filter may forbid the call that would.
+bool hasNoRights() {
+    __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
+    __user_cap_data_struct rights[_LINUX_CAPABILITY_U32S_3]{};
+    if (::syscall(SYS_capget, &header, rights) != 0) return false;
+    for (const __user_cap_data_struct& word : rights)
+        if (word.effective != 0 || word.permitted != 0 || word.inheritable != 0) return false;
+    return true;
+}
+
 void dropRights() {
     for (int capability = 0; ::prctl(PR_CAPBSET_READ, capability, 0, 0, 0) >= 0; ++capability)
         ::prctl(PR_CAPBSET_DROP, capability, 0, 0, 0);  // who has no rights may not drop them from what is bound either
@@ -138,7 +156,7 @@ void dropRights() {
                                    SECBIT_NO_SETUID_FIXUP_LOCKED | SECBIT_KEEP_CAPS_LOCKED);
     __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
     __user_cap_data_struct none[_LINUX_CAPABILITY_U32S_3]{};
-    if (::syscall(SYS_capset, &header, none) != 0) fail("its rights", errno);
+    if (::syscall(SYS_capset, &header, none) != 0 && !hasNoRights()) fail("its rights", errno);
     // Without new rights an executable can't bring any back, whatever the bits above came to.
     if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) fail("its rights", errno);
 }
