@@ -8,8 +8,8 @@
 #include <thread>
 
 #include "base/Limits.h"
-#include "tests/contract/ExtensionsWorld.h"
 #include "tests/contract/ExtensionTools.h"
+#include "tests/contract/ExtensionsWorld.h"
 
 namespace lumacast {
 namespace {
@@ -143,7 +143,8 @@ TEST_P(AppExtensionContract, HandlersComeOnALaneOfTheExtensionsOwnAndMayWait) {
     EXPECT_FALSE(wasInline && wasOnRequestLane);
     EXPECT_FALSE(wasOnRequestLane);
     EXPECT_TRUE(hadAuxiliary);
-    EXPECT_TRUE(eventually([&] { return world().wasPinged(); })) << "the extension reaches the daemon through the endpoint";
+    EXPECT_TRUE(eventually([&] { return world().wasPinged(); }))
+        << "the extension reaches the daemon through the endpoint";
 }
 
 TEST_P(AppExtensionContract, TheCompletionSlotHoldsTheNewestHandlerForOlderRequestsToo) {
@@ -284,8 +285,8 @@ TEST_P(AppExtensionContract, WhatAnObjectHadBegunIsCompletedAfterItHasGone) {
     ASSERT_TRUE(extension);
     const std::size_t before = world().processCount();
     Completions completions(*extension);
-    extension->beginExtensionRequestWithInputItems(
-        {textItem("command", "echo"), textItem("last", "")}, [](auto, auto) {});
+    extension->beginExtensionRequestWithInputItems({textItem("command", "echo"), textItem("last", "")},
+                                                   [](auto, auto) {});
     extension.reset();
     ASSERT_TRUE(eventually([&] { return completions.hasTitle("last"); }));
     EXPECT_TRUE(eventually([&] { return world().processCount() == before; })) << "then its process ends";

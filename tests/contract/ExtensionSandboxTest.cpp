@@ -1,8 +1,8 @@
 // A hostile extension in each of the port's sandboxes: what it tries, and what comes of it.
 
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <fcntl.h>
 #include <signal.h>
 #include <sys/file.h>
 #include <sys/wait.h>
@@ -125,9 +125,22 @@ TEST_P(ExtensionSandboxTest, OnlyWhatIsItsOwnAndTheSystemsProgramsCanBeOpened) {
     if (home && std::string_view(home).starts_with("/tmp/")) home = nullptr;
     const std::string folder = world_->dataHome() + "/lumacast/extensions/org.example.Hostile";
     const std::string own = world_->dataHome() + "/lumacast/extension-data/org.example.Hostile";
-    const std::vector<std::string> closed{clip, stray, other + "/manifest.json", other + "/program", "/etc/passwd", "/etc/shadow",
-                                          "/etc/lumacast", home ? home : "/root", "/home", "/var", "/run",
-                                          "/run/user", "/tmp/.X11-unix", "/proc/1/environ", "/sys/kernel", "/dev/shm/x",
+    const std::vector<std::string> closed{clip,
+                                          stray,
+                                          other + "/manifest.json",
+                                          other + "/program",
+                                          "/etc/passwd",
+                                          "/etc/shadow",
+                                          "/etc/lumacast",
+                                          home ? home : "/root",
+                                          "/home",
+                                          "/var",
+                                          "/run",
+                                          "/run/user",
+                                          "/tmp/.X11-unix",
+                                          "/proc/1/environ",
+                                          "/sys/kernel",
+                                          "/dev/shm/x",
                                           LC_SOURCE_DIR "/README.md"};
     const auto answers = open(*extension_, closed);
     for (const std::string& path : closed) {
@@ -136,7 +149,8 @@ TEST_P(ExtensionSandboxTest, OnlyWhatIsItsOwnAndTheSystemsProgramsCanBeOpened) {
         // An empty folder of the sandbox's own may stand in a path's way; it holds nothing of the user's.
         EXPECT_THAT(found->second, AnyOf("ENOENT", "EACCES", "EPERM", isInNamespaces() ? "read" : "EACCES")) << path;
     }
-    for (const std::string& path : {clip, stray, std::string("/etc/passwd"), std::string("/etc/shadow"), other + "/program"})
+    for (const std::string& path :
+         {clip, stray, std::string("/etc/passwd"), std::string("/etc/shadow"), other + "/program"})
         EXPECT_THAT(answers.at(path), AnyOf("ENOENT", "EACCES")) << path;
     const auto allowed = open(*extension_, {own, folder + "/manifest.json", folder, "/usr/bin/env", "/usr"});
     EXPECT_EQ(allowed.at(own), "write");
@@ -195,8 +209,8 @@ TEST_P(ExtensionSandboxTest, ATokenIsNeverIssuedThroughALink) {
     const std::string stray = world_->scratch().write("stray.txt", "the user's");
     std::filesystem::create_symlink(stray, world_->directory() + "/link.mp4");
     std::filesystem::create_directory_symlink(world_->scratch().path("data"), world_->directory() + "/folder");
-    for (const std::string name : {"/link.mp4", "/folder/lumacast/extensions/org.example.Hostile/manifest.json",
-                                   "/../stray.txt"})
+    for (const std::string name :
+         {"/link.mp4", "/folder/lumacast/extensions/org.example.Hostile/manifest.json", "/../stray.txt"})
         EXPECT_FALSE(extension_->issueReadOnlyFileToken("class", world_->directory() + name)) << name;
 }
 
@@ -223,7 +237,9 @@ TEST_P(ExtensionSandboxTest, NoProcessOfItsOutlivesIt) {
     EXPECT_EQ(textOf(answers.front()), isInNamespaces() ? "left" : "none") << "without namespaces it gets no children";
     const int file = ::open(lock.c_str(), O_RDWR | O_CLOEXEC);
     ASSERT_GE(file, 0);
-    if (isInNamespaces()) { EXPECT_NE(::flock(file, LOCK_EX | LOCK_NB), 0) << "the child holds it"; }
+    if (isInNamespaces()) {
+        EXPECT_NE(::flock(file, LOCK_EX | LOCK_NB), 0) << "the child holds it";
+    }
     extension_->kill(SIGKILL);
     EXPECT_TRUE(eventually([&] { return ::flock(file, LOCK_EX | LOCK_NB) == 0; }));
     ::close(file);

@@ -54,7 +54,9 @@ inline std::string textOf(const ExtensionItem& item) {
     return text ? *text : std::string();
 }
 
-inline Data pngOf(std::uint8_t contents) { return {0x89, 'P', 'N', 'G', '\r', '\n', 0x1a, '\n', contents}; }
+inline Data pngOf(std::uint8_t contents) {
+    return {0x89, 'P', 'N', 'G', '\r', '\n', 0x1a, '\n', contents};
+}
 
 struct BegunRequest {
     std::optional<ExtensionRequestID> request;
@@ -80,9 +82,10 @@ public:
         std::vector<ExtensionItem> items;
     };
     explicit Completions(AppExtension& extension) {
-        extension.setRequestCompletionHandler([kept = kept_](ExtensionRequestID request, std::vector<ExtensionItem> items) {
-            kept->change([&](auto& all) { all.push_back({request, std::move(items)}); });
-        });
+        extension.setRequestCompletionHandler(
+            [kept = kept_](ExtensionRequestID request, std::vector<ExtensionItem> items) {
+                kept->change([&](auto& all) { all.push_back({request, std::move(items)}); });
+            });
     }
     std::vector<Completed> get() const { return kept_->get(); }
     std::size_t count() const { return kept_->get().size(); }

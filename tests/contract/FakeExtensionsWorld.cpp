@@ -107,9 +107,8 @@ public:
     bool isOnRequestLane() override { return daemonQueue_->isCurrent(); }
     std::size_t processCount() override {
         const auto held = extensions_.extensions();
-        return static_cast<std::size_t>(std::count_if(held.begin(), held.end(), [](const auto& extension) {
-            return extension->isRunning();
-        }));
+        return static_cast<std::size_t>(
+            std::count_if(held.begin(), held.end(), [](const auto& extension) { return extension->isRunning(); }));
     }
 
 private:
@@ -134,6 +133,8 @@ private:
 
 }  // namespace
 
-std::unique_ptr<ExtensionsWorld> fakeExtensionsWorld() { return std::make_unique<FakeExtensionsWorld>(); }
+std::unique_ptr<ExtensionsWorld> fakeExtensionsWorld() {
+    return std::make_unique<FakeExtensionsWorld>();
+}
 
 }  // namespace lumacast

@@ -56,7 +56,8 @@ protected:
 
     ScratchDirectory scratch_;
     Log log_;
-    InstalledExtensions installed_{log_, {scratch_.path("user"), scratch_.path("share")}, userLocales("de:fr", "de_DE")};
+    InstalledExtensions installed_{
+        log_, {scratch_.path("user"), scratch_.path("share")}, userLocales("de:fr", "de_DE")};
 };
 
 TEST_F(InstalledExtensionsTest, TheUsersComeFirstAndWithinADirectoryTheIdentifiersDecide) {
@@ -253,11 +254,23 @@ TEST_P(ExtensionLimitTest, IsKept) {
         case Limit::ExtensionsInstalled: return overflowInstalled(limitOf(limit));
         case Limit::ExtensionItemsReturned: return overflowItems(limitOf(limit));
         case Limit::ExtensionRequestsInFlight: return overflowRequests(limitOf(limit));
-        case Limit::MessageBytes: case Limit::MessageDepth: case Limit::HandlesPerMessage: case Limit::ConnectionsPerUser:
-        case Limit::MessagesInFlight: case Limit::QueuedBytesPerReader: case Limit::ContextIdentifiersPerRequest:
-        case Limit::HelloBytes: case Limit::PlanesLeased: case Limit::MessageValues: case Limit::HeldBytesPerUser:
-        case Limit::ConnectionsBeforeHello: case Limit::RequestsWithoutReply: case Limit::StartsWaitingForUser:
-        case Limit::StartsOfApplicationWaitingForUser: case Limit::ArchiveBytes: case Limit::ArchiveDepth:
+        case Limit::MessageBytes:
+        case Limit::MessageDepth:
+        case Limit::HandlesPerMessage:
+        case Limit::ConnectionsPerUser:
+        case Limit::MessagesInFlight:
+        case Limit::QueuedBytesPerReader:
+        case Limit::ContextIdentifiersPerRequest:
+        case Limit::HelloBytes:
+        case Limit::PlanesLeased:
+        case Limit::MessageValues:
+        case Limit::HeldBytesPerUser:
+        case Limit::ConnectionsBeforeHello:
+        case Limit::RequestsWithoutReply:
+        case Limit::StartsWaitingForUser:
+        case Limit::StartsOfApplicationWaitingForUser:
+        case Limit::ArchiveBytes:
+        case Limit::ArchiveDepth:
         case Limit::FramesAtExtension: FAIL() << "not kept by the extensions";
     }
     FAIL() << "no overflow for this limit";

@@ -1,5 +1,5 @@
-// Tokens exchanged for files over a connection: the transport's part of it, between two ends and with a peer that speaks
-// bytes.
+// Tokens exchanged for files over a connection: the transport's part of it, between two ends and with a peer that
+// speaks bytes.
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -11,7 +11,9 @@
 namespace lumacast {
 namespace {
 
-Bytes bytesOf(std::string_view text) { return {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()}; }
+Bytes bytesOf(std::string_view text) {
+    return {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()};
+}
 
 class IpcTokenTest : public IpcHostileTest {
 protected:

@@ -45,7 +45,8 @@ TEST_P(KeyedArchiveContract, AnObjectComesBackAsItWasArchived) {
          {"date", Date{12.5}},
          {"place", URL("file:///a%20b")},
          {"nothing", Value()},
-         {"settings", Dictionary{{"AverageBitRate", 1'000'000}, {"Profile", "High"}, {"list", Array{1, "x", Array{}}}}}}};
+         {"settings",
+          Dictionary{{"AverageBitRate", 1'000'000}, {"Profile", "High"}, {"list", Array{1, "x", Array{}}}}}}};
     const auto data = archive().archivedData(object);
     ASSERT_TRUE(data);
     const auto back = archive().unarchivedRoot(*data, "Configuration");
@@ -63,7 +64,8 @@ TEST_P(KeyedArchiveContract, AnObjectWithoutFieldsIsOneToo) {
 }
 
 TEST_P(KeyedArchiveContract, TwoArchivesAreApart) {
-    const auto one = archive().archivedData({"Class", {{"n", 1}}}), other = archive().archivedData({"Class", {{"n", 2}}});
+    const auto one = archive().archivedData({"Class", {{"n", 1}}}),
+               other = archive().archivedData({"Class", {{"n", 2}}});
     ASSERT_TRUE(one && other);
     EXPECT_EQ(Value(archive().unarchivedRoot(*one, "Class")->fields), Value(Dictionary{{"n", 1}}));
     EXPECT_EQ(Value(archive().unarchivedRoot(*other, "Class")->fields), Value(Dictionary{{"n", 2}}));
@@ -136,13 +138,25 @@ TEST_P(ArchiveLimitTest, IsKept) {
             EXPECT_TRUE(isArchived(*archive, {{"k", nestedArrays(most - 1)}}));
             EXPECT_FALSE(isArchived(*archive, {{"k", nestedArrays(most)}}));
             return;
-        case Limit::MessageBytes: case Limit::MessageDepth: case Limit::HandlesPerMessage: case Limit::ConnectionsPerUser:
-        case Limit::MessagesInFlight: case Limit::QueuedBytesPerReader: case Limit::ContextIdentifiersPerRequest:
-        case Limit::HelloBytes: case Limit::PlanesLeased: case Limit::MessageValues: case Limit::HeldBytesPerUser:
-        case Limit::ConnectionsBeforeHello: case Limit::RequestsWithoutReply: case Limit::StartsWaitingForUser:
-        case Limit::StartsOfApplicationWaitingForUser: case Limit::ExtensionsInstalled:
-        case Limit::ExtensionItemsReturned: case Limit::ExtensionRequestsInFlight: case Limit::FramesAtExtension:
-            FAIL() << "not kept by archives";
+        case Limit::MessageBytes:
+        case Limit::MessageDepth:
+        case Limit::HandlesPerMessage:
+        case Limit::ConnectionsPerUser:
+        case Limit::MessagesInFlight:
+        case Limit::QueuedBytesPerReader:
+        case Limit::ContextIdentifiersPerRequest:
+        case Limit::HelloBytes:
+        case Limit::PlanesLeased:
+        case Limit::MessageValues:
+        case Limit::HeldBytesPerUser:
+        case Limit::ConnectionsBeforeHello:
+        case Limit::RequestsWithoutReply:
+        case Limit::StartsWaitingForUser:
+        case Limit::StartsOfApplicationWaitingForUser:
+        case Limit::ExtensionsInstalled:
+        case Limit::ExtensionItemsReturned:
+        case Limit::ExtensionRequestsInFlight:
+        case Limit::FramesAtExtension: FAIL() << "not kept by archives";
     }
     FAIL() << "no overflow for this limit";
 }

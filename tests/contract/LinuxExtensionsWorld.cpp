@@ -55,8 +55,10 @@ LinuxExtensionsWorld::~LinuxExtensionsWorld() {
 }
 
 std::string LinuxExtensionsWorld::manifestOf(const ExtensionToInstall& extension, const std::string& more) {
-    Dictionary manifest{{"identifier", extension.identifier}, {"extensionPoint", extension.point},
-                        {"displayName", extension.name},      {"executable", "program"}};
+    Dictionary manifest{{"identifier", extension.identifier},
+                        {"extensionPoint", extension.point},
+                        {"displayName", extension.name},
+                        {"executable", "program"}};
     if (!extension.canBeLaunched) manifest.set("executable", "no-program");
     if (!extension.germanName.empty()) manifest.set("displayName[de]", extension.germanName);
     if (extension.activationRule) manifest.set("activationRule", *extension.activationRule);
@@ -88,7 +90,10 @@ void LinuxExtensionsWorld::install(const ExtensionToInstall& extension) {
     if (extension.canBeLaunched) return;
     // It is there and may be run, but it is no program.
     const std::string name = "data/lumacast/extensions/" + extension.identifier + "/no-program";
-    fs::permissions(scratch_.write(name, "\x7f" "ELF, but not really"), fs::perms(0755));
+    fs::permissions(scratch_.write(name,
+                                   "\x7f"
+                                   "ELF, but not really"),
+                    fs::perms(0755));
 }
 
 void LinuxExtensionsWorld::uninstall(const std::string& identifier) {
@@ -130,6 +135,8 @@ std::size_t LinuxExtensionsWorld::linesWith(std::string_view text) const {
     return count;
 }
 
-std::unique_ptr<ExtensionsWorld> portExtensionsWorld() { return std::make_unique<LinuxExtensionsWorld>(); }
+std::unique_ptr<ExtensionsWorld> portExtensionsWorld() {
+    return std::make_unique<LinuxExtensionsWorld>();
+}
 
 }  // namespace lumacast

@@ -34,7 +34,9 @@ std::string name(int error) {
     return text ? text : std::to_string(error);
 }
 
-std::string outcome(long result) { return result >= 0 ? "0" : name(errno); }
+std::string outcome(long result) {
+    return result >= 0 ? "0" : name(errno);
+}
 
 long connectTo(const char* path, bool isAbstract, int type) {
     const int socket = ::socket(AF_UNIX, type, 0);
@@ -42,7 +44,8 @@ long connectTo(const char* path, bool isAbstract, int type) {
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
     std::strncpy(address.sun_path + (isAbstract ? 1 : 0), path, sizeof address.sun_path - 2);
-    const socklen_t length = static_cast<socklen_t>(offsetof(sockaddr_un, sun_path) + strlen(path) + (isAbstract ? 1 : 0));
+    const socklen_t length =
+        static_cast<socklen_t>(offsetof(sockaddr_un, sun_path) + strlen(path) + (isAbstract ? 1 : 0));
     const long result = ::connect(socket, reinterpret_cast<sockaddr*>(&address), length);
     const int error = errno;
     ::close(socket);

@@ -174,19 +174,20 @@ private:
     void exchange(std::int64_t request, const std::vector<ExtensionItem>& tokens, std::size_t at,
                   const std::shared_ptr<std::vector<ExtensionItem>>& answers) {
         if (at == tokens.size()) return complete(request, *answers);
-        exchangeFileToken(requests_, dataOf(tokens[at]),
-                          [self = shared_from_this(), request, tokens, at, answers](Fd file, std::optional<Error> error) {
-                              std::string text = error ? "error " + std::to_string(error->code()) : std::string();
-                              if (file) {
-                                  std::array<char, 256> some{};
-                                  const ssize_t count = ::pread(file.get(), some.data(), some.size(), 0);
-                                  text = "read " + std::string(some.data(), static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
-                                  const std::string written = writtenThrough(file.get());
-                                  if (!written.empty()) text += " WRITTEN: " + written;
-                              }
-                              answers->push_back(textItem("file", text));
-                              self->exchange(request, tokens, at + 1, answers);
-                          });
+        exchangeFileToken(
+            requests_, dataOf(tokens[at]),
+            [self = shared_from_this(), request, tokens, at, answers](Fd file, std::optional<Error> error) {
+                std::string text = error ? "error " + std::to_string(error->code()) : std::string();
+                if (file) {
+                    std::array<char, 256> some{};
+                    const ssize_t count = ::pread(file.get(), some.data(), some.size(), 0);
+                    text = "read " + std::string(some.data(), static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
+                    const std::string written = writtenThrough(file.get());
+                    if (!written.empty()) text += " WRITTEN: " + written;
+                }
+                answers->push_back(textItem("file", text));
+                self->exchange(request, tokens, at + 1, answers);
+            });
     }
 
     void tellEnvironment(std::int64_t request) {
@@ -252,7 +253,9 @@ int main(int count, char** arguments) {
     using namespace lumacast;
     if (count > 1 && std::strcmp(arguments[1], "--silent") == 0)
         for (;;) ::pause();
-    Log log([](LogLevel, std::string_view line) { std::fprintf(stderr, "%.*s\n", static_cast<int>(line.size()), line.data()); });
+    Log log([](LogLevel, std::string_view line) {
+        std::fprintf(stderr, "%.*s\n", static_cast<int>(line.size()), line.data());
+    });
     Reactor reactor("probe");
     LinuxIpc ipc(reactor, log, {});
     const auto probe = std::make_shared<probe::Probe>(reactor, ipc, log);

@@ -29,7 +29,8 @@ protected:
     }
 
     ScratchDirectory scratch_;
-    IconThemes themes_{scratch_.path("home"), {scratch_.path("data"), scratch_.path("more")}, {scratch_.path("config")}};
+    IconThemes themes_{
+        scratch_.path("home"), {scratch_.path("data"), scratch_.path("more")}, {scratch_.path("config")}};
 };
 
 TEST_F(IconThemesTest, TheNearestSizeIsTaken) {
@@ -49,7 +50,8 @@ TEST_F(IconThemesTest, TheNearestSizeIsTaken) {
 
 TEST_F(IconThemesTest, TheDesktopsThemeGoesBeforeItsParentsAndTheyBeforeTheDefault) {
     scratch_.write("config/gtk-3.0/settings.ini", "[Settings]\ngtk-icon-theme-name=Fine\n");
-    scratch_.write("data/icons/Fine/index.theme", "[Icon Theme]\nInherits=Parent,../evil\nDirectories=48\n[48]\nSize=48\n");
+    scratch_.write("data/icons/Fine/index.theme",
+                   "[Icon Theme]\nInherits=Parent,../evil\nDirectories=48\n[48]\nSize=48\n");
     scratch_.write("more/icons/Parent/index.theme", "[Icon Theme]\nInherits=Fine\nDirectories=48\n[48]\nSize=48\n");
     EXPECT_EQ(themes_.currentTheme(), "Fine");
     icon("hicolor/48x48/apps/player.png", "default");
@@ -70,7 +72,8 @@ TEST_F(IconThemesTest, TheUsersOwnIconsAndThoseOutsideThemesAreFound) {
 TEST_F(IconThemesTest, NamesDontLeadOutOfTheirFolders) {
     scratch_.write("secret.png", png("secret"));
     scratch_.write("data/secret.png", png("secret"));
-    for (const char* name : {"../secret", "../../secret", "../../../secret", "x/../../secret", "", ".", "..", ".secret"})
+    for (const char* name :
+         {"../secret", "../../secret", "../../../secret", "x/../../secret", "", ".", "..", ".secret"})
         EXPECT_EQ(find(name, 48), std::nullopt) << name;
 }
 
