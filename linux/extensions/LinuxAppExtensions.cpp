@@ -95,7 +95,7 @@ LinuxAppExtensions::Options LinuxAppExtensions::optionsFrom(const LinuxEnvironme
     options.sandbox.isUnsandboxedAllowed = [directories = environment.systemDirectories] {
         return unsandboxedExtensionsAllowed(directories);
     };
-    options.sandbox.dataHome = environment.dataHome;
+    options.sandbox.ownDirectories = environment.stateDirectory + "/extension-data";
     options.sandbox.forbidden = {environment.runtimeDirectory,
                                  environment.stateDirectory,
                                  environment.cacheDirectory,

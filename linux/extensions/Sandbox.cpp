@@ -43,7 +43,7 @@ Sandbox::Sandbox(Log& log, Options options)
     : log_(log), options_(std::move(options)), hasLandlock_(options_.landlock && kernelHasLandlock()) {}
 
 std::string Sandbox::dataDirectoryOf(const InstalledExtension& extension) const {
-    return options_.dataHome + "/lumacast/extension-data/" + extension.manifest.identifier;
+    return options_.ownDirectories + "/" + extension.manifest.identifier;
 }
 
 std::optional<Sandbox::Places> Sandbox::placesFor(const InstalledExtension& extension) const {
@@ -66,7 +66,10 @@ std::optional<Sandbox::Places> Sandbox::placesFor(const InstalledExtension& exte
         for (const std::string& forbidden : options_.forbidden)
             if (folder && (isSameOrBelow(*folder, forbidden) || isSameOrBelow(forbidden, *folder))) isGood = false;
         // What a user's own manifest grants is no more than it could write in its own directory anyway.
-        if (folder && !extension.isAdministrators && !isSameOrBelow(*folder, *data)) isGood = false;
+        if (folder && isSameOrBelow(*folder, *data))
+            isGood = true;
+        else if (!extension.isAdministrators)
+            isGood = false;
         if (isGood)
             places.writable.push_back(*folder);
         else

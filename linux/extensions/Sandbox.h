@@ -44,7 +44,7 @@ public:
         bool landlock = true;    ///< whether the kernel's is used
         /// Whether the administrator has allowed to run extensions without a sandbox. Asked when nothing else is left.
         std::function<bool()> isUnsandboxedAllowed;
-        std::string dataHome;                      ///< extensions' own directories are in lumacast/extension-data of it
+        std::string ownDirectories;                ///< the folder that has each extension's own directory
         std::vector<std::string> forbidden;        ///< directories that no grant may touch
         std::vector<std::string> baseEnvironment;  ///< "NAME=value", for every extension
         /// The daemon's variable of that name, for those it is granted to.

@@ -124,7 +124,7 @@ TEST_P(ExtensionSandboxTest, OnlyWhatIsItsOwnAndTheSystemsProgramsCanBeOpened) {
     const char* home = ::getenv("HOME");
     if (home && std::string_view(home).starts_with("/tmp/")) home = nullptr;
     const std::string folder = world_->dataHome() + "/lumacast/extensions/org.example.Hostile";
-    const std::string own = world_->dataHome() + "/lumacast/extension-data/org.example.Hostile";
+    const std::string own = world_->ownDirectories() + "/org.example.Hostile";
     const std::vector<std::string> closed{clip,
                                           stray,
                                           other + "/manifest.json",
@@ -158,6 +158,22 @@ TEST_P(ExtensionSandboxTest, OnlyWhatIsItsOwnAndTheSystemsProgramsCanBeOpened) {
     EXPECT_EQ(allowed.at(folder), "read");
     EXPECT_EQ(allowed.at("/usr/bin/env"), "read");
     EXPECT_EQ(allowed.at("/usr"), "read");
+}
+
+TEST_P(ExtensionSandboxTest, NoGrantReachesTheDaemonsOwnFilesOrAnotherExtensions) {
+    const std::string own = world_->ownDirectories() + "/org.example.Granted/sub",
+                      others = world_->ownDirectories() + "/org.example.Hostile", files = world_->directory();
+    for (const std::string& folder : {own, others}) std::filesystem::create_directories(folder);
+    const auto granted = installed("org.example.Granted", R"("grants": {"directories": [")" + own + R"(", ")" + others +
+                                                              R"(", ")" + files + R"("]})");
+    ASSERT_TRUE(granted);
+    const auto answers = open(*granted, {own, others, files});
+    EXPECT_EQ(answers.at(own), "write");
+    for (const std::string& folder : {others, files}) {
+        EXPECT_THAT(answers.at(folder), AnyOf("ENOENT", "EACCES"));
+        EXPECT_EQ(world_->linesWith("is not granted the directory " + folder), 1u);
+    }
+    EXPECT_EQ(world_->linesWith("is not granted the directory"), 2u);
 }
 
 TEST_P(ExtensionSandboxTest, ATokenIsGoodOnceForItsFileAndTheFileCanOnlyBeRead) {
@@ -222,7 +238,7 @@ TEST_P(ExtensionSandboxTest, ItsEnvironmentIsItsOwn) {
     ::unsetenv("LUMACAST_SECRET_OF_THE_TEST");
     ASSERT_EQ(answers.size(), 1u);
     const std::string environment = textOf(answers.front());
-    const std::string home = world_->dataHome() + "/lumacast/extension-data/org.example.Granted";
+    const std::string home = world_->ownDirectories() + "/org.example.Granted";
     EXPECT_THAT(environment, HasSubstr("HOME=" + home + "\n"));
     EXPECT_THAT(environment, HasSubstr("LANG=de_DE.UTF-8\n"));
     EXPECT_THAT(environment, HasSubstr("GRANTED=granted value\n"));
@@ -231,7 +247,7 @@ TEST_P(ExtensionSandboxTest, ItsEnvironmentIsItsOwn) {
 }
 
 TEST_P(ExtensionSandboxTest, NoProcessOfItsOutlivesIt) {
-    const std::string lock = world_->dataHome() + "/lumacast/extension-data/org.example.Hostile/lock";
+    const std::string lock = world_->ownDirectories() + "/org.example.Hostile/lock";
     const auto answers = ask(*extension_, "leave-child", {textItem("path", lock)});
     ASSERT_EQ(answers.size(), 1u);
     EXPECT_EQ(textOf(answers.front()), isInNamespaces() ? "left" : "none") << "without namespaces it gets no children";

@@ -31,8 +31,8 @@ LinuxExtensionsWorld::LinuxExtensionsWorld(const Change& change) {
     options.readableFiles = scratch_.makeDirectory("files");
     options.sandbox.launcher = LC_EXTENSION_LAUNCHER;
     options.sandbox.bubblewrap = firstProgram({"/usr/bin/bwrap", "/usr/local/bin/bwrap"});
-    options.sandbox.dataHome = dataHome();
-    options.sandbox.forbidden = {scratch_.path("files")};
+    options.sandbox.ownDirectories = ownDirectories();
+    options.sandbox.forbidden = {scratch_.path("files"), scratch_.path("state")};
     // The sanitizer's search for leaks stops the process from outside, which the sandbox is there to prevent.
     options.sandbox.baseEnvironment = {"LANG=de_DE.UTF-8", "ASAN_OPTIONS=detect_leaks=0"};
     options.sandbox.variable = [](const std::string& name) {

@@ -40,6 +40,7 @@ public:
     static std::string manifestOf(const ExtensionToInstall& extension, const std::string& more = {});
     ScratchDirectory& scratch() { return scratch_; }
     std::string dataHome() const { return scratch_.path("data"); }
+    std::string ownDirectories() const { return scratch_.path("state/extension-data"); }
     std::vector<std::string> lines() const { return log_.recentLines(); }
     Reactor& reactor() { return *reactor_; }
     /// The lines that hold this text.

@@ -112,11 +112,6 @@ std::set<ino_t> memoryOf(pid_t pid) {
     return all;
 }
 
-/// The innermost process of a running extension; 0 when there is none.
-pid_t processOf(const World& world, const std::string& identifier) {
-    return processRunning(world.path("data/lumacast/extensions/" + identifier + "/program"));
-}
-
 struct SampleBroadcast {
     explicit SampleBroadcast(const std::string& info = "view=https://example.org/live",
                              const std::vector<std::string>& options = {"--size", "640x360", "--fps", "30",
@@ -147,7 +142,7 @@ TEST(Broadcast, SamplesReachTheirExtensionWithoutACopyAndWithoutALoss) {
     ASSERT_TRUE(broadcast.waitForFrames(60)) << broadcast.world.daemonLog();
     const auto memory = memoryOf(broadcast.world.daemon().pid());
     EXPECT_THAT(broadcast.app->ask("stop"), HasSubstr("without movie"));
-    ASSERT_TRUE(waitUntil([&] { return processOf(broadcast.world, kTaker) == 0; }));
+    ASSERT_TRUE(waitUntil([&] { return broadcast.world.extensionProcess(kTaker) == 0; }));
     const Samples samples(broadcast.folder);
     EXPECT_LE(samples.missing(), samples.frames.size() / 20);  // see below
     EXPECT_GT(samples.sounds, 20u);
@@ -195,7 +190,7 @@ TEST(Broadcast, FullSizeReachesItsExtensionWithoutALoss) {
 TEST(Broadcast, AnExtensionThatIsKilledEndsItsBroadcastAndTheNextOneWorks) {
     SampleBroadcast broadcast("-");
     ASSERT_TRUE(broadcast.waitForFrames(10));
-    const pid_t pid = processOf(broadcast.world, kTaker);
+    const pid_t pid = broadcast.world.extensionProcess(kTaker);
     ASSERT_GT(pid, 1);
     ::kill(pid, SIGKILL);
     EXPECT_THAT(broadcast.app->nextEvent(), HasSubstr("taking samples"));
@@ -208,7 +203,7 @@ TEST(Broadcast, AnExtensionThatIsKilledEndsItsBroadcastAndTheNextOneWorks) {
 TEST(Broadcast, AnExtensionThatStandsStillCostsNoMemoryAndEndsItsBroadcastAlone) {
     SampleBroadcast broadcast("-");
     ASSERT_TRUE(broadcast.waitForFrames(10));
-    const pid_t pid = processOf(broadcast.world, kTaker);
+    const pid_t pid = broadcast.world.extensionProcess(kTaker);
     ASSERT_GT(pid, 1);
     const std::size_t before = broadcast.world.daemonNumber("VmRSS");
     ::kill(pid, SIGSTOP);
@@ -218,7 +213,7 @@ TEST(Broadcast, AnExtensionThatStandsStillCostsNoMemoryAndEndsItsBroadcastAlone)
     EXPECT_THAT(broadcast.app->nextEvent(), HasSubstr("taking samples"));
     EXPECT_THAT(broadcast.app->nextEvent(), HasSubstr("stopped -5808"));
     EXPECT_LT(broadcast.world.daemonNumber("VmRSS"), before + 20'000) << "kB";
-    EXPECT_TRUE(waitUntil([&] { return processOf(broadcast.world, kTaker) == 0; })) << "it is killed";
+    EXPECT_TRUE(waitUntil([&] { return broadcast.world.extensionProcess(kTaker) == 0; })) << "it is killed";
     other.reset();  // it was in front
     broadcast.begin("-");
     EXPECT_TRUE(broadcast.waitForFrames(Samples(broadcast.folder).frames.size() + 10)) << broadcast.world.daemonLog();

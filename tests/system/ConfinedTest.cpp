@@ -36,8 +36,10 @@ class Confined : public ::testing::Test {
 protected:
     Confined() : notified_(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
         for (const char* name : {"home", "videos", "sound"}) fs::create_directory(world_.path(name));
-        for (const auto& [program, name] :
-             {std::pair(LC_DAEMON, "lumacastd"), {LC_SELF_RECORDER, "player"}, {LC_CTL, "ctl"}})
+        for (const auto& [program, name] : {std::pair(LC_DAEMON, "lumacastd"),
+                                            {LC_SELF_RECORDER, "player"},
+                                            {LC_CTL, "ctl"},
+                                            {LC_EXTENSION_LAUNCHER, "lumacast-extension-launcher"}})
             fs::copy_file(program, world_.path(name));
         world_.install("org.lumacast.Player", "Player", world_.path("player"));
         // What the administrator writes for this user.
@@ -132,8 +134,9 @@ protected:
         const auto size = ::recv(notified_.get(), text.data(), text.size(), MSG_DONTWAIT);
         return size > 0 ? std::string(text.data(), static_cast<std::size_t>(size)) : "";
     }
-    std::string statusOfDaemon(const std::string& name) {
-        const std::string text = textOf("/proc/" + std::to_string(world_.daemon().pid()) + "/status");
+    std::string statusOfDaemon(const std::string& name) { return statusOf(world_.daemon().pid(), name); }
+    static std::string statusOf(pid_t process, const std::string& name) {
+        const std::string text = textOf("/proc/" + std::to_string(process) + "/status");
         const auto at = text.find(name + ":");
         return at == std::string::npos ? ""
                                        : text.substr(at + name.size() + 2, text.find('\n', at) - at - name.size() - 2);
@@ -177,8 +180,7 @@ TEST_F(Confined, TheDaemonAsksRecordsPictureAndSoundAndSaves) {
         EXPECT_TRUE(waitUntil([&] { return hasThreadBehind(); }, std::chrono::seconds(60)))
             << "what can wait is in a recording's way";
         // It has the time that the machine's other work leaves, which may be little.
-        EXPECT_TRUE(
-            waitUntil([&] { return hasSaved(); }, std::chrono::seconds(300)));
+        EXPECT_TRUE(waitUntil([&] { return hasSaved(); }, std::chrono::seconds(300)));
         saved = tool.readAll();
         EXPECT_EQ(tool.wait(), 0) << textOf(world_.path("tool.log")) << world_.daemonLog();
     }
@@ -215,6 +217,41 @@ TEST_F(Confined, TheDaemonHasNoRightsAndReachesNothingElse) {
     }
     EXPECT_EQ(writable, 4) << mounts;
     EXPECT_GT(readOnly, 0);
+}
+
+TEST_F(Confined, BroadcastsReachTheirExtensionsAndTheseAreConfinedEvenMore) {
+    const std::string clips = "org.lumacast.ClipKeeper", samples = "org.lumacast.SampleTaker";
+    const std::string kept = world_.installExtension(clips, LC_MINIMAL_EXTENSION, false),
+                      noted = world_.installExtension(samples, LC_SAMPLE_TAKER, true) + "/samples.log";
+    giveAway();
+    startDaemon();
+    const auto player = application({"--size", "320x180", "--fps", "30"});
+    ASSERT_TRUE(player->waitForFrame(30));
+    DialogUser user(world_.display().name());
+    // A clip is handed over by a token, and the extension keeps a copy of its own.
+    player->send("broadcast org.lumacast.Player " + clips + " directory=" + kept);
+    ASSERT_TRUE(user.answer(DialogUser::Button::Default)) << world_.daemonLog();
+    ASSERT_THAT(player->answer(), StartsWith("started")) << world_.daemonLog();
+    ASSERT_TRUE(waitUntil([&] { return fs::exists(kept + "/clip-2.mp4"); }, std::chrono::seconds(60)))
+        << world_.daemonLog();
+    EXPECT_THAT(player->ask("stop"), HasSubstr("without movie"));
+    EXPECT_GT(picturesOf(kept + "/clip-1.mp4").size(), 10u);
+    // A sample is handed over in shared memory. The user isn't asked again so soon.
+    ASSERT_THAT(player->ask("broadcast org.lumacast.Player " + samples + " -"), StartsWith("started"))
+        << world_.daemonLog();
+    ASSERT_TRUE(waitUntil([&] {
+        const std::string text = textOf(noted);
+        return std::count(text.begin(), text.end(), '\n') > 30;
+    })) << world_.daemonLog();
+    const pid_t extension = world_.extensionProcess(samples);
+    ASSERT_GT(extension, 1);
+    EXPECT_EQ(statusOf(extension, "NoNewPrivs"), "1");
+    EXPECT_GT(std::stoi(statusOf(extension, "Seccomp_filters")), std::stoi(statusOfDaemon("Seccomp_filters")))
+        << "its own filter is on top of the unit's";
+    EXPECT_EQ(statusOf(extension, "CapEff"), "0000000000000000");
+    EXPECT_THAT(world_.daemonLog(), HasSubstr("extensions run with file rules and a system call filter alone"));
+    EXPECT_THAT(player->ask("stop"), HasSubstr("without movie"));
+    EXPECT_EQ(world_.endDaemon(SIGTERM), 0);
 }
 
 }  // namespace

@@ -163,7 +163,7 @@ std::string World::installExtension(const std::string& identifier, const std::st
                             {"executable", "program"}};
     if (takesSamples) manifest["processMode"] = "LCBroadcastProcessModeSampleBuffer";
     std::ofstream(folder / "manifest.json") << manifest.dump();
-    const std::string data = path("data/lumacast/extension-data/" + identifier);
+    const std::string data = path("state/lumacast/extension-data/" + identifier);
     fs::create_directories(data);
     return data;
 }
@@ -173,6 +173,10 @@ std::string World::installExtensionFolder(const std::string& folder) {
     fs::create_directories(installed);
     fs::copy(folder, installed, fs::copy_options::recursive);
     return (installed / name).string();
+}
+
+pid_t World::extensionProcess(const std::string& identifier) const {
+    return processRunning(path("data/lumacast/extensions/" + identifier + "/program"));
 }
 
 void World::startDaemon(const std::vector<std::string>& variables) { startDaemonBy({LC_DAEMON}, variables); }

@@ -114,6 +114,8 @@ public:
     std::string installExtension(const std::string& identifier, const std::string& program, bool takesSamples);
     /// Installs an upload extension as it is built, a folder with its manifest. Answers where its program is then.
     std::string installExtensionFolder(const std::string& folder);
+    /// The innermost process of a running extension; 0 when there is none.
+    pid_t extensionProcess(const std::string& identifier) const;
 
 private:
     void setFlag(const std::string& name, bool on) const;
