@@ -106,6 +106,7 @@ void ExtensionProcess::took(Started started) {
     {
         const std::lock_guard lock(mutex_);
         process_ = std::move(started.process);
+        group_ = started.pid;
         isKilled = isKilled_;
         isOver = isOver_;
     }
@@ -115,7 +116,10 @@ void ExtensionProcess::took(Started started) {
         self_.reset();
         return;
     }
-    if (isKilled || isOver) send(process_.get(), SIGKILL);
+    if (isKilled || isOver) {
+        const std::lock_guard lock(mutex_);
+        killAll();
+    }
     if (!isOver) watchAll();
 }
 
@@ -192,8 +196,16 @@ void ExtensionProcess::signal(int signal) {
     const std::lock_guard lock(mutex_);
     if (isOver_) return;
     if (signal == SIGKILL) isKilled_ = true;
-    send(program_.get(), signal);
-    if (signal == SIGKILL || !program_) send(process_.get(), signal);
+    if (signal == SIGKILL) return killAll();
+    send(program_ ? program_.get() : process_.get(), signal);
+}
+
+/// With the mutex held. Also what bubblewrap had started when it was killed before that was set up: such a process
+/// knows of no parent yet that it should end with.
+void ExtensionProcess::killAll() {
+    send(program_.get(), SIGKILL);
+    send(process_.get(), SIGKILL);
+    if (group_ > 1) ::kill(-group_, SIGKILL);
 }
 
 void ExtensionProcess::end() {
@@ -201,9 +213,15 @@ void ExtensionProcess::end() {
     {
         const std::lock_guard lock(mutex_);
         if (isOver_) return;
-        if (::waitid(static_cast<idtype_t>(kPidfd), static_cast<id_t>(process_.get()), &info, WEXITED | WNOHANG) != 0 ||
-            info.si_pid == 0)
-            return;
+        const auto wait = [&](int how) {
+            return ::waitid(static_cast<idtype_t>(kPidfd), static_cast<id_t>(process_.get()), &info,
+                            WEXITED | WNOHANG | how) == 0 &&
+                   info.si_pid != 0;
+        };
+        if (!wait(WNOWAIT)) return;
+        killAll();  // whatever has ended it
+        wait(0);
+        group_ = 0;
         isOver_ = true;
     }
     // What it has printed last.
@@ -229,12 +247,12 @@ void ExtensionProcess::endNow() {
     if (isOver_) return;
     isOver_ = true;
     if (!process_) return;
-    send(program_.get(), SIGKILL);
-    send(process_.get(), SIGKILL);
+    killAll();
     pollfd end{process_.get(), POLLIN, 0};
     if (::poll(&end, 1, 2000) != 1) return;
     siginfo_t info{};
     ::waitid(static_cast<idtype_t>(kPidfd), static_cast<id_t>(process_.get()), &info, WEXITED | WNOHANG);
+    group_ = 0;
 }
 
 }  // namespace lumacast

@@ -40,9 +40,9 @@ public:
     /// Starts it. On the reactor, once.
     void start(LaunchLane& lane, const ConfinedCommand& command);
 
-    /// Sends the signal to the extension's own process; the ones that no process can refuse to end by go to the whole
-    /// sandbox. By descriptors, never by number. Before the start is through SIGKILL is kept for it, others are
-    /// dropped. Callable from any lane.
+    /// Sends the signal to the extension's own process; SIGKILL goes to the whole sandbox. By descriptors, or to the
+    /// group of a process that was not waited for, so that nobody else can have its number. Before the start is through
+    /// SIGKILL is kept for it, others are dropped. Callable from any lane.
     void signal(int signal);
 
     /// Ends it and waits for that, at most two seconds. For the end of this process's work with extensions; no event
@@ -57,6 +57,7 @@ private:
     void lookForHello(Greeting& greeting, std::unique_ptr<Reactor::Watch>& watch);
     Reactor::Again readOutput();
     void end();
+    void killAll();
 
     Reactor& reactor_;
     Log& log_;
@@ -65,6 +66,7 @@ private:
     OutputLines lines_;
 
     std::mutex mutex_;
+    pid_t group_ = 0;         ///< of what was started, until it was waited for
     FileDescriptor process_;  ///< what was started: with bubblewrap what watches over the sandbox
     Fd program_;              ///< the process that said hello
     bool isKilled_ = false;

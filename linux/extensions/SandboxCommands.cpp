@@ -6,6 +6,7 @@
 #include <filesystem>
 
 #include "linux/extensions/Sandbox.h"
+#include "linux/ipc/ExtensionRequests.h"
 
 namespace lumacast {
 
@@ -62,8 +63,7 @@ std::vector<std::string> Sandbox::insideBubblewrap(const std::string& folder, co
                                                    const std::vector<std::string>& program, bool isProbe) const {
     Words words = startOptions();
     append(words, {"--", options_.bubblewrap, "--unshare-user", "--unshare-pid", "--unshare-ipc", "--unshare-uts",
-                   "--unshare-cgroup-try", "--die-with-parent", "--new-session", "--cap-drop", "ALL", "--hostname",
-                   "extension"});
+                   "--unshare-cgroup-try", "--die-with-parent", "--cap-drop", "ALL", "--hostname", "extension"});
     if (!network) words.push_back("--unshare-net");
     append(words, {"--ro-bind", "/usr", "/usr"});
     appendSystemFolders(words);
@@ -79,6 +79,10 @@ std::vector<std::string> Sandbox::insideBubblewrap(const std::string& folder, co
     }
     append(words, {"--ro-bind", options_.launcher, kLauncherInside, "--chdir", places.data, "--remount-ro", "/", "--",
                    kLauncherInside});
+    // Bubblewrap's own processes stay in the group that the daemon ends; what it started before it could tell them to
+    // end with it looks whether the daemon is still there.
+    words.push_back("--session");
+    if (!isProbe) append(words, {"--connected", std::to_string(kExtensionRequestsDescriptor)});
     appendLimit(words, "processes", options_.resources.processes);
     if (hasLandlock_) {
         append(words, {"--read", "/"});

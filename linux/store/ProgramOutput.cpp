@@ -27,7 +27,7 @@ std::vector<char*> pointersTo(std::vector<std::string>& words) {
     return pointers;
 }
 
-/// A child process, killed and reaped with this object.
+/// A child process in a group of its own, killed and reaped with this object.
 class Child final {
 public:
     Child(ProgramRun run, int output) {
@@ -41,7 +41,8 @@ public:
             // This process's lanes take no signals; the program is to be ended by them.
             ::posix_spawnattr_setsigmask(&attributes, &none);
             ::posix_spawnattr_setsigdefault(&attributes, &all);
-            ::posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF);
+            ::posix_spawnattr_setflags(&attributes,
+                                       POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETPGROUP);
             ::posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
             ::posix_spawn_file_actions_adddup2(&actions, output, STDOUT_FILENO);
             ::posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, "/dev/null", O_WRONLY, 0);
@@ -64,7 +65,7 @@ public:
     /// Ends it, if it hasn't ended by itself; whether it had, with status 0.
     bool reap() {
         if (pid_ <= 0) return false;
-        ::kill(pid_, SIGKILL);
+        ::kill(-pid_, SIGKILL);  // with what it has started; nobody has waited for it, so the number is its
         int status = 0;
         while (::waitpid(pid_, &status, 0) < 0 && errno == EINTR) {
         }

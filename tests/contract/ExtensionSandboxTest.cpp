@@ -317,6 +317,41 @@ TEST_P(ExtensionSandboxTest, WithoutTheNetworkThereIsNone) {
     EXPECT_EQ(textOf(ask(*extension_, "connect", {textItem("x", "")}).front()), "0") << "others have it";
 }
 
+TEST_P(ExtensionSandboxTest, ItsResourcesAreLimitedForGood) {
+    const ExtensionResources resources;
+    std::map<std::string, std::string> limits;
+    for (const ExtensionItem& item : ask(*extension_, "limits")) limits[item.attributedTitle] = textOf(item);
+#ifndef LC_SANITIZED  // it maps far more than it uses: the launcher leaves this limit out
+    EXPECT_EQ(limits["address-space"], std::to_string(resources.addressSpace));
+#endif
+    EXPECT_EQ(limits["file-size"], std::to_string(resources.fileBytes));
+    EXPECT_EQ(limits["open-files"], std::to_string(resources.openFiles));
+    EXPECT_EQ(limits["core"], "0");
+    // Among the user's other processes it gets none at all.
+    if (isInNamespaces()) {
+        EXPECT_EQ(limits["processes"], std::to_string(resources.processes));
+    }
+}
+
+TEST_P(ExtensionSandboxTest, ItsProcessesAreLimitedAndAllEndWithIt) {
+    const auto answers = ask(*extension_, "forks");
+    ASSERT_EQ(answers.size(), 1u);
+    const int made = std::stoi(textOf(answers.front()));
+    if (!isInNamespaces())
+        EXPECT_EQ(made, 0) << "without namespaces it gets no processes at all";
+    else if (::geteuid() != 0)
+        EXPECT_LT(made, static_cast<int>(ExtensionResources().processes));
+    else
+        std::printf("    the kernel counts no process of the administrator's: %d were made\n", made);
+    if (isInNamespaces()) {
+        EXPECT_GT(made, 100);
+    }
+    const std::string program = world_->dataHome() + "/lumacast/extensions/org.example.Hostile/program";
+    EXPECT_GE(processesWith(program), static_cast<std::size_t>(made));
+    extension_->kill(SIGKILL);
+    EXPECT_TRUE(eventually([&] { return processesWith(program) == 0; })) << "all end with it";
+}
+
 #ifndef LC_SANITIZED  // it maps far more than it uses: the launcher leaves this limit out
 TEST_P(ExtensionSandboxTest, ItsMemoryIsLimited) {
     const auto answers = ask(*extension_, "memory");

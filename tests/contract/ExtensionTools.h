@@ -3,6 +3,9 @@
 
 #include <chrono>
 #include <condition_variable>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -25,6 +28,19 @@ template <class Condition>
         std::this_thread::sleep_for(std::chrono::milliseconds(2));
     }
     return true;
+}
+
+/// Processes that were started with a path of this test's.
+inline std::size_t processesWith(const std::string& path) {
+    std::size_t count = 0;
+    for (const auto& entry : std::filesystem::directory_iterator("/proc")) {
+        const std::string name = entry.path().filename().string();
+        if (name.find_first_not_of("0123456789") != std::string::npos) continue;
+        std::ifstream file(entry.path() / "cmdline");
+        const std::string command{std::istreambuf_iterator<char>(file), {}};
+        if (command.find(path) != std::string::npos) ++count;
+    }
+    return count;
 }
 
 struct Lookup {

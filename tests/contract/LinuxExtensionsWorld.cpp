@@ -119,13 +119,22 @@ std::shared_ptr<IpcEndpoint> LinuxExtensionsWorld::listenForPing() {
 }
 
 std::size_t LinuxExtensionsWorld::processCount() {
-    // Every process of ours is started by this one: with bubblewrap what watches over it, else itself.
-    std::size_t count = 0;
+    return processes().size();
+}
+
+pid_t LinuxExtensionsWorld::onlyProcess() {
+    const auto all = processes();
+    return all.size() == 1 ? all.front() : 0;
+}
+
+std::vector<pid_t> LinuxExtensionsWorld::processes() {
+    // Every process of ours is started by this one.
+    std::vector<pid_t> all;
     for (const auto& task : fs::directory_iterator("/proc/self/task")) {
         std::ifstream children(task.path() / "children");
-        for (std::string child; children >> child;) ++count;
+        for (pid_t child = 0; children >> child;) all.push_back(child);
     }
-    return count;
+    return all;
 }
 
 std::size_t LinuxExtensionsWorld::linesWith(std::string_view text) const {

@@ -34,6 +34,8 @@ public:
     bool wasPinged() override { return ping_->was; }
     bool isOnRequestLane() override { return reactor_->isCurrent(); }
     std::size_t processCount() override;
+    /// The one process there is: with bubblewrap what watches over it, else itself. 0 when there are none or more.
+    pid_t onlyProcess();
 
     /// A folder with the probe as "program" and this manifest; its path. `text` replaces "@" by the identifier's line.
     std::string installFolder(const std::string& name, const std::string& manifest);
@@ -47,6 +49,8 @@ public:
     std::size_t linesWith(std::string_view text) const;
 
 private:
+    std::vector<pid_t> processes();
+
     ScratchDirectory scratch_;
     Log log_;
     const std::shared_ptr<Reactor> reactor_ = std::make_shared<Reactor>("extensions test");

@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -40,6 +41,19 @@ std::string textOf(const ExtensionItem& item) {
 Data dataOf(const ExtensionItem& item) {
     const auto* data = item.attachments.empty() ? nullptr : item.attachments.front().item.as<Data>();
     return data ? *data : Data();
+}
+
+/// As many processes as it gets, up to 2000; they stay.
+int forkMany() {
+    int made = 0;
+    while (made < 2000) {
+        const pid_t child = ::fork();
+        if (child == 0)
+            for (;;) ::pause();
+        if (child < 0) break;
+        ++made;
+    }
+    return made;
 }
 
 class Probe final : public IpcExportedObject, public std::enable_shared_from_this<Probe> {
@@ -127,7 +141,8 @@ private:
             if (socket >= 0) ::close(socket);
             return complete(request, {textItem("socket", answer)});
         }
-        if (command == "forks") return forkMany(request);
+        if (command == "forks") return complete(request, {textItem("forks", std::to_string(forkMany()))});
+        if (command == "limits") return tellLimits(request);
         if (command == "memory") return takeMemory(request);
         if (command == "garbage") {
             const std::array<char, 64> garbage{};
@@ -213,16 +228,20 @@ private:
         ::close(lock);
     }
 
-    void forkMany(std::int64_t request) {
-        int made = 0;
-        for (int i = 0; i < 2000; ++i) {
-            const pid_t child = ::fork();
-            if (child == 0)
-                for (;;) ::pause();
-            if (child < 0) break;
-            ++made;
+    void tellLimits(std::int64_t request) {
+        std::vector<ExtensionItem> all;
+        for (const auto& [name, which] : {std::pair("address-space", RLIMIT_AS),
+                                          {"file-size", RLIMIT_FSIZE},
+                                          {"open-files", RLIMIT_NOFILE},
+                                          {"processes", RLIMIT_NPROC},
+                                          {"core", RLIMIT_CORE}}) {
+            rlimit now{};
+            ::getrlimit(which, &now);
+            // Neither may be raised: the hard limit is the same.
+            const bool isFixed = now.rlim_cur == now.rlim_max;
+            all.push_back(textItem(name, isFixed ? std::to_string(now.rlim_cur) : "can be raised"));
         }
-        complete(request, {textItem("forks", std::to_string(made))});
+        complete(request, all);
     }
 
     void takeMemory(std::int64_t request) {
@@ -253,6 +272,10 @@ int main(int count, char** arguments) {
     using namespace lumacast;
     if (count > 1 && std::strcmp(arguments[1], "--silent") == 0)
         for (;;) ::pause();
+    if (count > 1 && std::strcmp(arguments[1], "--forks") == 0) {
+        std::printf("%d\n", probe::forkMany());
+        return 0;
+    }
     Log log([](LogLevel, std::string_view line) {
         std::fprintf(stderr, "%.*s\n", static_cast<int>(line.size()), line.data());
     });

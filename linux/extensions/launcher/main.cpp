@@ -4,6 +4,8 @@
 //   --parent PID         ends with this parent; ends at once when another process is the parent
 //   --oom NUMBER         its badness when memory runs out
 //   --limit NAME=VALUE   address-space, data, open-files, file-size, processes (bytes or a number, hard limits)
+//   --session            a session of its own
+//   --connected NUMBER   ends at once when the other end of this socket has gone
 //   --no-rights          no capabilities, and none to come
 //   --read PATH, --write PATH   opens nothing but these (see Landlock.h)
 //   --calls namespaces|shared   a filter for system calls (see SystemCalls.h)
@@ -13,6 +15,7 @@
 #include <fcntl.h>
 #include <linux/capability.h>
 #include <linux/securebits.h>
+#include <poll.h>
 #include <signal.h>
 #include <sys/prctl.h>
 #include <sys/resource.h>
@@ -43,6 +46,8 @@ struct Order {
     std::optional<int> badness;
     std::vector<std::string> limits;
     bool dropsRights = false;
+    bool ownSession = false;
+    std::optional<int> connection;
     FileRules files;
     std::optional<CallRules> calls;
     bool network = true;
@@ -75,6 +80,10 @@ std::optional<Order> orderFrom(std::vector<char*> words) {
             order.dropsRights = true;
             continue;
         }
+        if (word == "--session") {
+            order.ownSession = true;
+            continue;
+        }
         if (word == "--no-network") {
             order.network = false;
             continue;
@@ -84,6 +93,8 @@ std::optional<Order> orderFrom(std::vector<char*> words) {
         const auto number = wholeNumber(value);
         if (word == "--parent" && number)
             order.parent = static_cast<pid_t>(*number);
+        else if (word == "--connected" && number)
+            order.connection = static_cast<int>(*number);
         else if (word == "--oom" && number)
             order.badness = static_cast<int>(*number);
         else if (word == "--limit")
@@ -105,6 +116,11 @@ std::optional<Order> orderFrom(std::vector<char*> words) {
 void endWith(pid_t parent) {
     if (::prctl(PR_SET_PDEATHSIG, SIGKILL) != 0) fail("its end with the daemon", errno);
     if (::getppid() != parent) std::_Exit(kFailed);  // it has gone before it could be told
+}
+
+void endUnlessConnected(int connection) {
+    pollfd other{connection, 0, 0};
+    if (::poll(&other, 1, 0) < 0 || (other.revents & (POLLHUP | POLLERR | POLLNVAL)) != 0) std::_Exit(kFailed);
 }
 
 /// Best effort: a kernel that can't is no reason not to run.
@@ -168,6 +184,8 @@ void dropRights() {
     ::setrlimit(RLIMIT_CORE, &noCore);
     for (const std::string& one : order.limits)
         if (!limit(one)) fail(one.c_str(), errno);
+    if (order.ownSession && ::setsid() < 0) fail("its session", errno);
+    if (order.connection) endUnlessConnected(*order.connection);
     if (order.dropsRights) dropRights();
     const bool hasFileRules = !order.files.readable.empty() || !order.files.writable.empty();
     if (hasFileRules && !restrictFiles(order.files)) fail("its files", errno);
