@@ -92,7 +92,8 @@ void ExtensionRun::abandon() {
     {
         const std::lock_guard lock(mutex_);
         isAbandoned_ = true;
-        if (!session_) return;
+        // A request that was begun just now is still to be launched for.
+        if (!session_ && requests_.empty()) return;
     }
     services_->reactor.async([self = shared_from_this()] {
         if (self->services_->isOver) return;

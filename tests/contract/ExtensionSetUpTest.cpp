@@ -6,8 +6,10 @@
 #include <sys/file.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <chrono>
 #include <filesystem>
+#include <future>
 
 #include "linux/ipc/Fd.h"
 #include "tests/contract/ExtensionTools.h"
@@ -70,8 +72,26 @@ TEST(ExtensionSetUp, NothingStaysOfTheRealOneWheneverItIsKilled) {
         const auto moment = std::chrono::steady_clock::now() + i * std::chrono::microseconds(15);
         ASSERT_TRUE(eventually([&] { return std::chrono::steady_clock::now() >= moment; }));
         found.front()->kill(SIGKILL);
+        ASSERT_TRUE(eventually([&] { return world.processCount() == 0; }));
     }
     EXPECT_TRUE(eventually([&] { return processesWith(world.dataHome()) == 0; })) << processesWith(world.dataHome());
+}
+
+TEST(ExtensionSetUp, AnExtensionWhoseObjectGoesBeforeItIsLaunchedEndsInItsTimeToo) {
+    LinuxExtensionsWorld world(
+        [](LinuxAppExtensions::Options& options) { options.lastRequests = std::chrono::milliseconds(500); });
+    world.install({"org.example.Upload"});
+    auto found = findExtensions(world).found;
+    ASSERT_EQ(found.size(), 1u);
+    std::promise<void> goesOn;
+    world.reactor().async([wait = goesOn.get_future().share()] { wait.get(); });
+    std::atomic<bool> isBegun{false};
+    found.front()->beginExtensionRequestWithInputItems({textItem("command", "hold")},
+                                                       [&](auto request, auto) { isBegun = request.has_value(); });
+    found.clear();
+    goesOn.set_value();
+    EXPECT_TRUE(eventually([&] { return isBegun.load(); })) << "it is launched for its request";
+    EXPECT_TRUE(eventually([&] { return world.processCount() == 0; })) << "which it never completes";
 }
 
 }  // namespace
