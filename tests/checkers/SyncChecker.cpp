@@ -61,7 +61,8 @@ SyncReport checkBeepsAtMarks(const std::vector<NumberedPicture>& pictures, const
         report.findings.push_back("there are no pictures");
         return report;
     }
-    const std::vector<nanoseconds> cuts = cutsOf(pictures, expectation.forbidden);
+    std::vector<nanoseconds> cuts = cutsOf(pictures, expectation.forbidden);
+    cuts.insert(cuts.end(), expectation.cuts.begin(), expectation.cuts.end());
     const auto mayBeSevered = [&cuts](nanoseconds time) {
         return std::any_of(cuts.begin(), cuts.end(),
                            [time](nanoseconds cut) { return std::chrono::abs(time - cut) <= kSevered; });

@@ -16,6 +16,8 @@ struct SyncExpectation {
     /// Numbers drawn while the recording was paused, as for the frames: a mark or beep that such a cut may have severed
     /// from the other need not have one. The same holds at either end of the movie.
     std::vector<NumberRange> forbidden;
+    /// More such cuts, by their times: where the clips of a stream meet.
+    std::vector<std::chrono::nanoseconds> cuts = {};
     /// How many marks there must be, each with its beep, for the movie to say anything.
     std::size_t leastPairs = 1;
 };

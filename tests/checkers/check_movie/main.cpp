@@ -71,6 +71,8 @@ int main(int argc, char** argv) {
     app.add_option("--max-sync-ms", mostSync, "how far a beep may be from its marked frame")->needs(sync);
     app.add_option("--min-sync-pairs", options.sync.leastPairs, "how many marked frames with a beep there must be")
         ->needs(sync);
+    std::vector<double> cuts;
+    app.add_option("--cut-at", cuts, "seconds at which clips meet: a mark or beep there may lack the other")->needs(sync);
     app.add_option("--tone-level", options.leastLevel, "a tone or beep is at least this loud, dB");
     app.add_option("--no-tone-level", options.mostLevel, "an absent tone is at most this loud, dB");
     app.add_option("--tone-margin", options.marginSeconds, "seconds at either end in which tones aren't judged");
@@ -88,6 +90,7 @@ int main(int argc, char** argv) {
             frames.expected.insert(static_cast<std::uint32_t>(number));
     }
     if (hole->count() > 0) frames.largestHole = fromMilliseconds(largestHole);
+    for (const double seconds : cuts) options.sync.cuts.push_back(fromMilliseconds(seconds * 1000));
     options.sync.tolerance = fromMilliseconds(mostSync);
     frames.lateness = fromMilliseconds(lateness);
     options.readNumbers = !noNumbers;

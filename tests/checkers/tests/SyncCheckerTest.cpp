@@ -95,6 +95,16 @@ TEST_F(Beeps, SeveredByAPauseNeedNoMarkAndOnlyThere) {
     EXPECT_TRUE(check({.tolerance = 20ms, .forbidden = {{210, 244}}}).findings.empty());
 }
 
+TEST_F(Beeps, MayBeMissingWhereClipsMeetAndOnlyThere) {
+    SyncExpectation joined;
+    joined.cuts = {onsets_[2] + 100ms, onsets_[6] - 100ms};
+    onsets_.erase(onsets_.begin() + 6);
+    onsets_.erase(onsets_.begin() + 2);
+    EXPECT_TRUE(check(joined).findings.empty());
+    joined.cuts[1] += 300ms;
+    EXPECT_EQ(check(joined).findings.size(), 1U);
+}
+
 TEST_F(Beeps, WithoutAnyMarkSayNothing) {
     for (NumberedPicture& picture : pictures_) picture.isMarked = false;
     onsets_.clear();
