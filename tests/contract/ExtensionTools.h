@@ -5,7 +5,6 @@
 #include <condition_variable>
 #include <filesystem>
 #include <fstream>
-#include <iterator>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -37,7 +36,8 @@ inline std::size_t processesWith(const std::string& path) {
         const std::string name = entry.path().filename().string();
         if (name.find_first_not_of("0123456789") != std::string::npos) continue;
         std::ifstream file(entry.path() / "cmdline");
-        const std::string command{std::istreambuf_iterator<char>(file), {}};
+        std::string command;
+        std::getline(file, command, '\n');  // all of it; an iterator would throw when the process has just gone
         if (command.find(path) != std::string::npos) ++count;
     }
     return count;

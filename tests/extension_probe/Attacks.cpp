@@ -126,6 +126,7 @@ Outcomes attackEverything(int victim) {
     attempt("abstract-display", connectTo("/tmp/.X11-unix/X0", true, SOCK_STREAM));
     attempt("bus", connectTo("/run/dbus/system_bus_socket", false, SOCK_STREAM));
     attempt("journal", connectTo("/run/systemd/journal/socket", false, SOCK_DGRAM));
+    attempt("local-socket", ::socket(AF_UNIX, SOCK_STREAM, 0));
     attempt("datagram-pair", reconnectPair());
     attempt("packet-socket", ::socket(AF_PACKET, SOCK_RAW, 0));
     attempt("raw-socket", ::socket(AF_INET, SOCK_RAW, 1));
@@ -159,7 +160,8 @@ std::string openedAs(const std::string& path) {
             return "write";
         }
         const std::filesystem::directory_iterator entries(path, error);
-        return error ? name(error.value()) : "read";
+        if (error) return name(error.value());
+        return entries == std::filesystem::directory_iterator() ? "empty" : "read";
     }
     for (const auto& [flags, answer] : {std::pair{O_RDWR, "write"}, std::pair{O_RDONLY, "read"}}) {
         const int file = ::open(path.c_str(), flags | O_CLOEXEC);

@@ -11,7 +11,8 @@ using Outcomes = std::vector<std::pair<std::string, std::string>>;
 /// Everything that no extension may do, whatever it was granted. `victim` is a process of the same user outside.
 Outcomes attackEverything(int victim);
 
-/// "read", "write" or the error's name: what can be done with the file or folder.
+/// "read", "write" or the error's name: what can be done with the file or folder; "empty" of a folder that has nothing
+/// to read.
 std::string openedAs(const std::string& path);
 
 /// Tries to write through a descriptor that was given to be read, and to open it anew with more rights. The names of

@@ -58,7 +58,8 @@ int forkMany() {
 
 class Probe final : public IpcExportedObject, public std::enable_shared_from_this<Probe> {
 public:
-    Probe(Reactor& reactor, LinuxIpc& ipc, Log& log) : reactor_(reactor), ipc_(ipc), log_(log) {}
+    Probe(int descriptorsAtStart, Reactor& reactor, LinuxIpc& ipc, Log& log)
+        : descriptorsAtStart_(descriptorsAtStart), reactor_(reactor), ipc_(ipc), log_(log) {}
 
     void start() {
         requests_ = ipc_.adopt(Fd(kExtensionRequestsDescriptor), Peer::of(kExtensionRequestsDescriptor));
@@ -142,6 +143,7 @@ private:
             return complete(request, {textItem("socket", answer)});
         }
         if (command == "forks") return complete(request, {textItem("forks", std::to_string(forkMany()))});
+        if (command == "descriptors") return tellDescriptors(request);
         if (command == "limits") return tellLimits(request);
         if (command == "memory") return takeMemory(request);
         if (command == "garbage") {
@@ -228,6 +230,11 @@ private:
         ::close(lock);
     }
 
+    /// The descriptors that it has been started with, apart from the standard three.
+    void tellDescriptors(std::int64_t request) {
+        complete(request, {textItem("descriptors", std::to_string(descriptorsAtStart_))});
+    }
+
     void tellLimits(std::int64_t request) {
         std::vector<ExtensionItem> all;
         for (const auto& [name, which] : {std::pair("address-space", RLIMIT_AS),
@@ -257,6 +264,7 @@ private:
         std::fflush(stdout);
     }
 
+    const int descriptorsAtStart_;
     Reactor& reactor_;
     LinuxIpc& ipc_;
     Log& log_;
@@ -276,12 +284,15 @@ int main(int count, char** arguments) {
         std::printf("%d\n", probe::forkMany());
         return 0;
     }
+    int descriptors = 0;
+    for (int descriptor = 3; descriptor < 1024; ++descriptor)
+        if (::fcntl(descriptor, F_GETFD) >= 0) ++descriptors;
     Log log([](LogLevel, std::string_view line) {
         std::fprintf(stderr, "%.*s\n", static_cast<int>(line.size()), line.data());
     });
     Reactor reactor("probe");
     LinuxIpc ipc(reactor, log, {});
-    const auto probe = std::make_shared<probe::Probe>(reactor, ipc, log);
+    const auto probe = std::make_shared<probe::Probe>(descriptors, reactor, ipc, log);
     probe->start();
     reactor.run();
 }
