@@ -25,6 +25,8 @@ template <class... Fs>
 struct Overloaded : Fs... {
     using Fs::operator()...;
 };
+template <class... Fs>
+Overloaded(Fs...) -> Overloaded<Fs...>;  // clang 16 doesn't find it by itself
 
 }  // namespace
 
