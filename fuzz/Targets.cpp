@@ -10,13 +10,17 @@ namespace lumacast::fuzz {
 namespace {
 
 constexpr std::array kTargets{
+    Target{"archives", archives},
     Target{"authority_file", authorityFile},
     Target{"desktop_entry", desktopEntry},
     Target{"device_info", deviceInfo},
+    Target{"extension_items", extensionItems},
+    Target{"extension_manifest", extensionManifest},
     Target{"frames", frames},
     Target{"manifest", manifest},
     Target{"messages", messages},
     Target{"movies", movies},
+    Target{"payloads", payloads},
     Target{"preferences", preferences},
     Target{"sound_server", soundServer},
     Target{"strings_table", stringsTable},

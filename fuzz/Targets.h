@@ -22,13 +22,17 @@ std::span<const Target> targets();
 const Target& targetNamed(std::string_view name);
 
 // One file each.
+void archives(Bytes input);
 void authorityFile(Bytes input);
 void desktopEntry(Bytes input);
 void deviceInfo(Bytes input);
+void extensionItems(Bytes input);
+void extensionManifest(Bytes input);
 void frames(Bytes input);
 void manifest(Bytes input);
 void messages(Bytes input);
 void movies(Bytes input);
+void payloads(Bytes input);
 void preferences(Bytes input);
 void soundServer(Bytes input);
 void stringsTable(Bytes input);

@@ -10,8 +10,11 @@ namespace lumacast::fuzz {
 void writeSeed(const std::filesystem::path& corpora, const std::string& target, const std::string& name,
                const Data& bytes);
 
+void writeArchiveSeeds(const std::filesystem::path& corpora);
 void writeFrameSeeds(const std::filesystem::path& corpora);
+void writeItemSeeds(const std::filesystem::path& corpora);
 void writeMessageSeeds(const std::filesystem::path& corpora);
+void writePayloadSeeds(const std::filesystem::path& corpora);
 void writeSoundServerSeeds(const std::filesystem::path& corpora);
 void writeValueSeeds(const std::filesystem::path& corpora);
 

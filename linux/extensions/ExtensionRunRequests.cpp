@@ -4,7 +4,6 @@
 
 #include <utility>
 
-#include "base/Limits.h"
 #include "linux/extensions/ExtensionRun.h"
 
 namespace lumacast {
@@ -39,24 +38,14 @@ void ExtensionRun::receiveMessage(const std::shared_ptr<IpcConnection>&, std::ui
 }
 
 std::vector<ExtensionItem> ExtensionRun::itemsFrom(const Array& items) {
-    std::vector<ExtensionItem> returned;
-    std::size_t illFormed = 0;
-    for (const Value& item : items) {
-        if (returned.size() == limitOf(Limit::ExtensionItemsReturned)) {
-            services_->log.error("%s has returned more than %d items: the others are dropped", name(),
-                                 static_cast<std::int64_t>(returned.size()));
-            break;
-        }
-        auto decoded = decodeItems({item});
-        if (decoded)
-            returned.push_back(std::move(decoded->front()));
-        else
-            ++illFormed;
-    }
-    if (illFormed > 0)
+    ReturnedItems returned = returnedItems(items);
+    if (returned.isCut)
+        services_->log.error("%s has returned more than %d items: the others are dropped", name(),
+                             static_cast<std::int64_t>(returned.items.size()));
+    if (returned.illFormed > 0)
         services_->log.error("%s has returned %d items that are none: dropped", name(),
-                             static_cast<std::int64_t>(illFormed));
-    return returned;
+                             static_cast<std::int64_t>(returned.illFormed));
+    return std::move(returned.items);
 }
 
 void ExtensionRun::complete(ExtensionRequestID id, const Array& items) {

@@ -4,6 +4,8 @@
 #include <string>
 #include <utility>
 
+#include "base/Limits.h"
+
 namespace lumacast {
 
 namespace {
@@ -17,6 +19,8 @@ constexpr std::array kCancel{A::Int64, A::NullableError};
 constexpr std::array kRequestMessages{MessageDeclaration{"beginRequest:items:", kBegin, Reply::Expected, {}}};
 constexpr std::array kHostMessages{MessageDeclaration{"completeRequest:returningItems:", kBegin},
                                    MessageDeclaration{"cancelRequest:withError:", kCancel}};
+/// An item may be anything that is copied on its way: nobody's memory is kept for a process that is gone.
+constexpr std::array kItemType{A::Plain};
 constexpr Protocol kRequestProtocol{"ExtensionRequests", kRequestMessages};
 constexpr Protocol kHostProtocol{"ExtensionRequestHost", kHostMessages};
 
@@ -30,6 +34,7 @@ std::optional<ItemProvider> decodeAttachment(const Value& value) {
     const std::string* type = entries ? textIn(*entries, kType) : nullptr;
     if (!type) return std::nullopt;
     const Value* item = entries->find(kItem);
+    if (item && !matches({*item}, kItemType)) return std::nullopt;
     return ItemProvider{*type, item ? *item : Value(), std::nullopt};
 }
 
@@ -76,6 +81,21 @@ std::optional<std::vector<ExtensionItem>> decodeItems(const Array& items) {
         decoded.push_back(std::move(*item));
     }
     return decoded;
+}
+
+ReturnedItems returnedItems(const Array& items) {
+    ReturnedItems returned;
+    for (const Value& item : items) {
+        if (returned.items.size() == limitOf(Limit::ExtensionItemsReturned)) {
+            returned.isCut = true;
+            break;
+        }
+        if (auto decoded = decodeItem(item))
+            returned.items.push_back(std::move(*decoded));
+        else
+            ++returned.illFormed;
+    }
+    return returned;
 }
 
 }  // namespace lumacast

@@ -5,6 +5,7 @@
 // two protocols (and the exchange of file tokens), kExtensionAuxiliaryDescriptor the auxiliary connection, typed by
 // whoever made the request. Both speak the transport's frames; the process says hello on both when it is up.
 
+#include <cstddef>
 #include <cstdint>
 #include <optional>
 #include <string_view>
@@ -33,5 +34,13 @@ const Protocol& extensionRequestHostProtocol();
 Array encodeItems(const std::vector<ExtensionItem>& items);
 /// None for anything that is not that.
 std::optional<std::vector<ExtensionItem>> decodeItems(const Array& items);
+
+/// What an extension returns with a request it completes, as far as it is any of that.
+struct ReturnedItems {
+    std::vector<ExtensionItem> items;  ///< at most Limit::ExtensionItemsReturned
+    std::size_t illFormed = 0;         ///< were looked at and are none
+    bool isCut = false;                ///< there were more, which were not looked at
+};
+ReturnedItems returnedItems(const Array& items);
 
 }  // namespace lumacast
