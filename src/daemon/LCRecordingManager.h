@@ -164,6 +164,8 @@ public:
     // LCRecordingSessionDelegate; from any lane.
     void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
                                           const std::optional<Error>& error) override;
+    void broadcastExtensionFailed(const std::shared_ptr<LCRecordingSession>& session,
+                                  const std::shared_ptr<LCBroadcastExtensionProxy>& link, const Error& error) override;
     void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<LCRecordingSession>& session,
                                               const Value& info) override;
     /// Deliberately does nothing.
@@ -262,13 +264,17 @@ private:
     void beginRecording(const WaitingStartRef& start);
     /// Waits for the extension on the session's start queue, then goes on with broadcastEnabled.
     void enableBroadcast(const WaitingStartRef& start, std::uint64_t generation, const BroadcastInfo& info);
+    /// Ends an extension that is not wanted any more; null is none. Any lane.
+    static void endLink(LCRecordingSession& session, const std::shared_ptr<LCBroadcastExtensionProxy>& link);
     /// Whether no newer start of the session has begun. Any lane.
     static bool isNewest(const WaitingStart& start, std::uint64_t generation);
     void broadcastEnabled(const WaitingStartRef& start, std::uint64_t generation,
-                          const std::shared_ptr<LCBroadcastExtensionProxy>& link, bool microphone, bool camera);
-    void startEnabledRecording(const WaitingStartRef& start, std::uint64_t generation);
-    /// A start that its extension has not taken note of is answered with what ended the recording.
-    void answerPendingStart(const std::shared_ptr<LCRecordingSession>& session, const std::optional<Error>& error);
+                          const LCRecordingSession::BroadcastLink& link, bool microphone, bool camera);
+    void startEnabledRecording(const WaitingStartRef& start, std::uint64_t generation,
+                               const std::shared_ptr<LCBroadcastExtensionProxy>& link = nullptr);
+    /// The starts of which this is true, and that their extension has not taken note of, are answered with the error.
+    static void answerPendingStarts(LCRecordingSession& session, const Error& error,
+                                    const std::function<bool(const LCRecordingSession::ManagerRecord::PendingStart&)>& which);
     void monitorForegroundApps(const std::shared_ptr<LCRecordingSession>& session);
     /// `checkAndPlaySystemRecordSound:isRecordingOn:`
     void checkAndPlaySystemRecordSound(const LCRecordingSession& session, bool isRecordingOn);

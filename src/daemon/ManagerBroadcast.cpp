@@ -1,5 +1,7 @@
 // Setting a broadcast up, and starting one. Request lane, but for the waits on a session's start queue.
 
+#include <utility>
+
 #include "broadcast/ConfigurationArchive.h"
 #include "broadcast/ExtensionDiscovery.h"
 #include "daemon/LCRecordingManager.h"
@@ -100,17 +102,25 @@ void LCRecordingManager::enableBroadcast(const WaitingStartRef& start, std::uint
     const auto& session = start->session;
     session->setBroadcastConfiguration(info.configuration);
     session->prepareBroadcast(info.extension, info.processMode, info.userInfo);
+    session->managerRecord.startsWaiting.push_back(generation);
     session->startQueue().async([self = shared_from_this(), start, generation, info,
                                  microphone = microphoneRecording_, camera = cameraRecording_] {
-        // A newer start has taken this one's place while it waited its turn.
-        const auto link = isNewest(*start, generation)
-                              ? start->session->connectBroadcast(info.extension, info.processMode,
-                                                                 start->request.listenerEndpoint)
-                              : nullptr;
+        // A newer start may have taken this one's place while it waited its turn, or its extension. It may be of the same
+        // set-up, so the process of this one ends before that one's is launched.
+        LCRecordingSession::BroadcastLink link;
+        if (isNewest(*start, generation))
+            link = start->session->connectBroadcast(info.extension, info.processMode, start->request.listenerEndpoint);
+        if (!isNewest(*start, generation)) endLink(*start->session, std::exchange(link.proxy, nullptr));
         self->onRequestLane([self, start, generation, link, microphone, camera] {
             self->broadcastEnabled(start, generation, link, microphone, camera);
         });
     });
+}
+
+void LCRecordingManager::endLink(LCRecordingSession& session, const std::shared_ptr<LCBroadcastExtensionProxy>& link) {
+    if (!link) return;
+    link->invalidateConnection();
+    if (session.broadcastUploadExtensionProxy() == link) session.setBroadcastUploadExtensionProxy(nullptr);
 }
 
 bool LCRecordingManager::isNewest(const WaitingStart& start, std::uint64_t generation) {
@@ -118,29 +128,50 @@ bool LCRecordingManager::isNewest(const WaitingStart& start, std::uint64_t gener
 }
 
 void LCRecordingManager::broadcastEnabled(const WaitingStartRef& start, std::uint64_t generation,
-                                          const std::shared_ptr<LCBroadcastExtensionProxy>& link, bool microphone,
-                                          bool camera) {
+                                          const LCRecordingSession::BroadcastLink& link, bool microphone, bool camera) {
     const auto& session = start->session;
-    const auto failure = session->takeEnablingError();
+    std::erase(session->managerRecord.startsWaiting, generation);
     const bool isWanted = isStillWanted(*start) && session->managerRecord.startGeneration == generation;
-    if (isWanted && !failure) {
+    if (isWanted && !link.failure) {
         microphoneRecording_ = microphone;
         cameraRecording_ = camera;
         // Another start of the application has been faster.
         if (session->isRecording()) stopCurrentRecordingSessionWithHandler(*start, {});
-        return startEnabledRecording(start, generation);
+        return startEnabledRecording(start, generation, link.proxy);
     }
-    if (link) {
-        link->invalidateConnection();
-        if (session->broadcastUploadExtensionProxy() == link) session->setBroadcastUploadExtensionProxy(nullptr);
-    }
+    endLink(*session, link.proxy);
     resetStatesForSession(session, generation);
-    if (failure && isWanted) {
+    if (link.failure && isWanted) {
         logRefusal(start->number, RecordingErrorCode::InvalidBroadcastSession, "the broadcast extension has failed");
-        start->handler(*failure, false, false);
+        start->handler(*link.failure, false, false);
         return;
     }
     refuse(*start, RecordingErrorCode::FailedToStart, "the client has gone, or has started anew, meanwhile");
+}
+
+void LCRecordingManager::broadcastExtensionFailed(const std::shared_ptr<LCRecordingSession>& session,
+                                                  const std::shared_ptr<LCBroadcastExtensionProxy>& link,
+                                                  const Error& error) {
+    onRequestLane([session, link = std::weak_ptr(link), error] {
+        answerPendingStarts(*session, error, [&](const auto& start) {
+            return !start.link.owner_before(link) && !link.owner_before(start.link);
+        });
+    });
+}
+
+void LCRecordingManager::answerPendingStarts(
+    LCRecordingSession& session, const Error& error,
+    const std::function<bool(const LCRecordingSession::ManagerRecord::PendingStart&)>& which) {
+    auto& pending = session.managerRecord.pendingStarts;
+    std::vector<StartHandler> handlers;
+    std::erase_if(pending, [&](const auto& start) {
+        const auto answer = start.answer.lock();
+        if (!answer || !*answer) return true;
+        if (!which(start)) return false;
+        handlers.push_back(std::exchange(*answer, {}));
+        return true;
+    });
+    for (const auto& handler : handlers) handler(error, false, false);
 }
 
 }  // namespace lumacast

@@ -127,7 +127,8 @@ void LCRecordingManager::beginRecording(const WaitingStartRef& start) {
         false, false);
 }
 
-void LCRecordingManager::startEnabledRecording(const WaitingStartRef& start, std::uint64_t generation) {
+void LCRecordingManager::startEnabledRecording(const WaitingStartRef& start, std::uint64_t generation,
+                                               const std::shared_ptr<LCBroadcastExtensionProxy>& link) {
     const auto& session = start->session;
     const StartRequest& request = start->request;
     session->managerRecord.startConnection = start->connection;
@@ -146,7 +147,11 @@ void LCRecordingManager::startEnabledRecording(const WaitingStartRef& start, std
     frontmostSession(*session, [&](ProcessID pid) { session->setFrontmostPIDForAudioTap(pid); });
     const auto answer = std::make_shared<StartHandler>(start->handler);
     // An extension that fails before it has taken note of the start answers it.
-    if (request.broadcast) session->managerRecord.pendingStart = {generation, answer};
+    if (request.broadcast) {
+        auto& pending = session->managerRecord.pendingStarts;
+        std::erase_if(pending, [](const auto& older) { return older.answer.expired(); });
+        pending.push_back({generation, link, answer});
+    }
     session->startSessionWithHandler([self = shared_from_this(), session, answer] {
         self->checkAndPlaySystemRecordSound(*session, true);
         self->log_.line("recording session started");

@@ -28,6 +28,9 @@ void LCRecordingManager::stopRecordingSession(const std::shared_ptr<LCRecordingS
     clearCurrentBroadcastImages();
     if (!session->isRecording()) return;
     if (layoutMonitor_) layoutMonitor_->removeObserver(*this);
+    // The set-up ends with the recording, though the stop is answered later: what is started meanwhile needs its own, or it
+    // would share a process that is about to end.
+    hostBundleIDtoExtensionInfoLookup_.erase(session->bundleID());
     const std::uint64_t generation = session->managerRecord.startGeneration;
     const auto underWay = noteStopUnderWay(session, generation);
     if (!handler && !session->broadcastExtensionID()) {
@@ -63,11 +66,14 @@ std::shared_ptr<void> LCRecordingManager::noteStopUnderWay(const std::shared_ptr
 }
 
 void LCRecordingManager::resetUnansweredStops(const std::shared_ptr<LCRecordingSession>& session) {
-    const auto& underWay = session->managerRecord.stopsUnderWay;
+    // Neither one whose stop may still be answered, nor one that waits for its extension and ends by itself.
+    const auto isUnderWay = [&record = session->managerRecord](std::uint64_t generation) {
+        return std::count(record.stopsUnderWay.begin(), record.stopsUnderWay.end(), generation) > 0 ||
+               std::count(record.startsWaiting.begin(), record.startsWaiting.end(), generation) > 0;
+    };
     const auto open = session->managerRecord.openTransactions;
     for (const std::uint64_t generation : open)
-        if (std::find(underWay.begin(), underWay.end(), generation) == underWay.end())
-            resetStatesForSession(session, generation);
+        if (!isUnderWay(generation)) resetStatesForSession(session, generation);
 }
 
 void LCRecordingManager::resetAfterStop(const std::shared_ptr<LCRecordingSession>& session, std::uint64_t generation) {
@@ -78,12 +84,13 @@ void LCRecordingManager::resetAfterStop(const std::shared_ptr<LCRecordingSession
 void LCRecordingManager::resetStatesForSession(const std::shared_ptr<LCRecordingSession>& session,
                                                std::uint64_t generation) {
     log_.line("LCRecordingManager:resetStatesForSession:");
+    // What a newer start uses is not an older one's to take away.
     if (session->managerRecord.startGeneration == generation) {
         session->setRecording(false);
         session->setPaused(false);
+        // A set-up is used for one recording only.
+        hostBundleIDtoExtensionInfoLookup_.erase(session->bundleID());
     }
-    // A set-up is used for one broadcast only.
-    hostBundleIDtoExtensionInfoLookup_.erase(session->bundleID());
     if (std::erase(session->managerRecord.openTransactions, generation) > 0) endTransaction();
 }
 
@@ -104,7 +111,9 @@ void LCRecordingManager::recordingSessionStoppedWithError(const std::shared_ptr<
     // The report of an older start that arrives after a newer one is dropped.
     onRequestLane([self = shared_from_this(), session, error, start = session->startCount()] {
         if (session->startCount() != start) return;
-        self->answerPendingStart(session, error);
+        const std::uint64_t generation = session->managerRecord.startGeneration;
+        if (error)
+            answerPendingStarts(*session, *error, [&](const auto& pending) { return pending.generation == generation; });
         self->recordingSessionStoppedWithError(session, error, std::nullopt);
         // Deliberately it stays where it is: only a recording that another one takes the place of goes to the library.
         const auto proxy = session->clientProxy();
@@ -119,14 +128,6 @@ void LCRecordingManager::recordingSessionStoppedWithError(const std::shared_ptr<
         if (std::none_of(sessions.begin(), sessions.end(), [](const auto& s) { return s.second->isRecording(); }))
             self->services_.captureManager.stopAppAudioCapture();
     });
-}
-
-void LCRecordingManager::answerPendingStart(const std::shared_ptr<LCRecordingSession>& session,
-                                            const std::optional<Error>& error) {
-    const auto pending = std::exchange(session->managerRecord.pendingStart, {});
-    if (!error || pending.generation != session->managerRecord.startGeneration) return;
-    const auto answer = pending.answer.lock();
-    if (const auto handler = answer ? std::exchange(*answer, {}) : StartHandler()) handler(error, false, false);
 }
 
 void LCRecordingManager::recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,

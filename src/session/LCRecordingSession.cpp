@@ -212,12 +212,13 @@ void LCRecordingSession::finishSessionWithStartClipDuration(double startClipDura
     lastSampleTimestamp_.set(kInvalidMediaTime);
     sampleTimeOffset_.set(kZeroMediaTime);
     if (broadcastProcessMode_ == static_cast<std::int64_t>(BroadcastProcessMode::SampleBuffers)) {
-        _notifyExtensionOfAction(ExtensionAction::Finish, [weak = weak_from_this(), handler = std::move(handler)] {
+        // The link stays until the extension has answered, though a newer broadcast may have a link of its own by then.
+        _notifyExtensionOfAction(ExtensionAction::Finish, [weak = weak_from_this(), link = broadcastUploadExtensionProxy(),
+                                                           handler = std::move(handler)] {
             handler(std::nullopt, std::nullopt);
+            if (link) link->invalidateConnection();
             const auto self = weak.lock();
-            if (!self) return;
-            if (const auto proxy = self->broadcastUploadExtensionProxy()) proxy->invalidateConnection();
-            self->setBroadcastUploadExtensionProxy(nullptr);
+            if (self && self->broadcastUploadExtensionProxy() == link) self->setBroadcastUploadExtensionProxy(nullptr);
         });
     } else if (broadcastProcessMode_ == static_cast<std::int64_t>(BroadcastProcessMode::MovieClips)) {
         finishMovie(startClipDuration, endClipDuration, std::move(handler));

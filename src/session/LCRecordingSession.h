@@ -194,17 +194,19 @@ public:
     std::int64_t enableBroadcastWithExtension(std::shared_ptr<AppExtension> extension, std::int64_t mode,
                                               std::optional<Dictionary> userInfo,
                                               const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
+    /// What came of connecting to an extension.
+    struct BroadcastLink {
+        std::shared_ptr<LCBroadcastExtensionProxy> proxy;  ///< null in movie-clip mode
+        std::optional<Error> failure;                      ///< the extension's, that ended the wait
+    };
     /// Its two halves: what the session is from now on, on the request lane, and the connection, which may wait, on the
-    /// start queue. Answers the link that it made; null in movie-clip mode.
+    /// start queue.
     void prepareBroadcast(std::shared_ptr<AppExtension> extension, std::int64_t mode,
                           std::optional<Dictionary> userInfo);
-    std::shared_ptr<LCBroadcastExtensionProxy> connectBroadcast(std::shared_ptr<AppExtension> extension,
-                                                                std::int64_t mode,
-                                                                const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
+    BroadcastLink connectBroadcast(std::shared_ptr<AppExtension> extension, std::int64_t mode,
+                                   const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
     /// Ends the wait of an enabling under way, if there is one. Any lane.
     void endWaitForExtension();
-    /// The extension's failure that ended the last enabling; none the next time.
-    std::optional<Error> takeEnablingError();
     /// Where broadcasts are enabled.
     SerialQueue& startQueue() { return *startQueue_; }
     /// `disableBroadcast` — the link to the extension is left as it is.
@@ -258,11 +260,14 @@ public:
         std::optional<UserID> user;                    ///< whose client began the last recording
         /// The start whose broadcast may be enabled: the newest. Read on the start queue too.
         std::atomic<std::uint64_t> broadcastGeneration{0};
-        /// The start of a broadcast whose extension has not taken note of it yet.
+        std::vector<std::uint64_t> startsWaiting;  ///< the starts that wait for their extension
+        /// A start of a broadcast whose extension has not taken note of it yet. The answer ends with the extension's note.
         struct PendingStart {
             std::uint64_t generation = 0;
+            std::weak_ptr<LCBroadcastExtensionProxy> link;
             std::weak_ptr<std::function<void(std::optional<Error>, bool, bool)>> answer;
-        } pendingStart;
+        };
+        std::vector<PendingStart> pendingStarts;
         DisplayCaptureSource::Counters countersBefore;  ///< the capture source's when the last recording began
 
         bool hasTransactionOf(std::uint64_t generation) const {
@@ -296,8 +301,8 @@ private:
     /// `startWritingHandler:` or the extension's start, then the continuation on the request lane.
     void startWriter(Size size, Handler continuation);
     struct ExtensionWait;
-    std::shared_ptr<LCBroadcastExtensionProxy> connectToExtension(std::shared_ptr<AppExtension> extension);
-    std::shared_ptr<LCBroadcastExtensionProxy> connectToListeningExtension(
+    BroadcastLink connectToExtension(std::shared_ptr<AppExtension> extension);
+    BroadcastLink connectToListeningExtension(
         const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
     void installHandlers(LCBroadcastExtensionProxy& proxy, const std::shared_ptr<ExtensionWait>& wait);
     void extensionFailed(const std::shared_ptr<LCBroadcastExtensionProxy>& proxy, const Error& error);
@@ -372,7 +377,6 @@ private:
     /// Changes under movieWriter_'s lock: the movie's end is asked for, and no clip is cut any more.
     bool movieIsFinishing_ = false;
     Guarded<std::shared_ptr<ExtensionWait>> extensionWait_;  ///< under way
-    Guarded<std::optional<Error>> enablingError_;
     std::int64_t chipId_ = 0;
 
     /// None at first: an application that comes back can discard what it left, but not what a writer still has.

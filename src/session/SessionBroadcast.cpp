@@ -46,24 +46,23 @@ void LCRecordingSession::prepareBroadcast(std::shared_ptr<AppExtension> extensio
     bundleIDOfFirstForegroundApp_.set(std::nullopt);
 }
 
-std::shared_ptr<LCBroadcastExtensionProxy> LCRecordingSession::connectBroadcast(
+LCRecordingSession::BroadcastLink LCRecordingSession::connectBroadcast(
     std::shared_ptr<AppExtension> extension, std::int64_t mode, const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
-    if (!isSampleBuffers(mode)) return nullptr;
+    if (!isSampleBuffers(mode)) return {};
     log_.line("setting up extension proxy");
     return listenerEndpoint ? connectToListeningExtension(listenerEndpoint) : connectToExtension(std::move(extension));
 }
 
-std::shared_ptr<LCBroadcastExtensionProxy> LCRecordingSession::connectToListeningExtension(
+LCRecordingSession::BroadcastLink LCRecordingSession::connectToListeningExtension(
     const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
     const auto proxy = LCBroadcastExtensionProxy::initWithBroadcastUploadListenerEndpoint(
         services_.platform, services_.errors, listenerEndpoint);
     installHandlers(*proxy, std::make_shared<ExtensionWait>(services_.platform.scheduler));
     setBroadcastUploadExtensionProxy(proxy);
-    return proxy;
+    return {proxy, std::nullopt};
 }
 
-std::shared_ptr<LCBroadcastExtensionProxy> LCRecordingSession::connectToExtension(
-    std::shared_ptr<AppExtension> extension) {
+LCRecordingSession::BroadcastLink LCRecordingSession::connectToExtension(std::shared_ptr<AppExtension> extension) {
     const auto proxy = LCBroadcastExtensionProxy::initWithBroadcastUploadExtension(services_.platform, services_.errors,
                                                                                    std::move(extension));
     const auto wait = std::make_shared<ExtensionWait>(services_.platform.scheduler);
@@ -84,8 +83,7 @@ std::shared_ptr<LCBroadcastExtensionProxy> LCRecordingSession::connectToExtensio
     extensionWait_.update([&](std::shared_ptr<ExtensionWait>& current) {
         if (current == wait) current = nullptr;
     });
-    enablingError_.set(wait->error.get());
-    return proxy;
+    return {proxy, wait->error.get()};
 }
 
 void LCRecordingSession::installHandlers(LCBroadcastExtensionProxy& proxy, const std::shared_ptr<ExtensionWait>& wait) {
@@ -101,6 +99,8 @@ void LCRecordingSession::installHandlers(LCBroadcastExtensionProxy& proxy, const
         const auto self = weak.lock();
         const auto failed = weakProxy.lock();
         if (self && failed) self->extensionFailed(failed, error);
+        // What waits for the extension's answer keeps the link, which ends with this.
+        if (!self && failed) failed->invalidateConnection();
         wait->error.set(error);
         wait->semaphore->signal();
     });
@@ -110,18 +110,14 @@ void LCRecordingSession::extensionFailed(const std::shared_ptr<LCBroadcastExtens
     const bool isCurrent = broadcastUploadExtensionProxy() == proxy;
     // What an older broadcast's extension reports ends nothing that came after it.
     if (isCurrent && isSampleBuffers(broadcastProcessMode_)) stopRecordingWithNotification(true, error);
+    if (const auto delegate = delegate_.get().lock())
+        delegate->broadcastExtensionFailed(shared_from_this(), proxy, error);
     proxy->invalidateConnection();
     if (isCurrent) setBroadcastUploadExtensionProxy(nullptr);
 }
 
 void LCRecordingSession::endWaitForExtension() {
     if (const auto wait = extensionWait_.get()) wait->semaphore->signal();
-}
-
-std::optional<Error> LCRecordingSession::takeEnablingError() {
-    std::optional<Error> error;
-    enablingError_.update([&](std::optional<Error>& kept) { kept.swap(error); });
-    return error;
 }
 
 void LCRecordingSession::disableBroadcast() {

@@ -1,8 +1,6 @@
 // Broadcasts as a client sees them: setting one up, starting it, its clips and samples, and what goes wrong.
 
-#include "broadcast/ConfigurationArchive.h"
-#include "tests/fakes/FakeUploader.h"
-#include "tests/unit/daemon/DaemonWorld.h"
+#include "tests/unit/daemon/BroadcastWorld.h"
 
 namespace lumacast {
 namespace {
@@ -10,54 +8,7 @@ namespace {
 using std::chrono::milliseconds;
 using std::chrono::seconds;
 
-class Broadcast : public DaemonWorld {
-protected:
-    void install(bool takesSamples, const std::string& identifier = "org.example.Uploader.upload") {
-        fakes_.appExtensions.install(uploadExtension(plan_, takesSamples, identifier));
-    }
-    Data configuration(double clipDuration) {
-        return *archiveOf(fakes_.keyedArchive, {clipDuration, Dictionary{{"AverageBitRate", 900000}}});
-    }
-    TestClient::AskedRef setUp(TestClient& client, const std::string& extension = "org.example.Uploader.setup",
-                               const Data& archive = {}, const Value& userInfo = Dictionary{{"title", "Game night"}},
-                               const std::string& host = {}) {
-        auto asked = client.ask(DaemonMessage::SetupBroadcast,
-                                {host.empty() ? client.id.text() : host, extension, archive, userInfo});
-        settle();
-        return asked;
-    }
-    TestClient::AskedRef startBroadcast(TestClient& client) {
-        auto asked = client.start({client.window}, {.broadcast = true});
-        settle();
-        return asked;
-    }
-    /// A client that broadcasts.
-    std::unique_ptr<TestClient> makeBroadcasting(bool samples) {
-        install(samples);
-        auto client = makeConnected();
-        EXPECT_EQ(setUp(*client)->answers, 1);
-        const auto start = startBroadcast(*client);
-        EXPECT_EQ(start->answers, 1);
-        EXPECT_EQ(start->code(), 0);
-        fakes_.logSink.clear();
-        return client;
-    }
-    std::shared_ptr<FakeAppExtension> extension() {
-        const auto all = fakes_.appExtensions.extensions();
-        return all.empty() ? nullptr : all.back();
-    }
-    Lines movies() {
-        Lines all = fakes_.fileSystem.files();
-        std::erase_if(all, [](const std::string& path) { return !path.ends_with(".mp4"); });
-        return all;
-    }
-    int toldOf(const TestClient& client, ClientMessage message) {
-        return static_cast<int>(std::count_if(client.told.begin(), client.told.end(),
-                                              [&](const auto& told) { return told.message == message; }));
-    }
-
-    const std::shared_ptr<UploaderPlan> plan_ = std::make_shared<UploaderPlan>();
-};
+class Broadcast : public BroadcastWorld {};
 
 TEST_F(Broadcast, IsSetUpForItsHostWithWhatTheClientGave) {
     install(true);
@@ -231,111 +182,6 @@ TEST_F(Broadcast, WhatTheExtensionReportsReachesTheClient) {
     settle();
     EXPECT_EQ(toldOf(*client, ClientMessage::UpdateBroadcastServiceInfo), 1);
     EXPECT_EQ(toldOf(*client, ClientMessage::UpdateBroadcastURL), 1);
-}
-
-TEST_F(Broadcast, AnExtensionThatNeverPingsHoldsUpItsOwnStartAlone) {
-    plan_->pings = 0;
-    install(true);
-    const auto client = makeConnected();
-    setUp(*client);
-    const auto waiting = startBroadcast(*client);
-    advance(seconds(100));
-    EXPECT_EQ(waiting->answers, 0);
-    // Others are served: they ask, record and stop.
-    const auto other = makeRecording("Editor", 600, 9);
-    const auto stop = other->ask(DaemonMessage::StopRecording);
-    settle();
-    EXPECT_EQ(stop->answers, 1);
-    EXPECT_EQ(waiting->answers, 0);
-    plan_->tell(BroadcastDaemonMessage::Ping);
-    settle();
-    ASSERT_EQ(waiting->answers, 1);
-    EXPECT_EQ(waiting->code(), 0);
-}
-
-TEST_F(Broadcast, TheWaitForAPingEndsWithTheClient) {
-    plan_->pings = 0;
-    install(true);
-    auto client = makeConnected();
-    setUp(*client);
-    startBroadcast(*client);
-    EXPECT_EQ(fakes_.keepAlive.open(), 1);
-    client->die();
-    settle();
-    EXPECT_EQ(fakes_.keepAlive.open(), 0);
-    EXPECT_TRUE(fakes_.appExtensions.extensions().empty() || !extension()->isRunning());
-}
-
-TEST_F(Broadcast, ANewerStartOfTheApplicationEndsTheWaitAndRefusesTheOlderOne) {
-    plan_->pings = 0;
-    install(true);
-    const auto client = makeConnected();
-    setUp(*client);
-    const auto waiting = startBroadcast(*client);
-    const auto newer = client->start();
-    settle();
-    ASSERT_EQ(waiting->answers, 1);
-    EXPECT_EQ(waiting->code(), -5803);
-    ASSERT_EQ(newer->answers, 1);
-    EXPECT_EQ(newer->code(), 0);
-    EXPECT_TRUE(session(*client)->isRecording());
-    EXPECT_FALSE(session(*client)->isBroadcasting());
-    EXPECT_FALSE(session(*client)->broadcastUploadExtensionProxy());
-    EXPECT_EQ(session(*client)->broadcastProcessMode(), 0);
-    EXPECT_EQ(fakes_.keepAlive.open(), 1);
-    // The older one's extension has gone, and nothing of it ends the newer recording.
-    for (const auto& one : fakes_.appExtensions.extensions()) EXPECT_FALSE(one->isRunning());
-    advance(seconds(30));
-    EXPECT_TRUE(session(*client)->isRecording());
-}
-
-TEST_F(Broadcast, AnExtensionThatNeverAnswersTheFinishEndsNothingThatComesAfterIt) {
-    const auto client = makeBroadcasting(true);
-    plan_->completesPayloads = false;
-    const auto stop = client->ask(DaemonMessage::StopRecording);
-    settle();
-    EXPECT_EQ(stop->answers, 0);
-    const auto start = client->start();
-    settle();
-    EXPECT_EQ(start->code(), 0);
-    advance(seconds(30));  // it is given up meanwhile
-    EXPECT_EQ(extension()->signals(), std::vector<int>{9});
-    EXPECT_TRUE(session(*client)->isRecording());
-    EXPECT_EQ(client->toldOfStop(-5808), 0);
-}
-
-TEST_F(Broadcast, AnExtensionThatDiesBeforeItsPingAnswersTheStartWithItsError) {
-    plan_->diesBeforePing = true;
-    install(true);
-    const auto client = makeConnected();
-    setUp(*client);
-    const auto start = startBroadcast(*client);
-    ASSERT_EQ(start->answers, 1);
-    EXPECT_EQ(start->code(), -5808);
-    EXPECT_EQ(fakes_.keepAlive.open(), 0);
-    EXPECT_FALSE(session(*client)->isRecording());
-    EXPECT_FALSE(session(*client)->broadcastUploadExtensionProxy());
-    // The next one works.
-    plan_->diesBeforePing = false;
-    setUp(*client);
-    EXPECT_EQ(startBroadcast(*client)->code(), 0);
-}
-
-TEST_F(Broadcast, AnExtensionThatDiesBeforeItTookNoteOfTheStartAnswersItWithItsError) {
-    plan_->completesPayloads = false;
-    install(true);
-    const auto client = makeConnected();
-    setUp(*client);
-    const auto start = startBroadcast(*client);
-    EXPECT_EQ(start->answers, 0);
-    EXPECT_TRUE(session(*client)->isRecording());
-    extension()->crash();
-    settle();
-    ASSERT_EQ(start->answers, 1);
-    EXPECT_EQ(start->code(), -5808);
-    EXPECT_EQ(client->toldOfStop(-5808), 1);
-    EXPECT_FALSE(session(*client)->isRecording());
-    EXPECT_EQ(fakes_.keepAlive.open(), 0);
 }
 
 TEST_F(Broadcast, AnExtensionThatCannotBeLaunchedMakesAPlainMovieOfIt) {

@@ -22,6 +22,8 @@ public:
         wasOnWhenTold |= session->isRecording() || session->isBroadcasting();
         stops.push_back(error ? error->code() : 0);
     }
+    void broadcastExtensionFailed(const std::shared_ptr<LCRecordingSession>&,
+                                  const std::shared_ptr<LCBroadcastExtensionProxy>&, const Error&) override {}
     void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<LCRecordingSession>&, const Value& info) override {
         infos.push_back(info);
     }
