@@ -165,10 +165,9 @@ void LCRecordingManager::answerPendingStarts(
     auto& pending = session.managerRecord.pendingStarts;
     std::vector<StartHandler> handlers;
     std::erase_if(pending, [&](const auto& start) {
-        const auto answer = start.answer.lock();
-        if (!answer || !*answer) return true;
+        if (!*start.answer) return true;
         if (!which(start)) return false;
-        handlers.push_back(std::exchange(*answer, {}));
+        handlers.push_back(std::exchange(*start.answer, {}));
         return true;
     });
     for (const auto& handler : handlers) handler(error, false, false);

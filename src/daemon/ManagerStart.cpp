@@ -149,7 +149,7 @@ void LCRecordingManager::startEnabledRecording(const WaitingStartRef& start, std
     // An extension that fails before it has taken note of the start answers it.
     if (request.broadcast) {
         auto& pending = session->managerRecord.pendingStarts;
-        std::erase_if(pending, [](const auto& older) { return older.answer.expired(); });
+        std::erase_if(pending, [](const auto& older) { return !*older.answer; });
         pending.push_back({generation, link, answer});
     }
     session->startSessionWithHandler([self = shared_from_this(), session, answer] {

@@ -261,11 +261,11 @@ public:
         /// The start whose broadcast may be enabled: the newest. Read on the start queue too.
         std::atomic<std::uint64_t> broadcastGeneration{0};
         std::vector<std::uint64_t> startsWaiting;  ///< the starts that wait for their extension
-        /// A start of a broadcast whose extension has not taken note of it yet. The answer ends with the extension's note.
+        /// A start of a broadcast whose extension has not taken note of it yet; its answer is empty when it was given.
         struct PendingStart {
             std::uint64_t generation = 0;
             std::weak_ptr<LCBroadcastExtensionProxy> link;
-            std::weak_ptr<std::function<void(std::optional<Error>, bool, bool)>> answer;
+            std::shared_ptr<std::function<void(std::optional<Error>, bool, bool)>> answer;
         };
         std::vector<PendingStart> pendingStarts;
         DisplayCaptureSource::Counters countersBefore;  ///< the capture source's when the last recording began

@@ -99,8 +99,6 @@ void LCRecordingSession::installHandlers(LCBroadcastExtensionProxy& proxy, const
         const auto self = weak.lock();
         const auto failed = weakProxy.lock();
         if (self && failed) self->extensionFailed(failed, error);
-        // What waits for the extension's answer keeps the link, which ends with this.
-        if (!self && failed) failed->invalidateConnection();
         wait->error.set(error);
         wait->semaphore->signal();
     });
