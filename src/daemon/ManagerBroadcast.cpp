@@ -131,8 +131,9 @@ void LCRecordingManager::broadcastEnabled(const WaitingStartRef& start, std::uin
                                           const LCRecordingSession::BroadcastLink& link, bool microphone, bool camera) {
     const auto& session = start->session;
     std::erase(session->managerRecord.startsWaiting, generation);
+    const auto failure = link.failure();
     const bool isWanted = isStillWanted(*start) && session->managerRecord.startGeneration == generation;
-    if (isWanted && !link.failure) {
+    if (isWanted && !failure) {
         microphoneRecording_ = microphone;
         cameraRecording_ = camera;
         // Another start of the application has been faster.
@@ -141,9 +142,9 @@ void LCRecordingManager::broadcastEnabled(const WaitingStartRef& start, std::uin
     }
     endLink(*session, link.proxy);
     resetStatesForSession(session, generation);
-    if (link.failure && isWanted) {
+    if (failure && isWanted) {
         logRefusal(start->number, RecordingErrorCode::InvalidBroadcastSession, "the broadcast extension has failed");
-        start->handler(*link.failure, false, false);
+        start->handler(*failure, false, false);
         return;
     }
     refuse(*start, RecordingErrorCode::FailedToStart, "the client has gone, or has started anew, meanwhile");

@@ -197,7 +197,9 @@ public:
     /// What came of connecting to an extension.
     struct BroadcastLink {
         std::shared_ptr<LCBroadcastExtensionProxy> proxy;  ///< null in movie-clip mode
-        std::optional<Error> failure;                      ///< the extension's, that ended the wait
+        /// The extension's, that ended the wait or came since. Null when nothing was connected.
+        std::shared_ptr<const Guarded<std::optional<Error>>> error;
+        std::optional<Error> failure() const { return error ? error->get() : std::nullopt; }
     };
     /// Its two halves: what the session is from now on, on the request lane, and the connection, which may wait, on the
     /// start queue.

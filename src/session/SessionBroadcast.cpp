@@ -19,7 +19,8 @@ bool isSampleBuffers(std::int64_t mode) { return mode == static_cast<std::int64_
 struct LCRecordingSession::ExtensionWait {
     explicit ExtensionWait(Scheduler& scheduler) : semaphore(scheduler.semaphore(0)) {}
     const std::unique_ptr<Semaphore> semaphore;
-    Guarded<std::optional<Error>> error;  ///< the extension's failure that ended it
+    /// The extension's failure that ended it, or came later.
+    const std::shared_ptr<Guarded<std::optional<Error>>> error = std::make_shared<Guarded<std::optional<Error>>>();
 };
 
 std::optional<BundleIdentifier> LCRecordingSession::broadcastExtensionID() const {
@@ -57,9 +58,10 @@ LCRecordingSession::BroadcastLink LCRecordingSession::connectToListeningExtensio
     const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
     const auto proxy = LCBroadcastExtensionProxy::initWithBroadcastUploadListenerEndpoint(
         services_.platform, services_.errors, listenerEndpoint);
-    installHandlers(*proxy, std::make_shared<ExtensionWait>(services_.platform.scheduler));
+    const auto wait = std::make_shared<ExtensionWait>(services_.platform.scheduler);
+    installHandlers(*proxy, wait);
     setBroadcastUploadExtensionProxy(proxy);
-    return {proxy, std::nullopt};
+    return {proxy, wait->error};
 }
 
 LCRecordingSession::BroadcastLink LCRecordingSession::connectToExtension(std::shared_ptr<AppExtension> extension) {
@@ -83,7 +85,7 @@ LCRecordingSession::BroadcastLink LCRecordingSession::connectToExtension(std::sh
     extensionWait_.update([&](std::shared_ptr<ExtensionWait>& current) {
         if (current == wait) current = nullptr;
     });
-    return {proxy, wait->error.get()};
+    return {proxy, wait->error};
 }
 
 void LCRecordingSession::installHandlers(LCBroadcastExtensionProxy& proxy, const std::shared_ptr<ExtensionWait>& wait) {
@@ -99,7 +101,7 @@ void LCRecordingSession::installHandlers(LCBroadcastExtensionProxy& proxy, const
         const auto self = weak.lock();
         const auto failed = weakProxy.lock();
         if (self && failed) self->extensionFailed(failed, error);
-        wait->error.set(error);
+        wait->error->set(error);
         wait->semaphore->signal();
     });
 }
