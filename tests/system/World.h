@@ -47,6 +47,8 @@ public:
     bool waitForFrame(std::uint32_t number);
     /// The next event line, waiting for it; empty when none comes.
     std::string nextEvent();
+    /// Passes over the events that came with the answers so far.
+    void forgetEvents() { events_.clear(); }
     /// Stops the recording; the movie's path, empty after a failure.
     std::string stop(const std::string& command = "stop");
 
