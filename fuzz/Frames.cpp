@@ -21,25 +21,6 @@ namespace lumacast::fuzz {
 
 namespace {
 
-void send(int socket, Bytes bytes, const std::vector<int>& descriptors) {
-    iovec part{const_cast<std::uint8_t*>(bytes.data()), bytes.size()};
-    alignas(cmsghdr) std::array<char, CMSG_SPACE(16 * sizeof(int))> control{};
-    msghdr message{};
-    message.msg_iov = &part;
-    message.msg_iovlen = 1;
-    if (!descriptors.empty()) {
-        message.msg_control = control.data();
-        message.msg_controllen = CMSG_SPACE(descriptors.size() * sizeof(int));
-        cmsghdr* header = CMSG_FIRSTHDR(&message);
-        header->cmsg_level = SOL_SOCKET;
-        header->cmsg_type = SCM_RIGHTS;
-        header->cmsg_len = CMSG_LEN(descriptors.size() * sizeof(int));
-        std::memcpy(CMSG_DATA(header), descriptors.data(), descriptors.size() * sizeof(int));
-    }
-    if (::sendmsg(socket, &message, MSG_NOSIGNAL) != static_cast<ssize_t>(bytes.size()))
-        throw std::runtime_error("a piece can't be sent");
-}
-
 class Lender final : public PlaneLender {
 public:
     void giveBack(std::uint64_t) override { ++given; }
@@ -134,7 +115,7 @@ Reading readAll(const std::vector<Piece>& pieces, Cut cut) {
     for (const Piece& piece : pieces) total += piece.bytes.size();
     const std::size_t crumb = 1 + total / 128;  // single bytes of a short script, and never many system calls
     const auto turn = [&](Bytes bytes, const std::vector<int>& descriptors) {
-        send(theirs.get(), bytes, descriptors);
+        if (!sendTo(theirs.get(), bytes, descriptors)) throw std::runtime_error("a piece can't be sent");
         sent += bytes.size();
         const auto received = incoming.receive(ours.get(), scratch);
         if (received != IncomingFrames::Received::Bytes) return false;
@@ -186,11 +167,6 @@ bool isWellBehaved(const std::vector<Piece>& pieces) {
         begin = end;
     }
     return std::all_of(piece, pieces.end(), [](const Piece& rest) { return rest.descriptors.empty(); });
-}
-
-/// The lowest free number: it grows with every descriptor that is not given back.
-int nextDescriptor() {
-    return Fd(::open("/dev/null", O_RDONLY | O_CLOEXEC)).get();
 }
 
 void checkHellos(const std::vector<Piece>& pieces) {

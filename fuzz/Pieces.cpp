@@ -6,6 +6,8 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
+#include <cstring>
 
 #include "linux/ipc/Frames.h"
 
@@ -34,6 +36,26 @@ Fd Wares::memory(off_t size, int seals) {
     if (::ftruncate(file.get(), size) != 0 || ::fcntl(file.get(), F_ADD_SEALS, seals) != 0) return Fd();
     return file;
 }
+
+bool sendTo(int socket, Bytes bytes, const std::vector<int>& descriptors) {
+    iovec part{const_cast<std::uint8_t*>(bytes.data()), bytes.size()};
+    alignas(cmsghdr) std::array<char, CMSG_SPACE(16 * sizeof(int))> control{};
+    msghdr message{};
+    message.msg_iov = &part;
+    message.msg_iovlen = 1;
+    if (!descriptors.empty()) {
+        message.msg_control = control.data();
+        message.msg_controllen = CMSG_SPACE(descriptors.size() * sizeof(int));
+        cmsghdr* header = CMSG_FIRSTHDR(&message);
+        header->cmsg_level = SOL_SOCKET;
+        header->cmsg_type = SCM_RIGHTS;
+        header->cmsg_len = CMSG_LEN(descriptors.size() * sizeof(int));
+        std::memcpy(CMSG_DATA(header), descriptors.data(), descriptors.size() * sizeof(int));
+    }
+    return ::sendmsg(socket, &message, MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
+}
+
+int nextDescriptor() { return Fd(::open("/dev/null", O_RDONLY | O_CLOEXEC)).get(); }
 
 std::vector<Piece> piecesOf(Input in, const Wares& wares) {
     std::vector<Piece> pieces;

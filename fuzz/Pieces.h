@@ -37,4 +37,10 @@ struct Piece {
 /// byte: kind, byte: descriptors declared, byte: bytes of the records at the end, byte: message, of a message).
 std::vector<Piece> piecesOf(Input in, const Wares& wares);
 
+/// Sends bytes in one go, with copies of descriptors, 16 at most. False when the socket does not take them.
+bool sendTo(int socket, Bytes bytes, const std::vector<int>& descriptors);
+
+/// The lowest free number: it grows with every descriptor that is not given back.
+int nextDescriptor();
+
 }  // namespace lumacast::fuzz

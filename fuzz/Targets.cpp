@@ -12,6 +12,8 @@ namespace {
 constexpr std::array kTargets{
     Target{"archives", archives},
     Target{"authority_file", authorityFile},
+    Target{"broadcast_settings", broadcastSettings},
+    Target{"connections", connections},
     Target{"desktop_entry", desktopEntry},
     Target{"device_info", deviceInfo},
     Target{"extension_items", extensionItems},

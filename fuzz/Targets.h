@@ -24,6 +24,8 @@ const Target& targetNamed(std::string_view name);
 // One file each.
 void archives(Bytes input);
 void authorityFile(Bytes input);
+void broadcastSettings(Bytes input);
+void connections(Bytes input);
 void desktopEntry(Bytes input);
 void deviceInfo(Bytes input);
 void extensionItems(Bytes input);

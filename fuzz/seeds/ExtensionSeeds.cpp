@@ -79,6 +79,35 @@ void writeItemSeeds(const std::filesystem::path& corpora) {
     write("recipe", Data{2, 3, 0, 1, 1, 1, 1, 5, 4, 1, 2, 3, 4, 0, 0, 1, 1, 2, 0, 0, 1, 1, 10, 1, 1, 'k', 0, 1, 0});
 }
 
+void writeSettingsSeeds(const std::filesystem::path& corpora) {
+    const auto write = [&](const char* name, const Dictionary& info) {
+        WireBody body;
+        if (!encode(info, body)) throw std::logic_error("a seed is over a limit");
+        Data bytes{0};
+        append(bytes, body.bytes);
+        writeSeed(corpora, "broadcast_settings", name, bytes);
+    };
+    write("folder", {{"directory", "/srv/hls"}, {"keep", 6}, {"clipDuration", 2.5}});
+    write("upload", {{"url", "https://example.org/live/"},
+                     {"viewURL", URL("https://example.org/watch")},
+                     {"keep", "12"},
+                     {"compression", Dictionary{{"AverageBitRate", 800'000}}}});
+    write("push", {{"url", "rtmp://example.org/live"},
+                   {"width", 1280},
+                   {"height", "720"},
+                   {"bitRate", 2.5e6},
+                   {"giveUpAfter", std::uint64_t{30}}});
+    write("srt", {{"url", URL("srt://example.org:9000")}});
+    write("odd",
+          {{"directory", ""}, {"url", 7}, {"keep", -1}, {"clipDuration", "1e999"}, {"width", 65}, {"compression", 1}});
+    const auto recipe = [&](const char* name, const Data& bytes) {
+        writeSeed(corpora, "broadcast_settings", name, bytes);
+    };
+    recipe("recipe-folder", Data{1, 1, 0, 3, '/', 'a', 'b', 0, 0, 0, 0, 1, 1, 9, 0, 1, 1, 40, 2, 0, 0, 0, 0, 0});
+    recipe("recipe-push",
+           Data{1, 0, 1, 2, 3, 'a', '/', 'b', 0, 0, 0, 0, 0, 1, 1, 99, 0, 1, 1, 88, 3, 0, 1, 1, 5, 2, 0});
+}
+
 void writePayloadSeeds(const std::filesystem::path& corpora) {
     const auto write = [&](const char* name, const Data& bytes) { writeSeed(corpora, "payloads", name, bytes); };
     const std::string type(kPayloadSampleType), time(kPayloadTimingInfo);

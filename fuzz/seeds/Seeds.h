@@ -11,10 +11,12 @@ void writeSeed(const std::filesystem::path& corpora, const std::string& target, 
                const Data& bytes);
 
 void writeArchiveSeeds(const std::filesystem::path& corpora);
+void writeConversationSeeds(const std::filesystem::path& corpora);
 void writeFrameSeeds(const std::filesystem::path& corpora);
 void writeItemSeeds(const std::filesystem::path& corpora);
 void writeMessageSeeds(const std::filesystem::path& corpora);
 void writePayloadSeeds(const std::filesystem::path& corpora);
+void writeSettingsSeeds(const std::filesystem::path& corpora);
 void writeSoundServerSeeds(const std::filesystem::path& corpora);
 void writeValueSeeds(const std::filesystem::path& corpora);
 

@@ -14,10 +14,12 @@ int main(int argc, char** argv) {
     }
     try {
         lumacast::fuzz::writeArchiveSeeds(argv[1]);
+        lumacast::fuzz::writeConversationSeeds(argv[1]);
         lumacast::fuzz::writeFrameSeeds(argv[1]);
         lumacast::fuzz::writeItemSeeds(argv[1]);
         lumacast::fuzz::writeMessageSeeds(argv[1]);
         lumacast::fuzz::writePayloadSeeds(argv[1]);
+        lumacast::fuzz::writeSettingsSeeds(argv[1]);
         lumacast::fuzz::writeSoundServerSeeds(argv[1]);
         lumacast::fuzz::writeValueSeeds(argv[1]);
     } catch (const std::exception& error) {

@@ -305,7 +305,7 @@ TEST_P(ExtensionSandboxTest, ItemsThatAreNoneAreDroppedAndTheOthersStay) {
     ASSERT_EQ(items.size(), 2u);
     EXPECT_EQ(items[0].attributedTitle, "good");
     EXPECT_EQ(items[1].attributedTitle, "also good");
-    EXPECT_EQ(world_->linesWith("has returned 4 items that are none"), 1u);
+    EXPECT_EQ(world_->linesWith("has returned 5 items that are none"), 1u);
 }
 
 TEST_P(ExtensionSandboxTest, WhoBreaksTheTransportsRulesIsEndedAlone) {

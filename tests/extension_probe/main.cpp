@@ -22,6 +22,7 @@
 #include "linux/ipc/LinuxIpc.h"
 #include "linux/ipc/Reactor.h"
 #include "tests/extension_probe/Attacks.h"
+#include "tests/fakes/FakePlane.h"
 
 extern char** environ;
 
@@ -171,6 +172,8 @@ private:
         items.emplace_back(Dictionary{{"title", "no attachments"}});
         items.emplace_back(Dictionary{{"title", 5}, {"attachments", Value(Array{})}});
         items.emplace_back(Dictionary{{"title", "x"}, {"attachments", Value(Array{Value(1)})}});
+        const Value memory(Value::PlaneRef(std::make_shared<FakePlane>(1, 1, 1, std::vector<PixelRect>())));
+        items.push_back(encodeItems({ExtensionItem{"memory", {{"x", memory, std::nullopt}}}}).front());
         items.push_back(encodeItems({textItem("also good", "2")}).front());
         completeWith(request, std::move(items));
     }
