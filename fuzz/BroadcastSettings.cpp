@@ -92,7 +92,8 @@ Value numberOf(Input& in) {
 
 Value textFrom(Input& in) {
     constexpr std::array kBegin{"", "https://", "rtmp://", "srt://", "file:///"};
-    const std::string text = kBegin[in.below(kBegin.size())] + std::string(textOf(in.bytes(in.below(40))));
+    std::string text = kBegin[in.below(kBegin.size())];
+    text += textOf(in.bytes(in.below(40)));
     if (in.below(4) == 3) return Value(URL(text));
     return in.below(16) == 15 ? valueOf(in) : Value(text);
 }

@@ -226,7 +226,10 @@ void Conversation::sendFile() {
 /// Some frame, or some bytes, with some descriptors. From here on only what always holds can be expected.
 void Conversation::sendAnything() {
     isWild_ = true;
-    FrameHeader header = headerOf(static_cast<FrameKind>(script_.below(9)), script_.byte(), script_.byte());
+    FrameHeader header;
+    header.kind = static_cast<FrameKind>(script_.below(9));
+    header.sequence = script_.byte();
+    header.message = script_.byte();
     if (script_.flag()) header.sequence = ++sequence_;
     const std::uint8_t how = script_.byte();
     std::vector<int> descriptors;

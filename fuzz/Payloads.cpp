@@ -79,6 +79,7 @@ void check(const Sound& sound) {
     require(format.channelsPerFrame > 0 && format.bytesPerFrame >= format.channelsPerFrame, "a sound has channels");
     require(sound.frames >= 0 && static_cast<std::uint64_t>(sound.frames) <= sound.bytes.size() / format.bytesPerFrame,
             "a sound's frames are all there");
+    require(static_cast<double>(sound.frames) <= 60 * format.sampleRate, "a sound lasts for a moment");
     constexpr int kRate = 48'000;
     extensions::PcmReader reader(kRate);
     for (int times = 0; times < 2; ++times) {

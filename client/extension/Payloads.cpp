@@ -12,7 +12,10 @@ namespace {
 constexpr std::int64_t kVideo = 1, kApplicationSound = 2, kMicrophone = 3;
 constexpr std::uint32_t kLastOrientation = 8;
 constexpr std::uint32_t kMostChannels = 64;
-constexpr double kHighestRate = 768'000;
+constexpr double kLowestRate = 1000, kHighestRate = 768'000;
+/// A tap hands over a fraction of a second at a time. Bytes that claim to last for hours would fill the memory when
+/// they are brought to another rate.
+constexpr double kLongestSeconds = 10;
 
 template <class T>
 const T* memberOf(const Dictionary& payload, std::string_view key) {
@@ -48,13 +51,14 @@ std::optional<Payload> frameIn(const Dictionary& payload) {
     const SharedPlane& picture = **plane;
     if (picture.width() <= 0 || picture.height() <= 0) return std::nullopt;
     const auto width = static_cast<std::size_t>(picture.width()), height = static_cast<std::size_t>(picture.height());
-    if (picture.stride() < width * 4 || picture.pixels().size() < picture.stride() * height) return std::nullopt;
+    if (picture.stride() < width * 4 || picture.pixels().size() / picture.stride() < height) return std::nullopt;
     return Frame{*plane, static_cast<std::uint32_t>(*orientation), *timing, nullptr};
 }
 
 bool makesSense(const AudioFormat& format) {
     if (format.formatID != kAudioFormatLinearPCM) return false;
-    if (!std::isfinite(format.sampleRate) || format.sampleRate < 1 || format.sampleRate > kHighestRate) return false;
+    if (!std::isfinite(format.sampleRate) || format.sampleRate < kLowestRate || format.sampleRate > kHighestRate)
+        return false;
     if (format.channelsPerFrame < 1 || format.channelsPerFrame > kMostChannels) return false;
     if (format.bitsPerChannel != 8 && format.bitsPerChannel != 16 && format.bitsPerChannel != 24 &&
         format.bitsPerChannel != 32 && format.bitsPerChannel != 64)
@@ -69,6 +73,7 @@ std::optional<Payload> soundIn(const Dictionary& payload, Sound::Source source) 
     const auto* frames = memberOf<std::int64_t>(payload, kPayloadNumSamples);
     if (!timing || !format || !bytes || !frames || !makesSense(*format) || *frames < 0) return std::nullopt;
     if (static_cast<std::uint64_t>(*frames) > bytes->size() / format->bytesPerFrame) return std::nullopt;
+    if (static_cast<double>(*frames) > format->sampleRate * kLongestSeconds) return std::nullopt;
     return Sound{source, *format, *bytes, *frames, *timing, nullptr};
 }
 

@@ -3,6 +3,7 @@
 #include <bit>
 #include <cmath>
 #include <cstring>
+#include <limits>
 
 namespace lumacast::extensions {
 
@@ -21,7 +22,8 @@ float sampleAt(const std::uint8_t* bytes, const AudioFormat& format) {
     if (format.formatFlags & AudioFormat::kFlagFloat) {
         const double value = count == 8 ? std::bit_cast<double>(bits)
                                         : static_cast<double>(std::bit_cast<float>(static_cast<std::uint32_t>(bits)));
-        return std::isfinite(value) ? static_cast<float>(value) : 0.0F;
+        // Encoders take nothing that is not a number; a double may be one that a float is not.
+        return std::abs(value) <= std::numeric_limits<float>::max() ? static_cast<float>(value) : 0.0F;
     }
     const auto sign = static_cast<std::int64_t>(bits << (64 - 8 * count));
     return static_cast<float>(std::ldexp(static_cast<double>(sign), -63));

@@ -135,10 +135,30 @@ void writePayloadSeeds(const std::filesystem::path& corpora) {
                                     {std::string(kPayloadAudioFormat), bytesOf(format())},
                                     {std::string(kPayloadNumSamples), std::int64_t{16}},
                                     {std::string(kPayloadAudioBufferList), Data(128, 60)}}));
+    AudioFormat odd = format();
+    const auto writeOdd = [&](const char* name, const Data& bytes) {
+        odd.bytesPerFrame = odd.bitsPerChannel / 8;
+        odd.channelsPerFrame = 1;
+        write(name, message(0, Dictionary{{type, 2},
+                                          {time, bytesOf(timing())},
+                                          {std::string(kPayloadAudioFormat), bytesOf(odd)},
+                                          {std::string(kPayloadNumSamples),
+                                           static_cast<std::int64_t>(bytes.size() / odd.bytesPerFrame)},
+                                          {std::string(kPayloadAudioBufferList), bytes}}));
+    };
+    odd.bitsPerChannel = 64;
+    writeOdd("sound-beyond-float", bytesOf(-1e300));
+    odd.bitsPerChannel = 8;
+    odd.formatFlags = AudioFormat::kFlagSignedInteger;
+    odd.sampleRate = 1;
+    writeOdd("sound-of-an-hour", Data(3600, 9));
     write("unknown", message(0, Dictionary{{"later", 1}}));
     // Recipes: an action, a frame, sounds of several formats, a clip's items.
     write("recipe-action", Data{1, 0, 2, 0, 1, 1, 0, 0});
     write("recipe-frame", Data{1, 2, 12, 8, 1, 32, 128, 0, 0, 0, 1, 0, 1, 0, 0, 0, 0, 0, 0});
+    // Rows so long that their number of bytes is 0 once more.
+    write("recipe-frame-beyond-memory",
+          Data{1, 2, 8, 8, 0, 0, 0, 0, 0, 0, 0, 0, 0x40, 0, 0, 0, 0, 1, 0, 1, 0, 0, 0, 0, 0});
     Data sound{1, 3, 2, 0, 1, 2, 3, 4, 0, 0};
     append(sound, {0, 0, 1, 0, 2, 0, 0, 0, 1, 2, 0});
     append(sound, Data(64, 60));

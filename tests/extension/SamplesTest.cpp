@@ -134,7 +134,11 @@ std::vector<Dictionary> illTyped() {
     withFormat([](AudioFormat& format) { format.bytesPerFrame = 0; });
     withFormat([](AudioFormat& format) { format.channelsPerFrame = 0; });
     withFormat([](AudioFormat& format) { format.sampleRate = std::nan(""); });
+    withFormat([](AudioFormat& format) { format.sampleRate = 1; });
     withFormat([](AudioFormat& format) { format.formatID = kAudioFormatAAC; });
+    AudioFormat slow = testing::tapFormat();
+    slow.sampleRate = 1000;
+    all.push_back(soundPayload(2, Data(10'001 * slow.bytesPerFrame), 10'001, 1, slow));  // more than ten seconds
     without({}, kPayloadActionType, "1");
     without(actionPayload(1), kPayloadUserInfo, 5.0);
     without({}, kPayloadFrontmostApp, std::int64_t{1});

@@ -57,6 +57,9 @@ TEST(PcmReader, WhatCannotBeReadIsEmpty) {
     EXPECT_EQ(reader.read(soundOf(format(48'000, 1, 16, AudioFormat::kFlagSignedInteger), {1, 2})).size(), 1u);
     const Data noNumber = bytesOf(std::nanf(""));
     EXPECT_EQ(reader.read(soundOf(format(48'000, 1, 32, AudioFormat::kFlagFloat), noNumber)).channels[0].at(0), 0.0F);
+    // A number, but not of those that samples are made of.
+    const Data tooLarge = bytesOf(-1e300);
+    EXPECT_EQ(reader.read(soundOf(format(48'000, 1, 64, AudioFormat::kFlagFloat), tooLarge)).channels[0].at(0), 0.0F);
 }
 
 TEST(PcmReader, AnotherRateIsBroughtToTheStreams) {
