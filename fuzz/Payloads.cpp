@@ -258,10 +258,16 @@ void checkClip(Input& in) {
     require(again && again->token == clip->token && again->url == clip->url && again->userInfo == clip->userInfo &&
                 again->isLast == clip->isLast,
             "a clip is read as it was sent");
-    const auto has = [&items](std::string_view title) {
-        return std::any_of(items.begin(), items.end(), [&](const auto& i) { return i.attributedTitle == title; });
+    // The first item of each title counts.
+    const auto first = [&items](std::string_view title) {
+        const auto found =
+            std::find_if(items.begin(), items.end(), [&](const auto& i) { return i.attributedTitle == title; });
+        require(found != items.end() && !found->attachments.empty(), "a clip is whole");
+        return found->attachments.front().item;
     };
-    require(has(kItemRequestedFinish) && has(kItemSandboxToken) && has(kItemMovieClipURL), "a clip is whole");
+    require(first(kItemRequestedFinish) == Value(clip->isLast ? "1" : "0"), "the last clip is told from the others");
+    require(first(kItemSandboxToken) == Value(clip->token) && first(kItemMovieClipURL) == Value(clip->url),
+            "a clip has its own token and place");
 }
 
 }  // namespace

@@ -1,5 +1,6 @@
 #include <stdexcept>
 
+#include "base/Wire.h"
 #include "broadcast/ConfigurationArchive.h"
 #include "fuzz/seeds/Seeds.h"
 #include "linux/ipc/LinuxKeyedArchive.h"
@@ -41,6 +42,14 @@ void writeArchiveSeeds(const std::filesystem::path& corpora) {
     writeArchive("text-as-length", archived({ours, {{"clipDuration", "5"}}}));
     writeArchive("array-as-properties", archived({ours, {{"videoCompressionProperties", Array{1}}}}));
     writeArchive("nothing", archived({ours, {{"clipDuration", Value()}, {"videoCompressionProperties", Value()}}}));
+    // One level more than an archive may have, which no encoder of ours writes.
+    Value deep(1);
+    for (int i = 0; i < 8; ++i) deep = Value(Array{deep});
+    WireBody body;
+    body.bytes = {'L', 'C', 'A', 'R', 'C', 'H', 'I', 'V', 1, 0, 0, 0};
+    const Dictionary object{{"class", ours}, {"fields", Dictionary{{"deep", deep}}}};
+    if (!encode(Dictionary{{"root", object}}, body)) throw std::logic_error("a seed is over a limit");
+    writeArchive("too-deep", body.bytes);
     // Recipes: an object with a dictionary, a configuration with a whole number and with one of many entries, a deep
     // one.
     write("recipe-object", Data{2, 3, 'A', 'b', 'c', 1, 1, 'k', 10, 1, 1, 'e', 0, 1, 0});

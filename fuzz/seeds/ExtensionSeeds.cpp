@@ -69,6 +69,9 @@ void writeItemSeeds(const std::filesystem::path& corpora) {
     write("no-attachment", complete({{std::string(kItemServiceInfo), {}}}));
     write("many", complete(std::vector<ExtensionItem>(20, info)));
     write("ill-formed", message(0, Array{std::int64_t{1}, Array{1, Dictionary{{"title", 5}}, encodeItems({info})[0]}}));
+    write("no-type",
+          message(0, Array{std::int64_t{1},
+                           Array{Dictionary{{"title", "x"}, {"attachments", Array{Dictionary{{"item", 1}}}}}}}));
     write("given-up", message(1, Array{std::int64_t{1}, Error("org.example", 7, {{"LocalizedDescription", "no"}})}));
     write("given-up-silently", message(1, Array{std::int64_t{1}, Value()}));
     // A plane where an item should be: tag 13, the first handle.
@@ -155,8 +158,9 @@ void writePayloadSeeds(const std::filesystem::path& corpora) {
     write("unknown", message(0, Dictionary{{"later", 1}}));
     // Recipes: an action, a frame, sounds of several formats, a clip's items.
     write("recipe-action", Data{1, 0, 2, 0, 1, 1, 0, 0});
-    write("recipe-frame", Data{1, 2, 12, 8, 1, 32, 128, 0, 0, 0, 1, 0, 1, 0, 0, 0, 0, 0, 0});
+    write("recipe-frame", Data{1, 2, 12, 8, 1, 32, 0, 1, 0, 0, 1, 0, 1, 0, 0, 0, 0, 0, 0});
     // Rows so long that their number of bytes is 0 once more.
+    write("recipe-frame-turned-in-a-ninth-way", Data{1, 2, 12, 8, 1, 32, 0, 1, 0, 0, 9, 0, 1, 0, 0, 0, 0, 0, 0});
     write("recipe-frame-beyond-memory",
           Data{1, 2, 8, 8, 0, 0, 0, 0, 0, 0, 0, 0, 0x40, 0, 0, 0, 0, 1, 0, 1, 0, 0, 0, 0, 0});
     Data sound{1, 3, 2, 0, 1, 2, 3, 4, 0, 0};
