@@ -58,9 +58,11 @@ public:
     Recorder(const Recorder&) = delete;
     Recorder& operator=(const Recorder&) = delete;
 
-    /// Starts a recording; one that is running, of whatever application, ends.
+    /// Starts a recording; one that is running, of whatever application, ends. A broadcast's start is answered when its
+    /// extension has taken note of it, which may be never; the next start, or the extension's failure, ends the wait.
     void start(const StartOptions& options, std::function<void(StartAnswer)> answered);
-    /// Stops and keeps the whole movie. Not answered when nothing is being recorded.
+    /// Stops and keeps the whole movie. Not answered when nothing is being recorded, nor when the extension that takes a
+    /// broadcast's samples dies before it has taken note of the end.
     void stop(std::function<void(StopAnswer)> answered);
     /// Stops and keeps the movie without its first `fromStart` and last `fromEnd` seconds (rounded to whole ones, both
     /// above 0). Not answered when nothing is being recorded, or the clip can't be made.

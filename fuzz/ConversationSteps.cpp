@@ -164,11 +164,16 @@ void Conversation::changeTokens() {
             if (auto text = tokens_.issue(files_.file())) issued_.push_back({std::move(*text), true, std::nullopt});
             return;
         }
-        case 2:
-            tokens_.handOver(id);
-            for (Token& token : issued_)
-                if (!token.request) token.request = request;
+        case 2: {
+            std::vector<ExtensionItem> items;
+            for (Token& token : issued_) {
+                if (token.request) continue;
+                token.request = request;
+                items.push_back({"", {{std::string(kGenericDataType), Data(token.text.begin(), token.text.end()), {}}}});
+            }
+            tokens_.handOver(id, items);
             return;
+        }
         case 3:
             tokens_.end(id);
             for (Token& token : issued_) token.isGood = token.isGood && token.request != request;

@@ -15,7 +15,7 @@
 namespace lumacast::extension {
 
 /// What an extension may impose on the broadcast: the clips' length in seconds (0: the daemon's own) and how pictures are
-/// compressed. It governs the next clip but one: the one being recorded goes on as it began.
+/// compressed. The length governs the next cut; the clip being recorded is compressed as it began.
 using BroadcastConfiguration = LCBroadcastConfiguration;
 
 class HostLink;

@@ -62,7 +62,8 @@ public:
     virtual void finished(Completion completion) { static_cast<void>(completion); }
     virtual void frame(Frame frame) { static_cast<void>(frame); }
     virtual void sound(Sound sound) { static_cast<void>(sound); }
-    /// Another application has come to the front of the screen.
+    /// Whose sound a broadcast of the whole display takes since its first change of the application in front: told once a
+    /// broadcast, and not again when another one comes to the front.
     virtual void frontmostApplication(BundleIdentifier application) { static_cast<void>(application); }
 
     /// The last call: the daemon has gone, or has no use for this process any more. run() returns after it.

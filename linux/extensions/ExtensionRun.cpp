@@ -35,12 +35,13 @@ void ExtensionRun::begin(std::vector<ExtensionItem> items, AppExtension::BeginHa
         const std::lock_guard lock(mutex_);
         if (requests_.size() < limitOf(Limit::ExtensionRequestsInFlight)) {
             const ExtensionRequestID id{++lastRequest_};
+            tokens_.handOver(id, items);
             requests_.emplace(id, Request{Stage::Waiting, std::move(items), std::move(handler), nullptr});
-            tokens_.handOver(id);
             services_->reactor.async([self = shared_from_this()] { self->proceed(); });
             return;
         }
     }
+    tokens_.handOver(std::nullopt, items);
     services_->log.error("%s has too many requests that it has not completed", name());
     queue_->async([handler = std::move(handler)] { handler(std::nullopt, systemError(EAGAIN)); });
 }

@@ -79,10 +79,20 @@ std::optional<std::string> FileTokens::issue(const std::string& path) {
     return text;
 }
 
-void FileTokens::handOver(ExtensionRequestID request) {
+void FileTokens::handOver(std::optional<ExtensionRequestID> request, const std::vector<ExtensionItem>& items) {
     const std::lock_guard lock(mutex_);
-    for (Token& token : tokens_)
-        if (!token.request) token.request = request;
+    for (const ExtensionItem& item : items)
+        for (const ItemProvider& attachment : item.attachments) {
+            const Data* data = attachment.item.as<Data>();
+            const auto token = std::find_if(tokens_.begin(), tokens_.end(), [&](const Token& one) {
+                return data && !one.request && isSame(*data, one.text);
+            });
+            if (token == tokens_.end()) continue;
+            if (request)
+                token->request = request;
+            else
+                tokens_.erase(token);
+        }
 }
 
 void FileTokens::end(ExtensionRequestID request) {

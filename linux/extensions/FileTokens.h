@@ -22,8 +22,8 @@ public:
     /// A token for the file: 256 random bits as 64 digits. None when it is not a regular file of this user's beneath
     /// the directory, a link is on the way, or the disk has not answered within 100 ms.
     std::optional<std::string> issue(const std::string& path);
-    /// The tokens issued since the last call belong to this request.
-    void handOver(ExtensionRequestID request);
+    /// The tokens that are among these items belong to this request; without a request they are worth nothing.
+    void handOver(std::optional<ExtensionRequestID> request, const std::vector<ExtensionItem>& items);
     /// The request is over, and so are its tokens.
     void end(ExtensionRequestID request);
     /// The process is over: so are all tokens, and what was counted.

@@ -70,7 +70,8 @@ struct MovieSave {
 };
 
 /// Owns the sessions, one per client application, and everything that clients ask of them. Everything here runs on the
-/// request lane (the main queue); what comes from other lanes hops there first. One file per concern.
+/// request lane (the main queue); what comes from other lanes hops there first, but for the answers of extension lookups, the
+/// connecting of an extension on its session's start queue, and what an extension returns, which is sent on. One file per concern.
 class LCRecordingManager final : public IpcListenerDelegate,
                                  public IpcExportedObject,
                                  public LCRecordingSessionDelegate,

@@ -1,4 +1,5 @@
-// Setting a broadcast up, and starting one. Request lane, but for the waits on a session's start queue.
+// Setting a broadcast up, and starting one. Request lane, but for what lookups answer (their lane, which asks the disk for
+// icons) and the waits on a session's start queue.
 
 #include <utility>
 

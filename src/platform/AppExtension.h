@@ -97,8 +97,8 @@ public:
     virtual void beginExtensionRequestWithInputItems(std::vector<ExtensionItem> items, BeginHandler handler) = 0;
     /// `_extensionContextForUUID:` — of a request that was begun; null when there is none.
     virtual std::shared_ptr<ExtensionContext> extensionContextForRequest(ExtensionRequestID request) = 0;
-    /// A token that this extension, and nobody else, can exchange once for a descriptor to read this file while the next
-    /// request it is begun with goes on. None when there is no such file.
+    /// A token that this extension, and nobody else, can exchange once for a descriptor to read this file, while the
+    /// request goes on among whose items it is, as data. None when there is no such file.
     virtual std::optional<std::string> issueReadOnlyFileToken(std::string_view tokenClass, const std::string& path) = 0;
     /// `_kill:` — sends its process the signal; nothing when none is running.
     virtual void kill(int signal) = 0;

@@ -32,6 +32,8 @@ void LCRecordingSession::_processAudioSampleBufferForMP4ClipHandler(const Sample
     if (subtract(time, broadcastFragmentStartTime_.get()).seconds() > limit) cutClip(time);
 }
 
+// The next writer takes the place of the last one before that one is finished: the end of the broadcast, on another lane, finds
+// either, never one that is being finished. Pictures between the two are nobody's.
 void LCRecordingSession::cutClip(MediaTime time) {
     broadcastFragmentStartTime_.set(time);
     ++broadcastFragmentIndex_;

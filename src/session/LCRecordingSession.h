@@ -113,7 +113,7 @@ public:
     void setBroadcastUploadExtensionProxy(std::shared_ptr<LCBroadcastExtensionProxy> proxy) {
         broadcastUploadExtensionProxy_.set(std::move(proxy));
     }
-    /// Kept for the extensions' sake; nothing uses them.
+    /// Deliberately there; nothing uses them.
     const std::shared_ptr<SerialQueue>& broadcastServiceInfoQueue() const { return broadcastServiceInfoQueue_; }
     const std::shared_ptr<SerialQueue>& broadcastAggregatePayloadQueue() const {
         return broadcastAggregatePayloadQueue_;

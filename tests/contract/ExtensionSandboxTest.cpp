@@ -192,8 +192,15 @@ TEST_P(ExtensionSandboxTest, ATokenIsGoodOnceForItsFileAndTheFileCanOnlyBeRead) 
 
 TEST_P(ExtensionSandboxTest, ATokenIsDeadWithItsRequest) {
     const std::string first = token("one.mp4", "a clip");
-    ask(*extension_, "echo");
+    ask(*extension_, "echo", {tokenItem(first)});
     EXPECT_THAT(exchange(*extension_, {first}), ::testing::ElementsAre("error " + std::to_string(EACCES)));
+}
+
+TEST_P(ExtensionSandboxTest, ATokenBelongsToTheRequestThatItIsHandedOverWith) {
+    const std::string first = token("one.mp4", "a clip"), second = token("two.mp4", "the last clip");
+    EXPECT_THAT(exchange(*extension_, {second}), ::testing::ElementsAre("read the last clip"));
+    // The other request's end has taken nothing from this one.
+    EXPECT_THAT(exchange(*extension_, {first}), ::testing::ElementsAre("read a clip"));
 }
 
 TEST_P(ExtensionSandboxTest, ATokenOfAnotherExtensionIsNone) {

@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "tests/fakes/FakeAppExtensions.h"
+#include "tests/fakes/FakePlatform.h"
 
 namespace lumacast {
 
@@ -107,6 +108,32 @@ private:
     const std::shared_ptr<UploaderPlan> plan_;
     std::shared_ptr<IpcConnection> link_;
     std::shared_ptr<Inbox> inbox_;
+};
+
+/// A process of an upload extension that listens by itself.
+class ListeningUploader final {
+public:
+    ListeningUploader(FakePlatform& machine, const std::shared_ptr<UploaderPlan>& plan, ProcessID pid)
+        : process_(machine.makeProcess(pid)), door_(std::make_shared<Door>(std::make_shared<FakeUploader>(plan))) {
+        listener_ = process_->anonymousListener();
+        listener_->setDelegate(door_);
+        listener_->resume();
+    }
+    std::shared_ptr<IpcEndpoint> endpoint() const { return listener_->endpoint(); }
+
+private:
+    struct Door final : IpcListenerDelegate {
+        explicit Door(std::shared_ptr<FakeUploader> program) : uploader(std::move(program)) {}
+        bool listenerShouldAcceptNewConnection(IpcListener&, const std::shared_ptr<IpcConnection>& connection) override {
+            uploader->serve(connection);
+            return true;
+        }
+        const std::shared_ptr<FakeUploader> uploader;
+    };
+
+    const std::unique_ptr<FakeIpc> process_;
+    const std::shared_ptr<Door> door_;
+    std::shared_ptr<IpcListener> listener_;
 };
 
 /// An installed upload extension that follows the plan.

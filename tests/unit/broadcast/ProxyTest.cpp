@@ -122,6 +122,10 @@ TEST_F(Proxy, AnEndpointThatIsNeverTakenHoldsUpItsExtensionsLaneAlone) {
     advance(std::chrono::hours(1));
     EXPECT_EQ(logged("Remote endpoint set."), 0u);
     EXPECT_TRUE(reported_.empty());
+    // What else it is asked waits behind that.
+    extension_->beginExtensionRequestWithInputItems({}, [this](auto, const auto&) { ++completions_; });
+    settle();
+    EXPECT_EQ(completions_, 0);
 }
 
 TEST_F(Proxy, AnExtensionThatGoesBeforeItTookTheEndpointIsReportedAndReleasesTheLane) {
@@ -137,22 +141,9 @@ TEST_F(Proxy, AnExtensionThatGoesBeforeItTookTheEndpointIsReportedAndReleasesThe
 }
 
 TEST_F(Proxy, OneThatIsMadeFromAnEndpointMakesNoRequestAndAwaitsNoPing) {
-    const auto process = fakes_.makeProcess(ProcessID{700});
-    const auto uploader = std::make_shared<FakeUploader>(plan_);
-    struct Door final : IpcListenerDelegate {
-        explicit Door(FakeUploader& uploader) : uploader(uploader) {}
-        bool listenerShouldAcceptNewConnection(IpcListener&, const std::shared_ptr<IpcConnection>& connection) override {
-            uploader.serve(connection);
-            return true;
-        }
-        FakeUploader& uploader;
-    };
-    const auto door = std::make_shared<Door>(*uploader);
-    const auto listener = process->anonymousListener();
-    listener->setDelegate(door);
-    listener->resume();
+    const ListeningUploader uploader(fakes_, plan_, ProcessID{700});
     proxy_ = LCBroadcastExtensionProxy::initWithBroadcastUploadListenerEndpoint(fakes_.platform(), errors_,
-                                                                                listener->endpoint());
+                                                                                uploader.endpoint());
     listenTo(*proxy_);
     settle();
     EXPECT_FALSE(proxy_->broadcastUploadExtension());
@@ -183,7 +174,7 @@ TEST_F(Proxy, TellsWhatTheExtensionReports) {
     EXPECT_EQ(logged("received finish request from service due to error"), 1u);
 }
 
-TEST_F(Proxy, ItsEndIsReportedOnceWithUserInfoThatIsThere) {
+TEST_F(Proxy, ItsEndIsReportedOnce) {
     establish();
     extension_->crash();
     settle();
@@ -249,8 +240,17 @@ TEST_F(Proxy, AnExtensionThatProcessesNothingForTenSecondsCountsAsLost) {
 TEST_F(Proxy, ADeliberateEndIsReportedToNobodyAndKillsTheExtension) {
     establish();
     fakes_.logSink.clear();
+    const auto endpoint = proxy_->listenerEndpoint();
     proxy_->invalidateConnection();
     settle();
+    // Nobody can come that way any more.
+    const auto stranger = fakes_.makeProcess(ProcessID{701});
+    const auto late = stranger->connectToEndpoint(endpoint);
+    int refused = 0;
+    late->setInvalidationHandler([&] { ++refused; });
+    late->resume();
+    settle();
+    EXPECT_EQ(refused, 1);
     EXPECT_TRUE(reported_.empty());
     EXPECT_EQ(extension_->signals(), std::vector<int>{9});
     EXPECT_FALSE(extension_->isRunning());

@@ -201,6 +201,37 @@ TEST_F(BroadcastStart, IsAnsweredThoughItsClientStoppedItBeforeItsExtensionDied)
     EXPECT_EQ(fakes_.keepAlive.open(), 1);
 }
 
+TEST_F(BroadcastStart, WithAnEndpointGoesToTheExtensionThatListensThere) {
+    install(true);
+    const ListeningUploader uploader(fakes_, plan_, ProcessID{700});
+    const auto client = makeConnected();
+    setUp(*client);
+    const auto start = client->start({client->window}, {.broadcast = true}, uploader.endpoint());
+    settle();
+    ASSERT_EQ(start->answers, 1);
+    EXPECT_EQ(start->code(), 0);
+    EXPECT_EQ(plan_->launches, 1) << "the one that listens";
+    EXPECT_EQ(plan_->actions(), std::vector<std::int64_t>{1});
+    // What it reports, it reports from the first moment on, and its end ends the broadcast.
+    plan_->tell(BroadcastDaemonMessage::UpdateServiceInfo, {Dictionary{{"viewers", 3}}});
+    plan_->tell(BroadcastDaemonMessage::FinishBroadcastWithError, {Value(Error("org.example.upload", 77))});
+    settle();
+    EXPECT_EQ(toldOf(*client, ClientMessage::UpdateBroadcastServiceInfo), 1);
+    EXPECT_EQ(client->toldOfStop(77), 1);
+}
+
+TEST_F(BroadcastStart, WhatAnExtensionReturnsWithAClipReachesTheClient) {
+    plan_->returned = {{"LCBroadcastExtensionKeyExtensionServiceInfo",
+                        {ItemProvider{std::string(kGenericDataType), Dictionary{{"viewers", 1}}, {}}}}};
+    fakes_.displayCapture.setAutomatic(true);
+    const auto client = makeBroadcasting(false);
+    advance(seconds(1));
+    client->ask(DaemonMessage::StopRecording);
+    settle();
+    EXPECT_EQ(toldOf(*client, ClientMessage::UpdateBroadcastServiceInfo), 1);
+    EXPECT_EQ(logged("LCRecordingManager:broadcastSessionDidUpdateServiceInfo:"), 1u);
+}
+
 TEST_F(BroadcastStart, AnExtensionThatNeverTakesTheFinishIsKilledThoughItsClientHasGone) {
     auto client = makeBroadcasting(true);
     plan_->completesPayloads = false;

@@ -76,12 +76,14 @@ public:
     struct Flags {
         bool microphone = false, camera = false, broadcast = false, system = false, capture = false;
     };
-    AskedRef start(const std::vector<ContextID>& windows, Flags flags) {
+    /// `endpoint`: where the broadcast's extension listens by itself.
+    AskedRef start(const std::vector<ContextID>& windows, Flags flags,
+                   const std::shared_ptr<IpcEndpoint>& endpoint = nullptr) {
         Array ids;
         for (const ContextID layer : windows) ids.emplace_back(number(layer));
         return ask(DaemonMessage::StartRecording,
                    {std::move(ids), Array{640.0, 360.0}, flags.microphone, flags.camera, flags.broadcast, flags.system,
-                    flags.capture, Value()});
+                    flags.capture, endpoint ? Value(endpoint) : Value()});
     }
     AskedRef start(const std::vector<ContextID>& windows) { return start(windows, {}); }
     AskedRef start() { return start({window}, {}); }

@@ -209,6 +209,12 @@ TEST_F(Clips, AReturnedConfigurationGovernsTheNextCutAndRebuildsNothing) {
     EXPECT_EQ(session_->movieWriter(), writer);
     hear(6 * kScale + 2);
     EXPECT_NE(session_->movieWriter(), writer);
+    // The clip that begins with the cut is compressed as it says.
+    show(6000);
+    const Dictionary settings = recording().movie().tracks.at(0).settings;
+    const Value* const compression = settings.find(VideoSettings::kCompressionProperties);
+    ASSERT_TRUE(compression && compression->as<Dictionary>());
+    EXPECT_TRUE(compression->as<Dictionary>()->find("a"));
 }
 
 TEST_F(Clips, OnlyItemsWhoseFirstAttachmentIsGenericDataAreLoaded) {
