@@ -241,9 +241,10 @@ TEST_F(Proxy, ADeliberateEndIsReportedToNobodyAndKillsTheExtension) {
     establish();
     fakes_.logSink.clear();
     const auto endpoint = proxy_->listenerEndpoint();
+    const auto listener = proxy_->listener();
     proxy_->invalidateConnection();
     settle();
-    // Nobody can come that way any more.
+    // Nobody can come that way any more, whoever still has the listener.
     const auto stranger = fakes_.makeProcess(ProcessID{701});
     const auto late = stranger->connectToEndpoint(endpoint);
     int refused = 0;

@@ -1,33 +1,13 @@
 // What a session does with a broadcast extension set: its pace, its names, and what the extension is told.
 
 #include "tests/fakes/StubExtension.h"
+#include "tests/unit/session/NotedLink.h"
 #include "tests/unit/session/SessionWorld.h"
 
 namespace lumacast {
 namespace {
 
 using std::chrono::milliseconds;
-
-/// A link to an extension that answers when the test says so.
-class Link final : public LCBroadcastExtensionProxy {
-public:
-    explicit Link(const SessionServices& services) : LCBroadcastExtensionProxy(services.platform, services.errors) {}
-    void processPayload(Dictionary payload, std::function<void()> completion) override {
-        payloads.push_back(std::move(payload));
-        if (whenTold) whenTold();
-        if (answers)
-            completion();
-        else
-            pending.push_back(std::move(completion));
-    }
-    void invalidateConnection() override { ++invalidations; }
-
-    std::vector<Dictionary> payloads;
-    std::vector<std::function<void()>> pending;
-    std::function<void()> whenTold;
-    bool answers = true;
-    int invalidations = 0;
-};
 
 class ExtensionActions : public SessionWorld {
 protected:
@@ -53,7 +33,7 @@ protected:
     }
     using Actions = std::vector<std::int64_t>;
 
-    const std::shared_ptr<Link> link_ = std::make_shared<Link>(services_);
+    const std::shared_ptr<NotedLink> link_ = std::make_shared<NotedLink>(services_);
 };
 
 TEST_F(ExtensionActions, TheIdentifierIsTheExtensionsOwn) {
