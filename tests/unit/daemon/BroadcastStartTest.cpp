@@ -180,6 +180,21 @@ TEST_F(BroadcastStart, OneWhileTheLastOnesFinishIsUnderWayHasItsOwnExtensionAndT
     EXPECT_EQ(fakes_.keepAlive.open(), 1);
 }
 
+TEST_F(BroadcastStart, OneWhoseForerunnerNeverTakesItsFinishGoesOnWhenThatIsGivenUp) {
+    const auto client = makeBroadcasting(true);
+    const auto olderExtension = extension();
+    plan_->completesPayloads = false;
+    client->ask(DaemonMessage::StopRecording);
+    settle();
+    plan_->completesPayloads = true;
+    setUp(*client);
+    ASSERT_EQ(startBroadcast(*client)->code(), 0);
+    advance(seconds(30));
+    EXPECT_EQ(olderExtension->signals(), std::vector<int>{9});
+    EXPECT_TRUE(session(*client)->isRecording());
+    EXPECT_EQ(client->toldOfStop(-5808), 0);
+}
+
 TEST_F(BroadcastStart, IsAnsweredThoughItsClientStoppedItBeforeItsExtensionDied) {
     plan_->completesPayloads = false;
     install(true);

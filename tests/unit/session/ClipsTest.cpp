@@ -112,6 +112,45 @@ TEST_F(Clips, TheLimitIsTheConfigurationsWhenItIsAboveZero) {
     EXPECT_EQ(clips_->broadcastFragmentIndex(), 2);
 }
 
+TEST_F(Clips, OutsideOfClipModeNothingIsCut) {
+    start();
+    show(10);
+    session_->setBroadcastProcessMode(2);
+    hear(0);
+    hear(20 * kScale);
+    EXPECT_EQ(clips_->broadcastFragmentIndex(), 1);
+}
+
+TEST_F(Clips, AnotherBroadcastBeginsToCountAnewAndDisablingLeavesTheCount) {
+    start();
+    show(10);
+    hear(0);
+    hear(5 * kScale + 1);
+    EXPECT_EQ(clips_->broadcastFragmentIndex(), 2);
+    session_->disableBroadcast();
+    EXPECT_EQ(clips_->broadcastFragmentIndex(), 2);
+    EXPECT_EQ(session_->enableBroadcastWithExtension(extension_, 0, {}, nullptr), 0);
+    EXPECT_EQ(clips_->broadcastFragmentIndex(), 1);
+    // Its first clip's length runs from its first sound.
+    hear(30 * kScale);
+    hear(35 * kScale);
+    EXPECT_EQ(clips_->broadcastFragmentIndex(), 1);
+    hear(35 * kScale + 1);
+    EXPECT_EQ(clips_->broadcastFragmentIndex(), 2);
+}
+
+TEST_F(Clips, AReturnedConfigurationThatDoesNotDecodeIsNone) {
+    session_->setBroadcastConfiguration(LCBroadcastConfiguration{2.0, {}});
+    plan_->returned = {ExtensionItem{"LCBroadcastExtensionKeyBroadcastConfiguration",
+                                     {ItemProvider{std::string(kGenericDataType), Data{1, 2}, {}}}}};
+    start();
+    show(10);
+    hear(0);
+    hear(2 * kScale + 1);
+    EXPECT_EQ(logged("received updated broadcast configuration from extension"), 1u);
+    EXPECT_FALSE(session_->broadcastConfiguration());
+}
+
 TEST_F(Clips, TheBufferThatIsOverTheLimitIsStillTheOldClips) {
     start();
     show(10);
