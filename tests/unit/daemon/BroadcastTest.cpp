@@ -46,6 +46,26 @@ TEST_F(Broadcast, AnUndecodableConfigurationOrNoUserInfoDoesNotFailTheSetUp) {
     EXPECT_EQ(plan_->payloads.at(0).find("LCBroadcastExtensionKeyExtensionUserInfo"), nullptr);
 }
 
+TEST_F(Broadcast, OfTwoWithOneBaseTheFirstIsTaken) {
+    install(true, "org.example.Uploader.upload");
+    install(true, "org.example.UploaderOfAnother.upload");  // a plain prefix: that is one, too
+    const auto client = makeConnected();
+    EXPECT_TRUE(setUp(*client)->values.at(0).isNull());
+    EXPECT_EQ(startBroadcast(*client)->code(), 0);
+    EXPECT_EQ(session(*client)->broadcastExtensionID(), BundleIdentifier("org.example.Uploader.upload"));
+}
+
+TEST_F(Broadcast, TheImagesAreTheLastSetUpsWhoeverAsks) {
+    install(true);
+    fakes_.bundles.setIcon(BundleIdentifier("org.example.Player"), IconFormat::Large, Data{7});
+    const auto client = makeConnected();
+    setUp(*client);
+    const auto other = makeConnected("Editor", 600, 9);
+    const auto images = other->ask(DaemonMessage::GetCurrentBroadcastImages);
+    settle();
+    EXPECT_EQ(images->values.at(0), Value(Data{7}));
+}
+
 TEST_F(Broadcast, WithoutAnExtensionNothingIsSetUp) {
     const auto client = makeConnected();
     const auto none = setUp(*client);
