@@ -9,6 +9,7 @@
 
 #include "base/Limits.h"
 #include "linux/ipc/LinuxIpcEndpoint.h"
+#include "linux/calls/FileCalls.h"
 
 namespace lumacast {
 
@@ -20,9 +21,9 @@ constexpr std::size_t kUsualMessage = 512;
 Fd copyOf(const SharedPlane& plane) {
     const auto pixels = plane.pixels();
     Fd memory(memfd_create("plane", MFD_CLOEXEC | MFD_ALLOW_SEALING));
-    if (!memory || ftruncate(memory.get(), static_cast<off_t>(pixels.size())) != 0) return Fd();
+    if (!memory || calls::truncate(memory.get(), static_cast<off_t>(pixels.size())) != 0) return Fd();
     for (std::size_t at = 0; at < pixels.size();) {
-        const ssize_t count = ::write(memory.get(), pixels.data() + at, pixels.size() - at);
+        const ssize_t count = calls::write(memory.get(), pixels.data() + at, pixels.size() - at);
         if (count <= 0) return Fd();
         at += static_cast<std::size_t>(count);
     }

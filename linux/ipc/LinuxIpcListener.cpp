@@ -13,6 +13,7 @@
 
 #include "base/Limits.h"
 #include "linux/ipc/LinuxIpcEndpoint.h"
+#include "linux/calls/FileCalls.h"
 
 namespace lumacast {
 
@@ -277,7 +278,7 @@ EndpointCall ringEndpoint(const IpcEndpoint& endpoint) {
     header->cmsg_type = SCM_RIGHTS;
     header->cmsg_len = CMSG_LEN(sizeof(int));
     std::memcpy(CMSG_DATA(header), &ends[1], sizeof(int));
-    if (sendmsg(ours->descriptor(), &message, MSG_DONTWAIT | MSG_NOSIGNAL) < 0) call.socket.reset();
+    if (calls::sendMessage(ours->descriptor(), message, MSG_DONTWAIT | MSG_NOSIGNAL) < 0) call.socket.reset();
     return call;
 }
 

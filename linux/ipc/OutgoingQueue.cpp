@@ -10,6 +10,7 @@
 #include <utility>
 
 #include "base/Limits.h"
+#include "linux/calls/FileCalls.h"
 
 namespace lumacast {
 
@@ -38,10 +39,7 @@ ssize_t write(int socket, std::span<iovec> parts, std::span<const int> descripto
         header->cmsg_len = CMSG_LEN(bytes);
         std::memcpy(CMSG_DATA(header), descriptors.data(), bytes);
     }
-    for (;;) {
-        const ssize_t sent = sendmsg(socket, &message, MSG_DONTWAIT | MSG_NOSIGNAL);
-        if (sent >= 0 || errno != EINTR) return sent;
-    }
+    return calls::sendMessage(socket, message, MSG_DONTWAIT | MSG_NOSIGNAL);
 }
 
 bool isBytesOnly(const OutgoingFrame& frame) {

@@ -9,6 +9,8 @@
 #include <cerrno>
 #include <vector>
 
+#include "linux/calls/FileCalls.h"
+
 namespace lumacast {
 
 namespace {
@@ -21,9 +23,9 @@ constexpr std::size_t kBuffer = 256 * 1024;
 void writeBack(int file, std::uint64_t written) {
     const std::uint64_t begin = written / kPiece * kPiece;
     if (begin < kPiece) return;
-    ::sync_file_range(file, static_cast<off64_t>(begin - kPiece), kPiece, SYNC_FILE_RANGE_WRITE);
+    calls::startWriteBack(file, static_cast<off64_t>(begin - kPiece), kPiece, SYNC_FILE_RANGE_WRITE);
     if (begin >= 2 * kPiece)
-        ::sync_file_range(file, static_cast<off64_t>(begin - 2 * kPiece), kPiece,
+        calls::startWriteBack(file, static_cast<off64_t>(begin - 2 * kPiece), kPiece,
                           SYNC_FILE_RANGE_WAIT_BEFORE | SYNC_FILE_RANGE_WRITE | SYNC_FILE_RANGE_WAIT_AFTER);
 }
 
@@ -37,8 +39,7 @@ bool asksForAnotherWay(int error) {
 
 int writeAll(int file, const char* bytes, std::size_t count) {
     while (count > 0) {
-        const ssize_t written = ::write(file, bytes, count);
-        if (written < 0 && errno == EINTR) continue;
+        const ssize_t written = calls::write(file, bytes, count);
         if (written < 0) return errno;
         if (written == 0) return EIO;
         bytes += written;
@@ -50,15 +51,14 @@ int writeAll(int file, const char* bytes, std::size_t count) {
 }  // namespace
 
 int copyBytes(int from, int to, std::uint64_t size, CopyBy first) {
-    if (first == CopyBy::Clone && ::ioctl(to, FICLONE, from) == 0) return 0;
-    if (size > 0 && ::fallocate(to, FALLOC_FL_KEEP_SIZE, 0, static_cast<off_t>(size)) != 0 && isNoRoom(errno))
+    if (first == CopyBy::Clone && calls::clone(from, to) == 0) return 0;
+    if (size > 0 && calls::reserve(to, static_cast<off_t>(size)) != 0 && isNoRoom(errno))
         return errno;
 
     // Both descriptors' positions move along, so that the next way goes on where the one before gave up.
     std::uint64_t copied = 0;
     while (first != CopyBy::Hand) {
-        const ssize_t count = ::copy_file_range(from, nullptr, to, nullptr, kPiece, 0);
-        if (count < 0 && errno == EINTR) continue;
+        const ssize_t count = calls::copyRange(from, to, kPiece);
         if (count < 0 && !asksForAnotherWay(errno)) return errno;
         if (count <= 0) break;
         copied += static_cast<std::uint64_t>(count);

@@ -8,6 +8,8 @@
 #include <utility>
 
 #include "linux/storage/BeneathDirectory.h"
+#include "linux/calls/FileCalls.h"
+#include "linux/calls/FolderSync.h"
 
 namespace lumacast {
 
@@ -15,13 +17,8 @@ namespace {
 
 constexpr mode_t kMode = 0755;  // less the umask
 
-int syncFolder(int folder) {
-    // Some file systems have nothing to sync in a folder and say so.
-    return ::fsync(folder) == 0 || errno == EINVAL ? 0 : errno;
-}
-
 FileDescriptor readable(int folder) {
-    return FileDescriptor(::openat(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    return FileDescriptor(calls::openAt(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
 }
 
 }  // namespace
@@ -31,7 +28,7 @@ LibraryFolder::LibraryFolder(LibraryFolder&& other) noexcept
 
 LibraryFolder::~LibraryFolder() {
     for (auto made = made_.rbegin(); made != made_.rend(); ++made)
-        ::unlinkat(made->parent.get(), made->name.c_str(), AT_REMOVEDIR);
+        calls::unlinkAt(made->parent.get(), made->name, AT_REMOVEDIR);
 }
 
 std::variant<FileDescriptor, int> LibraryFolder::openOrMake(const std::string& path, uid_t user, bool isOurs) {
@@ -43,7 +40,7 @@ std::variant<FileDescriptor, int> LibraryFolder::openOrMake(const std::string& p
     auto place = resolveForUser(path, user);
     if (const int* error = std::get_if<int>(&place)) return *error;
     auto& [parent, name] = std::get<ResolvedName>(place);
-    if (::mkdirat(parent.get(), name.c_str(), kMode) == 0) {
+    if (calls::makeDirectoryAt(parent.get(), name, kMode) == 0) {
         made_.push_back({std::move(parent), std::move(name)});
     } else if (errno != EEXIST) {  // two saves may make it at once
         return errno;
@@ -66,9 +63,7 @@ std::variant<LibraryFolder, int> LibraryFolder::open(const std::string& videos, 
 int LibraryFolder::sync() const {
     if (const int error = syncFolder(folder_.get()); error != 0) return error;
     for (const Made& made : made_) {
-        const FileDescriptor parent = readable(made.parent.get());
-        if (!parent) return errno;
-        if (const int error = syncFolder(parent.get()); error != 0) return error;
+        if (const int error = syncFolder(made.parent.get()); error != 0) return error;
     }
     return 0;
 }

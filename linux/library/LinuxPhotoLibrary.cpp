@@ -12,6 +12,7 @@
 #include "linux/library/LibraryFolder.h"
 #include "linux/library/VideosFolder.h"
 #include "linux/storage/BeneathDirectory.h"
+#include "linux/calls/FileCalls.h"
 #include "linux/system/LowPriority.h"
 #include "linux/system/SystemError.h"
 #include "linux/system/Threads.h"
@@ -26,7 +27,7 @@ using OpenedFile = std::variant<FileDescriptor, int>;
 
 /// Never waits for the writer of a pipe, and answers regular files only.
 OpenedFile openMovie(const ResolvedName& place) {
-    FileDescriptor file(::openat(place.directory.get(), place.name.c_str(),
+    FileDescriptor file(calls::openAt(place.directory.get(), place.name,
                                  O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
     struct stat status = {};
     if (!file || ::fstat(file.get(), &status) != 0) return errno;
@@ -93,11 +94,11 @@ std::variant<std::string, int> addCopy(int movie, const std::string& path, Libra
     auto& file = std::get<NewFile>(made);
     if (const int error = copyBytes(movie, file.get(), static_cast<std::uint64_t>(status.st_size), copyBy); error != 0)
         return error;
-    if (::fsync(file.get()) != 0) return errno;
+    if (calls::sync(file.get()) != 0) return errno;
     auto name = giveFreeName(file, nameOf(status.st_mtim.tv_sec), extensionOf(path));
     if (const int* error = std::get_if<int>(&name)) return *error;
     if (const int error = folder.sync(); error != 0) {
-        ::unlinkat(folder.get(), std::get<std::string>(name).c_str(), 0);
+        calls::unlinkAt(folder.get(), std::get<std::string>(name));
         return error;
     }
     folder.keep();

@@ -8,6 +8,8 @@
 #include <cerrno>
 #include <utility>
 
+#include "linux/calls/FileCalls.h"
+
 namespace lumacast {
 
 namespace {
@@ -27,7 +29,7 @@ std::string randomName() {
 
 std::variant<NewFile, int> NewFile::in(int folder, Unseen unseen) {
     if (unseen == Unseen::WithoutName) {
-        FileDescriptor file(::openat(folder, ".", O_TMPFILE | O_RDWR | O_CLOEXEC, kMode));
+        FileDescriptor file(calls::openAt(folder, ".", O_TMPFILE | O_RDWR | O_CLOEXEC, kMode));
         if (file) return NewFile(folder, std::move(file), {});
         // What a file system, or a kernel, that can't says: the flag is unknown, or "." is a directory and no more.
         if (errno != EOPNOTSUPP && errno != EISDIR && errno != EINVAL && errno != ENOENT) return errno;
@@ -36,7 +38,7 @@ std::variant<NewFile, int> NewFile::in(int folder, Unseen unseen) {
         std::string name = randomName();
         if (name.empty()) return EAGAIN;
         FileDescriptor file(
-            ::openat(folder, name.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, kMode));
+            calls::openAt(folder, name, O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, kMode));
         if (file) return NewFile(folder, std::move(file), std::move(name));
         if (errno != EEXIST) return errno;
     }
@@ -50,7 +52,7 @@ NewFile::NewFile(NewFile&& other) noexcept
     : folder_(other.folder_), file_(std::move(other.file_)), hiddenName_(std::exchange(other.hiddenName_, {})) {}
 
 NewFile::~NewFile() {
-    if (!hiddenName_.empty()) ::unlinkat(folder_, hiddenName_.c_str(), 0);
+    if (!hiddenName_.empty()) calls::unlinkAt(folder_, hiddenName_);
 }
 
 int NewFile::giveName(const std::string& name) {
@@ -59,32 +61,32 @@ int NewFile::giveName(const std::string& name) {
 
 int NewFile::giveNameToUnnamed(const std::string& name) {
     const std::string itself = "/proc/self/fd/" + std::to_string(file_.get());
-    if (::linkat(AT_FDCWD, itself.c_str(), folder_, name.c_str(), AT_SYMLINK_FOLLOW) == 0) return 0;
+    if (calls::link(AT_FDCWD, itself, folder_, name, AT_SYMLINK_FOLLOW) == 0) return 0;
     if (errno != ENOENT) return errno;
     // Without /proc only who may read everything can do it by the descriptor.
-    return ::linkat(file_.get(), "", folder_, name.c_str(), AT_EMPTY_PATH) == 0 ? 0 : errno;
+    return calls::link(file_.get(), "", folder_, name, AT_EMPTY_PATH) == 0 ? 0 : errno;
 }
 
 int NewFile::giveNameToHidden(const std::string& name) {
-    const char* const from = hiddenName_.c_str();
-    const char* const to = name.c_str();
+    const std::string& from = hiddenName_;
+    const std::string& to = name;
     const auto cannot = [] { return errno == EINVAL || errno == ENOSYS || errno == EOPNOTSUPP || errno == EPERM; };
-    if (::renameat2(folder_, from, folder_, to, RENAME_NOREPLACE) == 0) {
+    if (calls::renameToNew(folder_, from, folder_, to) == 0) {
         hiddenName_.clear();
         return 0;
     }
     if (!cannot()) return errno;
-    if (::linkat(folder_, from, folder_, to, 0) == 0) return 0;  // the hidden name goes at the end
+    if (calls::link(folder_, from, folder_, to, 0) == 0) return 0;  // the hidden name goes at the end
     if (!cannot()) return errno;
     // A file system with neither: an empty file of ours takes the name, and is what is replaced.
-    const FileDescriptor place(::openat(folder_, to, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, kMode));
+    const FileDescriptor place(calls::openAt(folder_, to, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, kMode));
     if (!place) return errno;
-    if (::renameat(folder_, from, folder_, to) == 0) {
+    if (calls::rename(folder_, from, folder_, to) == 0) {
         hiddenName_.clear();
         return 0;
     }
     const int error = errno;
-    ::unlinkat(folder_, to, 0);
+    calls::unlinkAt(folder_, to);
     return error;
 }
 

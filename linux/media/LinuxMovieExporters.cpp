@@ -9,6 +9,7 @@
 #include "linux/media/EncodingQueue.h"
 #include "linux/media/LinuxMovieExport.h"
 #include "linux/media/MovieSource.h"
+#include "linux/calls/FileCalls.h"
 #include "linux/system/FileDescriptor.h"
 
 namespace lumacast {
@@ -21,7 +22,7 @@ constexpr std::size_t kMostLibraryMemory = std::size_t{512} << 20;
 
 /// A regular file, for reading; without waiting for anybody, as the opening of a pipe would.
 std::shared_ptr<const FileDescriptor> openRegular(const std::string& path) {
-    FileDescriptor file(::open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+    FileDescriptor file(calls::openAt(AT_FDCWD, path, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
     struct stat status = {};
     if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) return nullptr;
     return std::make_shared<const FileDescriptor>(std::move(file));

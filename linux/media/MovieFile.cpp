@@ -6,6 +6,8 @@
 
 #include <cerrno>
 
+#include "linux/calls/FileCalls.h"
+#include "linux/calls/FolderSync.h"
 #include "linux/storage/BeneathDirectory.h"
 
 namespace lumacast::media {
@@ -14,15 +16,15 @@ namespace {
 
 class PosixMovieFile final : public MovieFile {
 public:
-    explicit PosixMovieFile(int descriptor) : descriptor_(descriptor) {}
+    /// `folder` holds the file.
+    PosixMovieFile(int descriptor, FileDescriptor folder) : descriptor_(descriptor), folder_(std::move(folder)) {}
     PosixMovieFile(const PosixMovieFile&) = delete;
     PosixMovieFile& operator=(const PosixMovieFile&) = delete;
     ~PosixMovieFile() override { ::close(descriptor_); }
 
     int write(std::uint64_t offset, std::span<const std::uint8_t> bytes) override {
         while (!bytes.empty()) {
-            const ssize_t count = ::pwrite(descriptor_, bytes.data(), bytes.size(), static_cast<off_t>(offset));
-            if (count < 0 && errno == EINTR) continue;
+            const ssize_t count = calls::writeAt(descriptor_, bytes.data(), bytes.size(), static_cast<off_t>(offset));
             if (count < 0) return errno;
             if (count == 0) return EIO;
             offset += static_cast<std::uint64_t>(count);
@@ -32,31 +34,30 @@ public:
     }
 
     int sync() override {
-        while (::fdatasync(descriptor_) != 0) {
-            if (errno == EINTR) continue;
+        if (calls::syncData(descriptor_) != 0)
             return errno == EINVAL || errno == EROFS ? 0 : errno;  // not a file that can be synced
-        }
-        return 0;
+        if (!folder_) return 0;
+        // Once: a file whose name is not on the disk is gone after a power cut, however much of it is there.
+        const FileDescriptor folder = std::move(folder_);
+        return syncFolder(folder.get());
     }
 
     void removeName(const std::string& path) override {
         struct stat own {}, named {};
         if (::fstat(descriptor_, &own) != 0 || ::lstat(path.c_str(), &named) != 0) return;
-        if (own.st_dev == named.st_dev && own.st_ino == named.st_ino) ::unlink(path.c_str());
+        if (own.st_dev == named.st_dev && own.st_ino == named.st_ino) calls::unlinkAt(AT_FDCWD, path);
     }
 
 private:
     const int descriptor_;
+    FileDescriptor folder_;  ///< until its names have been synced
 };
 
-/// `folder` may be AT_FDCWD.
-std::variant<std::unique_ptr<MovieFile>, int> createIn(int folder, const std::string& name) {
-    for (;;) {
-        // The mode is what umask 077 would leave, whatever the process's umask is.
-        const int descriptor = ::openat(folder, name.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
-        if (descriptor >= 0) return std::make_unique<PosixMovieFile>(descriptor);
-        if (errno != EINTR) return errno;
-    }
+std::variant<std::unique_ptr<MovieFile>, int> createIn(FileDescriptor folder, const std::string& name) {
+    // The mode is what umask 077 would leave, whatever the process's umask is.
+    const int descriptor = calls::openAt(folder.get(), name, O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
+    if (descriptor < 0) return errno;
+    return std::make_unique<PosixMovieFile>(descriptor, std::move(folder));
 }
 
 bool climbs(const std::string& path) { return ("/" + path + "/").find("/../") != std::string::npos; }
@@ -65,13 +66,19 @@ bool climbs(const std::string& path) { return ("/" + path + "/").find("/../") !=
 
 std::variant<std::unique_ptr<MovieFile>, int> PosixMovieFiles::create(const std::string& path) {
     if (path.empty() || climbs(path)) return EINVAL;
-    if (!directory_) return createIn(AT_FDCWD, path);
+    if (!directory_) {
+        const std::size_t slash = path.rfind('/');
+        const std::string around = slash == std::string::npos ? "." : path.substr(0, slash + 1);
+        FileDescriptor folder(calls::openAt(AT_FDCWD, around, O_PATH | O_DIRECTORY | O_CLOEXEC));
+        if (!folder) return errno;
+        return createIn(std::move(folder), path.substr(slash + 1));  // from 0 on where there is none
+    }
     const std::string inside = withSingleSlashes(*directory_) + "/";
     const std::string whole = withSingleSlashes(path);
     if (!whole.starts_with(inside) || whole.find('/', inside.size()) != std::string::npos) return EACCES;
-    const auto folder = openTrusted(inside);
+    auto folder = openTrusted(inside);
     if (const int* error = std::get_if<int>(&folder)) return *error;
-    return createIn(std::get<FileDescriptor>(folder).get(), whole.substr(inside.size()));
+    return createIn(std::move(std::get<FileDescriptor>(folder)), whole.substr(inside.size()));
 }
 
 }  // namespace lumacast::media

@@ -2,15 +2,15 @@
 
 #include <dirent.h>
 #include <fcntl.h>
-#include <linux/openat2.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <array>
 #include <cerrno>
 #include <memory>
 #include <vector>
+
+#include "linux/calls/FileCalls.h"
 
 namespace lumacast {
 
@@ -24,12 +24,12 @@ FileDescriptor openBeneath(int base, const std::string& path) {
     open_how how{};
     how.flags = static_cast<std::uint64_t>(kDirectoryFlags | O_NOFOLLOW);
     how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS | RESOLVE_NO_MAGICLINKS;
-    return FileDescriptor(static_cast<int>(::syscall(SYS_openat2, base, path.c_str(), &how, sizeof how)));
+    return FileDescriptor(calls::openResolved(base, path, how));
 }
 
 FileDescriptor walkBeneath(FileDescriptor base, const std::vector<std::string>& components) {
     for (const std::string& component : components) {
-        base.reset(::openat(base.get(), component.c_str(), kDirectoryFlags | O_NOFOLLOW));
+        base.reset(calls::openAt(base.get(), component, kDirectoryFlags | O_NOFOLLOW));
         if (!base) break;
     }
     return base;
@@ -56,10 +56,10 @@ void walkFirst(std::vector<std::string>& rest, std::string_view path) {
 
 int removeTree(int directory, const std::string& name, int depth) {
     if (depth > kMaximumDepth) return ELOOP;
-    if (::unlinkat(directory, name.c_str(), 0) == 0) return 0;
+    if (calls::unlinkAt(directory, name) == 0) return 0;
     if (errno != EISDIR && errno != EPERM) return errno;
     const int refusal = errno;
-    FileDescriptor opened(::openat(directory, name.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    FileDescriptor opened(calls::openAt(directory, name, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
     if (!opened) return errno == ENOTDIR || errno == ELOOP ? refusal : errno;
 
     const std::unique_ptr<DIR, int (*)(DIR*)> entries(::fdopendir(opened.get()), &::closedir);
@@ -73,13 +73,13 @@ int removeTree(int directory, const std::string& name, int depth) {
         if (error != 0 && firstError == 0) firstError = error;
     }
     if (firstError != 0) return firstError;
-    return ::unlinkat(directory, name.c_str(), AT_REMOVEDIR) == 0 ? 0 : errno;
+    return calls::unlinkAt(directory, name, AT_REMOVEDIR) == 0 ? 0 : errno;
 }
 
 }  // namespace
 
 Resolution availableResolution() {
-    const FileDescriptor root(::open("/", kDirectoryFlags));
+    const FileDescriptor root(calls::openAt(AT_FDCWD, "/", kDirectoryFlags));
     return openBeneath(root.get(), ".") ? Resolution::Kernel : Resolution::Walk;
 }
 
@@ -93,13 +93,13 @@ std::string withSingleSlashes(std::string_view path) {
 
 std::variant<FileDescriptor, int> openFolder(const std::string& directory, uid_t user) {
     if (directory.find('\0') != std::string::npos) return EINVAL;
-    FileDescriptor at(::open("/", kDirectoryFlags));
+    FileDescriptor at(calls::openAt(AT_FDCWD, "/", kDirectoryFlags));
     std::vector<std::string> rest;  // the next one last
     walkFirst(rest, directory);
     for (int links = 0; at && !rest.empty();) {
         const std::string name = std::move(rest.back());
         rest.pop_back();
-        FileDescriptor next(::openat(at.get(), name.c_str(), O_PATH | O_CLOEXEC | O_NOFOLLOW));
+        FileDescriptor next(calls::openAt(at.get(), name, O_PATH | O_CLOEXEC | O_NOFOLLOW));
         struct stat status = {};
         if (!next || ::fstat(next.get(), &status) != 0) return errno;
         if (!S_ISLNK(status.st_mode)) {
@@ -112,7 +112,7 @@ std::variant<FileDescriptor, int> openFolder(const std::string& directory, uid_t
         std::array<char, 4096> target{};
         const ssize_t length = ::readlinkat(next.get(), "", target.data(), target.size());
         if (length <= 0) return length < 0 ? errno : ENOENT;
-        if (target[0] == '/') at.reset(::open("/", kDirectoryFlags));
+        if (target[0] == '/') at.reset(calls::openAt(AT_FDCWD, "/", kDirectoryFlags));
         walkFirst(rest, std::string_view(target.data(), static_cast<std::size_t>(length)));
     }
     if (!at) return errno;

@@ -11,6 +11,8 @@
 #include <cerrno>
 #include <cstdio>
 
+#include "linux/calls/FileCalls.h"
+#include "linux/calls/FolderSync.h"
 #include "linux/storage/UsersFiles.h"
 #include "linux/system/LinuxEnvironment.h"
 #include "linux/system/SystemError.h"
@@ -103,7 +105,7 @@ struct LinuxFileSystem::Place {
 
 private:
     static std::variant<FileDescriptor, int> reopened(int folder, const char* name, int flags) {
-        FileDescriptor file(::openat(folder, name, flags | O_CLOEXEC));
+        FileDescriptor file(calls::openAt(folder, name, flags | O_CLOEXEC));
         if (!file) return errno;
         return file;
     }
@@ -149,7 +151,9 @@ bool LinuxFileSystem::exists(const std::string& path) {
 std::optional<Error> LinuxFileSystem::createDirectory(const std::string& path) {
     return errorOf(ask<Done>([path](const Place& place) {
         auto answer = place.perform(path, [](int folder, const std::string& name) {
-            return ::mkdirat(folder, name.c_str(), 0700);
+            const int made = calls::makeDirectoryAt(folder, name, 0700);
+            if (made == 0) (void)syncFolder(folder);  // a movie in it is on the disk only if the directory is
+            return made;
         });
         if (std::holds_alternative<Done>(answer) && place.isDirectory(path)) place.directoryWasThere = true;
         return answer;
@@ -217,7 +221,7 @@ Result<std::uint64_t> LinuxFileSystem::freeSize(const std::string& path) {
         const auto opened = place.isDirectory(path) ? place.openDirectoryAgain() : place.open(path, O_PATH);
         if (const int* error = std::get_if<int>(&opened)) return *error;
         struct statvfs status = {};
-        if (::fstatvfs(std::get<FileDescriptor>(opened).get(), &status) != 0) return errno;
+        if (calls::statFileSystem(std::get<FileDescriptor>(opened).get(), status) != 0) return errno;
         return static_cast<std::uint64_t>(status.f_bavail) * status.f_frsize;
     }));
 }
@@ -255,7 +259,7 @@ std::optional<Error> LinuxFileSystem::move(const std::string& from, const std::s
     if (const int* error = std::get_if<int>(&destination)) return systemError(*error);
     const auto& a = std::get<ResolvedName>(source);
     const auto& b = std::get<ResolvedName>(destination);
-    if (::renameat(a.directory.get(), a.name.c_str(), b.directory.get(), b.name.c_str()) != 0)
+    if (calls::rename(a.directory.get(), a.name, b.directory.get(), b.name) != 0)
         return systemError(errno);
     return std::nullopt;
 }

@@ -8,6 +8,7 @@
 #include <cerrno>
 
 #include "linux/storage/BeneathDirectory.h"
+#include "linux/calls/FileCalls.h"
 
 namespace lumacast {
 
@@ -40,7 +41,7 @@ int mayReadAndRemove(const std::string& path, uid_t user, const struct stat* not
     if (::fstatat(folder.get(), name.c_str(), &file, AT_SYMLINK_NOFOLLOW) != 0) return errno;
     if (!S_ISREG(file.st_mode)) return S_ISDIR(file.st_mode) ? EISDIR : EACCES;
     const FileDescriptor opened(
-        ::openat(folder.get(), name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+        calls::openAt(folder.get(), name, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
     struct stat read = {};
     if (!opened || ::fstat(opened.get(), &read) != 0) return errno;
     if (read.st_ino != file.st_ino || read.st_dev != file.st_dev) return EACCES;  // exchanged meanwhile
@@ -59,7 +60,7 @@ int removeFile(const std::string& path, uid_t user) {
     const auto place = resolveForUser(path, user);
     if (const int* error = std::get_if<int>(&place)) return *error;
     const auto& [folder, name] = std::get<ResolvedName>(place);
-    return ::unlinkat(folder.get(), name.c_str(), 0) == 0 ? 0 : errno;
+    return calls::unlinkAt(folder.get(), name) == 0 ? 0 : errno;
 }
 
 }  // namespace lumacast

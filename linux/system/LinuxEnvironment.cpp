@@ -8,6 +8,8 @@
 #include <cerrno>
 #include <cstdlib>
 
+#include "linux/calls/FileCalls.h"
+#include "linux/calls/FolderSync.h"
 #include "linux/system/FileDescriptor.h"
 #include "linux/system/IniFile.h"
 #include "linux/system/SmallFile.h"
@@ -144,10 +146,23 @@ std::vector<std::string> LinuxEnvironment::below(const std::vector<std::string>&
     return result;
 }
 
+namespace {
+
+/// Once made, a directory stays there, whatever happens to the power.
+void syncFolderOf(const std::string& path) {
+    const std::string parent = path.substr(0, path.rfind('/') + 1);
+    const FileDescriptor folder(calls::openAt(AT_FDCWD, parent, O_PATH | O_DIRECTORY | O_CLOEXEC));
+    if (folder) (void)syncFolder(folder.get());
+}
+
+}  // namespace
+
 std::optional<Error> makeDirectories(const std::string& path) {
     for (std::size_t end = path.find('/', 1); true; end = path.find('/', end + 1)) {
         const std::string part = path.substr(0, end);
-        if (::mkdir(part.c_str(), 0700) != 0 && errno != EEXIST) {
+        if (calls::makeDirectoryAt(AT_FDCWD, part, 0700) == 0) {
+            syncFolderOf(part);
+        } else if (errno != EEXIST) {
             const int error = errno;
             // A parent on a read-only or foreign file system is fine as long as it is there.
             if (!isDirectory(part)) return systemError(error);

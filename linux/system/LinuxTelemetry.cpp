@@ -13,6 +13,7 @@
 #include <system_error>
 #include <thread>
 
+#include "linux/calls/FileCalls.h"
 #include "linux/system/FileDescriptor.h"
 #include "linux/system/Json.h"
 #include "linux/system/LinuxClock.h"
@@ -40,7 +41,7 @@ bool endsWithinLine(const FileDescriptor& file, const struct stat& status) {
 bool append(const std::string& path, std::uint64_t maximumBytes, std::string line) {
     const auto open = [&] {
         return FileDescriptor(
-            ::open(path.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600));
+            calls::openAt(AT_FDCWD, path, O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600));
     };
     FileDescriptor file = open();
     if (!file && errno == ENOENT) {
@@ -50,14 +51,14 @@ bool append(const std::string& path, std::uint64_t maximumBytes, std::string lin
     struct stat status = {};
     if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) return false;
     if (status.st_size > 0 && static_cast<std::uint64_t>(status.st_size) + line.size() + 1 > maximumBytes) {
-        if (::rename(path.c_str(), (path + ".1").c_str()) != 0) return false;
+        if (calls::rename(AT_FDCWD, path, AT_FDCWD, path + ".1") != 0) return false;
         file = open();
         if (!file || ::fstat(file.get(), &status) != 0) return false;
     }
     if (endsWithinLine(file, status)) line.insert(line.begin(), '\n');
-    if (::write(file.get(), line.data(), line.size()) == static_cast<ssize_t>(line.size())) return true;
+    if (calls::write(file.get(), line.data(), line.size()) == static_cast<ssize_t>(line.size())) return true;
     // Half a line would spoil the next one too. Only this thread appends, so the old end is still the end.
-    if (::ftruncate(file.get(), status.st_size) != 0) return false;
+    if (calls::truncate(file.get(), status.st_size) != 0) return false;
     return false;
 }
 
