@@ -7,7 +7,7 @@
 //   journal   what changed the disk, byte by byte, if the file is there before the daemon starts
 //
 // A target is the last part of a file's name with each run of digits, and of the hexadecimal ones of a hidden name, as "#";
-// "socket" for a peer, "memory" for a file without a disk.
+// "socket" for a client, "channel" for any other peer, "memory" for a file without a disk.
 
 #include <array>
 #include <string>
@@ -36,7 +36,8 @@ inline std::string_view nameOf(Fault fault) {
     return "?";
 }
 
-/// The faults that a call of this name can have on a real system, the process's end before and after it with it.
+/// The faults that a call of this name can have on a real system, the process's end before and after it with it. Opening what is there
+/// is not interrupted here: that every call is made again then is decided in one place, and seen with all the others.
 inline std::vector<Fault> faultsOf(std::string_view call) {
     using enum Fault;
     if (call == "write" || call == "writeAt" || call == "copyRange")
@@ -47,6 +48,7 @@ inline std::vector<Fault> faultsOf(std::string_view call) {
     if (call == "makeDirectoryAt" || call == "rename" || call == "renameToNew" || call == "link" || call == "sync" ||
         call == "syncData")
         return {NoSpace, InputOutput, Interrupted, KillBefore, KillAfter};
+    if (call == "open") return {InputOutput, KillBefore, KillAfter};
     return {InputOutput, Interrupted, KillBefore, KillAfter};
 }
 

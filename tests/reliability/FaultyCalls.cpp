@@ -10,6 +10,7 @@
 #include <sys/ioctl.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
+#include <sys/un.h>
 #include <time.h>
 #include <unistd.h>
 
@@ -58,6 +59,15 @@ std::string targetOfDescriptor(int descriptor) {
     if (path.starts_with("socket:")) return "socket";
     if (path.starts_with("/memfd:")) return "memory";
     return test::targetOf(path);
+}
+
+/// What was accepted at the service's socket has its name.
+std::string targetOfSocket(int socket) {
+    sockaddr_un name{};
+    socklen_t size = sizeof name;
+    const bool isNamed = ::getsockname(socket, reinterpret_cast<sockaddr*>(&name), &size) == 0 && name.sun_path[0] != '\0' &&
+                         size > sizeof name.sun_family;
+    return isNamed ? "socket" : "channel";
 }
 
 [[noreturn]] void endAtOnce() {
@@ -124,10 +134,11 @@ public:
         }
         errno = error;
     }
-    void journal(const test::JournalEntry& entry) {
+    void journal(test::JournalEntry entry) {
         if (journal_ < 0) return;
         const int error = errno;
         const std::lock_guard lock(mutex_);
+        entry.time = static_cast<std::uint64_t>(hostNanoseconds());
         const std::string bytes = test::encode(entry);
         (void)!::write(journal_, bytes.data(), bytes.size());
         errno = error;
@@ -186,7 +197,7 @@ int openAt(int folder, const std::string& path, int flags, mode_t mode) {
     const std::string whole = pathOf(folder, path);
     return run(makes ? "openToMake" : "open", test::targetOf(whole), [&] {
         const int file = ::openat(folder, path.c_str(), flags, mode);
-        if (makes && file >= 0) faults().journal({test::JournalEntry::Kind::Make, pathOf(file), "", 0, {}});
+        if (makes && file >= 0) faults().journal({test::JournalEntry::Kind::Make, pathOf(file), "", 0, {}, 0});
         return file;
     });
 }
@@ -201,7 +212,7 @@ int makeDirectoryAt(int folder, const std::string& path, mode_t mode) {
     const std::string whole = pathOf(folder, path);
     return run("makeDirectoryAt", test::targetOf(whole), [&] {
         const int result = ::mkdirat(folder, path.c_str(), mode);
-        if (result == 0) faults().journal({test::JournalEntry::Kind::MakeDirectory, whole, "", 0, {}});
+        if (result == 0) faults().journal({test::JournalEntry::Kind::MakeDirectory, whole, "", 0, {}, 0});
         return result;
     });
 }
@@ -210,7 +221,9 @@ ssize_t write(int file, const void* bytes, std::size_t count) {
     return run("write", targetOfDescriptor(file), count, [&](std::size_t most) {
         const off_t offset = faults().hasJournal() ? ::lseek(file, 0, SEEK_CUR) : -1;
         const ssize_t result = ::write(file, bytes, most);
-        if (result > 0 && offset >= 0) faults().journal({test::JournalEntry::Kind::Write, pathOf(file), "", static_cast<std::uint64_t>(offset), test::bytesAt(bytes, result)});
+        if (result > 0 && offset >= 0)
+            faults().journal({test::JournalEntry::Kind::Write, pathOf(file), "", static_cast<std::uint64_t>(offset),
+                              test::bytesAt(bytes, result), 0});
         return result;
     });
 }
@@ -220,7 +233,7 @@ ssize_t writeAt(int file, const void* bytes, std::size_t count, off_t offset) {
         const ssize_t result = ::pwrite(file, bytes, most, offset);
         if (result > 0)
             faults().journal({test::JournalEntry::Kind::Write, pathOf(file), "", static_cast<std::uint64_t>(offset),
-                              test::bytesAt(bytes, result)});
+                              test::bytesAt(bytes, result), 0});
         return result;
     });
 }
@@ -245,7 +258,7 @@ int truncate(int file, off_t size) {
 int sync(int file) {
     return run("sync", targetOfDescriptor(file), [&] {
         const int result = ::fsync(file);
-        if (result == 0) faults().journal({test::JournalEntry::Kind::Sync, pathOf(file), "", 0, {}});
+        if (result == 0) faults().journal({test::JournalEntry::Kind::Sync, pathOf(file), "", 0, {}, 0});
         return result;
     });
 }
@@ -253,7 +266,7 @@ int sync(int file) {
 int syncData(int file) {
     return run("syncData", targetOfDescriptor(file), [&] {
         const int result = ::fdatasync(file);
-        if (result == 0) faults().journal({test::JournalEntry::Kind::Sync, pathOf(file), "", 0, {}});
+        if (result == 0) faults().journal({test::JournalEntry::Kind::Sync, pathOf(file), "", 0, {}, 0});
         return result;
     });
 }
@@ -267,7 +280,7 @@ int rename(int fromFolder, const std::string& from, int toFolder, const std::str
     const std::string before = pathOf(fromFolder, from), after = pathOf(toFolder, to);
     return run("rename", test::targetOf(after), [&] {
         const int result = ::renameat(fromFolder, from.c_str(), toFolder, to.c_str());
-        if (result == 0) faults().journal({test::JournalEntry::Kind::Rename, before, after, 0, {}});
+        if (result == 0) faults().journal({test::JournalEntry::Kind::Rename, before, after, 0, {}, 0});
         return result;
     });
 }
@@ -287,7 +300,7 @@ int unlinkAt(int folder, const std::string& path, int flags) {
     const std::string whole = pathOf(folder, path);
     return run("unlinkAt", test::targetOf(whole), [&] {
         const int result = ::unlinkat(folder, path.c_str(), flags);
-        if (result == 0) faults().journal({test::JournalEntry::Kind::Remove, whole, "", 0, {}});
+        if (result == 0) faults().journal({test::JournalEntry::Kind::Remove, whole, "", 0, {}, 0});
         return result;
     });
 }
@@ -299,7 +312,7 @@ int statFileSystem(int file, struct statvfs& status) {
 ssize_t sendMessage(int socket, const msghdr& message, int flags) {
     std::size_t count = 0;
     for (std::size_t i = 0; i < message.msg_iovlen; ++i) count += message.msg_iov[i].iov_len;
-    return run("sendMessage", "socket", count, [&](std::size_t most) -> std::int64_t {
+    return run("sendMessage", targetOfSocket(socket), count, [&](std::size_t most) -> std::int64_t {
         if (most == count) return ::sendmsg(socket, &message, flags);
         std::vector<iovec> parts(message.msg_iov, message.msg_iov + message.msg_iovlen);
         std::size_t left = most;

@@ -44,6 +44,7 @@ std::string encode(const JournalEntry& entry) {
     put(out, entry.newPath);
     put(out, entry.offset);
     put(out, entry.bytes);
+    put(out, entry.time);
     return out;
 }
 
@@ -60,7 +61,7 @@ std::optional<std::vector<JournalEntry>> readJournal(const std::string& path) {
         if (kind > static_cast<std::uint64_t>(JournalEntry::Kind::Remove)) return std::nullopt;
         entry.kind = static_cast<JournalEntry::Kind>(kind);
         if (!take(rest, entry.path) || !take(rest, entry.newPath) || !take(rest, entry.offset) ||
-            !take(rest, entry.bytes))
+            !take(rest, entry.bytes) || !take(rest, entry.time))
             break;
         entries.push_back(std::move(entry));
     }

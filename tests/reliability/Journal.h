@@ -17,6 +17,7 @@ struct JournalEntry {
     std::string newPath;  ///< of a rename
     std::uint64_t offset = 0;
     std::string bytes;
+    std::uint64_t time = 0;  ///< host nanoseconds, when the call had been answered
 };
 
 inline std::string bytesAt(const void* bytes, ssize_t count) {

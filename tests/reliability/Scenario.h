@@ -52,6 +52,9 @@ public:
 
     /// Starts the daemon with the faulty calls, following this plan (none: it only takes notes).
     void startFaulty(const std::optional<FaultPoint>& point, std::optional<Fault> fault);
+    /// Starts the daemon with the faulty calls, all of which it only notes, until its end, and has the system's own list of
+    /// `systemCalls` written to the file `trace` meanwhile (strace, which ends with it).
+    void startTraced(const std::string& trace, const std::string& systemCalls);
     /// Starts the shipped daemon.
     void startShipped();
     /// From now on calls are noted and may fail, if the daemon was started for that; no more, until the next start.
@@ -72,7 +75,7 @@ protected:
     SavingWorld world_;
 
 private:
-    bool wantsFaults_ = false;
+    bool wantsFaults_ = false, staysArmed_ = false;
 };
 
 /// The movie of a window; whole, its middle ("clip"), or with clips for an extension.
