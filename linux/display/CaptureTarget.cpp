@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cstring>
 #include <utility>
 
 namespace lumacast::x11 {
@@ -21,7 +22,7 @@ std::unique_ptr<CaptureTarget> CaptureTarget::open(X11Connection& connection, xc
         xcb_get_geometry_reply(connection.get(), xcb_get_geometry(connection.get(), window), nullptr));
     if (!geometry || (geometry->depth != 24 && geometry->depth != 32)) return nullptr;
     std::unique_ptr<CaptureTarget> target(new CaptureTarget(connection, window, kind, geometry->depth));
-    target->begin();
+    target->begin(geometry->width, geometry->height);
     return target;
 }
 
@@ -46,14 +47,31 @@ CaptureTarget::~CaptureTarget() {
     xcb_flush(x);
 }
 
-void CaptureTarget::begin() {
+void CaptureTarget::begin(std::uint16_t width, std::uint16_t height) {
     xcb_connection_t* const x = connection_.get();
     const std::uint32_t events = kind_ == Kind::Window ? kWindowEvents : kScreenEvents;
     xcb_change_window_attributes(x, window_, XCB_CW_EVENT_MASK, &events);
     if (kind_ == Kind::Window) xcb_composite_redirect_window(x, window_, XCB_COMPOSITE_REDIRECT_AUTOMATIC);
+    if (kind_ == Kind::Window) askForRepaint(width, height);
     xcb_damage_create(x, damage_, window_, XCB_DAMAGE_REPORT_LEVEL_NON_EMPTY);
     xcb_xfixes_create_region(x, region_, 0, nullptr);
     refresh();
+}
+
+/// What had covered the window until a moment ago is still in its picture where the server paints no background: the
+/// server has asked for a repaint then and does not again. So the application is asked here, in the server's words; the
+/// event comes to this client too, and what it names is waited for as what the server uncovers is.
+void CaptureTarget::askForRepaint(std::uint16_t width, std::uint16_t height) {
+    xcb_expose_event_t event{};
+    event.response_type = XCB_EXPOSE;
+    event.window = window_;
+    event.width = width;
+    event.height = height;
+    static_assert(sizeof event <= 32);
+    std::array<char, 32> sent{};
+    std::memcpy(sent.data(), &event, sizeof event);
+    xcb_send_event(connection_.get(), 0, window_, XCB_EVENT_MASK_EXPOSURE, sent.data());
+    asksForRepaint_ = true;
 }
 
 void CaptureTarget::handle(const xcb_generic_event_t& event, std::int64_t now) {
@@ -74,7 +92,7 @@ void CaptureTarget::handle(const xcb_generic_event_t& event, std::int64_t now) {
         if (reinterpret_cast<const xcb_unmap_notify_event_t&>(event).window != window_) return;
         freePixmap();
         needsRefresh_ = false;
-        awaited_.clear();
+        awaitNothing();
     } else if (type == XCB_MAP_NOTIFY) {
         needsRefresh_ |= reinterpret_cast<const xcb_map_notify_event_t&>(event).window == window_;
     } else if (type == XCB_VISIBILITY_NOTIFY) {
@@ -88,16 +106,26 @@ void CaptureTarget::handle(const xcb_generic_event_t& event, std::int64_t now) {
 }
 
 void CaptureTarget::exposed(const xcb_expose_event_t& event, std::int64_t now) {
+    const bool isSent = (event.response_type & 0x80) != 0;
+    // One by anybody else is between him and the application.
+    if (isSent && !std::exchange(asksForRepaint_, false)) return;
     if (awaited_.empty()) {
         repaintDeadline_ = now + kRepaintPatience;
         painted_.clear();
     }
-    awaited_.add(PixelRect{event.x, event.y, event.width, event.height});
+    const PixelRect rect{event.x, event.y, event.width, event.height};
+    awaited_.add(rect);
+    if (!isSent) uncovered_.add(rect);
 }
 
-DamageRegion CaptureTarget::unpainted() const {
+void CaptureTarget::awaitNothing() {
+    awaited_.clear();
+    uncovered_.clear();
+}
+
+DamageRegion CaptureTarget::unpainted(const DamageRegion& region) const {
     DamageRegion left;
-    for (const PixelRect& rect : awaited_.rects()) {
+    for (const PixelRect& rect : region.rects()) {
         const PixelRect inside = intersection(rect, {0, 0, width_, height_});
         if (!painted_.covers(inside)) left.add(inside);
     }
@@ -105,9 +133,11 @@ DamageRegion CaptureTarget::unpainted() const {
 }
 
 void CaptureTarget::repaintIsLate(std::int64_t now) {
-    if (!foreign_ || !readable()) return awaited_.clear();
+    const DamageRegion left = unpainted(uncovered_);
+    awaitNothing();
+    if (!foreign_ || !readable() || left.empty()) return;
     foreign_ = false;
-    awaited_ = unpainted();
+    awaited_ = left;
     paintOver(awaited_);
     painted_.clear();
     repaintDeadline_ = now + kRepaintPatience;
@@ -216,7 +246,7 @@ void CaptureTarget::takeDamage(DamageRegion& into) {
     into.add(changed);
     if (awaited_.empty()) return;
     painted_.add(changed);
-    if (unpainted().empty()) awaited_.clear();
+    if (unpainted(awaited_).empty()) awaitNothing();
 }
 
 bool CaptureTarget::read(const SharedMemory& memory, std::span<const Strip> strips) {

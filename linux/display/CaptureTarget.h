@@ -55,20 +55,23 @@ public:
     void takeDamage(DamageRegion& into) override;
     std::int64_t repaintDeadline() const override { return awaited_.empty() ? 0 : repaintDeadline_; }
     /// What the server uncovered may still show other windows' pixels; once, that is painted over and the application
-    /// asked again, with another deadline. The second time the picture is taken as it is.
+    /// asked again, with another deadline. The second time the picture is taken as it is, and so is what the application
+    /// was only asked for.
     void repaintIsLate(std::int64_t now) override;
     bool read(const SharedMemory& memory, std::span<const Strip> strips) override;
     bool overtaken() const override { return damagedBefore(lastRead_); }
 
 private:
     CaptureTarget(X11Connection& connection, xcb_window_t window, Kind kind, std::uint8_t depth);
-    void begin();
+    void begin(std::uint16_t width, std::uint16_t height);
     void nameWindow();
     void measureScreen();
     void freePixmap();
     void forgetDamage();
+    void askForRepaint(std::uint16_t width, std::uint16_t height);
     void exposed(const xcb_expose_event_t& event, std::int64_t now);
-    DamageRegion unpainted() const;
+    DamageRegion unpainted(const DamageRegion& region) const;
+    void awaitNothing();
     void paintOver(const DamageRegion& region);
     void resized(const xcb_configure_notify_event_t& event);
 
@@ -85,7 +88,9 @@ private:
     std::int32_t width_ = 0, height_ = 0, border_ = 0;
     std::uint64_t layout_ = 0;
 
-    DamageRegion awaited_;  ///< uncovered by the server, not painted yet
+    DamageRegion awaited_;    ///< to be painted by the application, not painted yet
+    DamageRegion uncovered_;  ///< what of it the server has uncovered
+    bool asksForRepaint_ = false;  ///< until its own event comes back
     DamageRegion painted_;
     bool foreign_ = false;  ///< the server made new memory for the picture, out of what was on the screen
     std::int64_t repaintDeadline_ = 0;

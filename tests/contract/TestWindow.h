@@ -31,6 +31,7 @@ public:
         std::int64_t background = kNone;  ///< a colour that the server paints
         bool mapped = true;
         bool repaints = true;             ///< on Expose
+        bool isSlow = false;              ///< repaints only when a client asks for it: the server's asking it has not heard yet
         xcb_window_t parent = XCB_NONE;   ///< the screen's root when none
         std::uint8_t depth = 0;           ///< the parent's when 0
     };

@@ -107,6 +107,30 @@ TEST_F(X11Capture, NeverShowsWhatCoversAWindowThatIsNotRepainted) {
     }
 }
 
+// What had covered it stays on the screen until the application has painted, which it may do after the recording has begun.
+TEST_F(X11Capture, NeverShowsWhatHadCoveredAWindowThatIsBeingRepainted) {
+    TestWindow window(display.name(), {.colour = kRed, .isSlow = true});
+    window.paint(kRed);
+    {
+        TestWindow cover(display.name(), {.place = {-10, -10, 600, 500}, .colour = kBlue});
+        cover.paint(kBlue);
+        cover.unmap();
+    }
+    const auto made = startOn(window, 320, 240);
+    ASSERT_TRUE(frames->waitForCount(1));
+    EXPECT_EQ(frames->frames()[0].colour, kRed);
+    EXPECT_TRUE(frames->frames()[0].oneColour);
+}
+
+TEST_F(X11Capture, TakesAWindowAsItIsThatDoesNotAnswerWhenItIsAskedToRepaint) {
+    TestWindow window(display.name(), {.colour = kRed, .repaints = false});
+    window.paint(kRed);
+    const auto made = startOn(window, 320, 240);
+    ASSERT_TRUE(frames->waitForCount(1));
+    EXPECT_EQ(frames->frames()[0].colour, kRed) << "nothing was painted over";
+    EXPECT_TRUE(frames->frames()[0].oneColour);
+}
+
 TEST_F(X11Capture, FollowsAResizeWithoutBlankOrTornPictures) {
     TestWindow window(display.name(), {.place = {0, 0, 320, 240}, .colour = kRed, .background = kRed});
     const auto made = startOn(window, 320, 240);
