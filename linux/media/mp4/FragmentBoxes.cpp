@@ -8,19 +8,9 @@
 namespace lumacast::mp4 {
 namespace {
 
-// Sample flags, ISO/IEC 14496-12 clause 8.8.3.1.
-constexpr std::uint32_t kSyncSample = 0x02000000;   // sample_depends_on 2: on no other
-constexpr std::uint32_t kDeltaSample = 0x01010000;  // sample_depends_on 1, sample_is_non_sync_sample
-
-constexpr std::uint32_t kMediaHeaderBytes = 8;
-
 // ISO/IEC 14496-12 clause 8.8.8. Answers where its data_offset stands, which is known only when the whole moof is.
 std::size_t writeTrackRun(BoxBuffer& out, const TrackFragment& track) {
-    constexpr std::uint32_t kDataOffset = 0x000001;
-    constexpr std::uint32_t kDuration = 0x000100;
-    constexpr std::uint32_t kSize = 0x000200;
-    constexpr std::uint32_t kFlags = 0x000400;
-    const Box box(out, "trun", 0, kDataOffset | kDuration | kSize | (track.isVideo ? kFlags : 0));
+    const Box box(out, "trun", 0, kRunHasOffsetDurationsSizes | (track.isVideo ? kRunHasFlags : 0));
     out.u32(track.sampleCount);
     const std::size_t dataOffsetAt = out.size();
     out.u32(0);
@@ -37,7 +27,6 @@ std::size_t writeTrackRun(BoxBuffer& out, const TrackFragment& track) {
 
 // ISO/IEC 14496-12 clause 8.8.6.
 std::size_t writeTrackFragment(BoxBuffer& out, const TrackFragment& track) {
-    constexpr std::uint32_t kDefaultBaseIsMoof = 0x020000;
     const Box box(out, "traf");
     {
         const Box header(out, "tfhd", 0, kDefaultBaseIsMoof);  // ISO/IEC 14496-12 clause 8.8.7

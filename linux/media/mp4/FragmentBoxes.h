@@ -8,6 +8,15 @@ namespace lumacast::mp4 {
 class BoxBuffer;
 class SampleIndex;
 
+// Flags of a track fragment and its run as they are written, ISO/IEC 14496-12 clauses 8.8.7 and 8.8.8.
+inline constexpr std::uint32_t kDefaultBaseIsMoof = 0x020000;
+inline constexpr std::uint32_t kRunHasOffsetDurationsSizes = 0x000301;
+inline constexpr std::uint32_t kRunHasFlags = 0x000400;
+// Sample flags, ISO/IEC 14496-12 clause 8.8.3.1.
+inline constexpr std::uint32_t kSyncSample = 0x02000000;   // sample_depends_on 2: on no other
+inline constexpr std::uint32_t kDeltaSample = 0x01010000;  // sample_depends_on 1, sample_is_non_sync_sample
+inline constexpr std::uint32_t kMediaHeaderBytes = 8;      // of the media data box behind a fragment
+
 // What makes a movie box a fragmented one: the movie extends box, naming each track.
 void writeMovieExtends(BoxBuffer& out, std::span<const std::uint32_t> trackIds);
 

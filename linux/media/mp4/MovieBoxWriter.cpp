@@ -5,14 +5,15 @@
 #include <utility>
 
 #include "linux/media/mp4/FragmentBoxes.h"
+#include "linux/media/mp4/IndexInPlace.h"
 #include "linux/media/mp4/MovieLayout.h"
+#include "linux/media/mp4/MovieNote.h"
 #include "linux/media/mp4/SampleDescription.h"
 #include "linux/media/mp4/Ticks.h"
 
 namespace lumacast::mp4 {
 namespace {
 
-constexpr std::size_t kMaxTracks = 8;
 constexpr std::uint64_t kMaxSamples = 1ULL << 26U;  // keeps the final movie box below 4 GiB
 constexpr std::uint32_t kMaxFragmentBytes = 1U << 30U;
 constexpr std::int64_t kMaxSeconds = 1LL << 31U;  // of a stamp, either way: keeps sums of nanoseconds within 64 bits
@@ -261,7 +262,9 @@ MovieError MovieBoxWriter::writeFragment() {
     boxes_.clear();
     if (fragments_ == 0) {
         placeFragments(tracks_, options_.presentationStart);
-        writeInitialMovie(boxes_, {options_.timescale, options_.creationTime}, tracks_);
+        const auto kind = options_.purpose == MoviePurpose::copy ? NoteKind::copy : NoteKind::recording;
+        writeInitialMovie(boxes_, {options_.timescale, options_.creationTime}, tracks_,
+                          noteOf(kind, options_.presentationStart.has_value(), tracks_));
     }
     std::vector<TrackFragment> parts;
     for (const MovieTrack& track : tracks_) {
@@ -289,41 +292,27 @@ MovieError MovieBoxWriter::writeFragment() {
     }
     pendingBytes_ = 0;
     fragments_ += 1;
-    if (!sink_.sync()) {
-        return fail();
-    }
-    BoxBuffer type;
-    type.code("moof");  // all of the fragment is there now: readers may see it
-    return sink_.overwrite(headerOffset + kBoxTypeOffset, type.view()) ? MovieError::none : fail();
+    return showFragment(headerOffset) ? MovieError::none : fail();
 }
 
-// The order is what makes it safe: README.md lists what a reader sees after each step.
-MovieError MovieBoxWriter::replaceFragmentsByIndex() {
-    const std::uint64_t movieOffset = position_ + 8;  // behind the header of the box that hides it
-    boxes_.clear();
-    boxes_.reserve(finalTableBytes(tracks_));
-    bool presents = false;
-    {
-        const Box hidden(boxes_, "free");  // ISO/IEC 14496-12 clause 8.1.2
-        const MovieHead head{options_.timescale, options_.creationTime};
-        presents = writeFinalMovie(boxes_, head, tracks_, options_.presentationStart);
+bool MovieBoxWriter::showFragment(std::uint64_t headerOffset) {
+    if (options_.purpose == MoviePurpose::copy) {
+        return true;
     }
-    if (!presents) {
+    BoxBuffer type;
+    type.code("moof");  // all of the fragment is there after the sync: readers may see it
+    return sink_.sync() && sink_.overwrite(headerOffset + kBoxTypeOffset, type.view());
+}
+
+MovieError MovieBoxWriter::replaceFragmentsByIndex() {
+    const FinalMovie movie{{options_.timescale, options_.creationTime}, tracks_, options_.presentationStart, {}};
+    boxes_.clear();
+    if (!writeHiddenIndex(boxes_, movie)) {
         state_ = State::finished;
         return MovieError::empty;
     }
-    if (!append(boxes_.view())) {
-        return fail();
-    }
-    BoxBuffer size;
-    size.u64(movieOffset - kReserveOffset);
-    if (!sink_.overwrite(kReserveSizeOffset, size.view()) || !sink_.sync()) {
-        return fail();
-    }
-    BoxBuffer header;  // ISO/IEC 14496-12 clause 8.1.1; size 1: the 64-bit size follows, clause 4.2
-    header.u32(1);
-    header.code("mdat");
-    if (!sink_.overwrite(kReserveOffset, header.view()) || !sink_.sync()) {
+    const std::uint64_t indexOffset = position_;
+    if (!append(boxes_.view()) || !switchToIndex(sink_, indexOffset)) {
         return fail();
     }
     state_ = State::finished;

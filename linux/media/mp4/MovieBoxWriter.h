@@ -28,15 +28,21 @@ enum class MovieError : std::uint8_t {
 
 enum class TrackId : std::uint32_t {};  // the track_ID in the file
 
+// What is lost when the movie is not finished.
+enum class MoviePurpose : std::uint8_t {
+    recording,  // everything: so its fragments are shown and synced as they come
+    copy,       // nothing, it can be made again: none of its fragments is shown, and nothing is synced, before the finish
+};
+
 struct MovieOptions {
     std::uint32_t timescale = kDefaultVideoTimescale;   // ticks per second of edit lists and of the movie's duration
     std::uint64_t creationTime = 0;                     // seconds since 1904 began, UTC; 0: not stated
     std::uint32_t fragmentNanoseconds = 1'000'000'000;  // media time after which a fragment is closed
     std::uint32_t fragmentBytes = 8U << 20U;            // pending bytes after which it is closed early; 1 GiB at most
     // Nanoseconds on the tracks' time line at which the movie begins. What lies before is there to decode from and is
-    // not Nanoseconds on the tracks' time line at which the movie begins. What lies before is there to decode from and
-    // is not presented. None: the movie begins with its first picture.
+    // not presented. None: the movie begins with its first picture.
     std::optional<std::int64_t> presentationStart;
+    MoviePurpose purpose = MoviePurpose::recording;
 };
 
 struct SampleInfo {
@@ -102,6 +108,7 @@ private:
     void take(MovieTrack& track, const SampleInfo& info, std::span<const std::uint8_t> bytes);
     [[nodiscard]] std::uint32_t lastFragmentDuration(const MovieTrack& track) const;
     [[nodiscard]] MovieError writeFragment();
+    [[nodiscard]] bool showFragment(std::uint64_t headerOffset);
     [[nodiscard]] MovieError replaceFragmentsByIndex();
     [[nodiscard]] bool append(std::span<const std::uint8_t> bytes);
     [[nodiscard]] MovieError fail();

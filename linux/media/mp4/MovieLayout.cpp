@@ -91,7 +91,8 @@ void placeFragments(std::span<MovieTrack> tracks, std::optional<std::int64_t> gi
     }
 }
 
-void writeInitialMovie(BoxBuffer& out, const MovieHead& head, std::span<const MovieTrack> tracks) {
+void writeInitialMovie(BoxBuffer& out, const MovieHead& head, std::span<const MovieTrack> tracks,
+                       const MovieNote& note) {
     const Box box(out, "moov");  // ISO/IEC 14496-12 clause 8.2.1
     writeMovieHeader(out, {head.timescale, head.creationTime, 0, nextTrackId(tracks)});
     const SampleIndex nothing;
@@ -103,10 +104,11 @@ void writeInitialMovie(BoxBuffer& out, const MovieHead& head, std::span<const Mo
         ids.push_back(track.id);
     }
     writeMovieExtends(out, ids);
+    writeNote(out, note);
 }
 
-bool writeFinalMovie(BoxBuffer& out, const MovieHead& head, std::span<const MovieTrack> tracks,
-                     std::optional<std::int64_t> givenStart) {
+bool writeFinalMovie(BoxBuffer& out, const FinalMovie& movie) {
+    const auto& [head, tracks, givenStart, note] = movie;
     const std::int64_t movieStart = givenStart ? *givenStart : movieStartNanoseconds(tracks);
     std::vector<TrackEdits> edits;
     std::uint64_t duration = 0;
@@ -124,6 +126,9 @@ bool writeFinalMovie(BoxBuffer& out, const MovieHead& head, std::span<const Movi
             writeTrack(out, tracks[i].description, {tracks[i].id, head.creationTime, edits[i].duration, edits[i].list},
                        tracks[i].index);
         }
+    }
+    if (note) {
+        writeNote(out, {*note, false, {}});
     }
     return true;
 }

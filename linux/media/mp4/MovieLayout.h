@@ -4,6 +4,7 @@
 #include <optional>
 #include <span>
 
+#include "linux/media/mp4/MovieNote.h"
 #include "linux/media/mp4/MovieTrack.h"
 
 namespace lumacast::mp4 {
@@ -36,12 +37,19 @@ void placeFragments(std::span<MovieTrack> tracks, std::optional<std::int64_t> st
 
 // The movie box of a file in fragments: every track declared, none with samples, and an edit list where ticks are
 // skipped.
-void writeInitialMovie(BoxBuffer& out, const MovieHead& head, std::span<const MovieTrack> tracks);
+void writeInitialMovie(BoxBuffer& out, const MovieHead& head, std::span<const MovieTrack> tracks,
+                       const MovieNote& note);
+
+struct FinalMovie {
+    MovieHead head;
+    std::span<const MovieTrack> tracks;
+    std::optional<std::int64_t> start;
+    std::optional<NoteKind> note;  // in a movie that somebody else finishes
+};
 
 // The movie box of the finished file: every track that has something to present, with its complete tables. False, and
 // nothing is written, when no track has.
-[[nodiscard]] bool writeFinalMovie(BoxBuffer& out, const MovieHead& head, std::span<const MovieTrack> tracks,
-                                   std::optional<std::int64_t> start);
+[[nodiscard]] bool writeFinalMovie(BoxBuffer& out, const FinalMovie& movie);
 
 // An upper bound of the bytes of the final movie box's tables.
 [[nodiscard]] std::size_t finalTableBytes(std::span<const MovieTrack> tracks);

@@ -8,6 +8,8 @@
 
 namespace lumacast::mp4 {
 
+inline constexpr std::size_t kMaxTracks = 8;
+
 // What the writer keeps of one track while it writes.
 struct MovieTrack {
     std::uint32_t id = 0;

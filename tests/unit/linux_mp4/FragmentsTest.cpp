@@ -56,7 +56,7 @@ TEST_F(Fragments, TheFirstBringsTheMovieBoxWithEveryTrackDeclaredAndNoSamples) {
     const auto boxes = parseBoxes(sink.file());
     ASSERT_EQ(test::typesOf(boxes), "ftyp free moov moof mdat");
     const ParsedBox& movie = boxes[2];
-    EXPECT_EQ(movie.childTypes(), "mvhd trak trak trak mvex");
+    EXPECT_EQ(movie.childTypes(), "mvhd trak trak trak mvex uuid");
     EXPECT_EQ(movie.at("mvex").childTypes(), "trex trex trex");
     for (const ParsedBox* trak : movie.all("trak")) {
         const auto track = test::parseTrack(*trak);
