@@ -28,6 +28,8 @@
 #include "linux/library/LinuxPhotoLibrary.h"
 #include "linux/media/LinuxContainerWriters.h"
 #include "linux/media/LinuxMovieExporters.h"
+#include "linux/media/MoviesCommand.h"
+#include "linux/media/UnfinishedMovies.h"
 #include "linux/network/LinuxNetworkReachability.h"
 #include "linux/sounds/LinuxSystemSounds.h"
 #include "linux/storage/LinuxFileSystem.h"
@@ -74,6 +76,10 @@ std::string environmentVariable(const char* name) {
     return value ? value : "";
 }
 
+std::string temporaryDirectory(const LinuxEnvironment& environment) {
+    return environment.root + std::string(kDeviceTemporaryDirectory);
+}
+
 /// Members are made in this order and unmade in the opposite one.
 class LinuxPlatform final : public PlatformOwner {
 public:
@@ -93,9 +99,10 @@ public:
           soundServer_(std::make_shared<sound::PulseConnection>()),
           audioInputQueues_(soundServer_, clock_, [this](ProcessID pid) { return applicationOf(pid); }),
           deviceCapture_(soundServer_, clock_, scheduler_),
-          movieFiles_(std::make_shared<media::PosixMovieFiles>(environment.root + std::string(kDeviceTemporaryDirectory))),
+          movieFiles_(std::make_shared<media::PosixMovieFiles>(temporaryDirectory(environment))),
           writers_(clock_, movieFiles_),
           exporters_(movieFiles_),
+          unfinishedMovies_(temporaryDirectory(environment), log_),
           photoLibrary_({.home = environment.home,
                          .configHome = environment.configHome,
                          .videosDirectory = environmentVariable("XDG_VIDEOS_DIR")}),
@@ -119,8 +126,7 @@ public:
                                                                   environmentVariable("XDG_RUNTIME_DIR"))}),
           storeLookup_(scheduler_, LinuxStoreLookup::optionsFrom(environment)),
           appExtensions_(*reactor_, scheduler_, ipc_, log_,
-                         LinuxAppExtensions::optionsFrom(environment,
-                                                         environment.root + std::string(kDeviceTemporaryDirectory))),
+                         LinuxAppExtensions::optionsFrom(environment, temporaryDirectory(environment))),
           platform_{log_,       scheduler_, clock_,   ipc_,
                     bundles_,   renderServer_, appState_, capture_,
                     capture_,   audioInputQueues_, deviceCapture_, writers_,
@@ -131,13 +137,18 @@ public:
           termination_([this] { closeMovies(); }, kTimeToEnd,
                        {[this] { keepAlive_.announceStopping(static_cast<int>(kMoreTime.count())); }, kAskForTimeEvery}) {
         admin_.addCommand("usage", usageCommand(telemetry_));
+        admin_.addCommand("movies", media::moviesCommand(scheduler_, temporaryDirectory(environment)));
     }
 
     /// What must be there before the daemon can work; the error when it can't be had.
     std::optional<Error> prepare() {
         if (auto error = fileSystem_.prepare()) return error;
+        unfinishedMovies_.remember();
         // The main loop's first task: by then clients are accepted.
-        scheduler_.mainQueue().async([this] { keepAlive_.announceReady(); });
+        scheduler_.mainQueue().async([this] {
+            keepAlive_.announceReady();
+            unfinishedMovies_.begin([this] { photoLibrary_.removeUnfinished(); });
+        });
         return std::nullopt;
     }
 
@@ -208,6 +219,7 @@ private:
     const std::shared_ptr<media::MovieFiles> movieFiles_;
     LinuxContainerWriters writers_;
     LinuxMovieExporters exporters_;
+    media::UnfinishedMovies unfinishedMovies_;
     LinuxPhotoLibrary photoLibrary_;
     LinuxFileSystem fileSystem_;
     LinuxPreferences preferences_;

@@ -10,6 +10,7 @@
 #include <variant>
 
 #include "linux/library/LibraryFolder.h"
+#include "linux/library/StaleParts.h"
 #include "linux/library/VideosFolder.h"
 #include "linux/storage/BeneathDirectory.h"
 #include "linux/calls/FileCalls.h"
@@ -105,9 +106,22 @@ std::variant<std::string, int> addCopy(int movie, const std::string& path, Libra
     return folder.path() + "/" + std::get<std::string>(name);
 }
 
+/// As the kernel stamps files.
+timespec momentOfFiles() {
+    timespec now = {};
+    ::clock_gettime(CLOCK_REALTIME_COARSE, &now);
+    return now;
+}
+
 }  // namespace
 
-LinuxPhotoLibrary::LinuxPhotoLibrary(Options options) : options_(std::move(options)) {}
+LinuxPhotoLibrary::LinuxPhotoLibrary(Options options) : options_(std::move(options)), start_(momentOfFiles()) {}
+
+void LinuxPhotoLibrary::removeUnfinished() {
+    const std::string videos = videosFolder(options_.home, options_.configHome, options_.videosDirectory);
+    const auto folder = openTrusted(withSingleSlashes(videos + "/Lumacast"));
+    if (const auto* found = std::get_if<FileDescriptor>(&folder)) (void)removeStaleParts(found->get(), start_);
+}
 
 Result<URL> LinuxPhotoLibrary::addVideo(const URL& movie, UserID userID) {
     const uid_t user = number(userID);

@@ -1,4 +1,6 @@
 #pragma once
+#include <time.h>
+
 #include <string>
 
 #include "linux/library/CopyBytes.h"
@@ -27,8 +29,13 @@ public:
 
     Result<URL> addVideo(const URL& movie, UserID user) override;
 
+    /// Removes from this user's own library what a process that was killed has left there: hidden files of saves that
+    /// began before this object was made. Makes no folder. Blocks as long as the disk does.
+    void removeUnfinished();
+
 private:
     const Options options_;
+    const timespec start_;
 };
 
 }  // namespace lumacast

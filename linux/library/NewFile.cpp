@@ -9,6 +9,7 @@
 #include <utility>
 
 #include "linux/calls/FileCalls.h"
+#include "linux/system/FileLock.h"
 
 namespace lumacast {
 
@@ -16,12 +17,14 @@ namespace {
 
 constexpr mode_t kMode = 0644;  // less the umask
 constexpr int kAttempts = 100;
+constexpr std::string_view kPrefix = ".lumacast-", kSuffix = ".part";
 
 std::string randomName() {
     std::uint64_t number = 0;
     if (::getrandom(&number, sizeof number, GRND_NONBLOCK) != sizeof number) return {};
     char text[48];
-    std::snprintf(text, sizeof text, ".lumacast-%016llx.part", static_cast<unsigned long long>(number));
+    std::snprintf(text, sizeof text, "%s%016llx%s", std::string(kPrefix).c_str(), static_cast<unsigned long long>(number),
+                  std::string(kSuffix).c_str());
     return text;
 }
 
@@ -39,10 +42,20 @@ std::variant<NewFile, int> NewFile::in(int folder, Unseen unseen) {
         if (name.empty()) return EAGAIN;
         FileDescriptor file(
             calls::openAt(folder, name, O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, kMode));
-        if (file) return NewFile(folder, std::move(file), std::move(name));
+        if (file) {
+            (void)markBeingWritten(file.get());  // it is new: nobody else's
+            return NewFile(folder, std::move(file), std::move(name));
+        }
         if (errno != EEXIST) return errno;
     }
     return EEXIST;
+}
+
+bool isHiddenName(std::string_view name) {
+    constexpr std::size_t kDigits = 16;
+    return name.size() == kPrefix.size() + kDigits + kSuffix.size() && name.starts_with(kPrefix) &&
+           name.ends_with(kSuffix) &&
+           name.substr(kPrefix.size(), kDigits).find_first_not_of("0123456789abcdef") == std::string_view::npos;
 }
 
 NewFile::NewFile(int folder, FileDescriptor file, std::string hiddenName)

@@ -1,5 +1,6 @@
 #pragma once
 #include <string>
+#include <string_view>
 #include <variant>
 
 #include "linux/system/FileDescriptor.h"
@@ -38,5 +39,8 @@ private:
     FileDescriptor file_;
     std::string hiddenName_;  ///< empty for none
 };
+
+/// Whether a file has the name of a hidden one: of a save that goes on, or that a process could not end.
+bool isHiddenName(std::string_view name);
 
 }  // namespace lumacast

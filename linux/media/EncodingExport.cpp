@@ -92,6 +92,7 @@ private:
     static mp4::MovieOptions options() {
         mp4::MovieOptions options;
         options.presentationStart = 0;
+        options.purpose = mp4::MoviePurpose::copy;
         return options;
     }
 

@@ -9,7 +9,8 @@
 
 namespace lumacast::media {
 
-/// Writes at once, and brings the file onto the disk only at the end: a copy that is lost can be made again.
+/// Writes at once, and brings the file onto the disk only where the box writer asks for it, which for a copy is before and
+/// after it is switched to its index: one that is lost can be made again, but what looks finished is.
 class ExportSink final : public mp4::BoxSink {
 public:
     explicit ExportSink(MovieFile& file) : file_(file) {}
@@ -21,7 +22,10 @@ public:
         if (error_ == 0) error_ = file_.write(offset, bytes);
         return error_ == 0;
     }
-    bool sync() override { return error_ == 0; }
+    bool sync() override {
+        if (error_ == 0) error_ = file_.sync();
+        return error_ == 0;
+    }
     /// The system's number of the first failure; 0: none.
     int error() const { return error_; }
 

@@ -25,9 +25,6 @@ ExportResult exportMovie(const ExportPlan& plan, MovieFiles& files, ExportState&
                               : exportEncoded(source, plan, sink, std::get<0>(span), state);
     // The disk knows best what was wrong with it.
     if (result.status == ExportStatus::Failed && sink.error() != 0) result.error = systemError(sink.error());
-    if (result.status == ExportStatus::Completed) {
-        if (const int error = file.sync(); error != 0) result = {ExportStatus::Failed, systemError(error)};
-    }
     if (result.status != ExportStatus::Completed) {
         file.removeName(plan.destination);
     } else {

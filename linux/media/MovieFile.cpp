@@ -9,6 +9,7 @@
 #include "linux/calls/FileCalls.h"
 #include "linux/calls/FolderSync.h"
 #include "linux/storage/BeneathDirectory.h"
+#include "linux/system/FileLock.h"
 
 namespace lumacast::media {
 
@@ -57,6 +58,7 @@ std::variant<std::unique_ptr<MovieFile>, int> createIn(FileDescriptor folder, co
     // The mode is what umask 077 would leave, whatever the process's umask is.
     const int descriptor = calls::openAt(folder.get(), name, O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
     if (descriptor < 0) return errno;
+    (void)markBeingWritten(descriptor);  // it is new: nobody else's
     return std::make_unique<PosixMovieFile>(descriptor, std::move(folder));
 }
 

@@ -61,6 +61,7 @@ private:
     static mp4::MovieOptions options(const ExportSpan& span) {
         mp4::MovieOptions options;
         options.presentationStart = span.start;
+        options.purpose = mp4::MoviePurpose::copy;
         return options;
     }
 

@@ -1,0 +1,86 @@
+#include "linux/media/UnfinishedMovies.h"
+
+#include <pthread.h>
+#include <signal.h>
+
+#include <system_error>
+
+#include "linux/media/mp4/MovieRecovery.h"
+#include "linux/system/LowPriority.h"
+#include "linux/system/SystemError.h"
+
+namespace lumacast::media {
+
+UnfinishedMovies::~UnfinishedMovies() {
+    cancelled_.store(true, std::memory_order_relaxed);
+    wait();
+}
+
+void UnfinishedMovies::remember() {
+    if (const auto folder = MovieFolder::open(directory_)) files_ = folder->list(kMostFiles);
+}
+
+void UnfinishedMovies::begin(std::function<void()> afterwards) {
+    sigset_t all;
+    sigset_t before;
+    sigfillset(&all);
+    pthread_sigmask(SIG_SETMASK, &all, &before);  // signals belong to the termination thread
+    try {
+        thread_ = std::thread([this, afterwards = std::move(afterwards)] {
+            runAtLowPriority();
+            run();
+            if (afterwards && !cancelled_.load(std::memory_order_relaxed)) afterwards();
+        });
+    } catch (const std::system_error&) {
+        // The next start has another try.
+    }
+    pthread_sigmask(SIG_SETMASK, &before, nullptr);
+}
+
+void UnfinishedMovies::wait() {
+    if (thread_.joinable()) thread_.join();
+}
+
+void UnfinishedMovies::run() {
+    if (files_.empty()) return;
+    const auto folder = MovieFolder::open(directory_);
+    if (!folder) return;
+    for (const ListedFile& listed : files_) {
+        if (cancelled_.load(std::memory_order_relaxed) || !handle(*folder, listed)) return;
+    }
+}
+
+/// False when the others are not worth a try.
+bool UnfinishedMovies::handle(const MovieFolder& folder, const ListedFile& listed) {
+    const auto movie = folder.openToChange(listed, cancelled_);
+    if (!movie) return true;
+    const mp4::Recovery result = mp4::recoverMovie(*movie, *movie);
+    switch (result) {
+        case mp4::Recovery::recovered:
+        case mp4::Recovery::completed:
+            movie->restoreTimes();
+            log_.line("an earlier run left %s unfinished: it has its index now", listed.name);
+            return true;
+        case mp4::Recovery::unfinishedCopy:
+            if (folder.remove(listed) == 0) log_.line("an earlier run left the copy %s unfinished: removed", listed.name);
+            return true;
+        case mp4::Recovery::sinkFailed:
+            movie->restoreTimes();
+            log_.error("an earlier run left %s unfinished, and its index can't be written: %s", listed.name,
+                       describe(systemError(movie->error())));
+            return false;
+        case mp4::Recovery::damaged:
+        case mp4::Recovery::tooLong:
+            log_.error("an earlier run left %s unfinished, and it can't be read back: %s", listed.name,
+                       mp4::nameOf(result));
+            return true;
+        case mp4::Recovery::finished:
+        case mp4::Recovery::notOurs:
+        case mp4::Recovery::nothingWhole:
+        case mp4::Recovery::sourceFailed:
+            return true;
+    }
+    return true;
+}
+
+}  // namespace lumacast::media
