@@ -177,7 +177,7 @@ int main(int argc, char** argv) {
     storage->footer(exitStatuses);
     storage->require_subcommand(0, 1);
     storage->add_flag("--json", json, "Answer one line of JSON");
-    CLI::App* list = storage->add_subcommand("list", "Show the movies: size, date, and whether one is being recorded");
+    CLI::App* list = storage->add_subcommand("list", "Show the movies: size, date, age, length and state");
     CLI::App* purgeable = storage->add_subcommand("purgeable", "Show what a purge could give back");
     CLI::App* purge = storage->add_subcommand(
         "purge", "Delete as if space were so short: from urgency 3 on a running recording is stopped and every movie "
