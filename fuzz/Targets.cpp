@@ -24,6 +24,7 @@ constexpr std::array kTargets{
     Target{"movies", movies},
     Target{"payloads", payloads},
     Target{"preferences", preferences},
+    Target{"recoveries", recoveries},
     Target{"sound_server", soundServer},
     Target{"strings_table", stringsTable},
     Target{"values", values},

@@ -36,6 +36,7 @@ void messages(Bytes input);
 void movies(Bytes input);
 void payloads(Bytes input);
 void preferences(Bytes input);
+void recoveries(Bytes input);
 void soundServer(Bytes input);
 void stringsTable(Bytes input);
 void values(Bytes input);

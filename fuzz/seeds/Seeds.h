@@ -16,6 +16,7 @@ void writeFrameSeeds(const std::filesystem::path& corpora);
 void writeItemSeeds(const std::filesystem::path& corpora);
 void writeMessageSeeds(const std::filesystem::path& corpora);
 void writePayloadSeeds(const std::filesystem::path& corpora);
+void writeRecoverySeeds(const std::filesystem::path& corpora);
 void writeSettingsSeeds(const std::filesystem::path& corpora);
 void writeSoundServerSeeds(const std::filesystem::path& corpora);
 void writeValueSeeds(const std::filesystem::path& corpora);

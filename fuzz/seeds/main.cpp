@@ -19,6 +19,7 @@ int main(int argc, char** argv) {
         lumacast::fuzz::writeItemSeeds(argv[1]);
         lumacast::fuzz::writeMessageSeeds(argv[1]);
         lumacast::fuzz::writePayloadSeeds(argv[1]);
+        lumacast::fuzz::writeRecoverySeeds(argv[1]);
         lumacast::fuzz::writeSettingsSeeds(argv[1]);
         lumacast::fuzz::writeSoundServerSeeds(argv[1]);
         lumacast::fuzz::writeValueSeeds(argv[1]);
