@@ -32,7 +32,9 @@ std::string recording(mp4::MoviePurpose purpose = mp4::MoviePurpose::recording, 
     for (std::uint32_t i = 0; i < 100; ++i)
         EXPECT_EQ(writer.addSample(*video, {i * 40'000, 0, i % 25 == 0}, mp4::test::payload(i, 500)), MovieError::none);
     EXPECT_EQ(writer.flushFragment(), MovieError::none);
-    if (isFinished) EXPECT_EQ(writer.finish(4'000'000), MovieError::none);
+    if (isFinished) {
+        EXPECT_EQ(writer.finish(4'000'000), MovieError::none);
+    }
     return {sink.file().begin(), sink.file().end()};
 }
 
