@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <random>
 
 #include "linux/media/mp4/MovieLook.h"
@@ -103,6 +104,33 @@ TEST_F(InterruptedRecovery, AtAnyByteLeavesTheFilePlayingAsBeforeAndTheNextOneFi
                             result == Recovery::finished) << nameOf(result);
                 test::expectSameMovie(next.bytes(), whole.bytes(), "operation " + std::to_string(count));
             }
+        }
+    }
+}
+
+// While the index is appended and not switched to, a reader walks from box to box: none may begin in the middle of it.
+TEST_F(InterruptedRecovery, HasNoBoxBeginInTheMiddleOfItsIndex) {
+    std::uint64_t header = 0;
+    for (const auto& box : test::parseBoxes(recording)) {
+        header = box.type == "moof" ? box.offset : header;
+    }
+    for (std::uint64_t cut = header + 1; cut < recording.size(); cut += cut < header + 24 ? 1 : 371) {
+        Bytes crashed(recording.begin(), recording.begin() + static_cast<std::ptrdiff_t>(cut));
+        std::copy_n("free", std::clamp<std::int64_t>(static_cast<std::int64_t>(cut - header) - 4, 0, 4),
+                    crashed.begin() + static_cast<std::ptrdiff_t>(std::min(header + 4, cut)));
+        MemoryFile movie(crashed);
+        ASSERT_EQ(nameOf(recoverMovie(movie, movie)), nameOf(Recovery::recovered));
+        std::size_t appends = 0;
+        while (movie.operations()[appends].kind == MemorySink::Kind::append) {
+            ++appends;
+        }
+        const Bytes state = movie.after(appends);
+        const std::uint64_t index = movie.operations()[appends - 1].offset;
+        std::uint64_t at = 0;
+        while (at < state.size()) {
+            ASSERT_TRUE(at <= index) << "cut at " << cut - header << ": a box begins " << at - index << " in the index";
+            const std::uint64_t size = test::Fields(std::span(state).subspan(at)).u32();
+            at = size < 8 ? state.size() : at + size;
         }
     }
 }
