@@ -121,8 +121,12 @@ private:
         json& report = result_.report["sync"];
         report = {{"pairs", sync.pairs.size()}, {"worst_ms", milliseconds(sync.worst)}};
         report["drift_ms"] = sync.drift ? json(milliseconds(*sync.drift)) : json();
+        report["mark_ms"] = json::array();
         report["late_ms"] = json::array();
-        for (const SyncPair& pair : sync.pairs) report["late_ms"].push_back(milliseconds(pair.late));
+        for (const SyncPair& pair : sync.pairs) {
+            report["mark_ms"].push_back(milliseconds(pair.mark));
+            report["late_ms"].push_back(milliseconds(pair.late));
+        }
     }
 
     void judgeBoxes() {
