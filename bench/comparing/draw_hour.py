@@ -17,9 +17,11 @@ def main(folder):
     figures = json.loads((folder / "hour.json").read_text())
     minutes = [sample["seconds"] / 60 for sample in samples]
     figure, (memory, counts, sync) = plt.subplots(3, 1, figsize=(9, 8), sharex=True)
-    memory.plot(minutes, [sample["pss"] / 1e6 for sample in samples], lw=1)
+    memory.plot(minutes, [sample["pss"] / 1e6 for sample in samples], lw=1, label="PSS")
+    memory.plot(minutes, [sample["own"] / 1e6 for sample in samples], lw=1, label="of it no file's")
     memory.set_ylim(bottom=0)
-    memory.set_ylabel("memory (PSS), MB")
+    memory.set_ylabel("memory, MB")
+    memory.legend(loc="lower right", fontsize=8)
     memory.set_title(f"The daemon over {figures['minutes']} minutes of recording, a pause each minute "
                      f"({figures['size']}, {figures['fps']} frames a second, picture and sound)", fontsize=10)
     counts.plot(minutes, [sample["descriptors"] for sample in samples], lw=1, label="descriptors")

@@ -1,327 +1,221 @@
 #include "tests/checkers/BoxTrackChecker.h"
 
-#include <algorithm>
-
-#include "tests/checkers/BoxReader.h"
+#include "tests/checkers/BoxSampleEntries.h"
 
 namespace lumacast::checkers {
 namespace {
 
-// Sample entries have this many bytes before the boxes they contain (ISO/IEC 14496-12, 12.1.3 and 12.2.3).
-constexpr std::size_t kVisualEntryBytes = 78;
-constexpr std::size_t kAudioEntryBytes = 28;
+__extension__ using Wide = unsigned __int128;
 
-struct FullBox {
-    std::uint8_t version;
-    BoxReader fields;
+constexpr char kTrackHeader[] = "14496-12, 8.3.2", kMediaHeader[] = "14496-12, 8.4.2", kHandler[] = "14496-12, 8.4.3",
+               kEdits[] = "14496-12, 8.6.6", kReferences[] = "14496-12, 8.7.2";
 
-    explicit FullBox(const Box& box) : version(0), fields(box.content) {
-        version = fields.u8();
-        fields.skip(3);
-    }
-};
+/// What is hidden of AAC, whose encoders put at least one packet before the first real sound.
+constexpr std::uint64_t kLeastPriming = 1024;
 
-struct ChunkRun {
-    std::uint32_t firstChunk, samplesPerChunk;
+struct EditEntry {
+    std::uint64_t length = 0;  // ticks of the movie
+    std::uint64_t start = 0;   // ticks of the track
+    bool isEmpty = false;
 };
 
 class TrackCheck final {
 public:
-    TrackCheck(std::uint32_t movieTimescale, const std::vector<Extent>& media, std::vector<Extent>& chunks,
-               Findings& findings)
-        : movieTimescale_(movieTimescale), media_(media), chunks_(chunks), findings_(findings) {}
+    TrackCheck(const TrackContext& context, const Complaints& movie)
+        : context_(context), complaints_(movie.about("a track")) {}
 
-    BoxTrack run(const Box& trak) {
-        const auto boxes = children(trak);
-        if (const Box* header = only(boxes, "tkhd")) readTrackHeader(*header);
-        where_ = "track " + std::to_string(track_.identifier);
-        if (const Box* media = only(boxes, "mdia")) readMedia(*media);
-        const auto edits = std::find_if(boxes.begin(), boxes.end(), [](const Box& box) { return box.type == "edts"; });
-        checkDuration(edits == boxes.end() ? nullptr : &*edits);
-        return track_;
+    CheckedTrack run(const Box& trak) {
+        const auto boxes = childrenOf(trak, complaints_);
+        const Box* header = onlyBox(boxes, "tkhd", kTrackHeader, complaints_);
+        if (header != nullptr) readTrackHeader(*header);
+        if (const Box* media = onlyBox(boxes, "mdia", "14496-12, 8.4.1", complaints())) readMedia(*media);
+        checkEdits(anyBox(boxes, "edts", "14496-12, 8.6.5", complaints()));
+        return checked_;
     }
 
 private:
-    void find(const std::string& text) { findings_.push_back(where_ + ": " + text); }
-    std::vector<Box> children(const Box& box) {
-        return boxesIn(box.content, box.offset, where_ + " " + box.type, findings_);
+    [[nodiscard]] Complaints complaints() const {
+        return track_.identifier == 0 ? complaints_ : complaints_.about("track " + std::to_string(track_.identifier));
     }
-    const Box* only(const std::vector<Box>& boxes, const char* type) { return onlyBox(boxes, type, where_, findings_); }
-
-    void require(bool condition, const std::string& text) {
-        if (!condition) find(text);
+    void require(bool isSo, const char* clause, const std::string& otherwise) const {
+        complaints().require(isSo, clause, otherwise);
     }
-    // A table must end where its box ends.
-    void requireEnd(const BoxReader& fields, const char* type) {
-        require(fields.good() && fields.left() == 0, std::string(type) + " has another size than its entries");
-    }
-    // Entries that its own bytes can hold, so that a wrong count can't make the walk endless.
-    std::uint64_t entries(BoxReader& fields, std::size_t entryBytes, const char* type) {
-        const std::uint64_t count = fields.u32();
-        if (count * entryBytes == fields.left()) return count;
-        find(std::string(type) + " has another size than its entries");
-        return std::min<std::uint64_t>(count, fields.left() / entryBytes);
-    }
+    [[nodiscard]] bool isFinished() const { return context_.shape == BoxShape::Finished; }
 
     void readTrackHeader(const Box& box) {
-        FullBox header(box);
+        constexpr std::uint32_t kEnabled = 1;
+        FullBox header(box, 1, complaints_);
         header.fields.skip(header.version == 0 ? 8 : 16);
         track_.identifier = header.fields.u32();
         header.fields.skip(4);
         track_.duration = header.fields.byVersion(header.version);
-        require(track_.identifier != 0, "the identifier is 0");
-        header.fields.skip(60);
-        requireEnd(header.fields, "tkhd");
+        require(track_.identifier != 0, kTrackHeader, "the identifier is 0");
+        require((header.flags & kEnabled) != 0, kTrackHeader, "the track is disabled");
+        header.fields.skip(16);
+        std::uint32_t last[3]{};
+        for (auto& row : last) {
+            header.fields.skip(8);
+            row = header.fields.u32();
+        }
+        require(last[0] == 0 && last[1] == 0 && last[2] == 0x40000000, "14496-12, 6.2.2",
+                "the last column of the matrix is not 0, 0, 1");
+        width_ = header.fields.u32();
+        height_ = header.fields.u32();
+        requireEnd(header.fields, "tkhd", kTrackHeader, complaints());
     }
 
     void readMedia(const Box& box) {
-        const auto boxes = children(box);
-        if (const Box* header = only(boxes, "mdhd")) {
-            FullBox fields(*header);
-            fields.fields.skip(fields.version == 0 ? 8 : 16);
-            track_.timescale = fields.fields.u32();
-            track_.mediaDuration = fields.fields.byVersion(fields.version);
-            fields.fields.skip(4);
-            requireEnd(fields.fields, "mdhd");
-            require(track_.timescale != 0, "the time scale is 0");
-        }
-        if (const Box* handler = only(boxes, "hdlr")) {
-            FullBox fields(*handler);
-            fields.fields.skip(4);
-            track_.handler = fields.fields.fourCharacters();
-        }
-        const Box* information = only(boxes, "minf");
-        if (information == nullptr) return;
-        const auto inside = children(*information);
-        if (track_.handler == "vide") (void)only(inside, "vmhd");
-        if (track_.handler == "soun") (void)only(inside, "smhd");
-        if (const Box* data = only(inside, "dinf")) (void)only(children(*data), "dref");
-        if (const Box* table = only(inside, "stbl")) readSampleTable(children(*table));
+        const auto boxes = childrenOf(box, complaints());
+        if (const Box* header = onlyBox(boxes, "mdhd", kMediaHeader, complaints())) readMediaHeader(*header);
+        if (const Box* handler = onlyBox(boxes, "hdlr", kHandler, complaints())) readHandler(*handler);
+        if (const Box* information = onlyBox(boxes, "minf", "14496-12, 8.4.4", complaints()))
+            readInformation(childrenOf(*information, complaints()));
     }
 
-    void readSampleTable(const std::vector<Box>& boxes) {
-        if (const Box* box = only(boxes, "stsd")) readEntries(*box);
-        if (const Box* box = only(boxes, "stsz")) readSizes(*box);
-        if (const Box* box = only(boxes, "stts")) readTimes(*box);
-        readOffsets(boxes);
-        if (const Box* box = only(boxes, "stsc")) placeChunks(*box);
-        track_.syncSamples = track_.samples;
-        for (const Box& box : boxes) {
-            if (box.type == "stss") readSyncSamples(box);
-            if (box.type == "ctts") readCompositionOffsets(box);
+    void readInformation(const std::vector<Box>& boxes) {
+        if (track_.handler == "vide") {
+            require(width_ != 0 && height_ != 0, kTrackHeader, "the picture has no width or no height");
+            if (const Box* header = onlyBox(boxes, "vmhd", "14496-12, 12.1.2", complaints()))
+                require(FullBox(*header).flags == 1, "14496-12, 12.1.2", "vmhd doesn't have the flags 1");
         }
+        if (track_.handler == "soun") (void)onlyBox(boxes, "smhd", "14496-12, 12.2.2", complaints());
+        std::uint64_t references = 0;
+        if (const Box* data = onlyBox(boxes, "dinf", "14496-12, 8.7.1", complaints())) {
+            const auto inside = childrenOf(*data, complaints());
+            if (const Box* table = onlyBox(inside, "dref", kReferences, complaints())) references = readReferences(*table);
+        }
+        if (const Box* table = onlyBox(boxes, "stbl", "14496-12, 8.5.1", complaints()))
+            readTables(childrenOf(*table, complaints()), references);
     }
 
-    void readEntries(const Box& box) {
-        FullBox table(box);
-        const std::uint32_t count = table.fields.u32();
+    void readTables(const std::vector<Box>& boxes, std::uint64_t references) {
+        if (const Box* entries = onlyBox(boxes, "stsd", "14496-12, 8.5.2", complaints())) {
+            const auto entry = checkSampleEntries(*entries, {track_.handler, track_.timescale, references}, complaints());
+            track_.codec = entry.codec;
+            checked_.nalLengthBytes = entry.nalLengthBytes;
+        }
+        if (isFinished()) checkSampleTables(boxes, context_.media, context_.fileBytes, checked_, complaints());
+        else checkEmptySampleTables(boxes, complaints());
+    }
+
+    void readMediaHeader(const Box& box) {
+        FullBox header(box, 1, complaints());
+        header.fields.skip(header.version == 0 ? 8 : 16);
+        track_.timescale = header.fields.u32();
+        track_.mediaDuration = header.fields.byVersion(header.version);
+        const std::uint32_t language = header.fields.u16();
+        header.fields.skip(2);
+        requireEnd(header.fields, "mdhd", kMediaHeader, complaints());
+        require(track_.timescale != 0, kMediaHeader, "the time scale is 0");
+        bool isLanguage = language < 0x8000;
+        for (const std::uint32_t letter : {language >> 10 & 31, language >> 5 & 31, language & 31})
+            isLanguage = isLanguage && letter >= 1 && letter <= 26;
+        require(isLanguage, kMediaHeader, "the language is not three letters");
+        require(isFinished() || track_.mediaDuration == 0, kMediaHeader,
+                "mdhd has a duration, though the samples are in fragments");
+    }
+
+    void readHandler(const Box& box) {
+        FullBox handler(box, 0, complaints());
+        require(handler.fields.u32() == 0, kHandler, "hdlr has something in a field that must be 0");
+        track_.handler = handler.fields.fourCharacters();
+        handler.fields.skip(12);
+        const auto name = handler.fields.take(handler.fields.left());
+        require(handler.fields.good() && !name.empty() && name.back() == 0, kHandler, "the name in hdlr doesn't end with 0");
+    }
+
+    std::uint64_t readReferences(const Box& box) {
+        FullBox table(box, 0, complaints());
+        const std::uint64_t count = table.fields.u32();
         const std::size_t before = box.content.size() - table.fields.left();
-        const auto described = boxesIn(box.content.subspan(before), box.offset + before, where_ + " stsd", findings_);
-        require(count == 1 && described.size() == 1, "there isn't exactly one sample entry");
-        if (described.empty()) return;
-        const Box& entry = described.front();
-        track_.codec = entry.type;
-        const std::size_t fixed = track_.handler == "vide" ? kVisualEntryBytes : kAudioEntryBytes;
-        if (track_.handler != "vide" && track_.handler != "soun") return;
-        if (entry.content.size() < fixed) return find("the sample entry is too short");
-        const auto inside =
-            boxesIn(entry.content.subspan(fixed), entry.offset + fixed, where_ + " " + entry.type, findings_);
-        if (entry.type == "avc1") (void)only(inside, "avcC");
-        if (entry.type == "mp4a") (void)only(inside, "esds");
-    }
-
-    void readSizes(const Box& box) {
-        FullBox table(box);
-        const std::uint32_t same = table.fields.u32();
-        if (same != 0) {
-            track_.samples = table.fields.u32();
-            sameSize_ = same;
-            track_.bytes = track_.samples * same;
-            requireEnd(table.fields, "stsz");
-        } else {
-            track_.samples = entries(table.fields, 4, "stsz");
-            for (std::uint64_t sample = 0; sample < track_.samples; ++sample) {
-                sizes_.push_back(table.fields.u32());
-                track_.bytes += sizes_.back();
-                if (sizes_.back() == 0) find("sample " + std::to_string(sample + 1) + " is empty");
-            }
-        }
-        require(track_.samples != 0, "there are no samples");
-    }
-
-    void readTimes(const Box& box) {
-        FullBox table(box);
-        std::uint64_t samples = 0;
-        bool still = false;
-        for (std::uint64_t left = entries(table.fields, 8, "stts"); left > 0; --left) {
-            const std::uint64_t count = table.fields.u32(), delta = table.fields.u32();
-            samples += count;
-            timed_ += count * delta;
-            still = still || delta == 0;
-        }
-        require(!still, "stts has samples of no duration");
-        require(samples == track_.samples, "stts has times for " + std::to_string(samples) +
-                                               " samples, stsz sizes for " + std::to_string(track_.samples));
-        require(timed_ == track_.mediaDuration,
-                "stts adds up to " + std::to_string(timed_) + ", mdhd says " + std::to_string(track_.mediaDuration));
-    }
-
-    void readOffsets(const std::vector<Box>& boxes) {
-        const Box* found = nullptr;
-        for (const Box& box : boxes) {
-            if (box.type != "stco" && box.type != "co64") continue;
-            require(found == nullptr, "there are several tables of chunk offsets");
-            found = &box;
-        }
-        if (found == nullptr) return find("there is no table of chunk offsets");
-        const bool wide = found->type == "co64";
-        FullBox table(*found);
-        for (std::uint64_t left = entries(table.fields, wide ? 8 : 4, found->type.c_str()); left > 0; --left)
-            offsets_.push_back(wide ? table.fields.u64() : table.fields.u32());
-        track_.chunks = offsets_.size();
-    }
-
-    void placeChunks(const Box& box) {
-        FullBox table(box);
-        std::vector<ChunkRun> runs;
-        for (std::uint64_t left = entries(table.fields, 12, "stsc"); left > 0; --left) {
-            runs.push_back({table.fields.u32(), table.fields.u32()});
-            require(table.fields.u32() == 1, "stsc names a sample entry that isn't there");
-            require(runs.back().samplesPerChunk != 0, "stsc has an empty chunk");
-            const bool rising = runs.size() == 1 ? runs.back().firstChunk == 1
-                                                 : runs.back().firstChunk > runs[runs.size() - 2].firstChunk;
-            if (!rising || runs.back().firstChunk > offsets_.size())
-                return find("stsc names chunks out of order or not there");
-        }
-        std::uint64_t sample = 0;
-        auto run = runs.begin();
-        for (std::size_t chunk = 1; chunk <= offsets_.size() && run != runs.end(); ++chunk) {
-            if (std::next(run) != runs.end() && std::next(run)->firstChunk == chunk) ++run;
-            std::uint64_t size = 0;
-            for (std::uint32_t left = run->samplesPerChunk; left > 0 && sample < track_.samples; --left, ++sample)
-                size += sizes_.empty() ? sameSize_ : sizes_[sample];
-            counted_ += run->samplesPerChunk;
-            placeChunk(chunk, {offsets_[chunk - 1], offsets_[chunk - 1] + size});
-        }
-        require(counted_ == track_.samples, "stsc has " + std::to_string(counted_) +
-                                                " samples in its chunks, stsz has " + std::to_string(track_.samples));
-    }
-
-    void placeChunk(std::size_t chunk, const Extent& extent) {
-        chunks_.push_back(extent);
-        const bool inside = std::any_of(media_.begin(), media_.end(), [&](const Extent& whole) {
-            return extent.begin >= whole.begin && extent.end <= whole.end && extent.end >= extent.begin;
-        });
-        require(inside, "chunk " + std::to_string(chunk) + " isn't within the media data");
-    }
-
-    void readSyncSamples(const Box& box) {
-        FullBox table(box);
-        std::uint64_t previous = 0;
-        track_.syncSamples = entries(table.fields, 4, "stss");
-        for (std::uint64_t left = track_.syncSamples; left > 0; --left) {
-            const std::uint64_t sample = table.fields.u32();
-            require(previous != 0 || sample == 1, "the first sample isn't a sync sample");
-            require(sample > previous && sample <= track_.samples, "stss names samples out of order or not there");
-            previous = sample;
-        }
-        require(previous != 0, "stss is empty");
-    }
-
-    void readCompositionOffsets(const Box& box) {
-        FullBox table(box);
-        std::uint64_t samples = 0;
-        for (std::uint64_t left = entries(table.fields, 8, "ctts"); left > 0; --left) {
-            samples += table.fields.u32();
-            const std::uint32_t offset = table.fields.u32();
-            const bool negative = table.version == 1 && offset > 0x7FFFFFFF;
-            largestOffset_ = std::max<std::uint64_t>(largestOffset_, negative ? 0 : offset);
-        }
-        require(samples == track_.samples, "ctts has another number of samples than stsz");
+        const auto references = boxesIn(box.content.subspan(before), box.offset + before, complaints().about(
+            complaints().where() + " dref"));
+        require(count == references.size() && count != 0, kReferences, "dref has another number of references than it says");
+        for (const Box& reference : references)
+            require(reference.type == "url " && (FullBox(reference).flags & 1) == 1, kReferences,
+                    "the media are not in this file");
+        return references.size();
     }
 
     // Converts to the movie's time scale, rounded up.
     [[nodiscard]] std::uint64_t inMovieTime(std::uint64_t media) const {
-        return track_.timescale == 0 ? 0 : (media * movieTimescale_ + track_.timescale - 1) / track_.timescale;
+        const Wide ticks = Wide{media} * context_.movieTimescale + track_.timescale - 1;
+        return track_.timescale == 0 ? 0 : static_cast<std::uint64_t>(ticks / track_.timescale);
     }
 
-    void checkDuration(const Box* edits) {
-        if (edits == nullptr) return requireNear(inMovieTime(track_.mediaDuration), 1, "the media");
-        const auto boxes = children(*edits);
-        const Box* list = only(boxes, "elst");
+    void checkEdits(const Box* edits) {
+        if (edits == nullptr) return checkWithoutEdits();
+        const auto boxes = childrenOf(*edits, complaints());
+        const Box* list = onlyBox(boxes, "elst", kEdits, complaints());
         if (list == nullptr) return;
-        FullBox table(*list);
+        const auto entries = readEdits(*list);
+        if (entries.empty()) return complaints().find(kEdits, "the edit list is empty");
         std::uint64_t total = 0;
-        const bool wide = table.version == 1;
-        const std::uint64_t count = entries(table.fields, wide ? 20 : 12, "elst");
-        for (std::uint64_t left = count; left > 0; --left) {
-            const std::uint64_t length = table.fields.byVersion(table.version);
-            const std::uint64_t start = table.fields.byVersion(table.version);
-            require(table.fields.u32() == 0x00010000, "an edit changes the speed");
-            total += length;
-            const bool empty = start == (wide ? ~0ULL : 0xFFFFFFFFULL);
-            // Composition may put the last sample later than decoding ends; both ends may be rounded.
-            require(empty || inMovieTime(start) + length <= inMovieTime(track_.mediaDuration + largestOffset_) + 2,
-                    "an edit reaches beyond the media");
+        for (const EditEntry& entry : entries) {
+            total += entry.length;
+            checkEdit(entry);
         }
-        requireNear(total, count, "the edit list");
+        require(!entries.back().isEmpty, kEdits, "the last edit is empty");
+        require(total == track_.duration, kTrackHeader,
+                "the edit list lasts " + std::to_string(total) + ", tkhd says " + std::to_string(track_.duration));
+        for (const EditEntry& entry : entries)
+            if (!entry.isEmpty) return requirePriming(entry.start);
     }
 
-    void requireNear(std::uint64_t expected, std::uint64_t slack, const std::string& what) {
-        const std::uint64_t apart =
-            expected > track_.duration ? expected - track_.duration : track_.duration - expected;
-        require(apart <= slack,
-                what + " lasts " + std::to_string(expected) + ", tkhd says " + std::to_string(track_.duration));
+    void checkWithoutEdits() {
+        const std::uint64_t expected = inMovieTime(track_.mediaDuration);
+        const std::uint64_t apart = expected > track_.duration ? expected - track_.duration : track_.duration - expected;
+        // One of them is rounded.
+        require(apart <= 1, kTrackHeader,
+                "the media lasts " + std::to_string(expected) + ", tkhd says " + std::to_string(track_.duration));
+        requirePriming(0);
     }
 
-    std::uint32_t movieTimescale_;
-    const std::vector<Extent>& media_;
-    std::vector<Extent>& chunks_;
-    Findings& findings_;
-    std::string where_ = "a track";
-    BoxTrack track_;
-    std::vector<std::uint32_t> sizes_;
-    std::uint32_t sameSize_ = 0;
-    std::vector<std::uint64_t> offsets_;
-    std::uint64_t timed_ = 0;
-    std::uint64_t largestOffset_ = 0;  // of composition
-    std::uint64_t counted_ = 0;
+    void requirePriming(std::uint64_t skipped) {
+        require(track_.codec != "mp4a" || skipped >= kLeastPriming, "",
+                "the sound is presented with its priming: the first edit begins at " + std::to_string(skipped));
+    }
+
+    std::vector<EditEntry> readEdits(const Box& box) {
+        FullBox table(box, 1, complaints());
+        const bool wide = table.version == 1;
+        std::vector<EditEntry> entries;
+        for (std::uint64_t left = entriesOf(table.fields, wide ? 20 : 12, "elst", kEdits, complaints()); left > 0; --left) {
+            EditEntry entry;
+            entry.length = table.fields.byVersion(table.version);
+            entry.start = table.fields.byVersion(table.version);
+            entry.isEmpty = entry.start == (wide ? ~0ULL : 0xFFFFFFFFULL);
+            require(table.fields.u32() == 0x00010000, kEdits, "an edit changes the speed");
+            const bool isNegative = entry.start > (wide ? ~0ULL >> 1 : 0x7FFFFFFFULL);
+            require(entry.isEmpty || !isNegative, kEdits, "an edit begins before the media");
+            entries.push_back(entry);
+        }
+        return entries;
+    }
+
+    void checkEdit(const EditEntry& entry) {
+        if (!isFinished()) return require(entry.length == 0, kEdits, "an edit has a length, though the media is in fragments");
+        require(entry.length != 0, kEdits, "an edit presents nothing");
+        if (entry.isEmpty) return;
+        // In ticks of both; composition may put the last sample later than decoding ends, and one tick of the movie may
+        // be a rounding.
+        const Wide media = Wide{track_.mediaDuration} + checked_.latestComposition;
+        const Wide end = Wide{entry.start} * context_.movieTimescale + Wide{entry.length} * track_.timescale;
+        require(end <= media * context_.movieTimescale + track_.timescale, kEdits, "an edit reaches beyond the media");
+    }
+
+    const TrackContext& context_;
+    Complaints complaints_;
+    CheckedTrack checked_;
+    BoxTrack& track_ = checked_.track;
+    std::uint32_t width_ = 0;   // 16.16
+    std::uint32_t height_ = 0;
 };
 
 }  // namespace
 
-std::vector<Box> boxesIn(std::span<const std::uint8_t> bytes, std::uint64_t offset, const std::string& inside,
-                         Findings& findings) {
-    std::vector<Box> boxes;
-    while (!bytes.empty()) {
-        BoxReader header(bytes);
-        std::uint64_t size = header.u32();
-        const std::string type = header.fourCharacters();
-        if (size == 1) size = header.u64();
-        const std::size_t headerBytes = bytes.size() - header.left();
-        if (!header.good() || size < headerBytes || size > bytes.size()) {
-            findings.push_back(inside + ": the box at " + std::to_string(offset) + " doesn't fit where it is");
-            return boxes;
-        }
-        boxes.push_back({type, offset + headerBytes, bytes.subspan(headerBytes, size - headerBytes)});
-        bytes = bytes.subspan(size);
-        offset += size;
-    }
-    return boxes;
-}
-
-const Box* onlyBox(const std::vector<Box>& boxes, const std::string& type, const std::string& inside,
-                   Findings& findings) {
-    const auto isIt = [&](const Box& box) { return box.type == type; };
-    const auto count = std::count_if(boxes.begin(), boxes.end(), isIt);
-    if (count == 1) return &*std::find_if(boxes.begin(), boxes.end(), isIt);
-    findings.push_back(inside + ": there are " + std::to_string(count) + " " + type + " boxes instead of one");
-    return nullptr;
-}
-
-BoxTrack checkTrack(const Box& trak, std::uint32_t movieTimescale, const std::vector<Extent>& media,
-                    std::vector<Extent>& chunks, Findings& findings) {
-    return TrackCheck(movieTimescale, media, chunks, findings).run(trak);
+CheckedTrack checkTrack(const Box& trak, const TrackContext& context, const Complaints& movie) {
+    return TrackCheck(context, movie).run(trak);
 }
 
 }  // namespace lumacast::checkers

@@ -1,38 +1,23 @@
 #pragma once
 
 #include <cstdint>
-#include <span>
-#include <string>
 #include <vector>
 
-#include "tests/checkers/BoxChecker.h"
+#include "tests/checkers/BoxSampleTables.h"
+#include "tests/checkers/Boxes.h"
 
 namespace lumacast::checkers {
 
-/// A box and where its content begins in the file.
-struct Box {
-    std::string type;
-    std::uint64_t offset = 0;  ///< of the content
-    std::span<const std::uint8_t> content;
+/// What a `trak` must agree with.
+struct TrackContext {
+    BoxShape shape = BoxShape::Finished;
+    std::uint32_t movieTimescale = 0;
+    const std::vector<Extent>& media;  ///< the content of each `mdat`
+    std::uint64_t fileBytes = 0;
 };
 
-/// A run of bytes in the file.
-struct Extent {
-    std::uint64_t begin = 0;
-    std::uint64_t end = 0;
-};
-
-/// The boxes that fill `bytes`, the first at file offset `offset`. What doesn't nest exactly becomes a finding about
-/// `inside`.
-[[nodiscard]] std::vector<Box> boxesIn(std::span<const std::uint8_t> bytes, std::uint64_t offset,
-                                       const std::string& inside, Findings& findings);
-
-/// The only box of this type; none or several is a finding about `inside` and gives nothing.
-[[nodiscard]] const Box* onlyBox(const std::vector<Box>& boxes, const std::string& type, const std::string& inside,
-                                 Findings& findings);
-
-/// Checks one `trak`. Chunks must lie within `media`; all of them are added to `chunks`.
-[[nodiscard]] BoxTrack checkTrack(const Box& trak, std::uint32_t movieTimescale, const std::vector<Extent>& media,
-                                  std::vector<Extent>& chunks, Findings& findings);
+/// Checks one `trak`: its headers, sample entry, tables and edit list against each other. Of a file in fragments the
+/// tables must be empty and nothing has a duration.
+[[nodiscard]] CheckedTrack checkTrack(const Box& trak, const TrackContext& context, const Complaints& movie);
 
 }  // namespace lumacast::checkers

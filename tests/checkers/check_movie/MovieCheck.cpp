@@ -130,10 +130,14 @@ private:
     }
 
     void judgeBoxes() {
-        const BoxReport boxes = checkBoxes(options_.movie);
+        const BoxReport boxes = checkBoxes(options_.movie, options_.fragmented ? BoxShape::Fragmented : BoxShape::Finished);
         for (const std::string& text : boxes.findings) find("boxes", text);
         json& report = result_.report["boxes"];
         report = {{"top_level", boxes.topLevel}, {"timescale", boxes.timescale}, {"duration", boxes.duration}};
+        if (options_.fragmented) {
+            report["fragments"] = boxes.fragments;
+            report["cut_off"] = boxes.cutOff;
+        }
         report["tracks"] = json::array();
         for (const BoxTrack& track : boxes.tracks)
             report["tracks"].push_back({{"id", track.identifier},

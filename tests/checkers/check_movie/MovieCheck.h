@@ -17,6 +17,7 @@ struct MovieCheckOptions {
     std::string movie;
     std::string contactSheet;  ///< PNG to write; empty: none
     bool unfinished = false;   ///< a recording cut off in the middle: the box structure isn't judged
+    bool fragmented = false;   ///< a recording under way, or left by a crash: its boxes are judged as such
     bool readNumbers = true;   ///< false for movies of something else than the scene
     int turnedDegrees = 0;     ///< how far clockwise the pictures were turned
     FrameExpectation frames;

@@ -57,6 +57,8 @@ int main(int argc, char** argv) {
         ->check(CLI::IsMember({0, 90, 180, 270}));
     app.add_flag("--no-numbers", noNumbers, "the movie shows something else: don't read frame numbers");
     app.add_flag("--unfinished", options.unfinished, "the recording was cut off: don't judge the box structure");
+    app.add_flag("--fragmented", options.fragmented,
+                 "a recording under way, or left by a crash: judge its boxes as those of a file in fragments");
     app.add_option("--min-seconds", options.leastSeconds, "shortest duration");
     app.add_option("--max-seconds", options.mostSeconds, "longest duration");
     app.add_option("--video-tracks", options.videoTracks, "how many video tracks there are");

@@ -223,7 +223,9 @@ TEST_F(MovieCheck, SaysThatDamagedMediaCantBeDecoded) {
     for (std::size_t place = bytes.size() / 2; place < bytes.size() / 2 + 400; ++place)
         bytes[place] = static_cast<char>(place * 37);
     writeBytes(path, bytes);
-    EXPECT_EQ(checkBoxes(path).findings, Findings{});
+    const Findings findings = checkBoxes(path).findings;
+    ASSERT_EQ(findings.size(), 1U) << ::testing::PrintToString(findings);
+    EXPECT_NE(findings[0].find("is not filled by its NAL units"), std::string::npos) << findings[0];
     MovieReader reader(path);
     std::vector<NumberedPicture> pictures;
     EXPECT_FALSE(readFrameNumbers(reader, pictures));
