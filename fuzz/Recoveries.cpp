@@ -75,8 +75,10 @@ mp4::AudioTrackDescription sound() {
 
 /// One NAL unit with a slice.
 Text sampleOf(std::size_t size) {
-    Text bytes{0, 0, 0, static_cast<std::uint8_t>(size + 1), 0x65};
-    bytes.resize(5 + size, 0x5A);
+    Text bytes(5 + size, 0x5A);
+    bytes[0] = bytes[1] = bytes[2] = 0;
+    bytes[3] = static_cast<std::uint8_t>(size + 1);
+    bytes[4] = 0x65;
     return bytes;
 }
 

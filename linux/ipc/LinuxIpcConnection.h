@@ -83,6 +83,7 @@ private:
     void sendOrLose(OutgoingFrame& frame);
     void sendTransport(FrameKind kind, std::uint64_t sequence, std::uint16_t number);
     void flush();
+    void sayNoMoreLocked();
     void waitForRoomLocked();
     void fail(const ErrorHandler& errorHandler, int error);
     void failExchange(FileHandler handler, int error);

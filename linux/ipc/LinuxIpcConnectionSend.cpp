@@ -1,6 +1,7 @@
 // A connection's way out: called on any lane, never blocks.
 
 #include <sys/epoll.h>
+#include <sys/socket.h>
 
 #include <cerrno>
 #include <utility>
@@ -50,6 +51,7 @@ int LinuxIpcConnection::commit(EncodedFrame& encoded, PendingReply& pending) {
     const OutgoingQueue::Result result = outgoing_.send(socket_.get(), encoded.frame);
     if (result == OutgoingQueue::Result::Full || result == OutgoingQueue::Result::Broken) {
         if (!isRequest) encoded.frame.onLost.swap(pending.errorHandler);
+        if (result == OutgoingQueue::Result::Broken) sayNoMoreLocked();
         return result == OutgoingQueue::Result::Full ? ENOBUFS : EPIPE;
     }
     if (result == OutgoingQueue::Result::Queued) waitForRoomLocked();
@@ -114,11 +116,15 @@ void LinuxIpcConnection::sendOrLose(OutgoingFrame& frame) {
         if (state_ == State::Lost || !socket_) return;
         const auto result = outgoing_.send(socket_.get(), frame);
         if (result == OutgoingQueue::Result::Queued) waitForRoomLocked();
-        // Broken: the reactor will read the end of what the peer has said, then report the loss.
+        if (result == OutgoingQueue::Result::Broken) sayNoMoreLocked();
         if (result != OutgoingQueue::Result::Full) return;
     }
     drop("it does not read");
 }
+
+/// After a failed write: the peer learns that it waits in vain, whatever the failure was. What it has said until then is
+/// still read; the reactor then finds its end and reports the loss, and with it what was waiting here.
+void LinuxIpcConnection::sayNoMoreLocked() { ::shutdown(socket_.get(), SHUT_WR); }
 
 void LinuxIpcConnection::waitForRoomLocked() {
     if (watch_) watch_->setEvents(EPOLLIN | EPOLLRDHUP | EPOLLOUT);
@@ -128,9 +134,9 @@ void LinuxIpcConnection::flush() {
     std::vector<OutgoingFrame> done;
     const std::lock_guard lock(mutex_);
     if (state_ == State::Lost) return;
-    // Broken: what waits is reported with the loss, which the reader finds.
-    if (outgoing_.flush(socket_.get(), done) != OutgoingQueue::Flushed::Some && watch_)
-        watch_->setEvents(EPOLLIN | EPOLLRDHUP);
+    const auto flushed = outgoing_.flush(socket_.get(), done);
+    if (flushed == OutgoingQueue::Flushed::Broken) sayNoMoreLocked();
+    if (flushed != OutgoingQueue::Flushed::Some && watch_) watch_->setEvents(EPOLLIN | EPOLLRDHUP);
 }
 
 }  // namespace lumacast

@@ -47,6 +47,12 @@ std::vector<Injection> injectionsOf(const std::vector<NotedCall>& calls) {
     return all;
 }
 
+/// Whatever failed, the client was told something, were it that its connection is gone.
+void expectAnswered(const Heard& heard) {
+    EXPECT_NE(heard.start, "no answer");
+    EXPECT_NE(heard.stop, "no answer");
+}
+
 class Faults : public ::testing::TestWithParam<Case> {
 protected:
     void SetUp() override { scenario_ = GetParam().make(); }
@@ -74,6 +80,7 @@ protected:
             EXPECT_FALSE(scenario_->world().status().is_null()) << "the daemon does not answer";
         }
         for (const std::string& wrong : scenario_->judgeAfterFault(heard, ended)) ADD_FAILURE() << wrong;
+        if (injection.point.call == "sendMessage") expectAnswered(heard);
         // The next one: of the same daemon, or of the one that comes after.
         if (ended || !scenario_->daemonLives()) scenario_->startShipped();
         for (const std::string& wrong : scenario_->judgeAfterFault(heard, ended)) ADD_FAILURE() << "after the next start: " << wrong;
@@ -121,6 +128,20 @@ TEST_P(Faults, LeaveAMovieThatPlaysOrNoneAndTheNextRecordingWorks) {
     for (std::size_t i = GetParam().shard; i < all.size(); i += step, ++injected) inject(all[i]);
     report(calls.size(), injected);
     EXPECT_LE(notReached_, injected / 5) << "the faults miss";
+}
+
+TEST(FaultyAnswers, LeaveNobodyWaiting) {
+    const auto scenario = plainMovie();
+    std::size_t reached = 0;
+    for (std::size_t number = 1; number <= 4; ++number) {
+        SCOPED_TRACE(number);
+        scenario->startFaulty(FaultPoint{"sendMessage", "socket", number}, Fault::BrokenPipe);
+        expectAnswered(scenario->record());
+        for (const NotedCall& call : scenario->calls()) reached += call.fault.empty() ? 0 : 1;
+        scenario->clear();
+        EXPECT_EQ(scenario->world().endDaemon(SIGTERM), 0);
+    }
+    EXPECT_GE(reached, 3u);
 }
 
 std::vector<Case> cases() {
