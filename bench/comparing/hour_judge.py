@@ -23,7 +23,7 @@ def judge(binaries, folder):
                "findings": report["findings"][:50], "frames": dict(report["frames"]), "tracks": report["boxes"]["tracks"]}
     figures["frames"]["missing"] = len(report["frames"]["missing"])
     figures["length"] = length_of(report, stretches, 1 / recorded["fps"])
-    figures["sync"] = sync_of(report)
+    figures["sync"] = sync_of(report, drawn_late(folder / "frames.txt", 1 / recorded["fps"]))
     figures["daemon"] = growth_of(samples, report["boxes"]["tracks"], report["duration_s"])
     figures["verdicts"] = verdicts_on(figures, len(stretches) - 1)
     (folder / "hour.json").write_text(json.dumps(figures, indent=1) + "\n")
@@ -72,12 +72,28 @@ def length_of(report, stretches, frame):
     return {"movie_s": report["duration_s"], "least_s": least, "most_s": most, "stretches": len(stretches)}
 
 
-def sync_of(report):
+def drawn_late(path, frame):
+    """The numbers of frames that the application, by its own log, drew more than half a frame's time too late."""
+    numbers, last = set(), None
+    for words in map(str.split, path.read_text().splitlines()):
+        number, shown = int(words[0]), int(words[1]) / 1e9
+        if last is not None and shown - last > 1.5 * frame:
+            numbers.add(number)
+        last = shown
+    return numbers
+
+
+def sync_of(report, held_up):
     marks, late = report["sync"]["mark_ms"], report["sync"]["late_ms"]
+    far = [(number, offset) for number, offset in zip(report["sync"]["mark_number"], late) if abs(offset) > MOST_SYNC]
+    sizes = sorted(abs(offset) for offset in late)
+    in_time = [abs(offset) for number, offset in zip(report["sync"]["mark_number"], late) if number not in held_up]
     slope, _ = line(marks, late) if len(marks) > 1 else (0, 0)
     return {"pairs": len(late), "worst_ms": report["sync"]["worst_ms"], "drift_ms": report["sync"]["drift_ms"],
             "drift_by_line_ms_per_hour": slope * 3.6e6, "median_ms": statistics.median(late) if late else None,
-            "unmatched": [text for text in report["findings"] if text.startswith("sync: no ")],
+            "p99_ms": sizes[len(sizes) * 99 // 100] if sizes else None, "far": len(far),
+            "far_drawn_late": sum(number in held_up for number, _ in far),
+            "worst_drawn_in_time_ms": max(in_time, default=None), "unmatched": [text for text in report["findings"] if text.startswith("sync: no ")],
             "marks_s": [mark / 1000 for mark in marks], "late_ms": late}
 
 
@@ -136,10 +152,13 @@ def show(figures):
     print(f"{figures['minutes']} minutes of {figures['size']} at {figures['fps']} frames a second: {frames['count']} "
           f"pictures, {frames['repeats']} repeated, {frames['missing']} frames missing, the largest step "
           f"{frames['largest_hole_ms']:.0f} ms, the farthest from its time {frames['largest_lateness_ms']:.0f} ms")
-    print(f"beeps: median {sync['median_ms']:.1f} ms late, worst {sync['worst_ms']:.1f} ms, drift "
-          f"{sync['drift_ms'] or 0:.1f} ms from the first fifth to the last "
-          f"({sync['drift_by_line_ms_per_hour']:.1f} ms an hour by the line); of the tones "
-          f"{figures['beeps']['late']} were played late")
+    print(f"beeps: median {sync['median_ms']:.1f} ms late, 99 in 100 within {sync['p99_ms']:.1f} ms, worst "
+          f"{sync['worst_ms']:.1f} ms; {sync['far']} further than {MOST_SYNC:.0f} ms, of which the application itself drew the "
+          f"marked frame late {sync['far_drawn_late']} times; the worst of the others {sync['worst_drawn_in_time_ms']:.1f} ms")
+    print(f"drift {sync['drift_ms'] or 0:.1f} ms from the first fifth to the last "
+          f"({sync['drift_by_line_ms_per_hour']:.1f} ms an hour by the line); the application ran out of sound "
+          f"{figures['beeps']['underflows']} times, played {figures['beeps']['late']} tones late and left out "
+          f"{figures['beeps']['left out']}")
     print(f"daemon: {daemon['pss_least'] / 1e6:.1f} to {daemon['pss_most'] / 1e6:.1f} MB of memory (PSS), of which "
           f"{daemon['own_least'] / 1e6:.1f} to {daemon['own_most'] / 1e6:.1f} are no file's, from second "
           f"{daemon['from_s']:.0f} on")

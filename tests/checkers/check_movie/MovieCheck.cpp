@@ -1,5 +1,7 @@
 #include "tests/checkers/check_movie/MovieCheck.h"
 
+#include <algorithm>
+
 #include "tests/checkers/BoxChecker.h"
 #include "tests/checkers/ContactSheet.h"
 #include "tests/checkers/MovieReader.h"
@@ -121,10 +123,13 @@ private:
         json& report = result_.report["sync"];
         report = {{"pairs", sync.pairs.size()}, {"worst_ms", milliseconds(sync.worst)}};
         report["drift_ms"] = sync.drift ? json(milliseconds(*sync.drift)) : json();
-        report["mark_ms"] = json::array();
-        report["late_ms"] = json::array();
+        for (const char* list : {"mark_ms", "mark_number", "late_ms"}) report[list] = json::array();
         for (const SyncPair& pair : sync.pairs) {
+            const auto picture = std::find_if(pictures_.begin(), pictures_.end(),
+                                              [&pair](const auto& one) { return one.time == pair.mark; });
+            const bool isNumbered = picture != pictures_.end() && picture->number;
             report["mark_ms"].push_back(milliseconds(pair.mark));
+            report["mark_number"].push_back(isNumbered ? json(*picture->number) : json());
             report["late_ms"].push_back(milliseconds(pair.late));
         }
     }
