@@ -67,8 +67,9 @@ std::vector<std::string> judgeScene(const std::string& movie, std::vector<std::u
 /// machine one asks again. A daemon that can't record any more never can.
 std::vector<std::string> untilGood(const std::function<std::vector<std::string>()>& attempt) {
     constexpr int kAttempts = 6;
+    const auto until = std::chrono::steady_clock::now() + std::chrono::seconds(30);
     std::vector<std::string> wrong;
-    for (int i = 0; i < kAttempts; ++i) {
+    for (int i = 0; i < kAttempts || std::chrono::steady_clock::now() < until; ++i) {
         wrong = attempt();
         if (wrong.empty()) break;
     }
