@@ -107,6 +107,8 @@ void LCRecordingManager::beginRecording(const WaitingStartRef& start) {
     // An older start of this application that still waits for its extension is over.
     session->managerRecord.broadcastGeneration = generation;
     session->endWaitForExtension();
+    answerPendingStarts(*session, services_.errors._lcUserErrorForCode(RecordingErrorCode::FailedToStart),
+                        [](const auto& older) { return older.reachesNobody; });
     if (!request.broadcast) {
         log_.line("broadcast disabled");
         session->disableBroadcast();
@@ -150,7 +152,7 @@ void LCRecordingManager::startEnabledRecording(const WaitingStartRef& start, std
     if (request.broadcast) {
         auto& pending = session->managerRecord.pendingStarts;
         std::erase_if(pending, [](const auto& older) { return !*older.answer; });
-        pending.push_back({generation, link, answer});
+        pending.push_back({generation, link, answer, link && !link->connection()});
     }
     session->startSessionWithHandler([self = shared_from_this(), session, answer] {
         self->checkAndPlaySystemRecordSound(*session, true);

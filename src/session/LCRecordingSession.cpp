@@ -218,7 +218,12 @@ void LCRecordingSession::finishSessionWithStartClipDuration(double startClipDura
             handler(std::nullopt, std::nullopt);
             if (link) link->invalidateConnection();
             const auto self = weak.lock();
-            if (self && self->broadcastUploadExtensionProxy() == link) self->setBroadcastUploadExtensionProxy(nullptr);
+            if (!self || !link) return;
+            if (self->broadcastUploadExtensionProxy() == link) self->setBroadcastUploadExtensionProxy(nullptr);
+            // It may have taken note of the end and never of the beginning.
+            const auto error = self->services_.errors._lcUserErrorForCode(RecordingErrorCode::InvalidBroadcastSession);
+            const auto delegate = self->delegate_.get().lock();
+            if (delegate) delegate->broadcastExtensionFailed(self, link, error);
         });
     } else if (broadcastProcessMode_ == static_cast<std::int64_t>(BroadcastProcessMode::MovieClips)) {
         finishMovie(startClipDuration, endClipDuration, std::move(handler));

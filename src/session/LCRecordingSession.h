@@ -268,6 +268,7 @@ public:
             std::uint64_t generation = 0;
             std::weak_ptr<LCBroadcastExtensionProxy> link;
             std::shared_ptr<std::function<void(std::optional<Error>, bool, bool)>> answer;
+            bool reachesNobody = false;  ///< the extension had not connected when it was to be told of the start
         };
         std::vector<PendingStart> pendingStarts;
         DisplayCaptureSource::Counters countersBefore;  ///< the capture source's when the last recording began

@@ -16,8 +16,8 @@ public:
     /// `recordingSession:stoppedWithError:` — the session stopped by itself, or was told to stop with notification.
     virtual void recordingSessionStoppedWithError(const std::shared_ptr<LCRecordingSession>& session,
                                                   const std::optional<Error>& error) = 0;
-    /// The extension at the other end of this link has failed, or can't be reached any more: whatever it has not taken note
-    /// of it never will. Told after the stop that comes of it, if any does.
+    /// The extension at the other end of this link has failed, has finished its broadcast, or can't be reached any more:
+    /// whatever it has not taken note of it never will. Told after the stop that comes of it, if any does.
     virtual void broadcastExtensionFailed(const std::shared_ptr<LCRecordingSession>& session,
                                           const std::shared_ptr<LCBroadcastExtensionProxy>& link, const Error& error) = 0;
     /// `broadcastSession:didUpdateServiceInfo:` — whatever the extension sent, passed on as it is.

@@ -216,6 +216,43 @@ TEST_F(BroadcastStart, IsAnsweredThoughItsClientStoppedItBeforeItsExtensionDied)
     EXPECT_EQ(fakes_.keepAlive.open(), 1);
 }
 
+TEST_F(BroadcastStart, IsAnsweredThoughItsExtensionTookNoteOfTheFinishAlone) {
+    plan_->completesPayloads = false;
+    install(true);
+    const auto client = makeConnected();
+    setUp(*client);
+    const auto start = startBroadcast(*client);
+    ASSERT_EQ(plan_->uncompleted.size(), 1u);
+    plan_->completesPayloads = true;
+    const auto stop = client->ask(DaemonMessage::StopRecording);
+    settle();
+    EXPECT_EQ(stop->answers, 1);
+    ASSERT_EQ(start->answers, 1);
+    EXPECT_EQ(start->code(), -5808);
+    EXPECT_EQ(client->toldOfStop(-5808), 0);
+    plan_->uncompleted.front()();
+    settle();
+    EXPECT_EQ(start->answers, 1);
+}
+
+TEST_F(BroadcastStart, WhoseExtensionCanNotBeToldOfItIsAnsweredWhenTheApplicationStartsAnew) {
+    fakes_.faults.failNext("AppExtension.vendor");
+    install(true);
+    const auto client = makeConnected();
+    setUp(*client);
+    const auto start = startBroadcast(*client);
+    EXPECT_EQ(start->answers, 0);
+    client->ask(DaemonMessage::StopRecording);
+    settle();
+    EXPECT_EQ(start->answers, 0);
+    const auto newer = client->start();
+    settle();
+    ASSERT_EQ(start->answers, 1);
+    EXPECT_EQ(start->code(), -5803);
+    ASSERT_EQ(newer->answers, 1);
+    EXPECT_EQ(newer->code(), 0);
+}
+
 TEST_F(BroadcastStart, WithAnEndpointGoesToTheExtensionThatListensThere) {
     install(true);
     const ListeningUploader uploader(fakes_, plan_, ProcessID{700});
