@@ -170,26 +170,26 @@ SampleRef FakeDisplayCaptureSource::nextSampleLocked(Picture picture) {
         clock_->run();
         return last_;
     }
-    std::shared_ptr<SharedPlane> plane = makePlaneLocked(picture);
-    if (!plane) {
+    if (pool_->inUse >= settings_->planes) {
         ++counters_.dropped;
         changed_ = true;  // shown with the next picture
         return nullptr;
     }
     clock_->run();
     if (picture == Picture::New) changed_ = false;
-    last_ = SampleBuffer::makeVideo(PixelBuffer(std::move(plane)), clock_->now(), minimumInterval_);
+    const MediaTime now = clock_->now();
+    last_ = SampleBuffer::makeVideo(PixelBuffer(makePlaneLocked(picture, now)), now, minimumInterval_);
     lastClock_ = clock_;
     return last_;
 }
 
-std::shared_ptr<SharedPlane> FakeDisplayCaptureSource::makePlaneLocked(Picture picture) {
-    if (pool_->inUse >= settings_->planes) return nullptr;
+std::shared_ptr<SharedPlane> FakeDisplayCaptureSource::makePlaneLocked(Picture picture, const MediaTime& now) {
     ++pool_->inUse;
     const auto width = static_cast<std::int32_t>(size_.width), height = static_cast<std::int32_t>(size_.height);
     std::vector<PixelRect> damage;
     if (picture == Picture::New) damage.push_back({0, 0, width, height});
-    return {new FakePlane(width, height, ++pictures_, std::move(damage)), [pool = pool_](const FakePlane* plane) {
+    return {new FakePlane(width, height, ++pictures_, std::move(damage), now.value),
+            [pool = pool_](const FakePlane* plane) {
                 delete plane;
                 --pool->inUse;
             }};

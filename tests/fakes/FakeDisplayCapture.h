@@ -67,7 +67,7 @@ private:
     void tick(std::uint64_t run);
     void deliver(std::uint64_t run, Picture picture);
     SampleRef nextSampleLocked(Picture picture);
-    std::shared_ptr<SharedPlane> makePlaneLocked(Picture picture);
+    std::shared_ptr<SharedPlane> makePlaneLocked(Picture picture, const MediaTime& now);
     std::unique_ptr<Timer> endLocked();
     void endAndTell(std::function<void(DisplayCaptureDelegate&, DisplayCaptureSource&)> tell);
 

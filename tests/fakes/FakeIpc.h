@@ -23,6 +23,8 @@ struct FakeIpcMachine {
     std::mutex mutex;
     std::map<std::string, std::weak_ptr<FakeListenerState>> services;
     std::size_t acceptedConnections = 0;
+    /// How often a process has answered a request that it had answered already: the second answer goes nowhere.
+    std::map<ProcessID, int> secondAnswers;
 };
 
 /// The Ipc role of one process: listeners and connections whose messages are encoded, checked and decoded like on the

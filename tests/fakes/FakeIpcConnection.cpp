@@ -73,8 +73,11 @@ public:
         if (live && live->finishRequest()) live->giveNoReply(sequence_, 0);
     }
     void give(Array values) {
-        if (given_.exchange(true)) return;
         const auto live = connection_.lock();
+        if (given_.exchange(true)) {
+            if (live) live->noteSecondAnswer();
+            return;
+        }
         if (live && live->finishRequest()) live->reply(sequence_, declaration_, std::move(values));
     }
 
@@ -90,6 +93,11 @@ FakeIpcConnection::FakeIpcConnection(std::shared_ptr<FakeIpc::Process> process, 
     if (!isAccepted_) return;
     const std::lock_guard lock(process_->machine->mutex);
     ++process_->machine->acceptedConnections;
+}
+
+void FakeIpcConnection::noteSecondAnswer() {
+    const std::lock_guard lock(process_->machine->mutex);
+    ++process_->machine->secondAnswers[process_->pid];
 }
 
 FakeIpcConnection::~FakeIpcConnection() {

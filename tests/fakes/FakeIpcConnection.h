@@ -109,6 +109,7 @@ private:
     void send(std::uint16_t message, Array arguments, std::function<void(Array)> reply, ErrorHandler errorHandler);
     int commit(FakeFrame& frame, Pending& pending);
     void reply(std::uint64_t sequence, const MessageDeclaration& declaration, Array values);
+    void noteSecondAnswer();
     bool finishRequest();
     void giveNoReply(std::uint64_t sequence, int error);
     int pack(Array values, FakeFrame& frame);

@@ -2,6 +2,7 @@
 #include <cstdint>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <vector>
 
 #include "writer/media/PixelBuffer.h"
@@ -14,8 +15,13 @@ class FakePlane final : public SharedPlane {
 public:
     using Pixels = std::shared_ptr<const std::vector<std::uint8_t>>;
 
-    FakePlane(std::int32_t width, std::int32_t height, std::uint64_t pictureNumber, std::vector<PixelRect> damage)
-        : width_(width), height_(height), pictureNumber_(pictureNumber), damage_(std::move(damage)) {}
+    FakePlane(std::int32_t width, std::int32_t height, std::uint64_t pictureNumber, std::vector<PixelRect> damage,
+              std::optional<std::int64_t> capturedAt = {})
+        : width_(width),
+          height_(height),
+          pictureNumber_(pictureNumber),
+          damage_(std::move(damage)),
+          capturedAt_(capturedAt) {}
 
     std::int32_t width() const override { return width_; }
     std::int32_t height() const override { return height_; }
@@ -24,6 +30,9 @@ public:
     std::span<const PixelRect> damage() const override { return damage_; }
     std::uint64_t pictureNumber() const override { return pictureNumber_; }
     int descriptor() const override { return -1; }
+
+    /// The capture clock's ticks when the picture was taken, where the maker has said so.
+    std::optional<std::int64_t> capturedAt() const { return capturedAt_; }
 
     /// The pixels, for whoever keeps them longer than the plane.
     Pixels sharedPixels() const {
@@ -42,6 +51,7 @@ private:
     const std::int32_t width_, height_;
     const std::uint64_t pictureNumber_;
     const std::vector<PixelRect> damage_;
+    const std::optional<std::int64_t> capturedAt_;
     mutable std::mutex mutex_;
     mutable Pixels pixels_;
 };

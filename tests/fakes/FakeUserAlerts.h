@@ -72,6 +72,11 @@ public:
         const std::lock_guard lock(state_->mutex);
         return state_->shown;
     }
+    /// Whom the oldest alert that stands is about; none when there is none.
+    std::optional<BundleIdentifier> standingAbout() const {
+        const std::lock_guard lock(state_->mutex);
+        return state_->standing.empty() ? std::nullopt : std::optional(state_->standing.front().content.application);
+    }
     std::size_t standing() const {
         const std::lock_guard lock(state_->mutex);
         return state_->standing.size();

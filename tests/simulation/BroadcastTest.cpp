@@ -7,10 +7,12 @@
 #include <set>
 
 #include "broadcast/ConfigurationArchive.h"
+#include "broadcast/PayloadKeys.h"
 #include "tests/fakes/FakeUploader.h"
 #include "tests/simulation/Seeds.h"
 #include "tests/simulation/SimulatedApplication.h"
 #include "tests/simulation/SimulatedDaemon.h"
+#include "tests/simulation/Stillness.h"
 
 namespace lumacast {
 namespace {
@@ -58,6 +60,14 @@ private:
 
     /// How the next process of an extension behaves.
     void misbehave() {
+        if (behaves_) {
+            const auto told = std::move(plan_->requests);
+            const auto payloads = std::move(plan_->payloads);
+            *plan_ = {};
+            plan_->requests = told;
+            plan_->payloads = payloads;
+            return;
+        }
         plan_->pings = oneIn(5) ? 0 : oneIn(5) ? 2 : 1;
         plan_->answersEndpoint = !oneIn(6);
         plan_->connects = !oneIn(8);
@@ -189,7 +199,65 @@ private:
         tally_.clips += static_cast<int>(plan_->requests.size());
         tally_.frames += static_cast<int>(plan_->samples(1));
         for (const std::int64_t action : plan_->actions()) tally_.finished += action == 4;
-        // The daemon records as if nothing had been.
+        expectStillness(daemon_, !isSound_);
+        if (oneIn(6)) broadcastOnceMore(oneIn(2));
+        recordOnceMore();
+    }
+
+    /// An extension that does what it should is given every frame, and each clip in its turn.
+    void broadcastOnceMore(bool samples) {
+        behaves_ = true;
+        const std::size_t framesBefore = plan_->samples(1), clipsBefore = plan_->requests.size();
+        SimulatedApplication host(fakes(), BundleIdentifier("org.example.Host"), "Host", ProcessID{samples ? 901 : 902},
+                                  ContextID{12});
+        host.connect();
+        const auto setUp = host.ask(DaemonMessage::SetupBroadcast,
+                                    {host.identifier.text(), samples ? "org.example.Live.x" : "org.example.Clips.x",
+                                     *archiveOf(fakes().keyedArchive, {1.0, {}}), Value()});
+        daemon_.world.scheduler.advance(milliseconds(100));
+        ASSERT_EQ(setUp->answers, 1);
+        const auto start = host.start({host.window}, {.broadcast = true});
+        daemon_.world.scheduler.advance(milliseconds(500));
+        ASSERT_EQ(start->answers, 1);
+        ASSERT_TRUE(start->values.at(0).isNull()) << describe(start->values.at(0));
+        for (int i = 0; i < 120; ++i) {
+            daemon_.world.scheduler.advance(milliseconds(20));
+            if (const auto tap = fakes().audioInputQueues.lastQueue())
+                tap->deliver(Data(1764, 1), static_cast<std::uint64_t>(daemon_.world.scheduler.now().nanoseconds));
+        }
+        const auto stop = host.ask(DaemonMessage::StopRecording);
+        daemon_.world.scheduler.advance(seconds(1));
+        EXPECT_EQ(stop->answers, 1);
+        if (samples) {
+            EXPECT_GE(plan_->samples(1) - framesBefore, 60u) << "of 87";
+        } else {
+            judgeClips({plan_->requests.begin() + static_cast<std::ptrdiff_t>(clipsBefore), plan_->requests.end()});
+        }
+        host.die();
+        daemon_.world.scheduler.advance(seconds(1));
+        for (const std::string& path : fakes().fileSystem.files())
+            EXPECT_EQ(path.find("LCMovie_org.example.Host"), std::string::npos) << path << " is left of a broadcast";
+        expectStillness(daemon_, !isSound_);
+    }
+
+    /// A clip a second, numbered from 1 on.
+    static void judgeClips(const std::vector<std::vector<ExtensionItem>>& requests) {
+        int number = 0;
+        for (const auto& items : requests) {
+            for (const ExtensionItem& item : items) {
+                if (item.attributedTitle != kItemMovieClipURL) continue;
+                std::string text;
+                item.attachments.front().loadItem([&](const Value& loaded, const std::optional<Error>&) {
+                    if (const auto* url = loaded.as<std::string>()) text = *url;
+                });
+                EXPECT_TRUE(text.ends_with("_" + std::to_string(++number) + ".mp4")) << number << " is " << text;
+            }
+        }
+        EXPECT_GE(number, 2);
+    }
+
+    /// The daemon records as if nothing had been.
+    void recordOnceMore() {
         SimulatedApplication last(fakes(), BundleIdentifier("org.example.Last"), "Last", ProcessID{900}, ContextID{11});
         last.connect();
         const auto start = last.start();
@@ -208,6 +276,7 @@ private:
     Tally& tally_;
     std::vector<std::unique_ptr<SimulatedApplication>> applications_;
     const bool isSound_ = random_.below(3) != 0;  ///< nothing of the platform fails: an answer may get lost there, too
+    bool behaves_ = false;  ///< the extensions, from now on
     int incarnation_ = 0;
 };
 

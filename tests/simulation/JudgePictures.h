@@ -6,10 +6,12 @@
 
 #include "platform/Clock.h"
 #include "tests/fakes/FakeMovie.h"
+#include "tests/fakes/FakePlane.h"
 
 namespace lumacast {
 
-/// In order, none doubled, and no hole: paused time does not exist in a movie.
+/// In order, none doubled, and no hole: paused time does not exist in a movie. Each picture stands where it was
+/// captured, or it would not fit its sound.
 inline void judgePictures(const FakeMovie& movie) {
     constexpr std::int64_t kTwoFrames = 2 * CaptureClock::kTimescale / 60;
     for (const FakeTrack& track : movie.tracks) {
@@ -21,6 +23,11 @@ inline void judgePictures(const FakeMovie& movie) {
                 EXPECT_LE(time - *last, kTwoFrames);
             }
             last = time;
+            const auto& image = sample->image();
+            const auto* plane = image ? dynamic_cast<const FakePlane*>(image->plane().get()) : nullptr;
+            if (plane && plane->capturedAt()) {
+                EXPECT_EQ(time, *plane->capturedAt());
+            }
         }
     }
 }

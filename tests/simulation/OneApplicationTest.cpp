@@ -3,10 +3,13 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
+
 #include "tests/simulation/JudgePictures.h"
 #include "tests/simulation/Seeds.h"
 #include "tests/simulation/SimulatedApplication.h"
 #include "tests/simulation/SimulatedDaemon.h"
+#include "tests/simulation/Stillness.h"
 
 namespace lumacast {
 namespace {
@@ -96,6 +99,25 @@ private:
             EXPECT_LE(asked->answers + asked->failures, 1) << describeMessage(*asked);
     }
 
+    /// Nobody else records here: one recording is lost to the next one only, and whoever began it hears of that.
+    void checkTold() {
+        const auto& asked = application_.asked();
+        for (const auto& told : application_.told()) {
+            const Error* error = told.arguments[0].asError();
+            if (!error || error->code() != -5806) continue;
+            const bool began = std::any_of(
+                asked.begin() + static_cast<std::ptrdiff_t>(told.firstOfConnection), asked.end(), [](const auto& one) {
+                    return one->message == DaemonMessage::StartRecording && one->answers == 1 && one->values[0].isNull();
+                });
+            EXPECT_TRUE(began) << "told of the end of a recording that it never began";
+        }
+        for (const auto& stop : stops_) {
+            const URL* url = stop->answers == 1 ? stop->values[0].as<URL>() : nullptr;
+            if (!url) continue;
+            EXPECT_TRUE(url->path().ends_with("/Player.mp4") || url->path().ends_with("/Player_trimmed.mp4")) << url->path();
+        }
+    }
+
     static std::string_view describeMessage(const SimulatedApplication::Asked& asked) {
         return daemonProtocol().messages[static_cast<std::size_t>(asked.message)].name;
     }
@@ -105,17 +127,23 @@ private:
         fakes().faults.clear();
         daemon_.world.scheduler.advance(seconds(5));
         checkNothingIsHeldWhenIdle();
-        if (application_.isAlive() && !faulty_) recordOnceMore();
+        expectStillness(daemon_, faulty_);
+        if (application_.isAlive() && !faulty_) {
+            recordOnceMore();
+            // What an older clip has left is not in the way of a newer one.
+            for (std::uint64_t i = random_.below(4) == 0 ? 2 : 0; i > 0; --i) recordClip();
+        }
         application_.die();
         daemon_.world.scheduler.advance(seconds(5));
         checkAlways();
+        checkTold();
         judgeMovies();
         EXPECT_EQ(fakes().keepAlive.open(), 0);
         EXPECT_EQ(fakes().renderServer.portsOpen(), 0);
         EXPECT_EQ(daemon_.sessionCount(), 0u);
         for (const SimBlockedTask& task : daemon_.world.scheduler.blockedTasks())
             ADD_FAILURE() << task.lane << " waits for " << task.waitsFor;
-        for (const auto& source : fakes().displayCapture.sources()) EXPECT_FALSE(source->isRunning());
+        expectStillness(daemon_, faulty_);
         for (const auto& start : starts_)
             if (start->answers == 1 && start->values[0].asError()) ++outcome_.failedStarts;
         const std::string folder = fakes().fileSystem.temporaryDirectory() + "/";
@@ -159,6 +187,21 @@ private:
         // Three seconds and one, without the pause.
         EXPECT_NEAR(movie->duration().seconds(), 4.0, 0.1);
         judgePictures(*movie);
+        stops_.push_back(stop);
+    }
+
+    void recordClip() {
+        const auto start = application_.start();
+        daemon_.world.scheduler.advance(seconds(3));
+        ASSERT_EQ(start->answers, 1);
+        const auto stop = application_.ask(DaemonMessage::StopRecordingWithClipDurations, {1.0, 1.0});
+        daemon_.world.scheduler.advance(seconds(1));
+        ASSERT_EQ(stop->answers, 1) << "a clip";
+        const URL* url = stop->values[0].as<URL>();
+        const auto movie = url ? fakes().fileSystem.movie(url->path()) : nullptr;
+        ASSERT_TRUE(movie);
+        EXPECT_TRUE(url->path().ends_with("/Player_trimmed.mp4")) << url->path();
+        EXPECT_NEAR(movie->duration().seconds(), 1.0, 0.1);
         stops_.push_back(stop);
     }
 

@@ -4,14 +4,16 @@ namespace lumacast {
 
 class SimulatedApplication::Inbox final : public IpcExportedObject {
 public:
-    explicit Inbox(std::shared_ptr<std::vector<Told>> told) : told_(std::move(told)) {}
+    Inbox(std::shared_ptr<std::vector<Told>> told, std::size_t firstOfConnection)
+        : told_(std::move(told)), firstOfConnection_(firstOfConnection) {}
     void receiveMessage(const std::shared_ptr<IpcConnection>&, std::uint16_t message, Array arguments,
                         IpcReply) override {
-        told_->push_back({static_cast<ClientMessage>(message), std::move(arguments)});
+        told_->push_back({static_cast<ClientMessage>(message), std::move(arguments), firstOfConnection_});
     }
 
 private:
     const std::shared_ptr<std::vector<Told>> told_;
+    const std::size_t firstOfConnection_;
 };
 
 SimulatedApplication::SimulatedApplication(FakePlatform& machine, BundleIdentifier theIdentifier,
@@ -33,7 +35,7 @@ void SimulatedApplication::startAgain(ProcessID pid) {
 
 void SimulatedApplication::connect() {
     firstOfConnection_ = asked_.size();
-    inbox_ = std::make_shared<Inbox>(told_);
+    inbox_ = std::make_shared<Inbox>(told_, firstOfConnection_);
     connection_ = process_->connectToService("com.orvane.lumacastd");
     connection_->setExportedInterface(clientProtocol());
     connection_->setExportedObject(inbox_);

@@ -28,6 +28,7 @@ public:
     struct Told {
         ClientMessage message;
         Array arguments;
+        std::size_t firstOfConnection = 0;  ///< the first request over the connection that it came over
     };
 
     /// Installs the application under `identifier`, starts its process and shows its window.

@@ -11,6 +11,7 @@
 #include "tests/simulation/Seeds.h"
 #include "tests/simulation/SimulatedApplication.h"
 #include "tests/simulation/SimulatedDaemon.h"
+#include "tests/simulation/Stillness.h"
 
 namespace lumacast {
 namespace {
@@ -200,6 +201,8 @@ private:
         daemon_.world.scheduler.advance(seconds(2));
         application.tell(DaemonMessage::ResumeRecording, {number(application.window)});
         daemon_.world.scheduler.advance(seconds(1));
+        application.tell(DaemonMessage::SetMicrophoneEnabled, {false});
+        daemon_.world.scheduler.advance(seconds(1));
         const auto stop = application.ask(DaemonMessage::StopRecording);
         daemon_.world.scheduler.advance(seconds(1));
         ASSERT_EQ(stop->answers, 1);
@@ -209,8 +212,10 @@ private:
         ASSERT_TRUE(movie);
         ASSERT_EQ(movie->tracks.size(), 3u);
         judgeTrack(movie->tracks[1], {player.tone, kSilence}, true);
-        EXPECT_NEAR(soundOf(movie->tracks[1], player.tone), 2.0, 0.15);
+        EXPECT_NEAR(soundOf(movie->tracks[1], player.tone), 3.0, 0.15);
         judgeTrack(movie->tracks[2], {kVoice, kSilence}, false);
+        EXPECT_NEAR(soundOf(movie->tracks[2], kVoice), 2.0, 0.25) << "its microphone was on for so long";
+        EXPECT_NEAR(soundOf(movie->tracks[2], kSilence), 1.0, 0.25) << "and then muted";
         const std::size_t before = fakes().photoLibrary.assets().size();
         const auto saved = application.ask(DaemonMessage::SaveVideoToCameraRoll, {*url});
         daemon_.world.scheduler.advance(seconds(2));
@@ -219,7 +224,7 @@ private:
         ASSERT_EQ(fakes().photoLibrary.assets().size(), before + 1);
         const auto& asset = fakes().photoLibrary.assets().back();
         EXPECT_EQ(asset.content->tracks.size(), 2u) << "one of the picture, one of all the sound";
-        EXPECT_NEAR(asset.content->duration().seconds(), 2.0, 0.15);
+        EXPECT_NEAR(asset.content->duration().seconds(), 3.0, 0.15);
         EXPECT_FALSE(fakes().fileSystem.exists(url->path()));
     }
 
@@ -278,6 +283,7 @@ private:
     void end() {
         fakes().faults.clear();
         daemon_.world.scheduler.advance(seconds(5));
+        expectStillness(daemon_, faulty_);
         if (!faulty_)
             for (Player& player : players_) recordOnceMore(player);
         for (Player& player : players_) {
@@ -293,7 +299,7 @@ private:
         }
         EXPECT_EQ(fakes().keepAlive.open(), 0);
         EXPECT_EQ(daemon_.sessionCount(), 0u);
-        for (const auto& source : fakes().displayCapture.sources()) EXPECT_FALSE(source->isRunning());
+        expectStillness(daemon_, faulty_);
         for (const SimBlockedTask& task : daemon_.world.scheduler.blockedTasks())
             ADD_FAILURE() << task.lane << " waits for " << task.waitsFor;
         for (const std::string& path : fakes().fileSystem.files())
