@@ -31,7 +31,14 @@ void LCRecordingManager::askNext() {
         if (isExemptFromAcknowledgementAlertSession(*start->session)) {
             // While it waited, the user has acknowledged another start of the application.
             waitingStarts_.pop_front();
-            continueAcknowledged(start);
+            const auto reason = whyNotAllowed(*start, start->session->bundleID());
+            if (!reason) {
+                continueAcknowledged(start);
+                continue;
+            }
+            microphoneRecording_ = microphone;
+            cameraRecording_ = camera;
+            refuse(*start, reason->first, reason->second);
             continue;
         }
         microphoneRecording_ = microphone;

@@ -103,7 +103,8 @@ void Contest::handWindowOver() {
     Player& other = players_[random_.below(players_.size())];
     for (Player& player : players_) {
         if (!asked || player.application.identifier != *asked || &player == &other) continue;
-        if (!player.application.isAlive() || !other.application.isAlive()) return;
+        // What it records already it has begun with its own window.
+        if (!player.application.isAlive() || !other.application.isAlive() || isRecording(player)) return;
         fakes().renderServer.addLayer(player.application.window, other.application.pid());
         fakes().userAlerts.answer(UserAlert::Response::DefaultButton);
         daemon_.world.scheduler.runUntilIdle();

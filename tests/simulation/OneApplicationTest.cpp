@@ -106,7 +106,7 @@ private:
             const Error* error = told.arguments[0].asError();
             if (!error || error->code() != -5806) continue;
             const bool began = std::any_of(
-                asked.begin() + static_cast<std::ptrdiff_t>(told.firstOfConnection), asked.end(), [](const auto& one) {
+                asked.begin() + static_cast<std::ptrdiff_t>(told.firstOfProcess), asked.end(), [](const auto& one) {
                     return one->message == DaemonMessage::StartRecording && one->answers == 1 && one->values[0].isNull();
                 });
             EXPECT_TRUE(began) << "told of the end of a recording that it never began";

@@ -4,16 +4,16 @@ namespace lumacast {
 
 class SimulatedApplication::Inbox final : public IpcExportedObject {
 public:
-    Inbox(std::shared_ptr<std::vector<Told>> told, std::size_t firstOfConnection)
-        : told_(std::move(told)), firstOfConnection_(firstOfConnection) {}
+    Inbox(std::shared_ptr<std::vector<Told>> told, std::size_t firstOfProcess)
+        : told_(std::move(told)), firstOfProcess_(firstOfProcess) {}
     void receiveMessage(const std::shared_ptr<IpcConnection>&, std::uint16_t message, Array arguments,
                         IpcReply) override {
-        told_->push_back({static_cast<ClientMessage>(message), std::move(arguments), firstOfConnection_});
+        told_->push_back({static_cast<ClientMessage>(message), std::move(arguments), firstOfProcess_});
     }
 
 private:
     const std::shared_ptr<std::vector<Told>> told_;
-    const std::size_t firstOfConnection_;
+    const std::size_t firstOfProcess_;
 };
 
 SimulatedApplication::SimulatedApplication(FakePlatform& machine, BundleIdentifier theIdentifier,
@@ -28,6 +28,7 @@ SimulatedApplication::~SimulatedApplication() { die(); }
 
 void SimulatedApplication::startAgain(ProcessID pid) {
     pid_ = pid;
+    firstOfProcess_ = asked_.size();
     process_ = machine_.makeProcess(pid);
     machine_.bundles.run(pid, identifier);
     machine_.renderServer.addLayer(window, pid);
@@ -35,7 +36,7 @@ void SimulatedApplication::startAgain(ProcessID pid) {
 
 void SimulatedApplication::connect() {
     firstOfConnection_ = asked_.size();
-    inbox_ = std::make_shared<Inbox>(told_, firstOfConnection_);
+    inbox_ = std::make_shared<Inbox>(told_, firstOfProcess_);
     connection_ = process_->connectToService("com.orvane.lumacastd");
     connection_->setExportedInterface(clientProtocol());
     connection_->setExportedObject(inbox_);

@@ -28,7 +28,7 @@ public:
     struct Told {
         ClientMessage message;
         Array arguments;
-        std::size_t firstOfConnection = 0;  ///< the first request over the connection that it came over
+        std::size_t firstOfProcess = 0;  ///< the first request of the process that was told
     };
 
     /// Installs the application under `identifier`, starts its process and shows its window.
@@ -77,7 +77,7 @@ private:
     std::shared_ptr<IpcConnection> connection_;
     std::shared_ptr<Inbox> inbox_;
     std::vector<std::shared_ptr<Asked>> asked_;
-    std::size_t firstOfConnection_ = 0;
+    std::size_t firstOfConnection_ = 0, firstOfProcess_ = 0;
     std::shared_ptr<std::vector<Told>> told_ = std::make_shared<std::vector<Told>>();
     std::shared_ptr<int> losses_ = std::make_shared<int>(0);
 };

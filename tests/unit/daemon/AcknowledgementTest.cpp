@@ -216,6 +216,19 @@ TEST_F(Acknowledgement, AWindowThatIsSomebodyElsesWhenTheUserHasAnsweredIsNotRec
     EXPECT_FALSE(isExempt(*client));
 }
 
+TEST_F(Acknowledgement, AWindowThatIsSomebodyElsesIsNotRecordedThoughAnotherStartIsAcknowledged) {
+    const auto client = makeConnected();
+    fakes_.ipc.grant(client->pid, "com.orvane.private.luma-cast", true);
+    const auto display = started(*client, {.system = true}), window = started(*client);
+    fakes_.renderServer.addLayer(client->window, ProcessID{999});
+    answer(Response::DefaultButton);
+    EXPECT_EQ(display->code(), 0);
+    ASSERT_EQ(window->answers, 1);
+    EXPECT_EQ(window->code(), -5803);
+    EXPECT_TRUE(session(*client)->isSystemRecording());
+    EXPECT_TRUE(session(*client)->isRecording());
+}
+
 TEST_F(Acknowledgement, AnEntitlementThatIsGoneWhenTheUserHasAnsweredCountsNoMore) {
     const auto client = makeConnected();
     fakes_.ipc.grant(client->pid, "com.orvane.private.luma-cast", true);
