@@ -58,6 +58,9 @@ std::string LCRecordingSession::trimmedOutputPath() const {
 void LCRecordingSession::startSessionWithHandler(Handler handler) {
     log_.line("LCRecordingSession: startSession");
     if (const auto source = screenCaptureController()) source->closeGate(GateWait::UntilDelivered);
+    // A stop does not wait for the frame that is being delivered, which may leave its marks after the end has wiped them.
+    lastSampleTimestamp_.set(kInvalidMediaTime);
+    sampleTimeOffset_.set(kZeroMediaTime);
     services_.platform.clock.startCaptureClock();
     paused_ = false;
     reportingAgent_.set(

@@ -121,6 +121,7 @@ bool FakeRecording::append(std::size_t track, const SampleRef& sample) {
         const bool isRepeat = !into.samples.empty() && compare(stamp, into.samples.back()->presentationTime()) <= 0;
         const bool isEarly = isVideo && compare(stamp, movie_.start) < 0;
         const bool isLate = sessionEnd_ && compare(stamp, *sessionEnd_) > 0;
+        if (isVideo && isRepeat && into.samples.size() > 1) ++repeats_;
         if (isRepeat || isEarly || isLate) return true;
         into.samples.push_back(sample);
         bytes_ += bytes;

@@ -41,6 +41,11 @@ public:
     /// The movie as it is now.
     FakeMovie movie() const;
     std::optional<AffineTransform> transform(std::size_t track) const;
+    /// Pictures that came again, or late, when more than one was there already: the writer lets none through.
+    std::uint64_t repeats() const {
+        const std::lock_guard lock(mutex_);
+        return repeats_;
+    }
     /// Whether the track's buffer has room, once it has had its first sample.
     void setReady(std::size_t track, bool ready);
     /// Writing fails from outside: the disk has gone, an encoder has died.
@@ -74,7 +79,7 @@ private:
     std::optional<MediaTime> clockAtFinish_;
     std::vector<std::function<void()>> completions_;
     std::uint64_t bytes_ = 0;
-    std::uint64_t pictures_ = 0;
+    std::uint64_t pictures_ = 0, repeats_ = 0;
     bool finishing_ = false;
     bool abandoned_ = false;
     bool held_ = false;

@@ -204,13 +204,44 @@ private:
         recordOnceMore();
     }
 
-    /// An extension that does what it should is given every frame, and each clip in its turn.
+    /// An extension that does what it should is given every frame, and each clip in its turn; also when the one before
+    /// it never took note of its end, and dies.
     void broadcastOnceMore(bool samples) {
         behaves_ = true;
-        const std::size_t framesBefore = plan_->samples(1), clipsBefore = plan_->requests.size();
         SimulatedApplication host(fakes(), BundleIdentifier("org.example.Host"), "Host", ProcessID{samples ? 901 : 902},
                                   ContextID{12});
         host.connect();
+        std::vector<std::shared_ptr<FakeAppExtension>> older;
+        if (samples && oneIn(2)) {
+            ASSERT_NO_FATAL_FAILURE(beginBroadcast(host, samples));
+            plan_->completesPayloads = false;
+            host.ask(DaemonMessage::StopRecording);
+            daemon_.world.scheduler.advance(milliseconds(100));
+            older = fakes().appExtensions.extensions();
+        }
+        const std::size_t framesBefore = plan_->samples(1), clipsBefore = plan_->requests.size();
+        ASSERT_NO_FATAL_FAILURE(beginBroadcast(host, samples));
+        if (oneIn(2))
+            for (const auto& extension : std::exchange(older, {})) extension->crash();
+        play();
+        const auto stop = host.ask(DaemonMessage::StopRecording);
+        daemon_.world.scheduler.advance(seconds(1));
+        EXPECT_EQ(stop->answers, 1);
+        if (samples) {
+            EXPECT_GE(plan_->samples(1) - framesBefore, 60u) << "of 87";
+        } else {
+            judgeClips({plan_->requests.begin() + static_cast<std::ptrdiff_t>(clipsBefore), plan_->requests.end()});
+        }
+        if (!older.empty()) daemon_.world.scheduler.advance(seconds(15));
+        for (const auto& extension : older) EXPECT_FALSE(extension->isRunning()) << "an extension that hangs runs on";
+        host.die();
+        daemon_.world.scheduler.advance(seconds(1));
+        for (const std::string& path : fakes().fileSystem.files())
+            EXPECT_EQ(path.find("LCMovie_org.example.Host"), std::string::npos) << path << " is left of a broadcast";
+        expectStillness(daemon_, !isSound_);
+    }
+
+    void beginBroadcast(SimulatedApplication& host, bool samples) {
         const auto setUp = host.ask(DaemonMessage::SetupBroadcast,
                                     {host.identifier.text(), samples ? "org.example.Live.x" : "org.example.Clips.x",
                                      *archiveOf(fakes().keyedArchive, {1.0, {}}), Value()});
@@ -220,24 +251,15 @@ private:
         daemon_.world.scheduler.advance(milliseconds(500));
         ASSERT_EQ(start->answers, 1);
         ASSERT_TRUE(start->values.at(0).isNull()) << describe(start->values.at(0));
+    }
+
+    /// The host plays for a while.
+    void play() {
         for (int i = 0; i < 120; ++i) {
             daemon_.world.scheduler.advance(milliseconds(20));
             if (const auto tap = fakes().audioInputQueues.lastQueue())
                 tap->deliver(Data(1764, 1), static_cast<std::uint64_t>(daemon_.world.scheduler.now().nanoseconds));
         }
-        const auto stop = host.ask(DaemonMessage::StopRecording);
-        daemon_.world.scheduler.advance(seconds(1));
-        EXPECT_EQ(stop->answers, 1);
-        if (samples) {
-            EXPECT_GE(plan_->samples(1) - framesBefore, 60u) << "of 87";
-        } else {
-            judgeClips({plan_->requests.begin() + static_cast<std::ptrdiff_t>(clipsBefore), plan_->requests.end()});
-        }
-        host.die();
-        daemon_.world.scheduler.advance(seconds(1));
-        for (const std::string& path : fakes().fileSystem.files())
-            EXPECT_EQ(path.find("LCMovie_org.example.Host"), std::string::npos) << path << " is left of a broadcast";
-        expectStillness(daemon_, !isSound_);
     }
 
     /// A clip a second, numbered from 1 on.

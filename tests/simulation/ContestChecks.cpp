@@ -25,6 +25,7 @@ void Contest::checkAlways() {
     EXPECT_LE(std::count_if(sources.begin(), sources.end(), [](const auto& source) { return source->isRunning(); }),
               1)
         << "two applications are captured at a time";
+    expectMoviesInTheirFiles(daemon_);
     EXPECT_LE(fakes().userAlerts.standing(), 1u) << "the user is asked two things at a time";
     for (Player& player : players_) {
         checkForbidden(player);
@@ -165,6 +166,10 @@ void Contest::checkAtRest() {
 void Contest::end() {
     fakes().faults.clear();
     setFreeSize(kPlenty);
+    daemon_.world.scheduler.runUntilIdle();
+    for (const Player& player : players_)
+        EXPECT_FALSE(fakes().userAlerts.standingAbout() == player.application.identifier && !player.application.isAlive())
+            << "the user is asked about " << player.application.name << ", which has gone";
     fakes().preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
     fakes().userAlerts.setUser([](const AlertContent&) { return UserAlert::Response::DefaultButton; });
     fakes().userAlerts.answer(UserAlert::Response::DefaultButton);
@@ -207,7 +212,7 @@ void Contest::end() {
     checkFiles();
     expectStillness(daemon_, faulty_);
     if (!faulty_)
-        for (const auto& recording : fakes().containerWriters.recordings()) judgePictures(recording->movie());
+        for (const auto& recording : fakes().containerWriters.recordings()) judgeRecording(*recording);
 }
 
 void Contest::endSystemRecordings() {

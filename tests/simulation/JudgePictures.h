@@ -5,6 +5,7 @@
 #include <optional>
 
 #include "platform/Clock.h"
+#include "tests/fakes/FakeContainerWriter.h"
 #include "tests/fakes/FakeMovie.h"
 #include "tests/fakes/FakePlane.h"
 
@@ -30,6 +31,12 @@ inline void judgePictures(const FakeMovie& movie) {
             }
         }
     }
+}
+
+/// The movie that is written there; its writer sends no picture twice.
+inline void judgeRecording(const FakeRecording& recording) {
+    judgePictures(recording.movie());
+    EXPECT_EQ(recording.repeats(), 0u);
 }
 
 }  // namespace lumacast

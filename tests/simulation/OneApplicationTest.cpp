@@ -214,7 +214,7 @@ private:
                 ++outcome_.clipsKept;
         }
         if (!faulty_)
-            for (const auto& recording : fakes().containerWriters.recordings()) judgePictures(recording->movie());
+            for (const auto& recording : fakes().containerWriters.recordings()) judgeRecording(*recording);
     }
 
     SimulatedDaemon daemon_;

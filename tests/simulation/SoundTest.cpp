@@ -174,6 +174,7 @@ private:
     void checkAlways() {
         for (const Player& player : players_)
             for (const auto& asked : player.application.asked()) EXPECT_LE(asked->answers + asked->failures, 1);
+        expectMoviesInTheirFiles(daemon_);
         if (faulty_) return;
         // The one in use, and one that was replaced and is running dry.
         int running = 0;

@@ -29,6 +29,19 @@ inline std::vector<DescribedSession> describedSessions(SimulatedDaemon& daemon) 
     return all;
 }
 
+/// At any moment: the movie of a recording that is on is in its file.
+inline void expectMoviesInTheirFiles(SimulatedDaemon& daemon) {
+    for (const char* name : {"Alpha", "Beta", "Gamma", "Delta"}) {
+        const auto session =
+            daemon.process->manager().registeredSession(BundleIdentifier(std::string("org.example.") + name));
+        const auto writer = session && session->isRecording() ? session->movieWriter() : nullptr;
+        const auto file = writer ? writer->assetWriter() : nullptr;
+        if (!file || file->status() != ContainerStatus::Writing || file->picturesTaken() == 0) continue;
+        EXPECT_TRUE(daemon.world.fakes.fileSystem.isThere(writer->outputPath()))
+            << writer->outputPath() << " is being recorded and is not there";
+    }
+}
+
 /// At rest: each request was answered once, what a recording uses of the device is used only while one is on, and the movie on its way is in its file.
 /// `soundMayFail`: a tap that could not be stopped runs on.
 inline void expectStillness(SimulatedDaemon& daemon, bool soundMayFail) {
