@@ -61,11 +61,11 @@ private:
     /// How the next process of an extension behaves.
     void misbehave() {
         if (behaves_) {
-            const auto told = std::move(plan_->requests);
-            const auto payloads = std::move(plan_->payloads);
-            *plan_ = {};
-            plan_->requests = told;
-            plan_->payloads = payloads;
+            UploaderPlan good;
+            good.payloads = std::move(plan_->payloads);
+            good.uncompleted = std::move(plan_->uncompleted);  // whoever asked waits on
+            good.requests = std::move(plan_->requests);
+            *plan_ = std::move(good);
             return;
         }
         plan_->pings = oneIn(5) ? 0 : oneIn(5) ? 2 : 1;

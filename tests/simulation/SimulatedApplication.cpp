@@ -53,7 +53,7 @@ void SimulatedApplication::die() {
 }
 
 std::shared_ptr<SimulatedApplication::Asked> SimulatedApplication::ask(DaemonMessage message, Array arguments) {
-    auto asked = std::make_shared<Asked>(Asked{message, 0, 0, {}});
+    auto asked = std::make_shared<Asked>(Asked{message, 0, 0, {}, firstOfProcess_});
     asked_.push_back(asked);
     connection_->remoteProxy([asked](const Error&) { ++asked->failures; })
         ->send(static_cast<std::uint16_t>(message), std::move(arguments), [asked](Array values) {

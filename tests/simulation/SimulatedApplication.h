@@ -23,6 +23,7 @@ public:
         int answers = 0;
         int failures = 0;  ///< the connection said that there will be no answer
         Array values;
+        std::size_t firstOfProcess = 0;  ///< the first request of the process that asked
     };
     /// A message from the daemon.
     struct Told {
