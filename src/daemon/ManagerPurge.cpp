@@ -42,21 +42,22 @@ std::optional<PurgeRecord> LCRecordingManager::cacheDeletePurge(std::int32_t urg
     log_.line("LCRecordingManager: cache delete purge callback");
     SerialQueue& requestLane = platform_.scheduler.mainQueue();
     std::shared_ptr<LCRecordingSession> recording;  // the last one in the registry's order
+    std::uint64_t lastClaim = 0;
     requestLane.sync([&] {
+        // What is begun from now on is not this purge's: a recording that begins before the next look is not stopped there.
+        lastClaim = services_.tempStore.lastClaim();
         for (const auto& [id, session] : bundleIDToRecordingSessionLookup_)
             if (session->isRecording()) recording = session;
     });
     if (urgency >= kUrgent) {
-        std::uint64_t lastClaim = 0;
         requestLane.sync([&] {
             if (recording && recording->isRecording()) {
                 stopRecordingSession(recording, 0, 0, {});
                 recordingSessionStoppedWithError(
                     recording, services_.errors._lcUserErrorForCode(RecordingErrorCode::InsufficientStorage));
             }
-            lastClaim = services_.tempStore.lastClaim();
         });
-        // Deliberately without waiting for the stop. What is begun from now on is not this purge's.
+        // Deliberately without waiting for the stop.
         return PurgeRecord{services_.tempStore._srDeleteAllTempFiles(lastClaim)};
     }
     // Deliberately nothing in the usual case: only where the recording has ended between the two looks.

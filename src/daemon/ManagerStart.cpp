@@ -1,5 +1,6 @@
 // Starting a recording: from the request's first check to the client's reply.
 
+#include <algorithm>
 #include <cmath>
 #include <utility>
 
@@ -107,8 +108,10 @@ void LCRecordingManager::beginRecording(const WaitingStartRef& start) {
     // An older start of this application that still waits for its extension is over.
     session->managerRecord.broadcastGeneration = generation;
     session->endWaitForExtension();
-    answerPendingStarts(*session, services_.errors._lcUserErrorForCode(RecordingErrorCode::FailedToStart),
-                        [](const auto& older) { return older.reachesNobody; });
+    const auto reachesNobody = [](const auto& older) { return older.reachesNobody; };
+    const auto& older = session->managerRecord.pendingStarts;
+    if (std::any_of(older.begin(), older.end(), reachesNobody))
+        answerPendingStarts(*session, services_.errors._lcUserErrorForCode(RecordingErrorCode::FailedToStart), reachesNobody);
     if (!request.broadcast) {
         log_.line("broadcast disabled");
         session->disableBroadcast();

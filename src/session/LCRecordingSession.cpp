@@ -55,12 +55,17 @@ std::string LCRecordingSession::trimmedOutputPath() const {
     return services_.tempStore.pathFor(name.value_or("(null)") + "_trimmed.mp4");
 }
 
+void LCRecordingSession::forgetTimes() {
+    lastSampleTimestamp_.set(kInvalidMediaTime);
+    sampleTimeOffset_.set(kZeroMediaTime);
+}
+
 void LCRecordingSession::startSessionWithHandler(Handler handler) {
     log_.line("LCRecordingSession: startSession");
     if (const auto source = screenCaptureController()) source->closeGate(GateWait::UntilDelivered);
-    // A stop does not wait for the frame that is being delivered, which may leave its marks after the end has wiped them.
-    lastSampleTimestamp_.set(kInvalidMediaTime);
-    sampleTimeOffset_.set(kZeroMediaTime);
+    // A stop does not wait for the frame that is being delivered, which may leave its times after the finish has forgotten
+    // them. Deliberately only after a finish: what a discarded recording leaves is the next one's.
+    if (std::exchange(finishForgetsTimes_, false)) forgetTimes();
     services_.platform.clock.startCaptureClock();
     paused_ = false;
     reportingAgent_.set(
@@ -212,8 +217,8 @@ void LCRecordingSession::finishSessionWithStartClipDuration(double startClipDura
     if (!isRecording()) return;
     log_.line("LCRecordingSession: finishSessionWithHandler");
     stopRecordingWithNotification(false, std::nullopt);
-    lastSampleTimestamp_.set(kInvalidMediaTime);
-    sampleTimeOffset_.set(kZeroMediaTime);
+    forgetTimes();
+    finishForgetsTimes_ = true;
     if (broadcastProcessMode_ == static_cast<std::int64_t>(BroadcastProcessMode::SampleBuffers)) {
         // The link stays until the extension has answered, though a newer broadcast may have a link of its own by then.
         _notifyExtensionOfAction(ExtensionAction::Finish, [weak = weak_from_this(), link = broadcastUploadExtensionProxy(),

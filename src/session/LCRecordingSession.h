@@ -301,6 +301,7 @@ protected:
 private:
     void continueStart(std::uint64_t start, std::uint64_t stops, const Handler& handler);
     void _resumeOrStartSession();
+    void forgetTimes();
     /// `startWritingHandler:` or the extension's start, then the continuation on the request lane.
     void startWriter(Size size, Handler continuation);
     struct ExtensionWait;
@@ -370,6 +371,7 @@ private:
     Guarded<std::optional<Date>> captureStartTime_;
     Guarded<MediaTime> firstSampleTimestamp_{kZeroMediaTime}, lastSampleTimestamp_{kInvalidMediaTime},
         sampleTimeOffset_{kZeroMediaTime};
+    bool finishForgetsTimes_ = false;  ///< since a finish, until the next start; the request lane's
     std::atomic<std::int64_t> broadcastProcessMode_{0};
     Guarded<std::optional<LCBroadcastConfiguration>> broadcastConfiguration_;
     Guarded<std::shared_ptr<AppExtension>> broadcastExtension_;

@@ -270,6 +270,17 @@ TEST_F(FramePipeline, AFinishForgetsTheLastTimeToo) {
     EXPECT_EQ(ticks(), (Ticks{0, 10})) << "the gap is counted from no frame at all";
 }
 
+TEST_F(FramePipeline, AFrameThatComesAfterTheFinishLeavesNothingToTheNextRecording) {
+    startQuietly();
+    for (const std::int64_t value : {1000, 1010}) deliver(value);
+    interruption();
+    finish();
+    deliver(3000);  // it was on its way
+    startQuietly();
+    for (const std::int64_t value : {5000, 5010}) deliver(value);
+    EXPECT_EQ(ticks(), (Ticks{5000, 5010}));
+}
+
 TEST_F(FramePipeline, AResumeThatNoFrameFollowedMeetsTheNextRecording) {
     startQuietly();
     interruption();
