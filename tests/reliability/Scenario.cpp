@@ -148,6 +148,13 @@ bool Scenario::daemonLives() {
     return !state.empty() && state != "Z";
 }
 
+std::vector<std::string> Scenario::judgeNext() {
+    return untilGood([&] {
+        clear();
+        return judgeWhole(record());
+    });
+}
+
 void Scenario::clear() {
     for (const std::string& movie : moviesIn(world_.temporaryDirectory())) fs::remove(movie);
 }
@@ -334,12 +341,6 @@ public:
         if (movies().empty()) wrong.push_back("a recording without fault left no movie");
         return wrong;
     }
-    std::vector<std::string> judgeNext() override {
-        return untilGood([&] {
-            clear();
-            return judgeWhole(record());
-        });
-    }
     void clear() override {
         Scenario::clear();
         for (const std::string& movie : world_.library()) fs::remove(movie);
@@ -394,12 +395,6 @@ public:
     std::vector<std::string> judgeWhole(const Heard& heard) override {
         if (heard.stop != "ok") return {"a save without fault: " + heard.stop};
         return judgeAfterFault(heard, std::nullopt);
-    }
-    std::vector<std::string> judgeNext() override {
-        return untilGood([&] {
-            clear();
-            return judgeWhole(record());
-        });
     }
     void clear() override {
         Scenario::clear();

@@ -45,8 +45,8 @@ public:
     virtual std::vector<std::string> judgeAfterFault(const Heard& heard, std::optional<std::chrono::nanoseconds> ended) = 0;
     /// What is wrong with a recording that had none.
     virtual std::vector<std::string> judgeWhole(const Heard& heard) = 0;
-    /// Has another movie made, the plainest and shortest that there is of this kind; what is wrong with it.
-    virtual std::vector<std::string> judgeNext() = 0;
+    /// Has another movie made, the plainest and shortest that there is of this kind; what is wrong with it in the end.
+    virtual std::vector<std::string> judgeNext();
     /// Removes what recordings have left.
     virtual void clear();
 
