@@ -175,6 +175,8 @@ TEST_F(DisplayRecording, OutlivesAToolThatIsKilledAndIsKeptWhenAnotherRecordingT
     checkers::MovieReader reader(fs::directory_iterator(library)->path());
     ASSERT_EQ(reader.videoTracks().size(), 1u) << reader.error();
     EXPECT_EQ(reader.videoTracks()[0].rotation, 90);
+    // A recording that is stopped before its first picture has no movie.
+    EXPECT_TRUE(world_.waitForElapsed(0.2)) << world_.daemonLog();
     EXPECT_FALSE(player->stop().empty());
 }
 
