@@ -16,6 +16,8 @@ using sound::TapMix;
 
 /// How much a buffer holds when it is handed over.
 constexpr double kPieceSeconds = 0.02;
+/// The same while there is nothing to hear: silence is worth few wake-ups.
+constexpr double kQuietPieceSeconds = 0.2;
 /// How many buffers are handed over only when full, until one has come back.
 constexpr std::size_t kKeptForLater = 5;
 /// Without a buffer to fill for so long, the stream goes back to the server.
@@ -199,13 +201,17 @@ void TapCore::tellRunning(Lock& lock) {
     lock.lock();
 }
 
+double TapCore::pieceFramesLocked() const {
+    return format_.sampleRate * (mix_->isQuiet() ? kQuietPieceSeconds : kPieceSeconds);
+}
+
 /// Waits until there is something to fill into a buffer, or a buffer, or less to do.
 void TapCore::rest(Lock& lock) {
     const auto run = run_;
     if (isDryLocked(LinuxClock::currentHostTime()) && !tap_) {
         changed_.wait(lock, [&] { return run_ != run || !enqueued_.empty(); });
     } else {
-        const auto piece = static_cast<std::int64_t>(std::ceil(format_.sampleRate * kPieceSeconds));
+        const auto piece = static_cast<std::int64_t>(std::ceil(pieceFramesLocked()));
         const std::int64_t begun =
             enqueued_.empty() ? 0 : std::min<std::int64_t>(enqueued_.front()->byteSize / format_.bytesPerFrame, piece - 1);
         const std::chrono::steady_clock::time_point moment{
@@ -279,7 +285,7 @@ void TapCore::keepLocked(std::int64_t frame, std::span<const float> samples) {
 bool TapCore::isToBeHandedOverLocked(const AudioQueueBuffer& buffer) const {
     if (buffer.bytes.size() - buffer.byteSize < format_.bytesPerFrame) return true;
     if (!cameBack_ && enqueued_.size() <= kKeptForLater) return false;
-    return buffer.byteSize / format_.bytesPerFrame >= format_.sampleRate * kPieceSeconds;
+    return buffer.byteSize / format_.bytesPerFrame >= pieceFramesLocked();
 }
 
 void TapCore::handOver(Lock& lock) {

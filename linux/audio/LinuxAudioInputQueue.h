@@ -25,7 +25,8 @@ struct TapServices {
 };
 
 /// What a queue's owner and its thread share. The thread lives from the first start until dispose; it goes by the clock,
-/// not by the server, and wakes fifty times a second while there are buffers to fill. Thread-safe.
+/// not by the server, and wakes fifty times a second while there are buffers to fill, five times when there has been
+/// nothing to hear for two seconds. Thread-safe.
 class TapCore final : public std::enable_shared_from_this<TapCore> {
 public:
     TapCore(TapServices services, const AudioFormat& format, AudioInputQueue::InputCallback callback);
@@ -61,6 +62,7 @@ private:
     void run();
     void tellRunning(Lock& lock);
     void rest(Lock& lock);
+    double pieceFramesLocked() const;
     bool isDryLocked(HostTime now) const;
     void fillLocked();
     void keepLocked(std::int64_t frame, std::span<const float> samples);

@@ -11,6 +11,8 @@ namespace {
 constexpr double kLaneSeconds = 1.5;
 /// What the delay grows by beyond what was too late.
 constexpr std::int64_t kMargin = 5'000'000;
+/// Applications play one sound after the other, each as a stream of its own.
+constexpr double kQuietAfterSeconds = 2;
 
 }  // namespace
 
@@ -90,6 +92,11 @@ void TapMix::write(SoundLane& lane, std::int64_t frame, std::span<const float> i
     lane.end_ = std::max(lane.end_, frame + count);
 }
 
+bool TapMix::isQuiet() const {
+    const std::lock_guard lock(mutex_);
+    return lanes_.empty() && static_cast<double>(position_ - lastWithStream_) >= kQuietAfterSeconds * rate_;
+}
+
 std::int64_t TapMix::position() const {
     const std::lock_guard lock(mutex_);
     return position_;
@@ -121,6 +128,7 @@ void TapMix::read(std::span<float> interleaved) {
         }
     }
     position_ += count;
+    if (!lanes_.empty()) lastWithStream_ = position_;
     std::erase_if(lanes_, [this](const auto& lane) { return lane->isClosed_ && lane->end_ <= position_; });
 }
 

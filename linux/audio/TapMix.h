@@ -50,6 +50,8 @@ public:
     void discardLane(const std::shared_ptr<SoundLane>& lane);
     void write(SoundLane& lane, std::int64_t frame, std::span<const float> interleaved);
 
+    /// There has been no stream for a while: what is read is silence, and nobody needs it soon.
+    bool isQuiet() const;
     /// The first frame that was not read yet.
     std::int64_t position() const;
     /// How many frames can be read at this moment.
@@ -73,6 +75,7 @@ private:
     mutable std::mutex mutex_;
     std::vector<std::shared_ptr<SoundLane>> lanes_;
     std::int64_t position_ = 0;
+    std::int64_t lastWithStream_ = 0;  ///< where the last one ended
     std::int64_t delay_ = kFirstDelay;
 };
 

@@ -109,6 +109,21 @@ TEST_P(AudioTapTest, WhoPlaysNothingIsDigitalSilenceWhileOthersPlay) {
     EXPECT_TRUE(test::holesIn(heard->pieces()).empty());
 }
 
+TEST_P(AudioTapTest, SilenceOfOneThatPlaysNothingComesInLongPiecesAndWhatItPlaysThenInShortOnes) {
+    TonePlayer one(server_->address());
+    const auto heard = hear(one.pid());
+    const auto longest = [&] {
+        std::size_t frames = 0;
+        for (const auto& piece : heard->pieces()) frames = std::max(frames, piece.frames);
+        return frames;
+    };
+    EXPECT_TRUE(eventually([&] { return longest() >= 8820; })) << "a fifth of a second";
+    ASSERT_TRUE(one.tell("play a 997 0.5 2"));
+    ASSERT_TRUE(heard->waitForTone(kOwn));
+    EXPECT_TRUE(eventually([&] { return heard->pieces().back().frames <= 2 * 882; }));
+    EXPECT_TRUE(test::holesIn(heard->pieces()).empty());
+}
+
 TEST_P(AudioTapTest, WhenTheApplicationEndsNothingElseIsHeardInItsPlace) {
     auto one = play(kOwn);
     const auto other = play(kOther);
