@@ -27,6 +27,15 @@ def encoder_options(movie):
     return dict(option.split("=", 1) for option in found.group(1).decode().split() if "=" in option)
 
 
+def option_line(ours, theirs):
+    """What differs between two movies' options, in words."""
+    if not ours or not theirs:
+        return "the encoder's options could not be read from the movies"
+    different = [f"{key}: {ours.get(key)} / {theirs.get(key)}" for key in sorted(ours.keys() | theirs.keys())
+                 if ours.get(key) != theirs.get(key)]
+    return f"encoder options in the stream: {len(ours)}, different: {'; '.join(different) or 'none'}"
+
+
 def numbers(binaries, movie):
     """The frame number in each picture, None where none can be read."""
     out = subprocess.run([str(binaries / "scene_pictures"), "numbers", str(movie)], check=True, capture_output=True,

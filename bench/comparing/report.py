@@ -2,6 +2,8 @@
 
 import statistics
 
+from . import movies
+
 # The most that ours may be of ffmpeg's.
 MOVING_CPU = 0.8
 STILL_CPU = 0.1
@@ -99,13 +101,7 @@ def show_likeness(pairs):
     print()
     for figures in (ours, theirs):
         print(f"{figures['recorder']:<7} " + "  ".join(f"{key} {value}" for key, value in figures["movie"].items()))
-    if ours["options"] is None or theirs["options"] is None:
-        print("the encoder's options could not be read from the movies")
-        return
-    different = [f"{key}: {ours['options'].get(key)} / {theirs['options'].get(key)}"
-                 for key in sorted(ours["options"].keys() | theirs["options"].keys())
-                 if ours["options"].get(key) != theirs["options"].get(key)]
-    print(f"encoder options in the stream: {len(ours['options'])}, different: {'; '.join(different) or 'none'}")
+    print(movies.option_line(ours["options"], theirs["options"]))
     print("command " + " ".join(theirs["command"]))
     for figures in (ours, theirs):
         print(f"threads of {figures['recorder']}, CPU s: " + "  ".join(
