@@ -4,6 +4,7 @@ import json
 import re
 import subprocess
 
+FFMPEG = ["ffmpeg", "-hide_banner", "-nostdin", "-y", "-loglevel", "error"]
 SAMPLE = 30  # pictures whose likeness is measured
 
 
