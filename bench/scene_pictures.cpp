@@ -1,6 +1,7 @@
 // What a comparison of recorders needs to know of the recorded scene:
 //   scene_pictures numbers MOVIE     each decoded picture: its time in ns and the frame number in it, "-" when none
-//   scene_pictures redraw WxH N...   frames as they were drawn, raw B, G, R, X, one after the other, without the lines
+//   scene_pictures redraw WxH [--part] N...
+//                                    frames as they were drawn, raw B, G, R, X, one after the other, without the lines
 //                                    from the clock on: the time it showed is not known any more
 
 #include <cinttypes>
@@ -41,11 +42,11 @@ int printNumbers(const char* movie) {
 /// A frame buffer of its own for each drawing: the scene draws whole then.
 class Drawing final {
 public:
-    Drawing(int width, int height, std::uint32_t number, const scene::WallTime& time)
+    Drawing(int width, int height, scene::Motion motion, std::uint32_t number, const scene::WallTime& time)
         : pixels_(static_cast<std::size_t>(width) * static_cast<std::size_t>(height)) {
         const scene::Picture picture{reinterpret_cast<std::uint8_t*>(pixels_.data()), width, height,
                                      static_cast<std::size_t>(width) * 4};
-        scene::Scene(width, height, scene::Motion::Everywhere).draw(picture, number, time);
+        scene::Scene(width, height, motion).draw(picture, number, time);
     }
     const std::vector<std::uint32_t>& pixels() const { return pixels_; }
 
@@ -54,22 +55,22 @@ private:
 };
 
 /// The rows above the first one that depends on the time, an even number.
-std::size_t rowsAboveClock(int width, int height) {
-    const Drawing one(width, height, 1, {}), other(width, height, 1, {11, 11, 11, 111});
+std::size_t rowsAboveClock(int width, int height, scene::Motion motion) {
+    const Drawing one(width, height, motion, 1, {}), other(width, height, motion, 1, {11, 11, 11, 111});
     std::size_t pixel = 0;
     while (pixel < one.pixels().size() && one.pixels()[pixel] == other.pixels()[pixel]) ++pixel;
     return pixel / static_cast<std::size_t>(width) / 2 * 2;
 }
 
-int redraw(const char* size, int count, char** numbers) {
+int redraw(const char* size, scene::Motion motion, int count, char** numbers) {
     int width = 0, height = 0;
     if (std::sscanf(size, "%dx%d", &width, &height) != 2 || width < scene::kMinimumWidth ||
         height < scene::kMinimumHeight || width > 16384 || height > 16384)
         return fail("the size is not usable");
-    const std::size_t pixels = rowsAboveClock(width, height) * static_cast<std::size_t>(width);
+    const std::size_t pixels = rowsAboveClock(width, height, motion) * static_cast<std::size_t>(width);
     for (int index = 0; index < count; ++index) {
         const auto number = static_cast<std::uint32_t>(std::strtoul(numbers[index], nullptr, 10));
-        const Drawing drawing(width, height, number, {});
+        const Drawing drawing(width, height, motion, number, {});
         if (std::fwrite(drawing.pixels().data(), sizeof(std::uint32_t), pixels, stdout) != pixels)
             return fail("writing failed");
     }
@@ -81,6 +82,8 @@ int redraw(const char* size, int count, char** numbers) {
 int main(int argc, char** argv) {
     const std::string_view what = argc > 1 ? argv[1] : "";
     if (what == "numbers" && argc == 3) return printNumbers(argv[2]);
-    if (what == "redraw" && argc > 3) return redraw(argv[2], argc - 3, argv + 3);
-    return fail("numbers MOVIE | redraw WxH N...");
+    const bool part = argc > 4 && std::string_view(argv[3]) == "--part";
+    if (what == "redraw" && part) return redraw(argv[2], scene::Motion::SmallPart, argc - 4, argv + 4);
+    if (what == "redraw" && argc > 3) return redraw(argv[2], scene::Motion::Everywhere, argc - 3, argv + 3);
+    return fail("numbers MOVIE | redraw WxH [--part] N...");
 }

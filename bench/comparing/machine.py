@@ -11,6 +11,7 @@ import tempfile
 import time
 
 ROOT = pathlib.Path(__file__).resolve().parents[2]
+MOTION = {"moving": [], "still": ["--still"], "part": ["--part"]}  # the application's option for each kind of window
 PATIENCE = 30  # seconds that anything may take to appear
 
 
@@ -26,14 +27,14 @@ def wait_for(what, condition):
 
 
 class Machine:
-    def __init__(self, binaries, size, still):
+    def __init__(self, binaries, size, kind="moving"):
         self.binaries, self.size = pathlib.Path(binaries).resolve(), size
         self.folder = pathlib.Path(tempfile.mkdtemp(prefix="lumacast-bench-"))
         self.children = []
         try:
             self._make_folders()
             self._start_display()
-            self._start_application(still)
+            self._start_application(kind)
         except BaseException:
             self.close()
             raise
@@ -87,9 +88,9 @@ class Machine:
             raise RuntimeError("Xvfb did not start: " + self.log("xvfb.log"))
         self.environment["DISPLAY"] = ":" + number
 
-    def _start_application(self, still):
+    def _start_application(self, kind):
         command = [str(self.binaries / "self_recorder"), "--size", self.size, "--fps", "60", "--name", "Self Recorder"]
-        self.application = self.start(command + (["--still"] if still else []), "application.log",
+        self.application = self.start(command + MOTION[kind], "application.log",
                                       stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True, bufsize=1)
         self.window = re.fullmatch(r"window (0x[0-9a-f]+)", self.application.stdout.readline().strip()).group(1)
         wait_for("the first frame", lambda: self.frame() > 0)

@@ -4,6 +4,8 @@ import collections
 import os
 import pathlib
 import subprocess
+import tempfile
+import subprocess
 import time
 
 TICK = 1 / os.sysconf("SC_CLK_TCK")
@@ -55,8 +57,29 @@ class Threads:
             seconds[f"{name} {seen[name]}"] = spent - earlier.of.get(task, ("", 0, 0))[1]
         return seconds
 
+    def switches_by_name_since(self, earlier):
+        """Voluntary switches of all threads of one name."""
+        switches = collections.Counter()
+        for task, (name, _, count) in self.of.items():
+            switches[name] += count - earlier.of.get(task, ("", 0, 0))[2]
+        return dict(switches)
+
     def _since(self, earlier, field):
         return (values[field] - earlier.of.get(task, ("", 0, 0))[field] for task, values in self.of.items())
+
+
+def share_of(pid, library, seconds):
+    """Which share of a process's time on a processor passes within a library, sampled for so long."""
+    with tempfile.TemporaryDirectory(prefix="lumacast-bench-perf-") as folder:
+        data = pathlib.Path(folder) / "perf.data"
+        subprocess.run(["perf", "record", "-q", "-e", "cpu-clock", "-F", "997", "-o", data, "-p", str(pid), "--", "sleep",
+                        str(seconds)], check=True, stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
+        told = subprocess.run(["perf", "report", "-i", data, "--stdio", "--sort", "dso", "-t", ";"], check=True,
+                              capture_output=True, text=True).stdout
+    lines = [line.split(";") for line in told.splitlines() if ";" in line and not line.startswith("#")]
+    if not lines:
+        raise RuntimeError("perf saw nothing of the process")
+    return sum(float(share.strip(" %")) for share, name in lines if name.strip().startswith(library)) / 100
 
 
 def pss(pid):

@@ -51,10 +51,10 @@ def spread(items):
     return [items[round(index * (len(items) - 1) / (SAMPLE - 1))] for index in range(SAMPLE)]
 
 
-def ssim(binaries, movie, size, sample):
+def ssim(binaries, movie, size, sample, kind="moving"):
     """Structural similarity (ffmpeg's filter) of pictures with what was drawn: sample is (index in the movie, frame
     number). Judged is what lies above the clock of the scene, as the time that it showed is not known any more."""
-    drawn = subprocess.run([str(binaries / "scene_pictures"), "redraw", size, *(str(number) for _, number in sample)],
+    drawn = subprocess.run([str(binaries / "scene_pictures"), "redraw", size, *(["--part"] if kind == "part" else []), *(str(number) for _, number in sample)],
                            check=True, capture_output=True).stdout
     width = int(size.split("x")[0])
     area = f"{width}:{len(drawn) // (width * 4 * len(sample))}"

@@ -10,7 +10,7 @@ class SoundingMachine(machine.Machine):
 
     def __init__(self, binaries, size, fps, application):
         self.fps, self.options = fps, application
-        super().__init__(binaries, size, still=False)
+        super().__init__(binaries, size)
 
     def _start_display(self):
         super()._start_display()
@@ -24,7 +24,7 @@ class SoundingMachine(machine.Machine):
         machine.wait_for("the sound server", socket.exists)
         self.environment["PULSE_SERVER"] = f"unix:{socket}"
 
-    def _start_application(self, still):
+    def _start_application(self, kind):
         options = [option.format(folder=self.folder) for option in self.options]
         self.application = self.start([str(self.binaries / "self_recorder"), "--size", self.size, "--fps", str(self.fps),
                                        "--name", "Self Recorder", *options], "application.log",

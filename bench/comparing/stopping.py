@@ -21,9 +21,9 @@ class PacedMachine(machine.Machine):
 
     def __init__(self, binaries, size, fps):
         self.fps = fps
-        super().__init__(binaries, size, still=False)
+        super().__init__(binaries, size)
 
-    def _start_application(self, still):
+    def _start_application(self, kind):
         self.application = self.start([str(self.binaries / "self_recorder"), "--size", self.size, "--fps", str(self.fps),
                                        "--name", "Self Recorder"], "application.log", stdin=subprocess.PIPE,
                                       stdout=subprocess.PIPE, text=True, bufsize=1)
