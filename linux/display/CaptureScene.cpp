@@ -41,7 +41,10 @@ bool CaptureScene::followScreen(std::int64_t now) {
 
 void CaptureScene::choosePicture() {
     std::vector<CaptureTarget*> shown;
-    for (const auto& target : targets_) shown.push_back(target.get());
+    for (const auto& target : targets_) {
+        target->allowScreen(targets_.size() == 1);
+        shown.push_back(target.get());
+    }
     if (shown.size() > 1 && !canvas_) canvas_ = std::make_unique<Canvas>(connection_);
     // One that goes, too: it leaves the events of windows that are captured alone.
     if (canvas_) canvas_->show(std::move(shown));

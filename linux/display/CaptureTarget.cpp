@@ -2,11 +2,15 @@
 
 #include <xcb/composite.h>
 #include <xcb/damage.h>
+#include <xcb/shm.h>
 
 #include <algorithm>
 #include <array>
 #include <cstring>
+#include <limits>
 #include <utility>
+
+#include "linux/display/Covering.h"
 
 namespace lumacast::x11 {
 namespace {
@@ -14,6 +18,9 @@ namespace {
 constexpr std::uint32_t kWindowEvents =
     XCB_EVENT_MASK_STRUCTURE_NOTIFY | XCB_EVENT_MASK_EXPOSURE | XCB_EVENT_MASK_VISIBILITY_CHANGE;
 constexpr std::uint32_t kScreenEvents = XCB_EVENT_MASK_STRUCTURE_NOTIFY;
+// A window that was redirected a moment ago may be covered again in the next: menus and messages come and go.
+constexpr std::int64_t kFirstLookAfter = 1'000'000'000, kLastLookAfter = 4'000'000'000;
+constexpr std::int64_t kNever = std::numeric_limits<std::int64_t>::max();
 
 }  // namespace
 
@@ -42,7 +49,7 @@ CaptureTarget::~CaptureTarget() {
         const std::uint32_t none = 0;
         xcb_damage_destroy(x, damage_);
         xcb_change_window_attributes(x, window_, XCB_CW_EVENT_MASK, &none);
-        if (kind_ == Kind::Window) xcb_composite_unredirect_window(x, window_, XCB_COMPOSITE_REDIRECT_AUTOMATIC);
+        if (kind_ == Kind::Window && !fromScreen_) xcb_composite_unredirect_window(x, window_, XCB_COMPOSITE_REDIRECT_AUTOMATIC);
     }
     xcb_flush(x);
 }
@@ -96,8 +103,12 @@ void CaptureTarget::handle(const xcb_generic_event_t& event, std::int64_t now) {
     } else if (type == XCB_MAP_NOTIFY) {
         needsRefresh_ |= reinterpret_cast<const xcb_map_notify_event_t&>(event).window == window_;
     } else if (type == XCB_VISIBILITY_NOTIFY) {
-        // A redirected window hides and comes back with its parent; this is all that tells.
-        needsRefresh_ |= reinterpret_cast<const xcb_visibility_notify_event_t&>(event).window == window_;
+        // A redirected window hides and comes back with its parent; this is all that tells. On the screen it tells that
+        // the window is covered, before anything that is read then is answered.
+        const auto& visibility = reinterpret_cast<const xcb_visibility_notify_event_t&>(event);
+        if (visibility.window != window_) return;
+        needsRefresh_ = true;
+        covered_ |= visibility.state != XCB_VISIBILITY_UNOBSCURED;
     } else if (type == XCB_REPARENT_NOTIFY) {
         needsRefresh_ |= reinterpret_cast<const xcb_reparent_notify_event_t&>(event).window == window_;
     } else if (type == XCB_DESTROY_NOTIFY) {
@@ -172,12 +183,13 @@ void CaptureTarget::resized(const xcb_configure_notify_event_t& event) {
 }
 
 void CaptureTarget::freePixmap() {
-    if (drawable_ != XCB_NONE && kind_ == Kind::Window) xcb_free_pixmap(connection_.get(), drawable_);
+    if (drawable_ != XCB_NONE && drawable_ != window_) xcb_free_pixmap(connection_.get(), drawable_);
     drawable_ = XCB_NONE;
 }
 
 void CaptureTarget::refresh() {
     needsRefresh_ = false;
+    if (fromScreen_) leaveScreen();
     freePixmap();
     if (kind_ == Kind::Window)
         nameWindow();
@@ -187,13 +199,14 @@ void CaptureTarget::refresh() {
     damaged_ = readable();
     foreign_ = kind_ == Kind::Window;
     ++layout_;
+    nextLook_ = 0;
 }
 
 void CaptureTarget::forgetDamage() {
     subtracted_ = xcb_damage_subtract(connection_.get(), damage_, XCB_NONE, XCB_NONE).sequence;
 }
 
-// At first, in one go with the redirection, what the server itself painted is forgotten, so that the application's own
+// With a redirection, in one go, what the server itself painted is forgotten, so that the application's own
 // painting is waited for. Later, at a change of size, the application may have been faster than this, and its painting
 // must count.
 void CaptureTarget::nameWindow() {
@@ -202,7 +215,7 @@ void CaptureTarget::nameWindow() {
     const auto nameCookie = xcb_composite_name_window_pixmap_checked(x, window_, pixmap);
     // The pixmap's own size: the window's may be another one by the time it is asked for.
     const auto pixmapCookie = xcb_get_geometry(x, pixmap);
-    if (layout_ == 0) forgetDamage();
+    if (std::exchange(redirectedNow_, false)) forgetDamage();
     const auto windowCookie = xcb_get_geometry(x, window_);
     const bool named = connection_.succeeded(nameCookie);
     const Owned<xcb_get_geometry_reply_t> size(xcb_get_geometry_reply(x, pixmapCookie, nullptr));
@@ -233,6 +246,8 @@ void CaptureTarget::measureScreen() {
 }
 
 void CaptureTarget::takeDamage(DamageRegion& into) {
+    into.add(carried_);
+    carried_.clear();
     xcb_connection_t* const x = connection_.get();
     subtracted_ = xcb_damage_subtract(x, damage_, XCB_NONE, region_).sequence;
     damaged_ = false;
@@ -249,8 +264,73 @@ void CaptureTarget::takeDamage(DamageRegion& into) {
     if (unpainted(awaited_).empty()) awaitNothing();
 }
 
+void CaptureTarget::allowScreen(bool allowed) {
+    if (kind_ != Kind::Window) return;
+    mayReadScreen_ = allowed;
+    needsRefresh_ |= fromScreen_ && !allowed;
+}
+
+std::int64_t CaptureTarget::nextLook() const {
+    return mayReadScreen_ && !fromScreen_ && readable() ? nextLook_ : kNever;
+}
+
+/// Between the look at what covers the window and the end of the redirection nobody else may change it: of what covers
+/// the window then, its picture would be overwritten.
+void CaptureTarget::look(std::int64_t now) {
+    const bool isFirst = nextLook_ == 0;
+    lookAgainAfter_ = isFirst ? kFirstLookAfter : std::min(2 * lookAgainAfter_, kLastLookAfter);
+    nextLook_ = now + lookAgainAfter_;
+    if (isFirst || !mayReadScreen_ || fromScreen_ || !readable() || needsRefresh_ || !awaited_.empty()) return;
+    xcb_connection_t* const x = connection_.get();
+    xcb_grab_server(x);
+    if (isWhollyShown(connection_, window_)) {
+        DamageRegion damage;
+        takeDamage(damage);
+        carried_ = damage;
+        damaged_ = !damage.empty();
+        xcb_composite_unredirect_window(x, window_, XCB_COMPOSITE_REDIRECT_AUTOMATIC);
+        forgetDamage();  // the server's own copying of the picture to the screen, where it is already
+        freePixmap();
+        drawable_ = window_;
+        fromScreen_ = true;
+        covered_ = false;
+    }
+    xcb_ungrab_server(x);
+    xcb_flush(x);
+}
+
+// What the server puts into the picture of the window where it is covered is what covers it; then it asks the
+// application to repaint that.
+void CaptureTarget::leaveScreen() {
+    xcb_composite_redirect_window(connection_.get(), window_, XCB_COMPOSITE_REDIRECT_AUTOMATIC);
+    fromScreen_ = covered_ = false;
+    redirectedNow_ = isRestorable_ = true;
+}
+
+// Own pixels, if of a moment ago, are better than waiting for those that the application will paint now.
+void CaptureTarget::restore(const SharedMemory& last) {
+    if (!std::exchange(isRestorable_, false) || !readable() || uncovered_.empty()) return;
+    xcb_connection_t* const x = connection_.get();
+    const xcb_gcontext_t context = xcb_generate_id(x);
+    xcb_create_gc(x, context, drawable_, 0, nullptr);
+    for (const PixelRect& rect : uncovered_.rects()) {
+        const PixelRect inside = intersection(rect, {0, 0, width_, height_});
+        if (isEmpty(inside)) continue;
+        xcb_shm_put_image(x, drawable_, context, static_cast<std::uint16_t>(width_), static_cast<std::uint16_t>(height_),
+                          static_cast<std::uint16_t>(inside.x), static_cast<std::uint16_t>(inside.y),
+                          static_cast<std::uint16_t>(inside.width), static_cast<std::uint16_t>(inside.height),
+                          static_cast<std::int16_t>(inside.x + border_), static_cast<std::int16_t>(inside.y + border_),
+                          depth_, XCB_IMAGE_FORMAT_Z_PIXMAP, 0, last.segment(), 0);
+    }
+    xcb_free_gc(x, context);
+    foreign_ = false;
+    awaitNothing();
+}
+
 bool CaptureTarget::read(const SharedMemory& memory, std::span<const Strip> strips) {
-    const RowsRead rows = readRows(connection_, drawable_, {border_, border_, width_, height_}, memory, strips);
+    // The picture in memory has the border around it.
+    const std::int32_t inset = fromScreen_ ? 0 : border_;
+    const RowsRead rows = readRows(connection_, drawable_, {inset, inset, width_, height_}, memory, strips);
     if (rows.lastRequest != 0) lastRead_ = rows.lastRequest;
     needsRefresh_ |= !rows.complete;
     return rows.complete;

@@ -15,8 +15,10 @@
 namespace lumacast::x11 {
 
 /// A window that is captured, whatever covers it: the server keeps its picture in memory of its own (automatic
-/// redirection), reports what changes in it, and copies what is asked for. Or the whole screen, as it is shown, without
-/// the pointer. There is no picture to read while the window is hidden; its size is without the window's border.
+/// redirection), reports what changes in it, and copies what is asked for. While nothing covers it, it may be read from
+/// the screen, which spares the server that memory and the copying of each change to the screen. Or the whole screen, as
+/// it is shown, without the pointer. There is no picture to read while the window is hidden; its size is without the
+/// window's border.
 class CaptureTarget final : public PictureSource {
 public:
     enum class Kind { Window, Screen };
@@ -36,6 +38,9 @@ public:
     /// The window was destroyed.
     bool gone() const { return gone_; }
 
+    /// Whether the window may be read from the screen: not when somebody copies from its picture within the server.
+    void allowScreen(bool allowed);
+
     /// For whoever copies from the picture within the server: where it is while it is readable, and the pixels before
     /// its first column and row there.
     xcb_drawable_t drawable() const { return drawable_; }
@@ -47,6 +52,8 @@ public:
     std::uint32_t id() const override { return damage_; }  // the window may be captured a second time
     bool needsRefresh() const override { return needsRefresh_; }
     void refresh() override;
+    std::int64_t nextLook() const override;
+    void look(std::int64_t now) override;
     bool readable() const override { return drawable_ != XCB_NONE; }
     std::int32_t width() const override { return width_; }
     std::int32_t height() const override { return height_; }
@@ -60,10 +67,14 @@ public:
     void repaintIsLate(std::int64_t now) override;
     bool read(const SharedMemory& memory, std::span<const Strip> strips) override;
     bool overtaken() const override { return damagedBefore(lastRead_); }
+    bool spoilt() const override { return fromScreen_ && covered_; }
+    void restore(const SharedMemory& last) override;
 
 private:
     CaptureTarget(X11Connection& connection, xcb_window_t window, Kind kind, std::uint8_t depth);
     void begin(std::uint16_t width, std::uint16_t height);
+    void redirect();
+    void leaveScreen();
     void nameWindow();
     void measureScreen();
     void freePixmap();
@@ -87,6 +98,15 @@ private:
     xcb_drawable_t drawable_ = XCB_NONE;
     std::int32_t width_ = 0, height_ = 0, border_ = 0;
     std::uint64_t layout_ = 0;
+
+    bool mayReadScreen_ = false;
+    bool fromScreen_ = false;     ///< it is not redirected
+    bool redirectedNow_ = true;   ///< no picture of the redirected window was named yet
+    bool covered_ = false;        ///< since it was read from the screen, in part at least
+    bool isRestorable_ = false;   ///< what covered it came a moment ago
+    DamageRegion carried_;        ///< fetched, and not asked for yet
+    std::int64_t nextLook_ = 0;   ///< 0: the first one is still to be planned
+    std::int64_t lookAgainAfter_ = 0;
 
     DamageRegion awaited_;    ///< to be painted by the application, not painted yet
     DamageRegion uncovered_;  ///< what of it the server has uncovered

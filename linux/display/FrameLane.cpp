@@ -68,6 +68,7 @@ void FrameLane::release() {
     scene_.reset();
     maker_.reset();
     connection_.reset();
+    last_.source = 0;
 }
 
 std::int64_t FrameLane::nextDeadline(const Order& order) const {
@@ -170,6 +171,7 @@ void FrameLane::makeMaker() {
     if (mirrors_ && width > height) std::swap(width, height);
     if (maker_ && maker_->makes(width, height)) return;
     maker_ = std::make_unique<PictureMaker>(*connection_, width, height);
+    last_.source = 0;
     pictureWanted_ = true;
 }
 
@@ -208,11 +210,18 @@ Turn FrameLane::turnOf(const Order& order) {
     return turn_;
 }
 
+// Whether the last picture is what was read of the source as it is laid out now, pixel by pixel.
+bool FrameLane::lastIsAsRead() const {
+    return last_.picture && last_.source == shown_->id() && last_.layout == shown_->layout() && maker_->isDirect(*last_.picture->plane());
+}
+
 // Whether the picture can be read now; what has changed in it is noted.
 bool FrameLane::lookAtPicture(const Order& order) {
     if (shown_->needsRefresh()) {
+        const bool isShown = lastIsAsRead();
         shown_->refresh();
         drainEvents(true);
+        if (isShown) shown_->restore(last_.picture->plane()->memory());
     }
     if (!shown_->readable()) return false;
     const Turn turn = turnOf(order);
@@ -239,10 +248,15 @@ void FrameLane::takePicture(const Order& order) {
         drainEvents(true);
         if (!shown_->overtaken() && !shown_->needsRefresh()) break;
     }
+    if (shown_->spoilt()) {
+        pictureWanted_ = true;
+        return pacer_.taken(steadyNow());
+    }
     // What a locked screen shows is nobody's business; the next look ends the run.
     if (scene_->screenIsBlank()) return;
     const std::uint32_t flags = maker_->turn() == Turn::Counterclockwise ? kRotateClockwise : 0;
-    if (!deliver(order, maker_->picture(*plane, ++pictures_), flags, stamp, CaptureControl::Stamp::Fresh)) return;
+    Delivered taken{maker_->picture(*plane, ++pictures_), stamp, order.clock, flags, shown_->id(), shown_->layout()};
+    if (!deliver(order, std::move(taken), CaptureControl::Stamp::Fresh)) return;
     maker_->delivered();
     pictureWanted_ = false;
 }
@@ -255,24 +269,27 @@ void FrameLane::dropPicture(bool hadNews) {
 }
 
 void FrameLane::repeatPicture(const Order& order, MediaTime stamp, CaptureControl::Stamp kind) {
-    deliver(order, std::make_shared<Picture>(last_.picture->plane(), DamageRegion{}, ++pictures_), last_.transformFlags,
-            stamp, kind);
+    Delivered again = last_;
+    again.picture = std::make_shared<Picture>(last_.picture->plane(), DamageRegion{}, ++pictures_);
+    again.stamp = stamp;
+    again.clock = order.clock;
+    deliver(order, std::move(again), kind);
 }
 
 // False when the order has changed meanwhile.
-bool FrameLane::deliver(const Order& order, std::shared_ptr<Picture> picture, std::uint32_t transformFlags,
-                        MediaTime stamp, CaptureControl::Stamp kind) {
+bool FrameLane::deliver(const Order& order, Delivered what, CaptureControl::Stamp kind) {
     const std::int64_t began = steadyNow();
     pacer_.taken(began);
     const auto source = setup_.source.lock();
     const auto delegate = setup_.control->delegate();
     if (!source || !delegate) return true;  // to nobody
-    const auto given = setup_.control->beginDelivery(order, stamp, kind);
+    const auto given = setup_.control->beginDelivery(order, what.stamp, kind);
     if (!given) return false;
-    last_ = {picture, *given, order.clock, transformFlags};
+    what.stamp = *given;
+    last_ = what;
     delegate->screenCaptureControllerDidReceiveSampleBuffer(
-        *source, SampleBuffer::makeVideo(PixelBuffer(std::move(picture)), *given, setup_.minimumInterval),
-        transformFlags);
+        *source, SampleBuffer::makeVideo(PixelBuffer(std::move(what.picture)), *given, setup_.minimumInterval),
+        what.transformFlags);
     setup_.control->countDelivered();
     setup_.control->endDelivery();
 

@@ -52,6 +52,8 @@ private:
         MediaTime stamp;
         std::shared_ptr<CaptureClock> clock;
         std::uint32_t transformFlags = 0;
+        std::uint32_t source = 0;  ///< which it was read from, and how that was laid out; 0 when it is not known any more
+        std::uint64_t layout = 0;
     };
     using Telling = std::function<void(DisplayCaptureDelegate&, DisplayCaptureSource&)>;
 
@@ -68,8 +70,8 @@ private:
     Turn turnOf(const Order& order);
     void dropPicture(bool hadNews);
     void repeatPicture(const Order& order, MediaTime stamp, CaptureControl::Stamp kind);
-    bool deliver(const Order& order, std::shared_ptr<Picture> picture, std::uint32_t transformFlags, MediaTime stamp,
-                 CaptureControl::Stamp kind);
+    bool lastIsAsRead() const;
+    bool deliver(const Order& order, Delivered what, CaptureControl::Stamp kind);
     void fail(const Order& order, std::int32_t status);
     void displayIsLost(const Order& order);
     void end(const Order& order, Telling telling);

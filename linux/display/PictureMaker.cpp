@@ -101,12 +101,14 @@ bool PictureMaker::update(std::size_t index, PictureSource& target) {
         std::memset(bytes.data(), 0, bytes.size());
         planeFits_[index] = fit_;
     }
-    const bool rowsAreTight = plane.stride() == static_cast<std::size_t>(fit_.sourceWidth) * 4;
-    const bool direct = fit_.exact() && rowsAreTight && fit_.turn == Turn::None && target.overlay().pixels.empty() &&
-                        isEmpty(drawnOver_);
-    const bool done = direct ? updateDirectly(index, target) : updateFromImage(index, target);
+    const bool done = isDirect(plane) && target.overlay().pixels.empty() ? updateDirectly(index, target) : updateFromImage(index, target);
     if (done) tracker_.planeIsCurrent(index);
     return done;
+}
+
+bool PictureMaker::isDirect(const Plane& plane) const {
+    const bool rowsAreTight = plane.stride() == static_cast<std::size_t>(fit_.sourceWidth) * 4;
+    return fit_.exact() && rowsAreTight && fit_.turn == Turn::None && isEmpty(drawnOver_);
 }
 
 bool PictureMaker::updateDirectly(std::size_t index, PictureSource& target) {

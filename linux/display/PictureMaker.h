@@ -43,6 +43,9 @@ public:
     void startOver() { tracker_.nothingDelivered(); }
     bool somethingNew() const { return !tracker_.sinceDelivery().empty(); }
 
+    /// Whether this plane holds pictures just as they were read.
+    bool isDirect(const Plane& plane) const;
+
     /// A plane nobody holds; none when all are held.
     std::optional<std::size_t> acquire();
     /// Brings a plane up to date. False when the server would not, or there is no memory.

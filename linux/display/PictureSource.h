@@ -60,6 +60,11 @@ public:
     virtual bool read(const SharedMemory& memory, std::span<const Strip> strips) = 0;
     /// The picture changed before the last read was over, so that it may show parts of two.
     virtual bool overtaken() const = 0;
+    /// What was read last may show others' pixels, and is not to be used.
+    virtual bool spoilt() const { return false; }
+    /// After a refresh: `last` is the picture that was shown last, in rows of width() pixels with nothing between them.
+    /// What the server has lost of the picture is taken from there.
+    virtual void restore(const SharedMemory& /*last*/) {}
 };
 
 }  // namespace lumacast::x11

@@ -32,6 +32,7 @@ struct CapturedFrame {
     std::uint32_t transformFlags = 0;
     std::chrono::steady_clock::time_point at;
     std::shared_ptr<SharedPlane> plane;  ///< only while kept
+    bool odd = false;                    ///< what the test calls so
 };
 
 inline std::uint32_t colourAt(const SharedPlane& plane, int x, int y) {
@@ -62,6 +63,7 @@ public:
         for (int y = 0; y < plane->height() && frame.oneColour; y += checkEvery)
             for (int x = 0; x < plane->width(); x += checkEvery)
                 frame.oneColour &= sameColour(colourAt(*plane, x, y), frame.colour);
+        if (isOdd) frame.odd = isOdd(*plane);
         {
             const std::lock_guard lock(mutex_);
             if (keepPlanes) frame.plane = plane;
@@ -148,6 +150,7 @@ public:
 
     // Set before the first frame.
     std::function<void(DisplayCaptureSource&)> onFrame;
+    std::function<bool(const SharedPlane&)> isOdd;  ///< asked for every frame
     int checkEvery = 7;
     std::atomic<bool> keepPlanes{false};
 
