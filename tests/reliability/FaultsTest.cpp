@@ -76,7 +76,8 @@ protected:
         if (hit != noted.end() && isKill(injection.fault)) {
             ended = noted.back().time;
             EXPECT_TRUE(waitUntil([&] { return !scenario_->daemonLives(); }, std::chrono::seconds(20)));
-        } else {
+        } else if (hit != noted.end()) {
+            // One that was not reached is still to come: this question's answer could be it.
             EXPECT_FALSE(scenario_->world().status().is_null()) << "the daemon does not answer";
         }
         for (const std::string& wrong : scenario_->judgeAfterFault(heard, ended)) ADD_FAILURE() << wrong;
