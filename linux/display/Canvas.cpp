@@ -77,7 +77,7 @@ bool Canvas::needsRefresh() const {
 void Canvas::refresh() {
     arrangementIsStale_ = false;
     for (CaptureTarget* const target : targets_)
-        if (target->needsRefresh()) target->refresh();
+        if (target->needsRefresh()) target->refresh(), target->restore(nullptr);
     Arrangement next = arrange();
     if (next == arranged_ && readable()) return;
     const bool otherSize = next.box.width != width() || next.box.height != height();

@@ -43,6 +43,7 @@ CaptureTarget::CaptureTarget(X11Connection& connection, xcb_window_t window, Kin
 
 CaptureTarget::~CaptureTarget() {
     xcb_connection_t* const x = connection_.get();
+    if (leavesScreen_) xcb_ungrab_server(x);
     freePixmap();
     xcb_xfixes_destroy_region(x, region_);
     if (!gone_) {
@@ -302,29 +303,35 @@ void CaptureTarget::look(std::int64_t now) {
 // What the server puts into the picture of the window where it is covered is what covers it; then it asks the
 // application to repaint that.
 void CaptureTarget::leaveScreen() {
+    xcb_grab_server(connection_.get());
     xcb_composite_redirect_window(connection_.get(), window_, XCB_COMPOSITE_REDIRECT_AUTOMATIC);
     fromScreen_ = covered_ = false;
-    redirectedNow_ = isRestorable_ = true;
+    redirectedNow_ = leavesScreen_ = true;
 }
 
 // Own pixels, if of a moment ago, are better than waiting for those that the application will paint now.
-void CaptureTarget::restore(const SharedMemory& last) {
-    if (!std::exchange(isRestorable_, false) || !readable() || uncovered_.empty()) return;
+void CaptureTarget::restore(const SharedMemory* last) {
+    if (!std::exchange(leavesScreen_, false)) return;
+    if (last && readable()) {
+        for (const PixelRect& rect : uncovered_.rects()) putBack(*last, intersection(rect, {0, 0, width_, height_}));
+        foreign_ = false;
+        awaitNothing();
+    }
+    xcb_ungrab_server(connection_.get());
+    xcb_flush(connection_.get());
+}
+
+void CaptureTarget::putBack(const SharedMemory& last, const PixelRect& rect) {
+    if (isEmpty(rect)) return;
     xcb_connection_t* const x = connection_.get();
     const xcb_gcontext_t context = xcb_generate_id(x);
     xcb_create_gc(x, context, drawable_, 0, nullptr);
-    for (const PixelRect& rect : uncovered_.rects()) {
-        const PixelRect inside = intersection(rect, {0, 0, width_, height_});
-        if (isEmpty(inside)) continue;
-        xcb_shm_put_image(x, drawable_, context, static_cast<std::uint16_t>(width_), static_cast<std::uint16_t>(height_),
-                          static_cast<std::uint16_t>(inside.x), static_cast<std::uint16_t>(inside.y),
-                          static_cast<std::uint16_t>(inside.width), static_cast<std::uint16_t>(inside.height),
-                          static_cast<std::int16_t>(inside.x + border_), static_cast<std::int16_t>(inside.y + border_),
-                          depth_, XCB_IMAGE_FORMAT_Z_PIXMAP, 0, last.segment(), 0);
-    }
+    xcb_shm_put_image(x, drawable_, context, static_cast<std::uint16_t>(width_), static_cast<std::uint16_t>(height_),
+                      static_cast<std::uint16_t>(rect.x), static_cast<std::uint16_t>(rect.y),
+                      static_cast<std::uint16_t>(rect.width), static_cast<std::uint16_t>(rect.height),
+                      static_cast<std::int16_t>(rect.x + border_), static_cast<std::int16_t>(rect.y + border_), depth_,
+                      XCB_IMAGE_FORMAT_Z_PIXMAP, 0, last.segment(), 0);
     xcb_free_gc(x, context);
-    foreign_ = false;
-    awaitNothing();
 }
 
 bool CaptureTarget::read(const SharedMemory& memory, std::span<const Strip> strips) {

@@ -68,13 +68,13 @@ public:
     bool read(const SharedMemory& memory, std::span<const Strip> strips) override;
     bool overtaken() const override { return damagedBefore(lastRead_); }
     bool spoilt() const override { return fromScreen_ && covered_; }
-    void restore(const SharedMemory& last) override;
+    void restore(const SharedMemory* last) override;
 
 private:
     CaptureTarget(X11Connection& connection, xcb_window_t window, Kind kind, std::uint8_t depth);
     void begin(std::uint16_t width, std::uint16_t height);
-    void redirect();
     void leaveScreen();
+    void putBack(const SharedMemory& last, const PixelRect& rect);
     void nameWindow();
     void measureScreen();
     void freePixmap();
@@ -103,7 +103,7 @@ private:
     bool fromScreen_ = false;     ///< it is not redirected
     bool redirectedNow_ = true;   ///< no picture of the redirected window was named yet
     bool covered_ = false;        ///< since it was read from the screen, in part at least
-    bool isRestorable_ = false;   ///< what covered it came a moment ago
+    bool leavesScreen_ = false;   ///< the server is held for it
     DamageRegion carried_;        ///< fetched, and not asked for yet
     std::int64_t nextLook_ = 0;   ///< 0: the first one is still to be planned
     std::int64_t lookAgainAfter_ = 0;

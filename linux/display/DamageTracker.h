@@ -30,6 +30,8 @@ public:
     /// What differs from the picture that was delivered last; the whole picture before the first.
     const DamageRegion& sinceDelivery() const { return sinceDelivery_; }
 
+    /// Its memory is given back; whatever it is next holds nothing yet.
+    void planeIsGone(std::size_t plane) { stale_[plane].add(whole_); }
     void planeIsCurrent(std::size_t plane) { stale_[plane].clear(); }
     void delivered() { sinceDelivery_.clear(); }
     /// The next picture goes to somebody who has seen none.

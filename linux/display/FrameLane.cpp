@@ -221,7 +221,7 @@ bool FrameLane::lookAtPicture(const Order& order) {
         const bool isShown = lastIsAsRead();
         shown_->refresh();
         drainEvents(true);
-        if (isShown) shown_->restore(last_.picture->plane()->memory());
+        shown_->restore(isShown ? &last_.picture->plane()->memory() : nullptr);
     }
     if (!shown_->readable()) return false;
     const Turn turn = turnOf(order);
@@ -258,6 +258,7 @@ void FrameLane::takePicture(const Order& order) {
     Delivered taken{maker_->picture(*plane, ++pictures_), stamp, order.clock, flags, shown_->id(), shown_->layout()};
     if (!deliver(order, std::move(taken), CaptureControl::Stamp::Fresh)) return;
     maker_->delivered();
+    maker_->tidy(steadyNow());
     pictureWanted_ = false;
 }
 

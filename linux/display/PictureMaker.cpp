@@ -6,12 +6,14 @@
 
 #include <algorithm>
 #include <cstring>
+#include <utility>
 
 namespace lumacast::x11 {
 namespace {
 
 // A request costs about as much as this many rows.
 constexpr std::int32_t kCheapRows = 8;
+constexpr std::int64_t kTidyingInterval = 5'000'000'000;
 
 struct Strips {
     std::array<Strip, DamageRegion::kMaximumRects> strips;
@@ -103,7 +105,19 @@ bool PictureMaker::update(std::size_t index, PictureSource& target) {
     }
     const bool done = isDirect(plane) && target.overlay().pixels.empty() ? updateDirectly(index, target) : updateFromImage(index, target);
     if (done) tracker_.planeIsCurrent(index);
+    needed_[index] = true;
     return done;
+}
+
+void PictureMaker::tidy(std::int64_t now) {
+    if (now < nextTidying_) return;
+    nextTidying_ = now + kTidyingInterval;
+    for (std::size_t i = 0; i < kPlanes; ++i) {
+        const bool idle = !std::exchange(needed_[i], false);
+        if (!idle || !pool_.plane(i) || !pool_.plane(i)->free()) continue;
+        pool_.giveBack(i, connection_);
+        tracker_.planeIsGone(i);
+    }
 }
 
 bool PictureMaker::isDirect(const Plane& plane) const {

@@ -54,6 +54,9 @@ public:
     std::shared_ptr<Picture> picture(std::size_t plane, std::uint64_t number);
     /// A picture was delivered: the next one's damage counts from it.
     void delivered() { tracker_.delivered(); }
+    /// From time to time: gives planes back that nobody has needed for some seconds, as after a moment in which the
+    /// machine was busy. Nanoseconds of the steady clock.
+    void tidy(std::int64_t now);
 
 private:
     bool updateDirectly(std::size_t plane, PictureSource& target);
@@ -70,6 +73,8 @@ private:
     std::uint64_t layout_ = 0;
     Fit fit_;
     std::array<Fit, kPlanes> planeFits_{};  ///< what each plane's borders were cleared for
+    std::array<bool, kPlanes> needed_{};    ///< since the last tidying
+    std::int64_t nextTidying_ = 0;
     std::optional<SharedMemory> image_;     ///< the target's picture, where it doesn't go straight into the plane
     DamageRegion imageStale_;
     PixelRect drawnOver_;               ///< of the image

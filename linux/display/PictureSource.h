@@ -32,7 +32,11 @@ public:
 
     /// The picture must be asked for anew: it has another size, or what it is made of came, went or moved.
     virtual bool needsRefresh() const = 0;
+    /// restore() must follow, once the events that came with the answers were handled: nobody may paint until then.
     virtual void refresh() = 0;
+    /// `last` is the picture that was shown last, in rows of width() pixels with nothing between them: what the server
+    /// has lost of the picture is taken from there. Null where there is none.
+    virtual void restore(const SharedMemory* /*last*/) {}
     /// Whether there is a picture to read now.
     virtual bool readable() const = 0;
     virtual std::int32_t width() const = 0;
@@ -62,9 +66,6 @@ public:
     virtual bool overtaken() const = 0;
     /// What was read last may show others' pixels, and is not to be used.
     virtual bool spoilt() const { return false; }
-    /// After a refresh: `last` is the picture that was shown last, in rows of width() pixels with nothing between them.
-    /// What the server has lost of the picture is taken from there.
-    virtual void restore(const SharedMemory& /*last*/) {}
 };
 
 }  // namespace lumacast::x11

@@ -35,6 +35,11 @@ std::optional<std::size_t> PlanePool::make(X11Connection& connection) {
     return std::nullopt;
 }
 
+void PlanePool::giveBack(std::size_t index, X11Connection& connection) {
+    planes_[index]->memory().detach(connection);
+    planes_[index].reset();
+}
+
 void PlanePool::detach(X11Connection& connection) {
     for (const auto& plane : planes_)
         if (plane) plane->memory().detach(connection);

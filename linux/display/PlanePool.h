@@ -96,6 +96,8 @@ public:
         return best ? best : make(connection);
     }
     const std::shared_ptr<Plane>& plane(std::size_t index) const { return planes_[index]; }
+    /// Gives the memory of a plane back that no picture holds; it is made anew when it is needed.
+    void giveBack(std::size_t index, X11Connection& connection);
     /// The server forgets the planes; pictures keep them. Only on the connection they were made on.
     void detach(X11Connection& connection);
 

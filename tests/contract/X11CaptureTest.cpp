@@ -391,6 +391,37 @@ TEST_F(X11Capture, DropsFramesWhenAllPlanesAreHeldAndGoesOnWhenTheyAreGivenBack)
     ASSERT_TRUE(frames->waitForColour(colour)) << "the newest picture comes, without anything new being drawn";
 }
 
+TEST_F(X11Capture, GivesPlanesBackThatWereNeededOnlyForAMoment) {
+    const auto planes = [] {
+        std::ptrdiff_t count = 0;
+        for (const auto& entry : std::filesystem::directory_iterator("/proc/self/fd")) {
+            std::error_code gone;
+            count += std::filesystem::read_symlink(entry, gone).string().starts_with("/memfd:lumacast-plane");
+        }
+        return count;
+    };
+    TestWindow window(display.name(), {.colour = 1});
+    frames->keepPlanes = true;
+    const auto made = startOn(window, 320, 240);
+    std::uint32_t colour = 1;
+    const auto paintNext = [&] {
+        const std::size_t before = frames->count();
+        window.paint(++colour);
+        return frames->waitFor([&](const Frames& got) { return got.size() > before; });
+    };
+    while (planes() < 12) ASSERT_TRUE(paintNext());
+    frames->keepPlanes = false;
+    frames->clear();
+    const auto limit = std::chrono::steady_clock::now() + kGenerous;
+    while (planes() > 3 && std::chrono::steady_clock::now() < limit) ASSERT_TRUE(paintNext());
+    EXPECT_LE(planes(), 3) << "one that is shown, one that is written, one in the encoder's hands";
+    ASSERT_TRUE(frames->waitForColour(colour));
+    // What is made anew is whole.
+    frames->keepPlanes = true;
+    while (planes() < 12) ASSERT_TRUE(paintNext());
+    for (const CapturedFrame& frame : frames->frames()) EXPECT_TRUE(frame.oneColour);
+}
+
 TEST_F(X11Capture, BringsEveryPlaneUpToDate) {
     TestWindow window(display.name(), {.colour = kRed, .repaints = false});
     const auto made = startOn(window, 320, 240, 1000);
