@@ -1,7 +1,7 @@
 // When a process encodes its first picture: preloaded into the daemon and into ffmpeg, which both call libavcodec, it
 // notes the moments of each video encoder's beginning in the file $LC_ENCODER_STAMPS, one line each: the process, the
-// moment's name, CLOCK_MONOTONIC in nanoseconds. It is linked with nothing, as other programs of those processes inherit
-// it.
+// moment's name, CLOCK_MONOTONIC in nanoseconds. It is linked with nothing, as other programs of those processes
+// inherit it.
 //
 //   loaded   the process has its libraries          frame    the encoder is given its first picture
 //   opening  the encoder is about to be opened      packet   its first coded picture is there
@@ -43,7 +43,9 @@ Function* theirs(Function*, const char* name) {
     return found;
 }
 
-[[gnu::constructor]] void loaded() { note("loaded"); }
+[[gnu::constructor]] void loaded() {
+    note("loaded");
+}
 
 /// Encoders whose first picture, or first coded one, is still to come.
 std::atomic<const AVCodecContext*> withoutFrame{nullptr}, withoutPacket{nullptr};
