@@ -1,5 +1,6 @@
 #pragma once
 #include <cerrno>
+#include <functional>
 #include <mutex>
 #include <string>
 #include <utility>
@@ -13,7 +14,7 @@
 namespace lumacast {
 
 /// Movies in a list. A failing call ("PhotoLibrary.addVideo") is a full disk; a movie that is not in the FakeFileSystem
-/// is ENOENT. It can act for every user but kNoUser. Thread-safe; never waits.
+/// is ENOENT. It can act for every user but kNoUser. Thread-safe; waits only where the test makes it.
 class FakePhotoLibrary final : public PhotoLibrary {
 public:
     struct Asset {
@@ -31,12 +32,17 @@ public:
         if (user == kNoUser) return fakeSystemError(EPERM);
         if (!files_.isThere(movie.path())) return fakeSystemError(ENOENT);
         if (files_.isFolder(movie.path())) return fakeSystemError(EISDIR);
+        auto content = files_.movie(movie.path());
+        if (whenCopying_) whenCopying_(movie);
         const std::lock_guard lock(mutex_);
         if (isReadOnly_) return fakeSystemError(EACCES);
         const URL file("file:///library/" + std::to_string(assets_.size() + 1) + ".mp4");
-        assets_.push_back({movie, file, user, files_.movie(movie.path())});
+        assets_.push_back({movie, file, user, std::move(content)});
         return file;
     }
+    /// Called with each movie that was found and is being copied, on the lane that adds it: a copy that takes as long as
+    /// that does. Set before the lanes run.
+    void setWhenCopying(std::function<void(const URL&)> copying) { whenCopying_ = std::move(copying); }
     /// From now on nothing can be written into it.
     void takeRightsAway() {
         const std::lock_guard lock(mutex_);
@@ -50,6 +56,7 @@ public:
 private:
     FakeFileSystem& files_;
     FaultPlan& faults_;
+    std::function<void(const URL&)> whenCopying_;
     mutable std::mutex mutex_;
     std::vector<Asset> assets_;
     bool isReadOnly_ = false;

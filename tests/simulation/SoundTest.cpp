@@ -57,6 +57,10 @@ public:
         fakes().audioInputQueues.hearAllTheTime(kBuffer);
         voice_ = daemon_.world.scheduler.timer(daemon_.world.scheduler.serialQueue("somebody who speaks"),
                                                milliseconds(kBuffer), [this] { speak(); });
+        // A copy into the library takes its time, and the application records on.
+        fakes().photoLibrary.setWhenCopying([this, library = daemon_.world.scheduler.fork()](const URL&) mutable {
+            (void)daemon_.world.scheduler.semaphore(0)->waitFor(milliseconds(library.below(1500)));
+        });
         faulty_ = random_.below(3) == 0;
         if (faulty_) fakes().faults.failAtRandom(random_.next(), 1, 80);
     }
