@@ -307,6 +307,7 @@ private:
         std::uint64_t generation = 0;
         PathClaim claim;
         bool isTold = true;  ///< its client is
+        std::optional<ProcessID> client;  ///< when it ended; none for one without a connection
     };
     PathClaim claimOf(const LCRecordingSession& session) const;
     void clearSystemRecordingUI(const LCRecordingSession& session);

@@ -17,6 +17,13 @@ bool isSize(Size size) {
     return std::isfinite(size.width) && std::isfinite(size.height) && size.width >= 1 && size.height >= 1;
 }
 
+/// Whose connection the session has now.
+std::optional<ProcessID> clientOf(const LCRecordingSession& session) {
+    const auto proxy = session.clientProxy();
+    const auto connection = proxy ? proxy->connection() : nullptr;
+    return connection ? std::optional(connection->processIdentifier()) : std::nullopt;
+}
+
 }  // namespace
 
 bool LCRecordingManager::checkContextIDsMatch(const std::vector<ContextID>& contextIDs) {
@@ -178,7 +185,8 @@ void LCRecordingManager::stopCurrentRecordingSessionWithHandler(const WaitingSta
         stopRecordingSession(
             session, 0, 0,
             [self = shared_from_this(), end, session,
-             ended = EndedRecording{session->managerRecord.startGeneration, claimOf(*session), isTold}](
+             ended = EndedRecording{session->managerRecord.startGeneration, claimOf(*session), isTold,
+                                    clientOf(*session)}](
                 const std::optional<URL>& url, const std::optional<Error>&) { ((*self).*end)(session, ended, url); });
     }
     // Deliberately without waiting for the stops to complete.
@@ -187,9 +195,12 @@ void LCRecordingManager::stopCurrentRecordingSessionWithHandler(const WaitingSta
 
 void LCRecordingManager::discardInterruptedRecording(const std::shared_ptr<LCRecordingSession>& session,
                                                      const EndedRecording& ended, const std::optional<URL>& movieURL) {
-    auto tellClient = [self = shared_from_this(), session, isTold = ended.isTold] {
+    auto tellClient = [self = shared_from_this(), session, isTold = ended.isTold, client = ended.client] {
         if (!isTold) return;
-        self->onRequestLane([self, session] {
+        self->onRequestLane([self, session, client] {
+            // Another process of the application may have connected since: it has not lost anything.
+            const auto now = clientOf(*session);
+            if (now && now != client) return;
             if (const auto proxy = session->clientProxy())
                 proxy->stopRecordingWithError(
                     self->services_.errors._lcUserErrorForCode(RecordingErrorCode::Interrupted), std::nullopt);

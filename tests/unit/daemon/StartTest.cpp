@@ -248,6 +248,35 @@ TEST_F(Start, ASecondStartOfTheSameApplicationInterruptsItsOwnRecording) {
     EXPECT_EQ(fakes_.keepAlive.open(), 0);
 }
 
+TEST_F(Start, AProcessThatTakesTheClientsPlaceBeforeItIsToldHasLostNothing) {
+    for (const bool isSameProcess : {false, true}) {
+        SCOPED_TRACE(isSameProcess);
+        const auto client = makeRecording();
+        advance(seconds(1));
+        const auto first = fakes_.containerWriters.lastRecording();
+        first->holdFinish(true);
+        client->start();
+        settle();
+        ASSERT_TRUE(client->told.empty()) << "the older movie is not finished yet";
+        std::unique_ptr<TestClient> next;
+        if (isSameProcess) {
+            client->connect();
+            settle();
+        } else {
+            next = makeConnected("Player", 501);
+        }
+        first->holdFinish(false);
+        settle();
+        EXPECT_EQ(client->toldOfStop(-5806), isSameProcess ? 1 : 0);
+        if (next) {
+            EXPECT_TRUE(next->told.empty());
+            next->die();
+        }
+        client->die();
+        settle();
+    }
+}
+
 TEST_F(Start, ASizeThatNoPictureCanHaveIsRefusedAndSpoilsNothing) {
     const auto client = makeConnected();
     constexpr double kNone = std::numeric_limits<double>::quiet_NaN();
