@@ -25,6 +25,7 @@ struct Outcome {
     int clipsKept = 0;
     int pauses = 0;
     int deaths = 0;
+    int replaced = 0;
     int failedStarts = 0;
 };
 
@@ -58,9 +59,11 @@ public:
 private:
     FakePlatform& fakes() { return daemon_.world.fakes; }
 
+    ProcessID nextProcess() { return ProcessID{static_cast<std::int32_t>(500 + ++incarnation_)}; }
+
     void act() {
         if (!application_.isAlive()) {
-            application_.startAgain(ProcessID{static_cast<std::int32_t>(500 + ++incarnation_)});
+            application_.startAgain(nextProcess());
             application_.connect();
             return;
         }
@@ -75,11 +78,16 @@ private:
             case 9: application_.ask(DaemonMessage::DiscardRecording); break;
             case 10: application_.ask(DaemonMessage::SynchronousGetCurrentState); break;
             default:
-                if (random_.below(3) == 0) {
-                    application_.die();
-                    ++outcome_.deaths;
-                } else {
-                    application_.connect();  // again, over the old connection
+                switch (random_.below(4)) {
+                    case 0:
+                        application_.die();
+                        ++outcome_.deaths;
+                        break;
+                    case 1:
+                        application_.replaceProcess(nextProcess());
+                        ++outcome_.replaced;
+                        break;
+                    default: application_.connect();  // again, over the old connection
                 }
         }
     }
@@ -236,6 +244,7 @@ TEST(OneApplication, LeavesNothingBehindInAnyOfManySeeds) {
         total.clipsKept += outcome.clipsKept;
         total.pauses += outcome.pauses;
         total.deaths += outcome.deaths;
+        total.replaced += outcome.replaced;
         total.failedStarts += outcome.failedStarts;
         if (HasFailure()) {
             for (const std::string& line : outcome.log) ADD_FAILURE() << line;
@@ -248,6 +257,7 @@ TEST(OneApplication, LeavesNothingBehindInAnyOfManySeeds) {
         EXPECT_GT(total.clipsKept, 5);
         EXPECT_GT(total.pauses, 100);
         EXPECT_GT(total.deaths, 20);
+        EXPECT_GT(total.replaced, 20);
         EXPECT_GT(total.failedStarts, 5);
     }
 }

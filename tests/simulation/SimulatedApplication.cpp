@@ -34,6 +34,14 @@ void SimulatedApplication::startAgain(ProcessID pid) {
     machine_.renderServer.addLayer(window, pid);
 }
 
+void SimulatedApplication::replaceProcess(ProcessID pid) {
+    const auto former = std::move(process_);
+    const auto itsConnection = std::move(connection_);
+    startAgain(pid);
+    connect();
+    if (former) machine_.endProcess(*former);
+}
+
 void SimulatedApplication::connect() {
     firstOfConnection_ = asked_.size();
     inbox_ = std::make_shared<Inbox>(told_, firstOfProcess_);

@@ -47,6 +47,8 @@ public:
     ProcessID pid() const { return pid_; }
     /// A new process of the same application, with another number and the same window.
     void startAgain(ProcessID pid);
+    /// The same while its process still ends: the new one has connected when the older one is gone.
+    void replaceProcess(ProcessID pid);
 
     std::shared_ptr<Asked> ask(DaemonMessage message, Array arguments = {});
     void tell(DaemonMessage message, Array arguments = {});
