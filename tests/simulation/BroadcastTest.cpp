@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <map>
 #include <set>
 
@@ -22,7 +23,7 @@ using std::chrono::seconds;
 
 /// What the seeds did all together: a run that goes nowhere proves nothing.
 struct Tally {
-    int begun = 0, clips = 0, frames = 0, crashes = 0, finished = 0;
+    int begun = 0, clips = 0, frames = 0, crashes = 0, finished = 0, forsaken = 0;
     std::map<std::int64_t, int> refused, told;
 };
 
@@ -93,7 +94,7 @@ private:
             return;
         }
         const std::string point = oneIn(2) ? "org.example.Live.x" : oneIn(6) ? "org.example.Missing.x" : "org.example.Clips.x";
-        switch (random_.below(12)) {
+        switch (random_.below(13)) {
             case 0:
             case 1:
             case 2:
@@ -110,7 +111,20 @@ private:
             case 9: application.ask(DaemonMessage::StopRecording); break;
             case 10: application.tell(DaemonMessage::PauseRecording); break;
             case 11: application.ask(DaemonMessage::GetSystemBroadcastExtensionInfo); break;
+            case 12: connectAnew(application); break;
         }
+    }
+
+    /// Over the old connection, whose starts nobody waits for any more.
+    void connectAnew(SimulatedApplication& application) {
+        tally_.forsaken += waitingStarts() > 0 ? 1 : 0;
+        application.connect();
+    }
+    std::ptrdiff_t waitingStarts() const {
+        const auto blocked = daemon_.world.scheduler.blockedTasks();
+        return std::count_if(blocked.begin(), blocked.end(), [](const SimBlockedTask& task) {
+            return task.lane == "com.orvane.lumacastd.BroadcastStart";
+        });
     }
 
     void disturb() {
@@ -166,11 +180,25 @@ private:
         }
     }
 
+    /// Whoever waits for an extension is a start of a connection that is still there.
+    void expectNoForsakenWaits() {
+        int open = 0;
+        for (const auto& application : applications_) {
+            const auto& all = application->asked();
+            bool isOpen = false;
+            for (std::size_t i = application->firstOfConnection(); i < all.size(); ++i)
+                if (all[i]->message == DaemonMessage::StartRecording) isOpen |= all[i]->answers == 0;
+            open += isOpen && application->isAlive() ? 1 : 0;
+        }
+        EXPECT_LE(waitingStarts(), open) << "a start waits that nobody is there for any more";
+    }
+
     void end() {
         fakes().faults.clear();
         completeLate();
         daemon_.world.scheduler.advance(seconds(1));
         daemon_.world.scheduler.advance(seconds(30));  // extensions that hang are given up
+        expectNoForsakenWaits();
         for (const auto& application : applications_) {
             if (isSound_) expectStartsAnswered(*application);
             for (const auto& asked : application->asked()) {
@@ -317,6 +345,7 @@ TEST(SimulatedBroadcasts, LetExtensionsDoWhatTheyLikeInAnyOfManySeeds) {
     EXPECT_GT(tally.frames, 500);
     EXPECT_GT(tally.crashes, 50);
     EXPECT_GT(tally.finished, 20);
+    EXPECT_GT(tally.forsaken, 5);
     EXPECT_GT(tally.refused[-5808], 50);
     EXPECT_GT(tally.refused[-5803], 5);
     EXPECT_GT(tally.told[-5808], 10);
