@@ -103,6 +103,7 @@ private:
     void checkTold(const Player& player);
     void checkForbidden(Player& player);
     void checkStops(const Player& player);
+    /// Whoever is captured shows no window of another.
     void checkWindows();
     /// When nothing is under way any more.
     void checkAtRest();

@@ -26,6 +26,7 @@ void Contest::checkAlways() {
               1)
         << "two applications are captured at a time";
     expectMoviesInTheirFiles(daemon_);
+    checkWindows();
     EXPECT_LE(fakes().userAlerts.standing(), 1u) << "the user is asked two things at a time";
     for (Player& player : players_) {
         checkForbidden(player);
@@ -94,13 +95,15 @@ void Contest::checkStops(const Player& player) {
 
 void Contest::checkWindows() {
     if (fakes().displayCloneControl.mode() != DisplayCloneControl::kCloneContexts) return;
-    for (const DescribedSession& session : describedSessions(daemon_)) {
-        if (!session.isRecording) continue;
+    for (const Player& player : players_) {
+        const auto session = daemon_.process->manager().registeredSession(player.application.identifier);
+        const auto source = session ? session->screenCaptureController() : nullptr;
+        const auto* fake = dynamic_cast<const FakeDisplayCaptureSource*>(source.get());
+        if (!fake || !fake->isRunning()) continue;
         for (const ContextID window : fakes().displayCloneControl.contexts())
-            for (const Player& player : players_)
-                EXPECT_TRUE(player.application.window != window ||
-                            player.application.identifier.text() == session.identifier)
-                    << session.identifier << " records a window of " << player.application.name;
+            for (const Player& other : players_)
+                EXPECT_TRUE(&other == &player || other.application.window != window)
+                    << player.application.name << " records a window of " << other.application.name;
     }
 }
 
