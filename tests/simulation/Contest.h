@@ -19,7 +19,7 @@ namespace lumacast {
 struct ContestTally {
     int movies = 0, clips = 0, purges = 0, deaths = 0;
     int granted = 0, refusedByUser = 0, leftStanding = 0, systemRecordings = 0, inLibrary = 0, interrupted = 0,
-        handedOver = 0;
+        handedOver = 0, interruptionsChecked = 0;
     std::map<std::int64_t, int> refused;  ///< by the error of the start's answer
     std::map<std::int64_t, int> told;     ///< by the error of the message
 };
@@ -116,6 +116,11 @@ private:
     /// The user is asked again after the application was in the background for long, and not after a short while.
     void checkExemption(Player& player);
     bool isAskedAbout(Player& player);
+    /// A recording that ends because the user, asked for long, lets another begin: its application is told of the movie
+    /// then, and once more when it becomes active while it records again.
+    void checkInterruption(Player& player, Player& other);
+    /// The user lets the other one begin while the player records.
+    void interrupt(Player& player, Player& other);
 
     static constexpr char kPrivileged[] = "Delta";
     static constexpr std::uint64_t kPlenty = 10'000'000'000;

@@ -183,6 +183,10 @@ void Contest::end() {
     if (!faulty_) {
         for (Player& player : players_) recordOnceMore(player);
         if (random_.below(2) == 0) checkExemption(players_[random_.below(players_.size())]);
+        if (random_.below(4) == 0) {
+            Player& player = players_[random_.below(players_.size())];
+            checkInterruption(player, players_[random_.below(players_.size())]);
+        }
     }
     endSystemRecordings();
     for (Player& player : players_) {
@@ -301,6 +305,56 @@ void Contest::checkExemption(Player& player) {
     application.tell(DaemonMessage::ClientDidBecomeActive);
     EXPECT_TRUE(isAskedAbout(player)) << application.name << " was in the background for long";
     fakes().preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
+}
+
+void Contest::interrupt(Player& player, Player& other) {
+    const auto pass = [&] { daemon_.world.scheduler.advance(milliseconds(300)); };
+    fakes().userAlerts.setUser({});
+    fakes().preferences.set(kPreferenceDomain, "LCSuppressAlert", false);
+    other.application.tell(DaemonMessage::ClientDidResignActive);
+    pass();
+    fakes().clock.setWallTime(Date{fakes().clock.now().secondsSince1970 + 500});
+    other.application.tell(DaemonMessage::ClientDidBecomeActive);
+    other.application.start();
+    pass();
+    EXPECT_EQ(fakes().userAlerts.standingAbout(), other.application.identifier);
+    fakes().preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
+    player.application.start();
+    pass();
+    EXPECT_TRUE(isRecording(player)) << "a question about another is in its way";
+    fakes().userAlerts.answer(UserAlert::Response::DefaultButton);
+    pass();
+    EXPECT_TRUE(isRecording(other) && !isRecording(player)) << "the user has let the other one begin";
+    fakes().userAlerts.setUser([](const AlertContent&) { return UserAlert::Response::DefaultButton; });
+}
+
+void Contest::checkInterruption(Player& player, Player& other) {
+    SimulatedApplication& application = player.application;
+    for (const Player* each : {&player, &other})
+        if (&player == &other || !each->application.isAlive() || each->deadSession.lock()) return;
+    application.connect();
+    other.application.connect();
+    std::size_t told = application.told().size();
+    interrupt(player, other);
+    ASSERT_EQ(application.told().size(), ++told);
+    const URL* movie = application.told().back().arguments[1].as<URL>();
+    ASSERT_TRUE(movie) << application.name << " is not told of its movie";
+    const std::string path = movie->path();
+    application.start();
+    for (const bool isFirst : {true, false, false}) {
+        daemon_.world.scheduler.advance(milliseconds(300));
+        EXPECT_TRUE(isRecording(player));
+        application.tell(DaemonMessage::ClientDidBecomeActive);
+        daemon_.world.scheduler.advance(milliseconds(300));
+        ASSERT_EQ(application.told().size(), told += isFirst ? 1 : 0) << "told again of an interruption";
+        const auto& arguments = application.told().back().arguments;
+        EXPECT_TRUE(arguments[0].asError() && arguments[0].asError()->code() == -5806);
+        EXPECT_TRUE(arguments[1].as<URL>() && arguments[1].as<URL>()->path() == path);
+        application.tell(DaemonMessage::ClientDidResignActive);
+    }
+    application.ask(DaemonMessage::StopRecording);
+    daemon_.world.scheduler.advance(milliseconds(300));
+    ++tally_.interruptionsChecked;
 }
 
 }  // namespace lumacast
