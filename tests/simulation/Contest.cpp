@@ -208,8 +208,29 @@ void Contest::resetMediaServices(FakeDisplayCaptureSource& source) {
     source.mediaServicesWereReset();
 }
 
+void Contest::purge(std::int32_t urgency) {
+    fakes().storagePurge.requestPurge(urgency, [this, urgency](const std::optional<PurgeRecord>&) {
+        // Whatever was handed out until now may be gone.
+        if (urgency == 3)
+            for (Player& player : players_) player.lastStop.reset();
+    });
+    ++tally_.purges;
+}
+
+void Contest::recordInThePurge() {
+    purge(3);
+    goOnUpTo(8);
+    Player& player = players_[random_.below(players_.size())];
+    if (!player.application.isAlive()) return;
+    player.lastStop.reset();
+    player.lastDiscard.reset();
+    player.starts.push_back(player.application.start());
+    noteForbidden(player, nullptr);
+}
+
 void Contest::disturb() {
-    switch (random_.below(9)) {
+    switch (random_.below(10)) {
+        case 9: recordInThePurge(); break;
         case 8: handWindowOver(); break;
         case 6: {
             // Late answers, and alerts whose program dies.
@@ -224,16 +245,7 @@ void Contest::disturb() {
             fakes().appStateMonitor.update(what == 0 ? 1 : what == 1 ? 8 : 4, what == 1, other.application.pid());
             break;
         }
-        case 0: {
-            const std::int32_t urgency = 1 + static_cast<std::int32_t>(random_.below(3));
-            fakes().storagePurge.requestPurge(urgency, [this, urgency](const std::optional<PurgeRecord>&) {
-                // Whatever was handed out until now may be gone.
-                if (urgency == 3)
-                    for (Player& player : players_) player.lastStop.reset();
-            });
-            ++tally_.purges;
-            break;
-        }
+        case 0: purge(1 + static_cast<std::int32_t>(random_.below(3))); break;
         case 1: fakes().storagePurge.passDay(); break;
         case 2:
             setForeground(players_[random_.below(players_.size())], random_.below(2) == 0 ? 8 : 4);
@@ -257,9 +269,13 @@ void Contest::disturb() {
     }
 }
 
-void Contest::goOn() {
-    for (std::uint64_t i = random_.below(60); i > 0; --i)
+void Contest::goOnUpTo(std::uint64_t steps) {
+    for (std::uint64_t i = random_.below(steps); i > 0; --i)
         if (!daemon_.world.scheduler.step()) break;
+}
+
+void Contest::goOn() {
+    goOnUpTo(60);
     if (random_.below(2) == 0) daemon_.world.scheduler.advance(milliseconds(random_.below(1500)));
 }
 

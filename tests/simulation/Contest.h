@@ -19,7 +19,7 @@ namespace lumacast {
 struct ContestTally {
     int movies = 0, clips = 0, purges = 0, deaths = 0;
     int granted = 0, refusedByUser = 0, leftStanding = 0, systemRecordings = 0, inLibrary = 0, interrupted = 0,
-        handedOver = 0, interruptionsChecked = 0;
+        handedOver = 0, interruptionsChecked = 0, purgedAway = 0, begunInThePurge = 0;
     std::map<std::int64_t, int> refused;  ///< by the error of the start's answer
     std::map<std::int64_t, int> told;     ///< by the error of the message
 };
@@ -86,12 +86,17 @@ private:
     void noteForbidden(Player& player, const char* why);
     /// The application whose frames a source delivers has a session that is given none any more.
     void resetMediaServices(FakeDisplayCaptureSource& source);
+    void purge(std::int32_t urgency);
+    /// The storage is cleared, and while that is under way an application begins to record.
+    void recordInThePurge();
     /// The device does something.
     void disturb();
     void setForeground(Player& player, std::uint32_t state);
     void setFreeSize(std::uint64_t bytes);
     /// While the user is asked about an application, its window becomes another one's. Then the user agrees.
     void handWindowOver();
+    /// Fewer steps than that.
+    void goOnUpTo(std::uint64_t steps);
     /// Lets anything from nothing to seconds happen.
     void goOn();
 
@@ -111,7 +116,8 @@ private:
     /// A recording of the whole display outlives its client. Its last session becomes an application's again.
     void endSystemRecordings();
     void checkFiles();
-    /// Whatever happened before, the application can record, alone, and that movie is whole.
+    /// Whatever happened before, the application can record, alone, and that movie is whole; unless the storage is
+    /// cleared just then, and it is told that this has ended its recording.
     void recordOnceMore(Player& player);
     /// The user is asked again after the application was in the background for long, and not after a short while.
     void checkExemption(Player& player);

@@ -256,9 +256,22 @@ void Contest::recordOnceMore(Player& player) {
             [&] { session = daemon_.process->manager().registeredSession(application.identifier); });
         if (session == dead) return;  // until the application itself goes
     }
+    const std::size_t told = application.told().size();
+    const bool isPurged = random_.below(3) == 0;
+    if (isPurged) {
+        purge(3);
+        goOnUpTo(8);
+    }
     const auto start = application.start();
     daemon_.world.scheduler.advance(seconds(2));
     ASSERT_EQ(start->answers, 1);
+    if (isPurged && application.told().size() > told) {
+        const Error* error = application.told().back().arguments[0].asError();
+        ASSERT_TRUE(error && error->code() == -5805) << describe(application.told().back().arguments[0]);
+        ++tally_.purgedAway;
+        return;
+    }
+    if (isPurged) ++tally_.begunInThePurge;
     ASSERT_TRUE(start->values[0].isNull()) << describe(start->values[0]);
     const auto stop = application.ask(DaemonMessage::StopRecording);
     daemon_.world.scheduler.advance(seconds(1));

@@ -41,6 +41,8 @@ TEST(SeveralApplications, LeaveNothingBehindInAnyOfManySeeds) {
     EXPECT_GT(tally.inLibrary, 50);
     EXPECT_GT(tally.interrupted, 0);
     EXPECT_GT(tally.interruptionsChecked, 50);
+    EXPECT_GT(tally.purgedAway, 50);
+    EXPECT_GT(tally.begunInThePurge, 50);
     for (const std::int64_t code : {-5801, -5803, -5805, -5808, -5810}) EXPECT_GT(tally.refused[code], 3) << code;
     for (const std::int64_t code : {-5805, -5806, -5816, -5817}) EXPECT_GT(tally.told[code], 3) << code;
 }
