@@ -31,7 +31,8 @@ public:
 
 /// What the seeds did all together: a run that goes nowhere proves nothing.
 struct Tally {
-    int heard = 0, retargeted = 0, voices = 0, muted = 0, saved = 0, notSaved = 0, interruptions = 0, deaths = 0;
+    int heard = 0, retargeted = 0, voices = 0, muted = 0, saved = 0, notSaved = 0, interruptions = 0, deaths = 0,
+        recordedWhileSaving = 0;
     int othersHeard = 0;  ///< buffers of another application after its number was asked for
 };
 
@@ -221,6 +222,7 @@ private:
         judgeTrack(movie->tracks[2], {kVoice, kSilence}, false);
         EXPECT_NEAR(soundOf(movie->tracks[2], kVoice), 2.0, 0.25) << "its microphone was on for so long";
         EXPECT_NEAR(soundOf(movie->tracks[2], kSilence), 1.0, 0.25) << "and then muted";
+        if (random_.below(3) == 0) return recordWhileSaving(application, *url);
         const std::size_t before = fakes().photoLibrary.assets().size();
         const auto saved = application.ask(DaemonMessage::SaveVideoToCameraRoll, {*url});
         daemon_.world.scheduler.advance(seconds(2));
@@ -231,6 +233,26 @@ private:
         EXPECT_EQ(asset.content->tracks.size(), 2u) << "one of the picture, one of all the sound";
         EXPECT_NEAR(asset.content->duration().seconds(), 3.0, 0.15);
         EXPECT_FALSE(fakes().fileSystem.exists(url->path()));
+    }
+
+    /// The next recording has the name of the movie that is being saved, and its movie is whole.
+    void recordWhileSaving(SimulatedApplication& application, const URL& movie) {
+        const auto saved = application.ask(DaemonMessage::SaveVideoToCameraRoll, {movie});
+        for (std::uint64_t i = random_.below(60); i > 0; --i)
+            if (!daemon_.world.scheduler.step()) break;
+        const auto start = application.start();
+        daemon_.world.scheduler.advance(seconds(2));
+        ASSERT_EQ(start->answers, 1);
+        ASSERT_EQ(saved->answers, 1);
+        ++tally_.recordedWhileSaving;
+        const auto stop = application.ask(DaemonMessage::StopRecording);
+        daemon_.world.scheduler.advance(seconds(1));
+        ASSERT_EQ(stop->answers, 1);
+        const URL* url = stop->values[0].as<URL>();
+        const auto next = url ? fakes().fileSystem.movie(url->path()) : nullptr;
+        ASSERT_TRUE(next);
+        EXPECT_TRUE(next->finished);
+        EXPECT_NEAR(next->duration().seconds(), 2.0, 0.15);
     }
 
     /// Seconds of a byte in a track.
@@ -352,6 +374,7 @@ TEST(Sound, IsTheApplicationsOwnInAnyOfManySeeds) {
     EXPECT_GT(tally.saved, 50);
     EXPECT_GT(tally.notSaved, 50);
     EXPECT_GT(tally.interruptions, 50);
+    EXPECT_GT(tally.recordedWhileSaving, 50);
     EXPECT_GT(tally.deaths, 50);
 }
 
