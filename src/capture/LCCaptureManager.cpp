@@ -124,6 +124,8 @@ void LCCaptureManager::stopMicrophoneCapture() {
 void LCCaptureManager::stopAllCapture() {
     stopCaptureSession();
     stopMicrophoneCapture();
+    // A microphone whose start was still under way has begun a session since.
+    if (sessionInProgress_) stopCaptureSession();
     stopAppAudioCapture();
     cameraOutputHandler_.set(nullptr);
     microphoneOutputHandler_.set(nullptr);

@@ -61,6 +61,7 @@ inline void expectStillness(SimulatedDaemon& daemon, bool soundMayFail) {
     EXPECT_FALSE(fakes.appStateMonitor.hasHandler()) << "the foreground is watched, and nobody records";
     if (const auto microphone = fakes.deviceCapture.lastSession()) {
         EXPECT_EQ(microphone->inputCount(), 0u) << "the microphone is used, and nobody records";
+        EXPECT_FALSE(microphone->isRunning()) << "the microphone's session runs, and nobody records";
     }
     if (soundMayFail) return;
     for (const auto& tap : fakes.audioInputQueues.queues())

@@ -53,6 +53,17 @@ TEST_F(Microphone, AStartMakesASessionAndTellsOnceThatItRuns) {
     EXPECT_EQ(didStart_, 1);
 }
 
+TEST_F(Microphone, AStopEndsTheSessionOfAStartThatIsStillUnderWay) {
+    manager_->startMicrophoneCaptureWithOutput([this](const SampleRef& s) { samples_.push_back(s); },
+                                               [this] { ++didStart_; });
+    ASSERT_FALSE(session()) << "it has not got so far yet";
+    manager_->stopAllCapture();
+    settle();
+    EXPECT_FALSE(manager_->isRecordingMicrophone());
+    EXPECT_FALSE(manager_->sessionInProgress());
+    EXPECT_FALSE(session() && session()->isRunning());
+}
+
 TEST_F(Microphone, ASecondStartKeepsTheFirstHandlers) {
     startMicrophone();
     int others = 0;
