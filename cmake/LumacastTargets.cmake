@@ -49,12 +49,19 @@ function(lc_executable name)
   set_target_properties(${name} PROPERTIES RUNTIME_OUTPUT_DIRECTORY ${PROJECT_BINARY_DIR}/bin)
 endfunction()
 
+# Most of what a test spends is its compiling.
+add_library(lc_test_options INTERFACE)
+target_compile_options(lc_test_options INTERFACE $<$<CONFIG:Release>:-O1>)
+
 # lc_test(NAME DIR DEPS...): one GoogleTest binary of all .cpp files below one folder.
 function(lc_test name dir)
   file(GLOB_RECURSE sources CONFIGURE_DEPENDS ${dir}/*.cpp)
   if(sources)
     add_executable(${name} ${sources})
     target_link_libraries(${name} PRIVATE ${ARGN} GTest::gtest GTest::gmock GTest::gtest_main lc_options)
+    if(NOT name STREQUAL simulation_tests)  # which runs for as long as one wants
+      target_link_libraries(${name} PRIVATE lc_test_options)
+    endif()
     target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR}/src ${PROJECT_SOURCE_DIR})
     target_compile_definitions(${name} PRIVATE LC_SOURCE_DIR="${PROJECT_SOURCE_DIR}" LC_BINARY_DIR="${PROJECT_BINARY_DIR}")
   endif()
