@@ -2,7 +2,6 @@
 
 import csv
 import json
-import os
 import pathlib
 import shutil
 import threading
@@ -38,13 +37,8 @@ class Sampler(threading.Thread):
                     return
 
     def sample(self):
-        proc = pathlib.Path(f"/proc/{self.process.pid}")
         movies = sum(path.stat().st_size for path in self.state.rglob("*.mp4"))
-        memory = {line.split(":")[0]: int(line.split()[1]) * 1024
-                  for line in (proc / "smaps_rollup").read_text().splitlines()[1:]}
-        # Of programs and libraries, which are files, others may map parts too: its share changes as they come and go.
-        return [f"{time.monotonic() - self.begin:.1f}", memory["Pss"], memory["Pss_Anon"] + memory["Pss_Shmem"],
-                len(os.listdir(proc / "fd")), len(os.listdir(proc / "task")), movies, meters.load()]
+        return [f"{time.monotonic() - self.begin:.1f}", *meters.holdings(self.process.pid).values(), movies, meters.load()]
 
 
 def asked(on, command):

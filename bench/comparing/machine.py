@@ -27,14 +27,17 @@ def wait_for(what, condition):
 
 
 class Machine:
-    def __init__(self, binaries, size, kind="moving"):
-        self.binaries, self.size = pathlib.Path(binaries).resolve(), size
+    """`options` are more of examples/self_recorder's; {folder} in them is the machine's folder."""
+
+    def __init__(self, binaries, size, kind="moving", fps=60, options=()):
+        self.binaries, self.size, self.fps = pathlib.Path(binaries).resolve(), size, fps
+        self.options = [*MOTION[kind], *options]
         self.folder = pathlib.Path(tempfile.mkdtemp(prefix="lumacast-bench-"))
         self.children = []
         try:
             self._make_folders()
             self._start_display()
-            self._start_application(kind)
+            self.start_application()
         except BaseException:
             self.close()
             raise
@@ -50,16 +53,35 @@ class Machine:
             end(child)
         shutil.rmtree(self.folder, ignore_errors=True)
 
-    def start(self, command, log, **options):
-        with open(self.folder / log, "wb") as errors:
+    def start(self, command, log, variables=None, **options):
+        """`variables` are this process's own. The log goes on where one of that name is."""
+        with open(self.folder / log, "ab") as errors:
             options.setdefault("stdout", errors)
             options.setdefault("stdin", subprocess.DEVNULL)
-            child = subprocess.Popen(command, env=self.environment, stderr=errors, **options)
+            child = subprocess.Popen([str(word) for word in command], env=self.environment | (variables or {}),
+                                     stderr=errors, **options)
         self.children.append(child)
         return child
 
+    def install(self, identifier, name, program):
+        """Makes a program an application."""
+        (self.folder / f"data/applications/{identifier}.desktop").write_text(
+            f"[Desktop Entry]\nType=Application\nName={name}\nExec={program}\n")
+
     def log(self, name):
         return (self.folder / name).read_text(errors="replace")
+
+    def install_copies(self, program, prefix, count):
+        """Makes one program so many applications, and answers where each is. To be done before the daemon starts: it looks
+        again only now and then."""
+        folder = self.folder / "programs" / prefix
+        folder.mkdir(parents=True)
+        shutil.copy(program, folder / "program")
+        copies = [folder / f"{prefix}{number}" for number in range(count)]
+        for copy in copies:
+            os.link(folder / "program", copy)
+            self.install(f"org.lumacast.{copy.name}", copy.name, copy)
+        return copies
 
     def _make_folders(self):
         self.environment = {"PATH": os.environ.get("PATH", ""), "HOME": str(self.folder), "LANG": "C",
@@ -72,25 +94,31 @@ class Machine:
         (self.folder / "config/lumacast/com.orvane.lumacastd.conf").write_text("LCSuppressAlert=true\n")
         shutil.copytree(ROOT / "resources/Lumacast.bundle", self.folder / "data/lumacast/Lumacast.bundle")
         (self.folder / "data/applications").mkdir()
-        (self.folder / "data/applications/org.lumacast.SelfRecorder.desktop").write_text(
-            f"[Desktop Entry]\nType=Application\nName=Self Recorder\nExec={self.binaries / 'self_recorder'}\n")
+        self.install("org.lumacast.SelfRecorder", "Self Recorder", self.binaries / "self_recorder")
 
     def _start_display(self):
+        self.environment["DISPLAY"] = ":" + self.start_display()
+
+    def start_display(self, number=None):
+        """Also again, after its end, with the same number. Answers its number."""
         reading, writing = os.pipe()
         with os.fdopen(reading) as answer:
             try:
-                self.display = self.start(["Xvfb", "-displayfd", str(writing), "-noreset", "-nolisten", "tcp",
-                                           "-screen", "0", f"{self.size}x24"], "xvfb.log", pass_fds=[writing])
+                self.display = self.start(["Xvfb", *([f":{number}"] if number else []), "-displayfd", str(writing), "-noreset",
+                                           "-nolisten", "tcp", "-screen", "0", f"{self.size}x24"], "xvfb.log",
+                                          pass_fds=[writing])
             finally:
                 os.close(writing)
             number = answer.readline().strip()
         if not number:
             raise RuntimeError("Xvfb did not start: " + self.log("xvfb.log"))
-        self.environment["DISPLAY"] = ":" + number
+        return number
 
-    def _start_application(self, kind):
-        command = [str(self.binaries / "self_recorder"), "--size", self.size, "--fps", "60", "--name", "Self Recorder"]
-        self.application = self.start(command + MOTION[kind], "application.log",
+    def start_application(self):
+        """Also again, after its end."""
+        options = [option.format(folder=self.folder) for option in self.options]
+        self.application = self.start([self.binaries / "self_recorder", "--size", self.size, "--fps", str(self.fps),
+                                       "--name", "Self Recorder", *options], "application.log",
                                       stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True, bufsize=1)
         self.window = re.fullmatch(r"window (0x[0-9a-f]+)", self.application.stdout.readline().strip()).group(1)
         wait_for("the first frame", lambda: self.frame() > 0)

@@ -84,10 +84,22 @@ def share_of(pid, library, seconds):
 
 def pss(pid):
     """Bytes of memory, what is shared divided among its users."""
-    for line in pathlib.Path(f"/proc/{pid}/smaps_rollup").read_text().splitlines():
-        if line.startswith("Pss:"):
-            return int(line.split()[1]) * 1024
-    raise RuntimeError(f"process {pid} tells no memory")
+    return memory(pid)[0]
+
+
+def memory(pid):
+    """(PSS, of it what is no file's), bytes. Others may map parts of programs and libraries too, which are files: that
+    share changes as they come and go."""
+    sizes = {line.split(":")[0]: int(line.split()[1]) * 1024
+             for line in pathlib.Path(f"/proc/{pid}/smaps_rollup").read_text().splitlines()[1:]}
+    return sizes["Pss"], sizes["Pss_Anon"] + sizes["Pss_Shmem"]
+
+
+def holdings(pid):
+    """What a process has: memory in bytes, descriptors, threads."""
+    pss_bytes, own = memory(pid)
+    return {"pss": pss_bytes, "own": own, "descriptors": len(os.listdir(f"/proc/{pid}/fd")),
+            "threads": len(os.listdir(f"/proc/{pid}/task"))}
 
 
 def load():

@@ -1,11 +1,13 @@
 """What a recorded movie holds, and how like what was drawn it is."""
 
+import array
 import json
 import re
 import subprocess
 
 FFMPEG = ["ffmpeg", "-hide_banner", "-nostdin", "-y", "-loglevel", "error"]
 SAMPLE = 30  # pictures whose likeness is measured
+SILENT = 33  # of 32768, the largest sample of what counts as silence: 60 dB below full
 
 
 def probe(movie):
@@ -42,6 +44,22 @@ def numbers(binaries, movie):
     out = subprocess.run([str(binaries / "scene_pictures"), "numbers", str(movie)], check=True, capture_output=True,
                          text=True)
     return [None if number == "-" else int(number) for _, number in map(str.split, out.stdout.splitlines())]
+
+
+def lost(seen, first, last):
+    """How many of the frames with these numbers, both ends too, are in no picture. `seen` is what `numbers` answered."""
+    inside = {number for number in seen if number and first <= number <= last}
+    return last - first + 1 - len(inside)
+
+
+def silent_seconds(movie):
+    """How much of the sound is silence, in steps of a tenth of a second; all of it where there is no sound."""
+    rate = 8000
+    out = subprocess.run(["ffmpeg", "-v", "error", "-i", str(movie), "-vn", "-ac", "1", "-ar", str(rate), "-f", "s16le", "-"],
+                         check=True, capture_output=True).stdout
+    samples, step = array.array("h", out[:len(out) // 2 * 2]), rate // 10
+    tenths = [samples[begin:begin + step] for begin in range(0, len(samples), step)]
+    return sum(max(map(abs, tenth)) < SILENT for tenth in tenths) / 10 if tenths else probe(movie)["seconds"]
 
 
 def spread(items):

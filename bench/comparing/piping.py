@@ -34,7 +34,7 @@ class PipeWireMachine(machine.Machine):
         self.start(["pipewire"], "pipewire.log")
         machine.wait_for("PipeWire", lambda: answers(self.folder / "runtime/pipewire-0"))
 
-    def _start_application(self, kind):
+    def start_application(self):
         pass
 
 

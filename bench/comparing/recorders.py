@@ -19,9 +19,10 @@ ENCODER = ("-pix_fmt yuv420p -c:v libx264 -threads 2 -preset ultrafast -tune zer
 class Daemon:
     name = "ours"
 
-    def __init__(self, machine, _rate):
+    def __init__(self, machine, _rate=None, variables=None):
+        """`variables` are added to its environment."""
         self.machine = machine
-        self.process = machine.start([str(machine.binaries / "lumacastd")], "daemon.log")
+        self.process = machine.start([machine.binaries / "lumacastd"], "daemon.log", variables)
         socket = machine.folder / "runtime/lumacast/com.orvane.lumacastd.sock"
         machines.wait_for("the daemon", socket.exists)
 

@@ -5,35 +5,15 @@ import pathlib
 import re
 import shutil
 import signal
-import struct
 import subprocess
 import time
 
-from . import machine, recorders
-
-# linux/media/mp4/README.md draws the file.
-FILE_START = 48  # bytes before the movie box of a recording under way
-BOX_HEADER = 8   # of the box that the index is appended in
-
-
-class PacedMachine(machine.Machine):
-    """Its application draws so many frames a second."""
-
-    def __init__(self, binaries, size, fps):
-        self.fps = fps
-        super().__init__(binaries, size)
-
-    def _start_application(self, kind):
-        self.application = self.start([str(self.binaries / "self_recorder"), "--size", self.size, "--fps", str(self.fps),
-                                       "--name", "Self Recorder"], "application.log", stdin=subprocess.PIPE,
-                                      stdout=subprocess.PIPE, text=True, bufsize=1)
-        self.window = re.fullmatch(r"window (0x[0-9a-f]+)", self.application.stdout.readline().strip()).group(1)
-        machine.wait_for("the first frame", lambda: self.frame() > 0)
+from . import boxes, machine, recorders
 
 
 class Pair:
     def __init__(self, binaries, size, fps):
-        self.machine = PacedMachine(binaries, size, fps)
+        self.machine = machine.Machine(binaries, size, fps=fps)
 
     def __enter__(self):
         return self
@@ -82,10 +62,10 @@ class Pair:
                                  capture_output=True, text=True)
         if checked.returncode != 0:
             raise RuntimeError("our movie: " + checked.stderr)
-        index, fragment = index_bytes(self.ours), last_fragment_bytes(self.ours)
+        index, fragment = boxes.index_bytes(self.ours), boxes.last_fragment_bytes(self.ours)
         return {"ours_bytes": self.ours.stat().st_size, "ours_index": index, "ours_last_fragment": fragment,
-                "ours_may_grow": index + BOX_HEADER + fragment, "ffmpeg_bytes": self.ffmpeg.movie.stat().st_size,
-                "ffmpeg_index": index_bytes(self.ffmpeg.movie), "ours_seconds": seconds(self.ours),
+                "ours_may_grow": index + boxes.HEADER + fragment, "ffmpeg_bytes": self.ffmpeg.movie.stat().st_size,
+                "ffmpeg_index": boxes.index_bytes(self.ffmpeg.movie), "ours_seconds": seconds(self.ours),
                 "ffmpeg_seconds": seconds(self.ffmpeg.movie)}
 
 
@@ -95,34 +75,6 @@ def written(pid):
         if line.startswith("wchar:"):
             return int(line.split()[1])
     raise RuntimeError(f"process {pid} tells nothing of what it writes")
-
-
-def boxes(path, begin=0, end=None):
-    """Type, offset and size of the boxes one after the other."""
-    with open(path, "rb") as file:
-        end = end or path.stat().st_size
-        while begin + 8 <= end:
-            file.seek(begin)
-            size, kind = struct.unpack(">I4s", file.read(8))
-            if size == 1:
-                size = struct.unpack(">Q", file.read(8))[0]
-            if size < 8 or begin + size > end:
-                raise RuntimeError(f"{path}: the box at {begin} does not fit")
-            yield kind.decode("latin-1"), begin, size
-            begin += size
-
-
-def index_bytes(path):
-    return sum(size for kind, _, size in boxes(path) if kind == "moov")
-
-
-def last_fragment_bytes(path):
-    """The fragments that a recording was made of lie within the media of the finished movie."""
-    begin, size = next((begin, size) for kind, begin, size in boxes(path) if kind == "mdat")
-    index = next(begin for kind, begin, _ in boxes(path) if kind == "moov")
-    fragments = [(kind, place, size) for kind, place, size in boxes(path, FILE_START, min(begin + size, index - 8))]
-    last = max(place for kind, place, _ in fragments if kind == "moof")
-    return sum(size for _, place, size in fragments if place >= last)
 
 
 def seconds(path):
