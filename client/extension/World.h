@@ -17,10 +17,12 @@ class HandlerLane {
 public:
     /// Any lane. Nothing is taken any more after finish().
     void call(std::function<void()> call) {
-        const std::lock_guard lock(mutex_);
-        if (isFinished_) return;
-        calls_.push_back(std::move(call));
-        changed_.notify_one();
+        {
+            const std::lock_guard lock(mutex_);
+            if (isFinished_) return;
+            calls_.push_back(std::move(call));
+        }
+        changed_.notify_one();  // not within the lock, which is the first thing that the thread wants
     }
     /// Nothing follows what waits now. Any lane.
     void finish() {

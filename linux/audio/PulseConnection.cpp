@@ -7,7 +7,6 @@
 #include <algorithm>
 #include <condition_variable>
 #include <cstdint>
-#include <deque>
 #include <mutex>
 #include <thread>
 #include <vector>
@@ -149,7 +148,7 @@ private:
     }
 
     void runTasks() {
-        std::deque<std::function<void()>> tasks;
+        std::vector<std::function<void()>> tasks;  // an empty one takes no memory
         {
             const std::lock_guard lock(mutex_);
             tasks.swap(tasks_);
@@ -237,7 +236,7 @@ private:
     std::condition_variable stopped_;
     FileDescriptor wake_;
     std::vector<std::shared_ptr<PulseUser>> attached_;
-    std::deque<std::function<void()>> tasks_;
+    std::vector<std::function<void()>> tasks_;
     bool running_ = false, ended_ = false;
     std::thread::id thread_;
 

@@ -4,6 +4,7 @@
 
 #include "linux/ipc/Fd.h"
 #include "linux/ipc/Frames.h"
+#include "linux/ipc/PlaneMappings.h"
 #include "writer/media/PixelBuffer.h"
 
 namespace lumacast {
@@ -14,6 +15,10 @@ public:
     virtual ~PlaneLender() = default;
     /// Callable from any lane.
     virtual void giveBack(std::uint64_t lease) = 0;
+    PlaneMappings& mappings() { return mappings_; }
+
+private:
+    PlaneMappings mappings_;
 };
 
 /// A plane that another process lent: its memory, mapped read-only when somebody first looks. Given back to the lender
@@ -23,7 +28,7 @@ public:
     /// Null when the memory is too small for the picture, or could shrink under the reader.
     static std::shared_ptr<ReceivedPlane> make(Fd memory, PlaneRecord record, std::weak_ptr<PlaneLender> lender);
 
-    ReceivedPlane(Fd memory, PlaneRecord record, std::weak_ptr<PlaneLender> lender);
+    ReceivedPlane(Fd memory, PlaneMappings::Identity identity, PlaneRecord record, std::weak_ptr<PlaneLender> lender);
     ReceivedPlane(const ReceivedPlane&) = delete;
     ReceivedPlane& operator=(const ReceivedPlane&) = delete;
     ~ReceivedPlane() override;
@@ -41,10 +46,11 @@ private:
     std::size_t bytes() const { return record_.stride * static_cast<std::size_t>(record_.height); }
 
     const Fd memory_;
+    const PlaneMappings::Identity identity_;
     const PlaneRecord record_;
     const std::weak_ptr<PlaneLender> lender_;
     mutable std::mutex mutex_;
-    mutable void* mapping_ = nullptr;
+    mutable std::shared_ptr<const PlaneMapping> mapping_;
 };
 
 }  // namespace lumacast

@@ -143,7 +143,11 @@ std::optional<Error> VideoEncoder::encode(const std::shared_ptr<I420Picture>& pi
     if (!uploads_) paceRate(stamp);
     AVFrame& frame = *frame_;
     av_frame_unref(&frame);
-    frame.buf[0] = shareMemory(picture);
+    if (picture.get() != shared_) {
+        memory_.reset(shareMemory(picture));
+        shared_ = picture.get();
+    }
+    frame.buf[0] = memory_ ? av_buffer_ref(memory_.get()) : nullptr;
     if (!frame.buf[0]) return systemError(ENOMEM);
     frame.format = AV_PIX_FMT_YUV420P;
     frame.width = context_->width;

@@ -74,6 +74,8 @@ private:
 
     AvOwned<AVCodecContext> context_;
     AvOwned<AVBufferRef> uploads_;  ///< frames in the device's memory; null for encoders that read ours
+    AvOwned<AVBufferRef> memory_;   ///< of `shared_`, which it keeps alive: mostly it is one picture all the time
+    const I420Picture* shared_ = nullptr;
     AvOwned<AVFrame> frame_, uploaded_;
     AvOwned<AVPacket> packet_;
     std::optional<std::int64_t> lastStamp_;

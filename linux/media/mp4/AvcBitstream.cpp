@@ -85,10 +85,9 @@ bool carriesChromaFields(std::uint8_t profile) {
     return std::find(kProfiles.begin(), kProfiles.end(), profile) != kProfiles.end();
 }
 
-}  // namespace
-
-std::vector<std::span<const std::uint8_t>> splitAnnexB(std::span<const std::uint8_t> stream) {
-    std::vector<std::span<const std::uint8_t>> units;
+/// Without memory of its own: it is done for each picture.
+template <class Do>
+void forEachUnit(std::span<const std::uint8_t> stream, const Do& act) {
     std::size_t start = findStartCode(stream, 0);
     while (start < stream.size()) {
         const std::size_t begin = start + 3;
@@ -98,10 +97,17 @@ std::vector<std::span<const std::uint8_t>> splitAnnexB(std::span<const std::uint
             --end;
         }
         if (end > begin) {
-            units.push_back(stream.subspan(begin, end - begin));
+            act(stream.subspan(begin, end - begin));
         }
         start = next;
     }
+}
+
+}  // namespace
+
+std::vector<std::span<const std::uint8_t>> splitAnnexB(std::span<const std::uint8_t> stream) {
+    std::vector<std::span<const std::uint8_t>> units;
+    forEachUnit(stream, [&](std::span<const std::uint8_t> unit) { units.push_back(unit); });
     return units;
 }
 
@@ -120,17 +126,17 @@ ParameterSets parameterSetsOf(std::span<const std::uint8_t> annexB) {
 bool appendLengthPrefixed(std::span<const std::uint8_t> annexB, std::vector<std::uint8_t>& sample) {
     const std::size_t before = sample.size();
     bool hasSlice = false;
-    for (const auto nal : splitAnnexB(annexB)) {
+    forEachUnit(annexB, [&](std::span<const std::uint8_t> nal) {
         const unsigned type = typeOf(nal);
         if (type == kSequenceParameterSet || type == kPictureParameterSet || type == kAccessUnitDelimiter) {
-            continue;
+            return;
         }
         hasSlice = hasSlice || (type >= kSliceFirst && type <= kSliceLast);
         for (unsigned shift = 32; shift > 0; shift -= 8) {
             sample.push_back(static_cast<std::uint8_t>(nal.size() >> (shift - 8)));
         }
         sample.insert(sample.end(), nal.begin(), nal.end());
-    }
+    });
     if (!hasSlice) {
         sample.resize(before);
     }
