@@ -120,8 +120,12 @@ Result<std::vector<std::string>> FakeFileSystem::list(const std::string& directo
 
 std::optional<Error> FakeFileSystem::remove(const std::string& path) {
     if (disk_) disk_(path);
-    if (faults_.fails("FileSystem.remove")) return fakeSystemError(EIO);
+    const bool fails = faults_.fails("FileSystem.remove");
     const std::lock_guard lock(mutex_);
+    if (fails) {
+        notRemoved_.insert(withSingleSlashes(path));
+        return fakeSystemError(EIO);
+    }
     const auto found = find(path);
     if (const int* error = std::get_if<int>(&found)) return fakeSystemError(*error);
     const std::string whole = withSingleSlashes(path);
@@ -219,6 +223,11 @@ void FakeFileSystem::addLink(const std::string& path) {
     const std::lock_guard lock(mutex_);
     const auto made = make(path, false);
     if (const auto* file = std::get_if<std::shared_ptr<FakeFile>>(&made)) (*file)->isLink = true;
+}
+
+bool FakeFileSystem::removalHasFailed(const std::string& path) const {
+    const std::lock_guard lock(mutex_);
+    return notRemoved_.contains(withSingleSlashes(path));
 }
 
 std::vector<std::string> FakeFileSystem::files() const {

@@ -4,6 +4,7 @@
 #include <memory>
 #include <mutex>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -64,6 +65,8 @@ public:
     void setDisk(std::function<void(const std::string& path)> before) { disk_ = std::move(before); }
     /// The paths of all files, sorted.
     std::vector<std::string> files() const;
+    /// Whether the plan has ever let a removal of that path fail.
+    bool removalHasFailed(const std::string& path) const;
 
     // For the writers of files.
 
@@ -90,6 +93,7 @@ private:
     mutable std::mutex mutex_;
     std::map<std::string, std::shared_ptr<FakeFile>> nodes_;
     std::map<std::string, std::pair<UserID, std::shared_ptr<FakeFile>>> usersFiles_;
+    std::set<std::string> notRemoved_;
     std::uint64_t capacity_ = 1'000'000'000;
     std::uint64_t made_ = 0;
 };

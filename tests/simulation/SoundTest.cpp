@@ -329,8 +329,10 @@ private:
         expectStillness(daemon_, faulty_);
         for (const SimBlockedTask& task : daemon_.world.scheduler.blockedTasks())
             ADD_FAILURE() << task.lane << " waits for " << task.waitsFor;
+        // What the disk refused to remove is not tried again: it goes with the old files, a day later.
         for (const std::string& path : fakes().fileSystem.files())
-            EXPECT_EQ(path.find("LCLuma_Final"), std::string::npos) << path << " is left of a save";
+            EXPECT_TRUE(path.find("LCLuma_Final") == std::string::npos || fakes().fileSystem.removalHasFailed(path))
+                << path << " is left of a save";
         judgeMovies();
         if (faulty_) return;
         // One that could not be mixed is saved as it is, whatever that is.
