@@ -218,8 +218,7 @@ void Contest::end() {
         ADD_FAILURE() << task.lane << " waits for " << task.waitsFor;
     checkFiles();
     expectStillness(daemon_, faulty_);
-    if (!faulty_)
-        for (const auto& recording : fakes().containerWriters.recordings()) judgeRecording(*recording);
+    if (!faulty_) judgeRecordings(fakes().containerWriters.recordings(), kPrivileged);
 }
 
 void Contest::endSystemRecordings() {
