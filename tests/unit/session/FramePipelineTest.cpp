@@ -290,6 +290,16 @@ TEST_F(FramePipeline, AResumeThatNoFrameFollowedMeetsTheNextRecording) {
     EXPECT_EQ(ticks(), (Ticks{0, 10}));
 }
 
+TEST_F(FramePipeline, AfterADiscardTheFrameThatEndsTheResumeTakesThePlaceOfTheDiscardedOnesLast) {
+    startQuietly();
+    for (const std::int64_t value : {1000, 1010}) deliver(value);
+    interruption();
+    cleanUp();
+    startQuietly();
+    for (const std::int64_t value : {0, 10}) deliver(value);
+    EXPECT_EQ(ticks(), (Ticks{1010, 1020})) << "deliberately: only a finish forgets the time, and only a frame the resume";
+}
+
 /// A writer that takes its time.
 class SlowWriter final : public LCMovieWriter {
 public:
