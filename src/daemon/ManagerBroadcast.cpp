@@ -102,15 +102,15 @@ void LCRecordingManager::enableBroadcast(const WaitingStartRef& start, std::uint
                                          const BroadcastInfo& info) {
     const auto& session = start->session;
     session->setBroadcastConfiguration(info.configuration);
-    session->prepareBroadcast(info.extension, info.processMode, info.userInfo);
+    const auto wait = session->prepareBroadcast(info.extension, info.processMode, info.userInfo);
     session->managerRecord.startsWaiting.push_back(generation);
-    session->startQueue().async([self = shared_from_this(), start, generation, info,
+    session->startQueue().async([self = shared_from_this(), start, generation, info, wait,
                                  microphone = microphoneRecording_, camera = cameraRecording_] {
-        // A newer start may have taken this one's place while it waited its turn, or its extension. It may be of the same
-        // set-up, so the process of this one ends before that one's is launched.
-        LCRecordingSession::BroadcastLink link;
-        if (isNewest(*start, generation))
-            link = start->session->connectBroadcast(info.extension, info.processMode, start->request.listenerEndpoint);
+        // Nothing is connected when its client went, or a newer start took its place, while it waited its turn.
+        auto link = start->session->connectBroadcast(wait, info.extension, info.processMode,
+                                                     start->request.listenerEndpoint);
+        // A newer start that came since may be of the same set-up, so the process of this one ends before that one's is
+        // launched.
         if (!isNewest(*start, generation)) endLink(*start->session, std::exchange(link.proxy, nullptr));
         self->onRequestLane([self, start, generation, link, microphone, camera] {
             self->broadcastEnabled(start, generation, link, microphone, camera);

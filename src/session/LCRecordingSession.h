@@ -201,13 +201,16 @@ public:
         std::shared_ptr<const Guarded<std::optional<Error>>> error;
         std::optional<Error> failure() const { return error ? error->get() : std::nullopt; }
     };
+    struct ExtensionWait;
+    using ExtensionWaitRef = std::shared_ptr<ExtensionWait>;
     /// Its two halves: what the session is from now on, on the request lane, and the connection, which may wait, on the
-    /// start queue.
-    void prepareBroadcast(std::shared_ptr<AppExtension> extension, std::int64_t mode,
-                          std::optional<Dictionary> userInfo);
-    BroadcastLink connectBroadcast(std::shared_ptr<AppExtension> extension, std::int64_t mode,
-                                   const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
-    /// Ends the wait of an enabling under way, if there is one. Any lane.
+    /// start queue. The wait is there from the first half on, so that it can be ended before it has begun; then the
+    /// second one connects nothing.
+    ExtensionWaitRef prepareBroadcast(std::shared_ptr<AppExtension> extension, std::int64_t mode,
+                                      std::optional<Dictionary> userInfo);
+    BroadcastLink connectBroadcast(const ExtensionWaitRef& wait, std::shared_ptr<AppExtension> extension,
+                                   std::int64_t mode, const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
+    /// Ends the wait of the last enabling, if it is still to come or under way. Any lane.
     void endWaitForExtension();
     /// Where broadcasts are enabled.
     SerialQueue& startQueue() { return *startQueue_; }
@@ -304,11 +307,10 @@ private:
     void forgetTimes();
     /// `startWritingHandler:` or the extension's start, then the continuation on the request lane.
     void startWriter(Size size, Handler continuation);
-    struct ExtensionWait;
-    BroadcastLink connectToExtension(std::shared_ptr<AppExtension> extension);
-    BroadcastLink connectToListeningExtension(
-        const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
-    void installHandlers(LCBroadcastExtensionProxy& proxy, const std::shared_ptr<ExtensionWait>& wait);
+    BroadcastLink connectToExtension(const ExtensionWaitRef& wait, std::shared_ptr<AppExtension> extension);
+    BroadcastLink connectToListeningExtension(const ExtensionWaitRef& wait,
+                                              const std::shared_ptr<IpcEndpoint>& listenerEndpoint);
+    void installHandlers(LCBroadcastExtensionProxy& proxy, const ExtensionWaitRef& wait);
     void extensionFailed(const std::shared_ptr<LCBroadcastExtensionProxy>& proxy, const Error& error);
     /// The link to send over; null, and a line, when there is none.
     std::shared_ptr<LCBroadcastExtensionProxy> readyExtensionProxy();
@@ -381,7 +383,7 @@ private:
     std::atomic<std::int64_t> broadcastFragmentIndex_{0};
     /// Changes under movieWriter_'s lock: the movie's end is asked for, and no clip is cut any more.
     bool movieIsFinishing_ = false;
-    Guarded<std::shared_ptr<ExtensionWait>> extensionWait_;  ///< under way
+    Guarded<ExtensionWaitRef> extensionWait_;  ///< to come or under way
     std::int64_t chipId_ = 0;
 
     /// None at first: an application that comes back can discard what it left, but not what a writer still has.

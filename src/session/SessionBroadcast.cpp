@@ -18,6 +18,7 @@ bool isSampleBuffers(std::int64_t mode) { return mode == static_cast<std::int64_
 /// The wait for an extension. Shared with handlers that may be called when it is long over.
 struct LCRecordingSession::ExtensionWait {
     explicit ExtensionWait(Scheduler& scheduler) : semaphore(scheduler.semaphore(0)) {}
+    std::atomic<bool> isForsaken{false};  ///< nobody wants what would come of it any more
     const std::unique_ptr<Semaphore> semaphore;
     /// The extension's failure that ended it, or came later.
     const std::shared_ptr<Guarded<std::optional<Error>>> error = std::make_shared<Guarded<std::optional<Error>>>();
@@ -31,13 +32,14 @@ std::optional<BundleIdentifier> LCRecordingSession::broadcastExtensionID() const
 std::int64_t LCRecordingSession::enableBroadcastWithExtension(std::shared_ptr<AppExtension> extension, std::int64_t mode,
                                                               std::optional<Dictionary> userInfo,
                                                               const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
-    prepareBroadcast(std::move(extension), mode, std::move(userInfo));
-    connectBroadcast(broadcastExtension(), mode, listenerEndpoint);
+    const auto wait = prepareBroadcast(std::move(extension), mode, std::move(userInfo));
+    connectBroadcast(wait, broadcastExtension(), mode, listenerEndpoint);
     return 0;  // deliberately always: a failure shows in disableBroadcast alone
 }
 
-void LCRecordingSession::prepareBroadcast(std::shared_ptr<AppExtension> extension, std::int64_t mode,
-                                          std::optional<Dictionary> userInfo) {
+LCRecordingSession::ExtensionWaitRef LCRecordingSession::prepareBroadcast(std::shared_ptr<AppExtension> extension,
+                                                                          std::int64_t mode,
+                                                                          std::optional<Dictionary> userInfo) {
     log_.line("LCRecordingSession: enableBroadcastWithExtension");
     setBroadcastExtension(std::move(extension));
     broadcastUserInfo_.set(std::move(userInfo));
@@ -45,32 +47,41 @@ void LCRecordingSession::prepareBroadcast(std::shared_ptr<AppExtension> extensio
     broadcastFragmentIndex_ = 1;
     broadcastProcessMode_ = mode;
     bundleIDOfFirstForegroundApp_.set(std::nullopt);
+    auto wait = std::make_shared<ExtensionWait>(services_.platform.scheduler);
+    extensionWait_.set(wait);
+    return wait;
 }
 
 LCRecordingSession::BroadcastLink LCRecordingSession::connectBroadcast(
-    std::shared_ptr<AppExtension> extension, std::int64_t mode, const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
-    if (!isSampleBuffers(mode)) return {};
-    log_.line("setting up extension proxy");
-    return listenerEndpoint ? connectToListeningExtension(listenerEndpoint) : connectToExtension(std::move(extension));
+    const ExtensionWaitRef& wait, std::shared_ptr<AppExtension> extension, std::int64_t mode,
+    const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
+    BroadcastLink link;
+    if (isSampleBuffers(mode) && !wait->isForsaken) {
+        log_.line("setting up extension proxy");
+        link = listenerEndpoint ? connectToListeningExtension(wait, listenerEndpoint)
+                                : connectToExtension(wait, std::move(extension));
+    }
+    extensionWait_.update([&](ExtensionWaitRef& current) {
+        if (current == wait) current = nullptr;
+    });
+    return link;
 }
 
 LCRecordingSession::BroadcastLink LCRecordingSession::connectToListeningExtension(
-    const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
+    const ExtensionWaitRef& wait, const std::shared_ptr<IpcEndpoint>& listenerEndpoint) {
     const auto proxy = LCBroadcastExtensionProxy::initWithBroadcastUploadListenerEndpoint(
         services_.platform, services_.errors, listenerEndpoint);
-    const auto wait = std::make_shared<ExtensionWait>(services_.platform.scheduler);
     installHandlers(*proxy, wait);
     setBroadcastUploadExtensionProxy(proxy);
     return {proxy, wait->error};
 }
 
-LCRecordingSession::BroadcastLink LCRecordingSession::connectToExtension(std::shared_ptr<AppExtension> extension) {
+LCRecordingSession::BroadcastLink LCRecordingSession::connectToExtension(const ExtensionWaitRef& wait,
+                                                                         std::shared_ptr<AppExtension> extension) {
     const auto proxy = LCBroadcastExtensionProxy::initWithBroadcastUploadExtension(services_.platform, services_.errors,
                                                                                    std::move(extension));
-    const auto wait = std::make_shared<ExtensionWait>(services_.platform.scheduler);
     installHandlers(*proxy, wait);
     setBroadcastUploadExtensionProxy(proxy);
-    extensionWait_.set(wait);
     proxy->establishConnectionWithHandler([weak = weak_from_this(), wait](const std::optional<Error>& error) {
         if (const auto self = weak.lock()) {
             // A newer start has its own broadcast by then.
@@ -82,13 +93,10 @@ LCRecordingSession::BroadcastLink LCRecordingSession::connectToExtension(std::sh
         wait->semaphore->signal();
     });
     wait->semaphore->wait();  // deliberately without a limit; endWaitForExtension ends it
-    extensionWait_.update([&](std::shared_ptr<ExtensionWait>& current) {
-        if (current == wait) current = nullptr;
-    });
     return {proxy, wait->error};
 }
 
-void LCRecordingSession::installHandlers(LCBroadcastExtensionProxy& proxy, const std::shared_ptr<ExtensionWait>& wait) {
+void LCRecordingSession::installHandlers(LCBroadcastExtensionProxy& proxy, const ExtensionWaitRef& wait) {
     proxy.setServiceInfoHandler([weak = weak_from_this()](const Value& info) {
         const auto self = weak.lock();
         if (const auto client = self ? self->clientProxy() : nullptr) client->updateBroadcastServiceInfo(info);
@@ -117,7 +125,10 @@ void LCRecordingSession::extensionFailed(const std::shared_ptr<LCBroadcastExtens
 }
 
 void LCRecordingSession::endWaitForExtension() {
-    if (const auto wait = extensionWait_.get()) wait->semaphore->signal();
+    const auto wait = extensionWait_.get();
+    if (!wait) return;
+    wait->isForsaken = true;
+    wait->semaphore->signal();
 }
 
 void LCRecordingSession::disableBroadcast() {

@@ -43,6 +43,35 @@ TEST_F(BroadcastStart, TheWaitForAPingEndsWithTheClient) {
     EXPECT_TRUE(fakes_.appExtensions.extensions().empty() || !extension()->isRunning());
 }
 
+TEST_F(BroadcastStart, WhoseClientConnectsAnewOrGoesBeforeTheWaitHasBegunWaitsForNobody) {
+    plan_->pings = 0;
+    install(true);
+    for (const bool goes : {false, true}) {
+        const auto client = makeConnected(goes ? "Player" : "Editor", goes ? 500 : 600);
+        setUp(*client);
+        // The start's turn to connect comes late.
+        const auto turn = world_.scheduler.semaphore(0);
+        const auto itsSession = session(*client);
+        itsSession->startQueue().async([&] { turn->wait(); });
+        startBroadcast(*client);
+        EXPECT_EQ(fakes_.keepAlive.open(), 1);
+        goes ? client->die() : client->connect();
+        settle();
+        turn->signal();
+        settle();
+        EXPECT_EQ(fakes_.keepAlive.open(), 0) << goes;
+        EXPECT_TRUE(world_.scheduler.blockedTasks().empty()) << goes;
+        EXPECT_TRUE(fakes_.appExtensions.extensions().empty()) << "one is launched for nobody";
+        EXPECT_FALSE(itsSession->broadcastUploadExtensionProxy());
+    }
+    // The next one works.
+    plan_->pings = 1;
+    const auto next = makeConnected("Viewer", 700, 9);
+    setUp(*next);
+    EXPECT_EQ(startBroadcast(*next)->code(), 0);
+    EXPECT_EQ(fakes_.keepAlive.open(), 1);
+}
+
 TEST_F(BroadcastStart, ANewerStartOfTheApplicationEndsTheWaitAndRefusesTheOlderOne) {
     plan_->pings = 0;
     install(true);
