@@ -1,6 +1,7 @@
 // The road of one screen frame through the session: dropped, re-timed or not, and delivered. Runs on the frame lane.
 
 #include <cmath>
+#include <functional>
 #include <limits>
 
 #include "session/FrameGeometry.h"
@@ -58,8 +59,8 @@ void LCRecordingSession::_processSampleBuffer(const SampleRef& sample, std::uint
     } else {
         lastSampleTimestamp_.set(pts);
     }
-    _updateSampleBufferWithOffset(
-        sample, [this, transformFlags, pts](const SampleRef& retimed) { deliver(retimed, transformFlags, pts); });
+    const auto deliverIt = [&](const SampleRef& retimed) { deliver(retimed, transformFlags, pts); };
+    _updateSampleBufferWithOffset(sample, std::cref(deliverIt));  // a reference takes no memory
     shouldStopLock_->unlock();
 }
 
@@ -87,7 +88,7 @@ SampleRef LCRecordingSession::_copySampleBufferFromSourceBuffer(const SampleRef&
         log_.line("LCRecordingSession: _copySampleBufferFromSourceBuffer: Overflow detected");
         return nullptr;
     }
-    std::vector<SampleTiming> timing = sample->timing();
+    std::vector<SampleTiming> timing(sample->timing().begin(), sample->timing().end());
     for (SampleTiming& entry : timing) {
         entry.presentation = updatedTimeStamp;
         entry.decode = kInvalidMediaTime;

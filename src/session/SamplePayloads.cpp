@@ -20,7 +20,7 @@ Data bytesOf(const Record& record) {
 }  // namespace
 
 Data timingInfoBlock(const SampleBuffer& sample) {
-    const auto& entries = sample.timing();
+    const auto entries = sample.timing();
     return bytesOf(entries.empty() ? SampleTiming{} : entries.front());
 }
 

@@ -76,7 +76,8 @@ void LCMovieWriter::resetSampleQueues() {
 }
 
 bool LCMovieWriter::appendVideoSampleBuffer(const SampleRef& sample, const AffineTransform& windowTransform) {
-    movieWriterQueue_->sync([&] { dispatchedAppendVideoSampleBuffer(sample, windowTransform); });
+    const auto append = [&] { dispatchedAppendVideoSampleBuffer(sample, windowTransform); };
+    movieWriterQueue_->sync(std::cref(append));  // a reference takes no memory
     return true;
 }
 

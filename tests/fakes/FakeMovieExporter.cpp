@@ -31,7 +31,7 @@ private:
 
 /// The picture with another stamp.
 SampleRef restamped(const SampleRef& sample, MediaTime stamp) {
-    std::vector<SampleTiming> timing = sample->timing();
+    std::vector<SampleTiming> timing(sample->timing().begin(), sample->timing().end());
     timing.front().presentation = stamp;
     return sample->copyWithTiming(std::move(timing));
 }

@@ -5,26 +5,28 @@
 namespace lumacast {
 
 SampleRef SampleBuffer::makeVideo(PixelBuffer image, MediaTime presentation, MediaTime duration) {
-    std::shared_ptr<SampleBuffer> sample(new SampleBuffer);
+    const auto sample = std::make_shared<SampleBuffer>(Key());
     sample->format_.type = MediaType::Video;
-    sample->timing_.push_back({duration, presentation, kInvalidMediaTime});
+    sample->timing_ = {duration, presentation, kInvalidMediaTime};
     sample->sampleCount_ = 1;
     sample->image_ = std::move(image);
     return sample;
 }
 
 SampleRef SampleBuffer::makeAudio(const AudioFormat& format, Data data, std::int64_t sampleCount, SampleTiming timing) {
-    std::shared_ptr<SampleBuffer> sample(new SampleBuffer);
+    const auto sample = std::make_shared<SampleBuffer>(Key());
     sample->format_ = {MediaType::Audio, format};
-    sample->timing_.push_back(timing);
+    sample->timing_ = timing;
     sample->sampleCount_ = sampleCount;
     sample->data_ = std::make_shared<Data>(std::move(data));
     return sample;
 }
 
 SampleRef SampleBuffer::copyWithTiming(std::vector<SampleTiming> timing) const {
-    std::shared_ptr<SampleBuffer> sample(new SampleBuffer(*this));
-    sample->timing_ = std::move(timing);
+    const auto sample = std::make_shared<SampleBuffer>(*this);
+    sample->timingCount_ = std::min<std::size_t>(timing.size(), 1);
+    sample->timing_ = timing.empty() ? SampleTiming{} : timing.front();
+    sample->several_ = timing.size() > 1 ? std::move(timing) : std::vector<SampleTiming>();
     return sample;
 }
 
@@ -33,9 +35,9 @@ void SampleBuffer::overwriteDataWithZero() const {
 }
 
 MediaTime SampleBuffer::presentationTime() const {
-    return timing_.empty() ? kInvalidMediaTime : timing_.front().presentation;
+    return timing().empty() ? kInvalidMediaTime : timing().front().presentation;
 }
 
-MediaTime SampleBuffer::duration() const { return timing_.empty() ? kInvalidMediaTime : timing_.front().duration; }
+MediaTime SampleBuffer::duration() const { return timing().empty() ? kInvalidMediaTime : timing().front().duration; }
 
 }  // namespace lumacast

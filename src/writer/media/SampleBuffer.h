@@ -1,9 +1,11 @@
 #pragma once
 // One timed unit of media.
 
+#include <cstddef>
 #include <cstdint>
 #include <memory>
 #include <optional>
+#include <span>
 #include <vector>
 
 #include "base/Value.h"
@@ -36,6 +38,13 @@ using SampleRef = std::shared_ptr<const SampleBuffer>;
 /// One video frame or a run of audio packets. Immutable, but for overwriteDataWithZero.
 class SampleBuffer {
 public:
+    /// For the makers below: everybody else gets a reference.
+    class Key {
+        friend class SampleBuffer;
+        Key() = default;
+    };
+    explicit SampleBuffer(Key) {}
+
     /// A video frame. `decode` is left invalid.
     static SampleRef makeVideo(PixelBuffer image, MediaTime presentation, MediaTime duration);
     /// A run of `sampleCount` audio samples in `format`.
@@ -50,7 +59,10 @@ public:
     /// The first entry's duration for one entry that stands for all samples; invalid when there is no entry.
     MediaTime duration() const;
     std::int64_t sampleCount() const { return sampleCount_; }
-    const std::vector<SampleTiming>& timing() const { return timing_; }
+    /// For as long as the buffer.
+    std::span<const SampleTiming> timing() const {
+        return several_.empty() ? std::span(&timing_, timingCount_) : std::span(several_);
+    }
     /// The picture of a video frame; none for audio.
     const std::optional<PixelBuffer>& image() const { return image_; }
     /// The bytes of an audio buffer; null for video.
@@ -60,10 +72,11 @@ public:
     void overwriteDataWithZero() const;
 
 private:
-    SampleBuffer() = default;
-
     FormatDescription format_;
-    std::vector<SampleTiming> timing_;
+    // Nearly always one entry, for which a frame takes no memory of its own.
+    SampleTiming timing_;
+    std::size_t timingCount_ = 1;
+    std::vector<SampleTiming> several_;
     std::int64_t sampleCount_ = 0;
     std::optional<PixelBuffer> image_;
     std::shared_ptr<Data> data_;

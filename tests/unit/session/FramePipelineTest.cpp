@@ -139,7 +139,7 @@ TEST_F(FramePipeline, EveryTimingEntryOfARetimedFrameHasTheNewTimeAndNoDecodeTim
     const SampleTiming first{MediaTime::make(4, 600), MediaTime::make(2010, 600), MediaTime::make(2009, 600)};
     const SampleTiming second{MediaTime::make(6, 600), MediaTime::make(2014, 600), MediaTime::make(2013, 600)};
     session_->screenCaptureControllerDidReceiveSampleBuffer(*source(), plain->copyWithTiming({first, second}), 0);
-    const auto& timing = recording().movie().tracks[0].samples.back()->timing();
+    const auto timing = recording().movie().tracks[0].samples.back()->timing();
     ASSERT_EQ(timing.size(), 2u);
     for (const SampleTiming& entry : timing) {
         EXPECT_EQ(compare(entry.presentation, MediaTime::make(1020, 600)), 0);
