@@ -64,6 +64,18 @@ double levelOf(const checkers::Sound& sound, double frequency) {
     return checkers::toneLevel(sound.samples, sound.rate, frequency);
 }
 
+/// The half second in which a tone is loudest: on a busy machine a server runs out of sound now and then, and a tone that
+/// is cut off is heard in all the other frequencies.
+checkers::Sound bestPart(const checkers::Sound& sound, double frequency) {
+    constexpr double kLength = 0.5, kStep = 0.05;
+    checkers::Sound best;
+    for (double from = 0; from + kLength <= lengthOf(sound); from += kStep) {
+        auto one = part(sound, from, from + kLength);
+        if (best.samples.empty() || levelOf(one, frequency) > levelOf(best, frequency)) best = std::move(one);
+    }
+    return best;
+}
+
 /// Whether the application itself drew the marked picture of that moment more than half a frame time too late.
 bool wasDrawnLate(nanoseconds mark, const std::vector<checkers::NumberedPicture>& pictures,
                   const checkers::FramesLog& drawn) {
@@ -112,10 +124,13 @@ TEST_P(SoundOnServer, EachRecordingHoldsItsOwnApplicationsToneAndNoOther) {
         const auto sound = soundOf(record(front, 3));
         ASSERT_GT(lengthOf(sound), 2.5);
         const auto middle = part(sound, 0.5, lengthOf(sound) - 0.3);
-        const double heard = levelOf(middle, own);
+        const auto best = bestPart(middle, own);
+        const double heard = levelOf(best, own);
         EXPECT_GT(heard, -20);
         for (std::size_t i = 0; i + 1 < applications.size(); ++i) {
-            const double separation = heard - levelOf(middle, tones[i]);
+            // They are played at -6 dB.
+            EXPECT_LT(levelOf(middle, tones[i]), -50) << tones[i] << " Hz";
+            const double separation = heard - levelOf(best, tones[i]);
             std::printf("    %s: %.0f Hz at %.1f dB, the other application's %.0f Hz %.1f dB below it\n",
                         server_->name().c_str(), own, heard, tones[i], separation);
             EXPECT_GE(separation, 60);
