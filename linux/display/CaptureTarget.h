@@ -67,7 +67,7 @@ public:
     void repaintIsLate(std::int64_t now) override;
     bool read(const SharedMemory& memory, std::span<const Strip> strips) override;
     bool overtaken() const override { return damagedBefore(lastRead_); }
-    bool spoilt() const override { return fromScreen_ && covered_; }
+    bool spoilt() const override { return fromScreen_ && (covered_ || needsRefresh_); }
     void restore(const SharedMemory* last) override;
 
 private:

@@ -218,10 +218,12 @@ bool FrameLane::lastIsAsRead() const {
 // Whether the picture can be read now; what has changed in it is noted.
 bool FrameLane::lookAtPicture(const Order& order) {
     if (shown_->needsRefresh()) {
-        const bool isShown = lastIsAsRead();
+        const bool wasShown = lastIsAsRead();
         shown_->refresh();
         drainEvents(true);
-        shown_->restore(isShown ? &last_.picture->plane()->memory() : nullptr);
+        // Of another size it has nothing for what the window has gained.
+        const bool fits = wasShown && last_.picture->width() == shown_->width() && last_.picture->height() == shown_->height();
+        shown_->restore(fits ? &last_.picture->plane()->memory() : nullptr);
     }
     if (!shown_->readable()) return false;
     const Turn turn = turnOf(order);

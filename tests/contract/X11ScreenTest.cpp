@@ -129,6 +129,26 @@ TEST_F(X11Screen, KeepsAWindowThatIsMovedPartlyOffTheScreenWhole) {
     for (const CapturedFrame& frame : frames->frames()) EXPECT_TRUE(frame.oneColour);
 }
 
+TEST_F(X11Screen, NeverShowsWhatWasBehindAWindowThatGrowsWhileItIsReadFromTheScreen) {
+    TestWindow behind(display.name(), {.place = {0, 0, 900, 700}, .colour = kBlue});
+    behind.paint(kBlue);
+    TestWindow window(display.name(), {.place = {30, 40, 320, 240}, .colour = kRed, .repaints = false});
+    window.paint(kRed);
+    frames->isOdd = [](const SharedPlane& plane) {
+        for (int y = 0; y < plane.height(); y += 3)
+            for (int x = 0; x < plane.width(); x += 3)
+                if (sameColour(colourAt(plane, x, y), kBlue)) return true;
+        return false;
+    };
+    const auto made = startOn(window, 320, 240);
+    ASSERT_TRUE(waitForScreen(window));
+    window.resize(480, 360);
+    ASSERT_TRUE(eventually([&] { return isRedirected(window); }));
+    window.paint(kGreen);
+    ASSERT_TRUE(frames->waitForColour(kGreen));
+    for (const CapturedFrame& frame : frames->frames()) EXPECT_FALSE(frame.odd) << frame.number;
+}
+
 TEST_F(X11Screen, AWindowWithinAnotherIsReadFromTheScreenOnlyWhileNothingIsInFrontOfEither) {
     TestWindow outer(display.name(), {.place = {50, 50, 500, 400}, .colour = kBlue, .border = 5});
     TestWindow window(display.name(), {.place = {20, 30, 320, 240}, .colour = kRed, .border = 3, .parent = outer.id()});
