@@ -144,7 +144,16 @@ void LinuxLogSink::flush() {
     if (const auto last = repeated_.end()) writeToLog(last->level, last->text);
 }
 
+bool LinuxLogSink::mayBeWritten(LogLevel level) {
+    return level == LogLevel::Debug || level == LogLevel::Sample || quota_.take(now_());
+}
+
 void LinuxLogSink::writeToLog(LogLevel level, const std::string& line) {
+    if (!mayBeWritten(level)) {
+        ++unreported_;
+        ++dropped_;
+        return;
+    }
     const std::uint64_t missed = unreported_.exchange(0);
     if (journal_ ? sendToJournal(level, line, missed) : writeToError(level, line, missed)) return;
     unreported_ += missed + 1;

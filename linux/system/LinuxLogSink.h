@@ -7,6 +7,7 @@
 #include <string>
 
 #include "linux/system/FileDescriptor.h"
+#include "linux/system/LineQuota.h"
 #include "linux/system/RepeatedLines.h"
 #include "platform/LogSink.h"
 
@@ -26,7 +27,9 @@ struct LogSinkTargets {
 /// room for is dropped, and the next one that gets through is preceded by how many were. Lines are cut at 4000 bytes;
 /// control characters become blanks, so that no text can pretend to be a line of its own. A line that comes again and
 /// again is written once; how often it came is told when another comes, and every ten seconds while it goes on
-/// ("repeated 500 times: the line"). `Print` lines are not folded. Callable from any lane.
+/// ("repeated 500 times: the line"). Beyond 2,000 lines at once, and 50 a second after them, lines are dropped as well
+/// (`LineQuota`), but for those that come with each frame, which somebody asked for. `Print` lines are neither folded nor
+/// counted. Callable from any lane.
 class LinuxLogSink final : public LogSink {
 public:
     explicit LinuxLogSink(const LogSinkTargets& targets);
@@ -52,6 +55,7 @@ private:
         FileDescriptor reopened_;
     };
 
+    bool mayBeWritten(LogLevel level);
     void writeToLog(LogLevel level, const std::string& line);
     /// `missed` lines were dropped before this one. False when it was dropped too.
     bool writeToError(LogLevel level, const std::string& text, std::uint64_t missed) const;
@@ -62,6 +66,7 @@ private:
     FileDescriptor journal_;
     const std::function<std::chrono::steady_clock::time_point()> now_;
     RepeatedLines repeated_;
+    LineQuota quota_;
     std::atomic<std::uint64_t> dropped_{0};
     std::atomic<std::uint64_t> unreported_{0};  ///< those of the log that no note has told of
 };
