@@ -7,6 +7,7 @@
 
 #include <cstdio>
 #include <memory>
+#include <string_view>
 #include <thread>
 #include <utility>
 
@@ -47,6 +48,11 @@ Options::Options()
     : requestsDescriptor(kExtensionRequestsDescriptor), auxiliaryDescriptor(kExtensionAuxiliaryDescriptor) {}
 
 void sayRefused(const char* what) { std::fprintf(stderr, "lumacast extension: refused: %s\n", what); }
+
+void sayLogged(LogLevel level, std::string_view text) {
+    if (level != LogLevel::Error) return;
+    std::fprintf(stderr, "lumacast extension: %.*s\n", static_cast<int>(text.size()), text.data());
+}
 
 int run(Handler& handler, Options options) {
     Fd requests = socketOf(options.requestsDescriptor), auxiliary = socketOf(options.auxiliaryDescriptor);

@@ -5,6 +5,7 @@
 #include <deque>
 #include <functional>
 #include <mutex>
+#include <string_view>
 
 #include "base/Log.h"
 #include "linux/ipc/LinuxIpc.h"
@@ -56,16 +57,18 @@ private:
     bool isFinished_ = false;
 };
 
+/// One line on standard error: something that came from the daemon was refused.
+void sayRefused(const char* what);
+/// A line of the library's log, on standard error: why a connection was dropped.
+void sayLogged(LogLevel level, std::string_view text);
+
 /// Kept by everything that may still want to send: an answer that its holder releases late finds no connection, but a lane.
 class World {
 public:
-    Log log;
+    Log log{sayLogged};
     Reactor reactor{"lumacast extension"};
     LinuxIpc ipc{reactor, log, {}};
     HandlerLane lane;
 };
-
-/// One line on standard error: something that came from the daemon was refused.
-void sayRefused(const char* what);
 
 }  // namespace lumacast::extension

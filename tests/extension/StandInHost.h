@@ -9,12 +9,14 @@
 
 #include <atomic>
 #include <condition_variable>
+#include <cstdio>
 #include <deque>
 #include <functional>
 #include <memory>
 #include <mutex>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <thread>
 #include <utility>
 #include <vector>
@@ -161,19 +163,25 @@ public:
         EXPECT_EQ(ping->number, static_cast<std::uint16_t>(BroadcastDaemonMessage::Ping));
         EXPECT_TRUE(endpointSet.next());
     }
-    /// Sends a payload; `processed` is called on the host's loop when it was.
+    /// Sends a payload; one of the two is called on the host's loop: when it was processed, or when it can't be.
     void send(
-        Dictionary payload, std::function<void()> processed = [] {}) {
+        Dictionary payload, std::function<void()> processed = [] {}, std::function<void()> failed = [] {}) {
         onLoop([&] {
-            daemon_->remoteProxy([](const Error&) {})
+            daemon_
+                ->remoteProxy([failed = std::move(failed)](const Error& error) {
+                    std::fprintf(stderr, "a payload can't be processed: error %lld\n",
+                                 static_cast<long long>(error.code()));
+                    failed();
+                })
                 ->send(0, {Value(std::move(payload))}, [processed = std::move(processed)](Array) { processed(); });
         });
     }
-    /// Sends it and waits until it was processed.
+    /// Sends it and waits until it was processed; false when it can't be, or was not in time.
     bool sendAndWait(Dictionary payload) {
-        Told<bool> processed;
-        send(std::move(payload), [&] { processed.add(true); });
-        return processed.next().has_value();
+        const auto processed = std::make_shared<Told<bool>>();  // an answer may come too late
+        send(
+            std::move(payload), [processed] { processed->add(true); }, [processed] { processed->add(false); });
+        return processed->next().value_or(false);
     }
 
     bool listenerShouldAcceptNewConnection(IpcListener&, const std::shared_ptr<IpcConnection>& connection) override {
@@ -225,7 +233,9 @@ private:
 
     void onLoop(const std::function<void()>& task) { reactor_.sync(task); }
 
-    Log log_;
+    Log log_{[](LogLevel level, std::string_view text) {
+        if (level == LogLevel::Error) std::fprintf(stderr, "host: %.*s\n", static_cast<int>(text.size()), text.data());
+    }};
     Reactor reactor_;
     LinuxIpc ipc_{reactor_, log_, {}};
     const std::shared_ptr<Inbox> answers_ = std::make_shared<Inbox>();
