@@ -100,20 +100,21 @@ void QuestionLane::connect() {
 void QuestionLane::sleep() {
     if (connection_ && connection_->broken()) connection_.reset();
     std::vector<int> others;
+    bool mayHaveMore = false;
     if (observer_ != nullptr) {
         // Events that were read while waiting for a reply don't wake the descriptor again.
-        if (connection_) observer_->eventsMayHaveCome(*connection_);
+        if (connection_) mayHaveMore = observer_->takeEvents(*connection_);
         others = observer_->descriptors();
     }
     std::vector<pollfd> polled{{wake_.descriptor(), POLLIN, 0}};
     if (connection_) xcb_flush(connection_->get());
     polled.push_back({connection_ ? connection_->descriptor() : -1, POLLIN, 0});
     for (const int descriptor : others) polled.push_back({descriptor, POLLIN, 0});
-    ::poll(polled.data(), polled.size(), -1);
+    ::poll(polled.data(), polled.size(), mayHaveMore ? 0 : -1);
     if (polled[0].revents != 0) wake_.clear();
     if (polled[1].revents != 0) {
         if (observer_ != nullptr)
-            observer_->eventsMayHaveCome(*connection_);
+            observer_->takeEvents(*connection_);
         else
             while (Owned<xcb_generic_event_t>(xcb_poll_for_event(connection_->get()))) {
             }

@@ -23,8 +23,9 @@ public:
     virtual ~QuestionLaneObserver() = default;
     /// A new connection is there; nothing of an older one counts any more.
     virtual void connected(X11Connection& connection) = 0;
-    /// Events may have come.
-    virtual void eventsMayHaveCome(X11Connection& connection) = 0;
+    /// Takes the events that have come. True when there were some: with the answers of what it then asked the server, more
+    /// may have been read.
+    virtual bool takeEvents(X11Connection& connection) = 0;
     /// More descriptors to wait for; and one of them is readable.
     virtual std::vector<int> descriptors() = 0;
     virtual void readable(int descriptor) = 0;

@@ -156,14 +156,18 @@ void X11AppStateMonitor::rememberOwnersOfWindows(X11Connection& connection) {
     for (const ProcessID owner : x11::ownersOf(connection, activeWindow_->applicationWindows())) remember(owner);
 }
 
-void X11AppStateMonitor::eventsMayHaveCome(X11Connection& connection) {
+bool X11AppStateMonitor::takeEvents(X11Connection& connection) {
     using Change = x11::ActiveWindow::Change;
     Change change = Change::None;
-    while (const x11::Owned<xcb_generic_event_t> event{xcb_poll_for_event(connection.get())})
+    bool areThere = false;
+    while (const x11::Owned<xcb_generic_event_t> event{xcb_poll_for_event(connection.get())}) {
         change = std::max(change, activeWindow_->meaningOf(*event));
-    if (change == Change::None || !watching_) return;
+        areThere = true;
+    }
+    if (change == Change::None || !watching_) return areThere;
     if (change == Change::Windows) rememberOwnersOfWindows(connection);
     lookForChange(connection);
+    return true;
 }
 
 bool X11AppStateMonitor::areOneApplication(ProcessID one, ProcessID other) const {

@@ -52,7 +52,7 @@ private:
     };
 
     void connected(x11::X11Connection& connection) override;
-    void eventsMayHaveCome(x11::X11Connection& connection) override;
+    bool takeEvents(x11::X11Connection& connection) override;
     std::vector<int> descriptors() override;
     void readable(int descriptor) override;
 
