@@ -253,7 +253,7 @@ void CaptureTarget::takeDamage(DamageRegion& into) {
     subtracted_ = xcb_damage_subtract(x, damage_, XCB_NONE, region_).sequence;
     damaged_ = false;
     const Owned<xcb_xfixes_fetch_region_reply_t> region(
-        xcb_xfixes_fetch_region_reply(x, xcb_xfixes_fetch_region(x, region_), nullptr));
+        xcb_xfixes_fetch_region_reply(x, xcb_xfixes_fetch_region_unchecked(x, region_), nullptr));
     if (!region) return;
     const xcb_rectangle_t* const rects = xcb_xfixes_fetch_region_rectangles(region.get());
     const int count = xcb_xfixes_fetch_region_rectangles_length(region.get());

@@ -24,7 +24,7 @@ void Pointer::look() {
     if (shapeIsStale_) return readShape();
     xcb_connection_t* const x = connection_.get();
     const Owned<xcb_query_pointer_reply_t> place(
-        xcb_query_pointer_reply(x, xcb_query_pointer(x, connection_.screen().root), nullptr));
+        xcb_query_pointer_reply(x, xcb_query_pointer_unchecked(x, connection_.screen().root), nullptr));
     onScreen_ = place && place->same_screen != 0;
     if (!onScreen_) return;
     x_ = place->root_x;
