@@ -20,6 +20,8 @@ constexpr std::uint32_t kWindowEvents =
 constexpr std::uint32_t kScreenEvents = XCB_EVENT_MASK_STRUCTURE_NOTIFY;
 // A window that was redirected a moment ago may be covered again in the next: menus and messages come and go.
 constexpr std::int64_t kFirstLookAfter = 1'000'000'000, kLastLookAfter = 4'000'000'000;
+// What was painted as a whole so often in a row is taken to be so again; each so-many-th time the server is asked.
+constexpr std::uint32_t kWholeBefore = 4, kAskAgain = 8;
 constexpr std::int64_t kNever = std::numeric_limits<std::int64_t>::max();
 
 }  // namespace
@@ -246,9 +248,23 @@ void CaptureTarget::measureScreen() {
     height_ = size->height;
 }
 
+// Films and games paint everything each time: not to ask what has changed spares a wait for the server with each of
+// their pictures. When they cease to, some more pictures are read as a whole. An application that is waited for is not
+// taken at its word.
+bool CaptureTarget::takesForWhole() const {
+    return damaged_ && awaited_.empty() && wholeInARow_ >= kWholeBefore && wholeInARow_ % kAskAgain != 0;
+}
+
 void CaptureTarget::takeDamage(DamageRegion& into) {
     into.add(carried_);
     carried_.clear();
+    const PixelRect whole{0, 0, width_, height_};
+    if (takesForWhole()) {
+        forgetDamage();
+        damaged_ = false;
+        ++wholeInARow_;
+        return into.add(whole);
+    }
     xcb_connection_t* const x = connection_.get();
     subtracted_ = xcb_damage_subtract(x, damage_, XCB_NONE, region_).sequence;
     damaged_ = false;
@@ -260,6 +276,7 @@ void CaptureTarget::takeDamage(DamageRegion& into) {
     DamageRegion changed;
     for (int i = 0; i < count; ++i) changed.add(PixelRect{rects[i].x, rects[i].y, rects[i].width, rects[i].height});
     into.add(changed);
+    wholeInARow_ = changed.covers(whole) ? wholeInARow_ + 1 : 0;
     if (awaited_.empty()) return;
     painted_.add(changed);
     if (unpainted(awaited_).empty()) awaitNothing();

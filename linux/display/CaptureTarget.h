@@ -73,6 +73,7 @@ public:
 private:
     CaptureTarget(X11Connection& connection, xcb_window_t window, Kind kind, std::uint8_t depth);
     void begin(std::uint16_t width, std::uint16_t height);
+    bool takesForWhole() const;
     void leaveScreen();
     void putBack(const SharedMemory& last, const PixelRect& rect);
     void nameWindow();
@@ -94,6 +95,7 @@ private:
     bool needsRefresh_ = true;
     bool damaged_ = false;
     std::uint32_t damage_ = 0;
+    std::uint32_t wholeInARow_ = 0;  ///< how often all of it had changed, or was taken to have
     xcb_xfixes_region_t region_ = XCB_NONE;
     xcb_drawable_t drawable_ = XCB_NONE;
     std::int32_t width_ = 0, height_ = 0, border_ = 0;

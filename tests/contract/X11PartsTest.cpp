@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstring>
 #include <memory>
 #include <mutex>
@@ -103,6 +104,33 @@ TEST_F(X11Parts, TenThousandRandomChangesShowAsAWholeReadingWould) {
     }
     // How much depends on how many changes one picture has.
     EXPECT_LT(converted->partConverted(), 1) << "of the pixels were converted";
+}
+
+// What paints everything each time is soon taken to do so without a question to the server.
+TEST_F(X11Parts, DamageIsSmallAgainWhenAWindowCeasesToPaintEverything) {
+    TestWindow window(display.name(), {.place = {0, 0, kWidth, kHeight}, .colour = 0x406080, .repaints = false});
+    const auto made = startOn(window, kWidth, kHeight);
+    for (std::uint32_t red = 0x080000; red <= 0xF00000; red += 0x080000) {
+        window.paint(red);
+        ASSERT_TRUE(frames->waitForColour(red));
+    }
+    for (const CapturedFrame& frame : frames->frames()) {
+        if (frame.damage.empty()) continue;  // a repeat
+        EXPECT_EQ(frame.damage, (std::vector<PixelRect>{{0, 0, kWidth, kHeight}})) << frame.number;
+    }
+    const auto damageOf = [&](std::uint32_t colour) -> std::vector<PixelRect> {
+        window.paintPart({310, 170, 30, 20}, colour);
+        const auto isThere = [&](const CapturedFrames::Frames& got) { return got.back().colour == colour; };
+        if (!frames->waitFor(isThere)) return {};
+        const CapturedFrames::Frames got = frames->frames();
+        return std::find_if(got.begin(), got.end(), [&](const auto& frame) { return frame.colour == colour; })->damage;
+    };
+    const std::vector<PixelRect> painted{{310, 170, 30, 20}};
+    constexpr std::uint32_t kFirst = 0x10B030;
+    std::uint32_t colour = kFirst;
+    while (colour < kFirst + 10 && damageOf(colour) != painted) ++colour;
+    EXPECT_LT(colour, kFirst + 10) << "ten pictures later the whole window is read still";
+    EXPECT_EQ(damageOf(0x2030D0), painted);
 }
 
 }  // namespace
