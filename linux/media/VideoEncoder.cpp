@@ -141,14 +141,20 @@ bool VideoEncoder::works(VideoEncoder& encoder, const VideoTrackSettings& settin
 std::optional<Error> VideoEncoder::encode(const std::shared_ptr<I420Picture>& picture, std::int64_t stamp, KeyFrame key,
                                           const Output& output) {
     if (!uploads_) paceRate(stamp);
+    if (picture.get() != shown_ && !show(picture)) return systemError(ENOMEM);
+    frame_->pts = stamp;
+    frame_->pict_type = key == KeyFrame::Forced ? AV_PICTURE_TYPE_I : AV_PICTURE_TYPE_NONE;
+    if (const int error = send(frame_.get()); error < 0) return avError(error);
+    return receive(output);
+}
+
+bool VideoEncoder::show(const std::shared_ptr<I420Picture>& picture) {
     AVFrame& frame = *frame_;
     av_frame_unref(&frame);
-    if (picture.get() != shared_) {
-        memory_.reset(shareMemory(picture));
-        shared_ = picture.get();
-    }
-    frame.buf[0] = memory_ ? av_buffer_ref(memory_.get()) : nullptr;
-    if (!frame.buf[0]) return systemError(ENOMEM);
+    shown_ = nullptr;
+    frame.buf[0] = shareMemory(picture);
+    if (!frame.buf[0]) return false;
+    shown_ = picture.get();
     frame.format = AV_PIX_FMT_YUV420P;
     frame.width = context_->width;
     frame.height = context_->height;
@@ -157,12 +163,7 @@ std::optional<Error> VideoEncoder::encode(const std::shared_ptr<I420Picture>& pi
     frame.data[2] = picture->v();
     frame.linesize[0] = picture->lumaStride();
     frame.linesize[1] = frame.linesize[2] = picture->chromaStride();
-    frame.pts = stamp;
-    frame.pict_type = key == KeyFrame::Forced ? AV_PICTURE_TYPE_I : AV_PICTURE_TYPE_NONE;
-    const int error = send(&frame);
-    av_frame_unref(&frame);
-    if (error < 0) return avError(error);
-    return receive(output);
+    return true;
 }
 
 /// The software encoder refills its rate buffer by one sixtieth (the frame rate) of a second with each picture. Where

@@ -69,14 +69,15 @@ private:
                                                                         const VideoTrackSettings& settings);
     static bool works(VideoEncoder& encoder, const VideoTrackSettings& settings);
     void paceRate(std::int64_t stamp);
+    bool show(const std::shared_ptr<I420Picture>& picture);
     int send(AVFrame* frame);
     std::optional<Error> receive(const Output& output);
 
     AvOwned<AVCodecContext> context_;
     AvOwned<AVBufferRef> uploads_;  ///< frames in the device's memory; null for encoders that read ours
-    AvOwned<AVBufferRef> memory_;   ///< of `shared_`, which it keeps alive: mostly it is one picture all the time
-    const I420Picture* shared_ = nullptr;
-    AvOwned<AVFrame> frame_, uploaded_;
+    AvOwned<AVFrame> frame_;        ///< keeps the picture alive that it shows: mostly it is one all the time
+    const I420Picture* shown_ = nullptr;
+    AvOwned<AVFrame> uploaded_;
     AvOwned<AVPacket> packet_;
     std::optional<std::int64_t> lastStamp_;
 };
