@@ -8,7 +8,6 @@
 #include <ctime>
 
 #include "linux/display/X11DisplayCapture.h"
-#include "writer/media/SampleBuffer.h"
 
 namespace lumacast::x11 {
 namespace {
@@ -291,7 +290,7 @@ bool FrameLane::deliver(const Order& order, Delivered what, CaptureControl::Stam
     what.stamp = *given;
     last_ = what;
     delegate->screenCaptureControllerDidReceiveSampleBuffer(
-        *source, SampleBuffer::makeVideo(PixelBuffer(std::move(what.picture)), *given, setup_.minimumInterval),
+        *source, samples_.video(PixelBuffer(std::move(what.picture)), *given, setup_.minimumInterval),
         what.transformFlags);
     setup_.control->countDelivered();
     setup_.control->endDelivery();

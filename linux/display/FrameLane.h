@@ -17,6 +17,7 @@
 #include "linux/display/Wake.h"
 #include "linux/display/X11Connection.h"
 #include "platform/Scheduler.h"
+#include "writer/media/SampleMaker.h"
 
 namespace lumacast::x11 {
 
@@ -102,6 +103,7 @@ private:
     bool pictureWanted_ = false;  ///< the current picture is due though nothing may have changed
     std::int64_t stoppedSince_ = 0;
     std::uint64_t pictures_ = 0;  ///< numbered so far
+    SampleMaker samples_;
     Delivered last_;
 };
 

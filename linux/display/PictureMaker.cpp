@@ -196,7 +196,7 @@ void PictureMaker::scale(const PixelRect& rect, std::uint8_t* frame, int stride)
 }
 
 std::shared_ptr<Picture> PictureMaker::picture(std::size_t plane, std::uint64_t number) {
-    return std::make_shared<Picture>(pool_.plane(plane), tracker_.sinceDelivery(), number);
+    return pictures_.make(pool_.plane(plane), tracker_.sinceDelivery(), number);
 }
 
 }  // namespace lumacast::x11

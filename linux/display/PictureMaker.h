@@ -7,6 +7,7 @@
 #include <optional>
 #include <vector>
 
+#include "base/Recycler.h"
 #include "linux/display/DamageTracker.h"
 #include "linux/display/Fit.h"
 #include "linux/display/PictureSource.h"
@@ -78,6 +79,7 @@ private:
     std::optional<SharedMemory> image_;     ///< the target's picture, where it doesn't go straight into the plane
     DamageRegion imageStale_;
     PixelRect drawnOver_;               ///< of the image
+    Recycler<Picture> pictures_;
     std::vector<std::uint8_t> scaled_;  ///< an upright frame, where it is scaled before it is turned
 };
 

@@ -15,8 +15,9 @@ constexpr double kBufferSeconds = 1.0;
 constexpr double kMostBufferBytes = 57344;
 
 /// The sample of a filled buffer, with the packet count that came with it; null when it can't be made.
-SampleRef makeTappedSample(const AudioFormat& format, const AudioQueueBuffer& buffer, std::uint32_t packetCount,
-                           MediaTime presentation, const std::vector<AudioPacketDescription>& descriptions) {
+SampleRef makeTappedSample(const SampleMaker& maker, const AudioFormat& format, const AudioQueueBuffer& buffer,
+                           std::uint32_t packetCount, MediaTime presentation,
+                           const std::vector<AudioPacketDescription>& descriptions) {
     if (buffer.byteSize > buffer.bytes.size() || !(format.sampleRate > 0)) return nullptr;
     if (!descriptions.empty() && descriptions.size() != packetCount) return nullptr;
     std::uint64_t frames = std::uint64_t{packetCount} * format.framesPerPacket;
@@ -28,9 +29,8 @@ SampleRef makeTappedSample(const AudioFormat& format, const AudioQueueBuffer& bu
         if (format.framesPerPacket == 0) frames += packet.framesInPacket;
     }
     const auto rate = static_cast<std::int32_t>(std::clamp(std::round(format.sampleRate), 1.0, 1e9));
-    return SampleBuffer::makeAudio(
-        format, Data(buffer.bytes.begin(), buffer.bytes.begin() + buffer.byteSize), packetCount,
-        {MediaTime::make(static_cast<std::int64_t>(frames), rate), presentation, kInvalidMediaTime});
+    return maker.audio(format, Data(buffer.bytes.begin(), buffer.bytes.begin() + buffer.byteSize), packetCount,
+                       {MediaTime::make(static_cast<std::int64_t>(frames), rate), presentation, kInvalidMediaTime});
 }
 
 }  // namespace
@@ -145,10 +145,11 @@ void LCCaptureManager::handleInputBuffer(const std::shared_ptr<AudioRecorderStat
         std::int64_t packetsReceived = packetCount;
         if (packetCount == 0 && format.bytesPerPacket != 0) packetsReceived = buffer->byteSize / format.bytesPerPacket;
         // With the callback's own count, deliberately not the one just computed.
-        if (const SampleRef sample = makeTappedSample(format, *buffer, packetCount, presentation, packets)) {
+        if (const SampleRef sample =
+                makeTappedSample(self->tappedSamples_, format, *buffer, packetCount, presentation, packets)) {
             self->lastAudioDate_.set(
                 Date{self->platform_.clock.now().secondsSince1970 + sample->duration().seconds()});
-            if (const SampleHandler handler = self->appAudioOutputHandler()) handler(sample);
+            self->appAudioOutputHandler_.call(sample);
         }
         recorder->currentPacket += packetsReceived;
         if (recorder->queue->enqueueBuffer(buffer) == AudioStatus::kSuccess)
@@ -167,8 +168,7 @@ void LCCaptureManager::fillGapAfterResume() {
     log_.line("gap since last audio tap, filling with empty sample buffer");
     const SampleRef silence = makeSilence(gap, kZeroMediaTime);
     // A resume always brings a handler; it may have been cleared by a stop of everything meanwhile.
-    const SampleHandler handler = appAudioOutputHandler();
-    if (silence && handler) handler(silence);
+    if (silence) appAudioOutputHandler_.call(silence);
 }
 
 LCCaptureManager::~LCCaptureManager() {

@@ -144,9 +144,9 @@ void LCCaptureManager::captureOutputDidOutputSampleBuffer(const std::shared_ptr<
         lastMicAudioDate_.set(
             Date{platform_.clock.now().secondsSince1970 + sample->duration().seconds()});
         micInterruptionPresentationTimeStamp_.set(add(sample->presentationTime(), sample->duration()));
-        if (const SampleHandler handler = microphoneOutputHandler()) handler(sample);
+        microphoneOutputHandler_.call(sample);
     } else if (output == captureSessionVideoDataOutput()) {
-        if (const SampleHandler handler = cameraOutputHandler()) handler(sample);
+        cameraOutputHandler_.call(sample);
     }
 }
 
@@ -168,8 +168,7 @@ void LCCaptureManager::checkAndHandleMicInterruption() {
     if (!(gap > 0.0)) return;
     log_.line("gap since last mic tap, filling with empty sample buffer");
     const SampleRef silence = makeSilence(gap, micInterruptionPresentationTimeStamp());
-    const SampleHandler handler = microphoneOutputHandler();
-    if (silence && handler) handler(silence);
+    if (silence) microphoneOutputHandler_.call(silence);
 }
 
 SampleRef LCCaptureManager::makeSilence(double seconds, MediaTime presentation) const {

@@ -13,11 +13,13 @@
 #include "base/Date.h"
 #include "base/Guarded.h"
 #include "base/Identifiers.h"
+#include "capture/SharedSampleHandler.h"
 #include "platform/AudioInputQueue.h"
 #include "platform/DeviceCapture.h"
 #include "platform/Platform.h"
 #include "writer/media/MediaTime.h"
 #include "writer/media/SampleBuffer.h"
+#include "writer/media/SampleMaker.h"
 
 namespace lumacast {
 
@@ -59,7 +61,7 @@ class LCCaptureManager : public CaptureDevices,
                          public CaptureSessionObserver,
                          public std::enable_shared_from_this<LCCaptureManager> {
 public:
-    using SampleHandler = std::function<void(const SampleRef&)>;
+    using SampleHandler = SharedSampleHandler::Handler;
     using Handler = std::function<void()>;
 
     /// `init`, and what `sharedManager` adds: watches the shared audio session, and makes it one that plays, records and
@@ -211,7 +213,8 @@ private:
     const std::shared_ptr<SerialQueue> audioDispatchQueue_, sessionSampleBufferQueue_;
     std::unique_ptr<AudioSession::Registration> interruptions_;
 
-    Guarded<SampleHandler> appAudioOutputHandler_;
+    SharedSampleHandler appAudioOutputHandler_;
+    SampleMaker tappedSamples_;
     Guarded<Handler> appTapDidStartHandler_;
     Guarded<std::shared_ptr<AudioRecorderState>> audioRecorderQueue_;
     std::vector<std::weak_ptr<AudioRecorderState>> formerTaps_;  ///< may still run; of the audio capture queue alone
@@ -225,7 +228,7 @@ private:
     Guarded<std::shared_ptr<DeviceCaptureSession>> captureSession_;
     Guarded<std::shared_ptr<CaptureInput>> captureDeviceAudioInput_, captureDeviceVideoInput_;
     Guarded<std::shared_ptr<CaptureOutput>> captureSessionAudioDataOutput_, captureSessionVideoDataOutput_;
-    Guarded<SampleHandler> microphoneOutputHandler_, cameraOutputHandler_;
+    SharedSampleHandler microphoneOutputHandler_, cameraOutputHandler_;
     Guarded<Handler> micDidStartHandler_;
     std::atomic<std::int64_t> cameraPosition_{0};
     Guarded<std::shared_ptr<void>> avPreviewLayer_;

@@ -4,22 +4,22 @@
 
 namespace lumacast {
 
+SampleBuffer::SampleBuffer(Key, PixelBuffer image, MediaTime presentation, MediaTime duration)
+    : format_{MediaType::Video, {}},
+      timing_{duration, presentation, kInvalidMediaTime},
+      sampleCount_(1),
+      image_(std::move(image)) {}
+
+SampleBuffer::SampleBuffer(Key, const AudioFormat& format, std::shared_ptr<Data> data, std::int64_t sampleCount,
+                           const SampleTiming& timing)
+    : format_{MediaType::Audio, format}, timing_(timing), sampleCount_(sampleCount), data_(std::move(data)) {}
+
 SampleRef SampleBuffer::makeVideo(PixelBuffer image, MediaTime presentation, MediaTime duration) {
-    const auto sample = std::make_shared<SampleBuffer>(Key());
-    sample->format_.type = MediaType::Video;
-    sample->timing_ = {duration, presentation, kInvalidMediaTime};
-    sample->sampleCount_ = 1;
-    sample->image_ = std::move(image);
-    return sample;
+    return std::make_shared<SampleBuffer>(Key(), std::move(image), presentation, duration);
 }
 
 SampleRef SampleBuffer::makeAudio(const AudioFormat& format, Data data, std::int64_t sampleCount, SampleTiming timing) {
-    const auto sample = std::make_shared<SampleBuffer>(Key());
-    sample->format_ = {MediaType::Audio, format};
-    sample->timing_ = timing;
-    sample->sampleCount_ = sampleCount;
-    sample->data_ = std::make_shared<Data>(std::move(data));
-    return sample;
+    return std::make_shared<SampleBuffer>(Key(), format, std::make_shared<Data>(std::move(data)), sampleCount, timing);
 }
 
 SampleRef SampleBuffer::copyWithTiming(std::vector<SampleTiming> timing) const {

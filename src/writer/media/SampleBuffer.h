@@ -38,12 +38,15 @@ using SampleRef = std::shared_ptr<const SampleBuffer>;
 /// One video frame or a run of audio packets. Immutable, but for overwriteDataWithZero.
 class SampleBuffer {
 public:
-    /// For the makers below: everybody else gets a reference.
+    /// For the makers below and SampleMaker: everybody else gets a reference.
     class Key {
         friend class SampleBuffer;
+        friend class SampleMaker;
         Key() = default;
     };
-    explicit SampleBuffer(Key) {}
+    SampleBuffer(Key, PixelBuffer image, MediaTime presentation, MediaTime duration);
+    SampleBuffer(Key, const AudioFormat& format, std::shared_ptr<Data> data, std::int64_t sampleCount,
+                 const SampleTiming& timing);
 
     /// A video frame. `decode` is left invalid.
     static SampleRef makeVideo(PixelBuffer image, MediaTime presentation, MediaTime duration);
