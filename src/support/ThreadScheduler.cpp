@@ -11,6 +11,15 @@ namespace lumacast {
 
 namespace {
 
+class TaskJob final : public ThreadPool::Job {
+public:
+    explicit TaskJob(Task task) : task_(std::move(task)) {}
+    void run() override { task_(); }
+
+private:
+    const Task task_;
+};
+
 /// Longer than any process lives, and far from the end of the clock's range.
 constexpr std::chrono::nanoseconds kLongestWait = std::chrono::hours(24 * 365 * 10);
 
@@ -91,6 +100,8 @@ ThreadScheduler::~ThreadScheduler() {
     timers_.reset();
     pool_->finish();
 }
+
+void ThreadScheduler::Queue::async(Task task) { pool_.submit(priority_, std::make_shared<TaskJob>(std::move(task))); }
 
 std::shared_ptr<SerialQueue> ThreadScheduler::serialQueue(std::string label) {
     return std::make_shared<ThreadSerialQueue>(std::move(label), pool_);

@@ -36,7 +36,7 @@ private:
     class Queue final : public GlobalQueue {
     public:
         Queue(ThreadPool& pool, QueuePriority priority) : pool_(pool), priority_(priority) {}
-        void async(Task task) override { pool_.submit(priority_, std::move(task)); }
+        void async(Task task) override;
 
     private:
         ThreadPool& pool_;

@@ -26,7 +26,7 @@ void ThreadPool::finish() {
     }
 }
 
-void ThreadPool::submit(QueuePriority priority, Task job) {
+void ThreadPool::submit(QueuePriority priority, std::shared_ptr<Job> job) {
     std::list<std::thread> ended;
     {
         const std::lock_guard lock(mutex_);
@@ -57,9 +57,9 @@ void ThreadPool::endWaiting() {
     --waiting_;
 }
 
-Task ThreadPool::takeJob() {
-    std::deque<Task>& from = jobs_.empty() ? backgroundJobs_ : jobs_;
-    Task job = std::move(from.front());
+std::shared_ptr<ThreadPool::Job> ThreadPool::takeJob() {
+    auto& from = jobs_.empty() ? backgroundJobs_ : jobs_;
+    auto job = std::move(from.front());
     from.pop_front();
     return job;
 }
@@ -88,10 +88,10 @@ void ThreadPool::work(std::list<std::thread>::iterator self) {
             if (!woken) break;
             continue;
         }
-        Task job = takeJob();
+        auto job = takeJob();
         lock.unlock();
-        job();
-        job = nullptr;
+        job->run();
+        job.reset();
         lock.lock();
     }
     workerIds_.erase(std::this_thread::get_id());

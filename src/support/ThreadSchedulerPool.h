@@ -32,7 +32,13 @@ public:
     /// when every job has ended: a job that waits for ever keeps it.
     void finish();
 
-    void submit(QueuePriority priority, Task job);
+    /// What a worker runs, once for each time that it is submitted.
+    class Job {
+    public:
+        virtual ~Job() = default;
+        virtual void run() = 0;
+    };
+    void submit(QueuePriority priority, std::shared_ptr<Job> job);
 
     /// Around every wait of a lane. A caller that is no worker of this pool is left alone.
     class Waiting {
@@ -56,15 +62,15 @@ private:
     bool beginWaiting();
     void endWaiting();
     bool hasJob() const { return !jobs_.empty() || !backgroundJobs_.empty(); }
-    Task takeJob();
+    std::shared_ptr<Job> takeJob();
     void growIfNeeded();
     void work(std::list<std::thread>::iterator self);
 
     const ThreadPoolLimits limits_;
     mutable std::mutex mutex_;
     std::condition_variable wake_;
-    std::deque<Task> jobs_;
-    std::deque<Task> backgroundJobs_;
+    std::deque<std::shared_ptr<Job>> jobs_;
+    std::deque<std::shared_ptr<Job>> backgroundJobs_;
     std::list<std::thread> workers_;
     std::list<std::thread> ended_;  ///< to be joined by whoever comes next
     std::unordered_set<std::thread::id> workerIds_;

@@ -17,7 +17,8 @@ constexpr int kTasksPerTurn = 64;
 
 }  // namespace
 
-struct ThreadSerialQueue::State : std::enable_shared_from_this<State> {
+/// Is itself what a worker runs for it: asking for one takes no memory.
+struct ThreadSerialQueue::State final : ThreadPool::Job, std::enable_shared_from_this<State> {
     explicit State(std::shared_ptr<ThreadPool> threadPool) : pool(std::move(threadPool)) {}
 
     const std::shared_ptr<ThreadPool> pool;
@@ -27,7 +28,7 @@ struct ThreadSerialQueue::State : std::enable_shared_from_this<State> {
     std::atomic<std::thread::id> holder;
 
     void askForWorker() {
-        pool->submit(QueuePriority::Default, [self = shared_from_this()] { self->drain(); });
+        pool->submit(QueuePriority::Default, shared_from_this());
     }
 
     /// The holder's turn is over: hands the queue on, or leaves it idle.
@@ -49,7 +50,7 @@ struct ThreadSerialQueue::State : std::enable_shared_from_this<State> {
         askForWorker();
     }
 
-    void drain() {
+    void run() override {
         holder = std::this_thread::get_id();
         for (int count = 0; count < kTasksPerTurn; ++count) {
             Task task;
