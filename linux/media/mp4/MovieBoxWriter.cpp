@@ -1,6 +1,7 @@
 #include "linux/media/mp4/MovieBoxWriter.h"
 
 #include <algorithm>
+#include <array>
 #include <limits>
 #include <utility>
 
@@ -267,6 +268,7 @@ MovieError MovieBoxWriter::writeFragment() {
                           noteOf(kind, options_.presentationStart.has_value(), tracks_));
     }
     std::vector<TrackFragment> parts;
+    parts.reserve(tracks_.size());
     for (const MovieTrack& track : tracks_) {
         if (track.pendingCount > 0) {
             const auto decodeTime = static_cast<std::uint64_t>(track.pendingFirstPts + track.fragmentOffset);
@@ -299,9 +301,8 @@ bool MovieBoxWriter::showFragment(std::uint64_t headerOffset) {
     if (options_.purpose == MoviePurpose::copy) {
         return true;
     }
-    BoxBuffer type;
-    type.code("moof");  // all of the fragment is there after the sync: readers may see it
-    return sink_.sync() && sink_.overwrite(headerOffset + kBoxTypeOffset, type.view());
+    constexpr std::array<std::uint8_t, 4> kType{'m', 'o', 'o', 'f'};  // it is whole after the sync: readers may see it
+    return sink_.sync() && sink_.overwrite(headerOffset + kBoxTypeOffset, kType);
 }
 
 MovieError MovieBoxWriter::replaceFragmentsByIndex() {
