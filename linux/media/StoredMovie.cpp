@@ -4,6 +4,7 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <utility>
@@ -26,6 +27,10 @@ bool isSameFile(const ListedFile& listed, const struct stat& status) {
 
 bool isSameMoment(const struct timespec& a, const struct timespec& b) {
     return a.tv_sec == b.tv_sec && a.tv_nsec == b.tv_nsec;
+}
+
+bool isLater(const struct timespec& a, const struct timespec& b) {
+    return a.tv_sec != b.tv_sec ? a.tv_sec > b.tv_sec : a.tv_nsec > b.tv_nsec;
 }
 
 /// Follows no link, and waits for nobody, as the opening of a pipe would.
@@ -110,20 +115,24 @@ std::optional<MovieFolder> MovieFolder::open(const std::string& directory) {
 }
 
 std::vector<ListedFile> MovieFolder::list(std::size_t most) const {
-    std::vector<ListedFile> files;
+    const auto isNewer = [](const ListedFile& a, const ListedFile& b) { return isLater(a.changed, b.changed); };
+    std::vector<ListedFile> files;  // a heap, the oldest first
     // A description of its own, which begins at the first name.
     FileDescriptor names(calls::openAt(folder_.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     DIR* const entries = names ? ::fdopendir(names.get()) : nullptr;
     if (!entries) return files;
     (void)names.release();  // it is closed with the stream
-    while (files.size() < most) {
-        const dirent* const entry = ::readdir(entries);
-        if (!entry) break;
+    while (const dirent* const entry = ::readdir(entries)) {
         struct stat status = {};
-        if (::fstatat(folder_.get(), entry->d_name, &status, AT_SYMLINK_NOFOLLOW) == 0 && isOwnRegularFile(status))
-            files.push_back({entry->d_name, status.st_dev, status.st_ino, status.st_ctim});
+        if (::fstatat(folder_.get(), entry->d_name, &status, AT_SYMLINK_NOFOLLOW) != 0 || !isOwnRegularFile(status)) continue;
+        files.push_back({entry->d_name, status.st_dev, status.st_ino, status.st_ctim});
+        std::push_heap(files.begin(), files.end(), isNewer);
+        if (files.size() <= most) continue;
+        std::pop_heap(files.begin(), files.end(), isNewer);
+        files.pop_back();
     }
     ::closedir(entries);
+    std::sort_heap(files.begin(), files.end(), isNewer);
     return files;
 }
 

@@ -61,7 +61,7 @@ public:
     /// Reached as the file system role reaches it; none when it is not there or is somebody else's.
     static std::optional<MovieFolder> open(const std::string& directory);
 
-    /// This user's regular files in it, `most` at most.
+    /// This user's regular files in it, the last ones changed first; where there are more than `most`, those only.
     std::vector<ListedFile> list(std::size_t most) const;
 
     /// One of them for a look; null when it is no regular file of this user's any more.

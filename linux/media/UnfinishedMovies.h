@@ -19,7 +19,7 @@ namespace lumacast::media {
 /// said once, and the next start tries again.
 class UnfinishedMovies final {
 public:
-    /// Files that are looked at, at most: the rest waits for the next start.
+    /// Files that are looked at, at most: the last ones changed, among which is what a crash has left.
     static constexpr std::size_t kMostFiles = 4096;
 
     /// `log` must outlive it.

@@ -192,6 +192,17 @@ TEST_F(UnfinishedMovies, StayAsTheyAreOnAFullDiskWhichIsSaidOnce) {
     for (const char* name : {"a.mp4", "b.mp4", "c.mp4"}) EXPECT_EQ(nameOf(look(name).state), "recovered");
 }
 
+// A broadcast whose extension takes nothing leaves a clip every few seconds.
+TEST_F(UnfinishedMovies, AreFoundAmongMoreFilesThanAreLookedAt) {
+    constexpr int kCut = 20;
+    for (std::size_t i = 0; i < 2 * media::UnfinishedMovies::kMostFiles; ++i)
+        scratch.write("LCMovie_" + std::to_string(i) + ".mp4", "");
+    const std::string part = recording();
+    for (int i = 0; i < kCut; ++i) scratch.write("cut" + std::to_string(i) + ".mp4", part);
+    start();
+    for (int i = 0; i < kCut; ++i) EXPECT_EQ(nameOf(look("cut" + std::to_string(i) + ".mp4").state), "recovered") << i;
+}
+
 TEST_F(UnfinishedMovies, ThatCanNotBeReadBackAreNamed) {
     std::string damaged = recording();
     const std::size_t second = damaged.find("moof", damaged.find("moof") + 1);
