@@ -3,6 +3,7 @@
 #include <pthread.h>
 #include <signal.h>
 
+#include <cerrno>
 #include <system_error>
 
 #include "linux/media/mp4/MovieRecovery.h"
@@ -10,6 +11,12 @@
 #include "linux/system/SystemError.h"
 
 namespace lumacast::media {
+
+namespace {
+
+bool isNoRoom(int error) { return error == ENOSPC || error == EDQUOT || error == EFBIG; }
+
+}  // namespace
 
 UnfinishedMovies::~UnfinishedMovies() {
     cancelled_.store(true, std::memory_order_relaxed);
@@ -68,7 +75,7 @@ bool UnfinishedMovies::handle(const MovieFolder& folder, const ListedFile& liste
             movie->restoreTimes();
             log_.error("an earlier run left %s unfinished, and its index can't be written: %s", listed.name,
                        describe(systemError(movie->error())));
-            return false;
+            return !isNoRoom(movie->error());
         case mp4::Recovery::damaged:
         case mp4::Recovery::tooLong:
             log_.error("an earlier run left %s unfinished, and it can't be read back: %s", listed.name,

@@ -16,7 +16,8 @@ namespace lumacast::media {
 /// is. A movie keeps its modification date, so that it ages from the crash on.
 ///
 /// One line of the log for each; nothing where there is nothing. On a full disk the movies stay as they are, which is
-/// said once, and the next start tries again.
+/// said once, and the next start tries again. So it does with one whose place on the disk takes nothing; the others have
+/// their turn.
 class UnfinishedMovies final {
 public:
     /// Files that are looked at, at most: the last ones changed, among which is what a crash has left.
