@@ -17,6 +17,7 @@
 #include "client/lumacastctl/ExitStatus.h"
 #include "client/lumacastctl/Text.h"
 #include "linux/admin/LinuxAdminService.h"
+#include "linux/calls/FolderSync.h"
 #include "linux/system/FileDescriptor.h"
 
 namespace lumacast::ctl {
@@ -133,6 +134,19 @@ std::string recordLine(const RunningRecording& recording) {
     return line;
 }
 
+namespace {
+
+/// Brings the copy onto the disk, its bytes and its name: the other one may go then. 0 or the error number.
+int syncCopy(const std::string& path) {
+    const FileDescriptor copy(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+    if (!copy || ::fsync(copy.get()) != 0) return errno;
+    const std::string around = std::filesystem::path(path).parent_path().string();
+    const FileDescriptor folder(::open(around.empty() ? "." : around.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    return folder ? syncFolder(folder.get()) : errno;
+}
+
+}  // namespace
+
 std::optional<std::string> moveMovie(const std::string& from, const std::string& to) {
     if (::renameat2(AT_FDCWD, from.c_str(), AT_FDCWD, to.c_str(), RENAME_NOREPLACE) == 0) return std::nullopt;
     if (errno != EXDEV && errno != EINVAL) return std::string(std::strerror(errno));
@@ -143,11 +157,9 @@ std::optional<std::string> moveMovie(const std::string& from, const std::string&
         if (failure != std::errc::file_exists) std::filesystem::remove(to, failure);
         return reason;
     }
-    const FileDescriptor copy(::open(to.c_str(), O_RDONLY | O_CLOEXEC));
-    if (!copy || ::fsync(copy.get()) != 0) {
-        const std::string reason = std::strerror(errno);
+    if (const int error = syncCopy(to); error != 0) {
         std::filesystem::remove(to, failure);
-        return reason;
+        return std::string(std::strerror(error));
     }
     std::filesystem::remove(from, failure);
     return std::nullopt;
