@@ -63,6 +63,15 @@ std::vector<std::string> judgeScene(const std::string& movie, std::vector<std::u
     return wrong;
 }
 
+/// What is wrong with a movie that was recorded to its end: it has its index, and nothing is left of its fragments.
+void judgeFinished(const std::string& movie, std::vector<std::string>& wrong) {
+    const auto report = checkers::checkBoxes(movie);
+    if (report.topLevel != std::vector<std::string>{"ftyp", "mdat", "moov"})
+        wrong.push_back(movie + ": it was not finished");
+    else
+        for (const auto& finding : report.findings) wrong.push_back(movie + ": " + finding);
+}
+
 /// A desktop that does not say within 100 ms who is in front, or a disk how much room it has within 40, refuses a start: on a busy
 /// machine one asks again. A daemon that can't record any more never can.
 std::vector<std::string> untilGood(const std::function<std::vector<std::string>()>& attempt) {
@@ -234,6 +243,7 @@ private:
         for (const std::string& movie : made) {
             std::vector<std::uint32_t> numbers;
             for (auto& finding : judgeScene(movie, numbers)) wrong.push_back(std::move(finding));
+            judgeFinished(movie, wrong);
             pictures += numbers.size();
         }
         if (pictures < kLeast) wrong.push_back("a recording without fault has " + std::to_string(pictures) + " pictures only");
@@ -339,6 +349,7 @@ public:
         if (heard.start != "ok" || heard.stop != "ok")
             wrong.push_back("a recording without fault: start " + heard.start + ", stop " + heard.stop);
         if (movies().empty()) wrong.push_back("a recording without fault left no movie");
+        for (const std::string& movie : movies()) judgeFinished(movie, wrong);
         return wrong;
     }
     void clear() override {
@@ -399,7 +410,9 @@ public:
     }
     std::vector<std::string> judgeWhole(const Heard& heard) override {
         if (heard.stop != "ok") return {"a save without fault: " + heard.stop};
-        return judgeAfterFault(heard, std::nullopt);
+        auto wrong = judgeAfterFault(heard, std::nullopt);
+        for (const std::string& movie : world_.library()) judgeFinished(movie, wrong);
+        return wrong;
     }
     void clear() override {
         Scenario::clear();
