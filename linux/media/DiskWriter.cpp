@@ -33,17 +33,18 @@ std::optional<int> DiskWriter::waitForCreation(std::chrono::milliseconds limit) 
 
 bool DiskWriter::append(std::span<const std::uint8_t> bytes) {
     Operation operation{Operation::Kind::Write, end_, {bytes.begin(), bytes.end()}};
+    const When when = end_ == 0 ? When::Now : When::WithTheNext;  // by its beginning the file is known as a movie
     end_ += bytes.size();
-    return submit(std::move(operation));
+    return submit(std::move(operation), when);
 }
 
 bool DiskWriter::overwrite(std::uint64_t offset, std::span<const std::uint8_t> bytes) {
-    return submit({Operation::Kind::Write, offset, {bytes.begin(), bytes.end()}});
+    return submit({Operation::Kind::Write, offset, {bytes.begin(), bytes.end()}}, When::Now);
 }
 
-bool DiskWriter::sync() { return submit({Operation::Kind::Sync, 0, {}}); }
+bool DiskWriter::sync() { return submit({Operation::Kind::Sync, 0, {}}, When::Now); }
 
-bool DiskWriter::submit(Operation operation) {
+bool DiskWriter::submit(Operation operation, When when) {
     std::unique_lock lock(mutex_);
     // One operation larger than the buffer passes when nothing else waits.
     changed_.wait(lock, [&] {
@@ -52,12 +53,16 @@ bool DiskWriter::submit(Operation operation) {
     if (error_ != 0 || closing_) return false;
     waitingBytes_ += operation.bytes.size();
     waiting_.push_back(std::move(operation));
+    if (when == When::WithTheNext && waitingBytes_ < kHeldBytes) return true;
+    isDue_ = true;
     changed_.notify_all();
     return true;
 }
 
 int DiskWriter::drain() {
     std::unique_lock lock(mutex_);
+    isDue_ = true;
+    changed_.notify_all();
     changed_.wait(lock, [this] { return error_ != 0 || (waiting_.empty() && !busy_); });
     return error_;
 }
@@ -93,8 +98,9 @@ void DiskWriter::work(MovieFile& file) {
     std::unique_lock lock(mutex_);
     for (;;) {
         busy_ = false;
+        if (waiting_.empty()) isDue_ = false;
         changed_.notify_all();
-        changed_.wait(lock, [this] { return closing_ || !waiting_.empty(); });
+        changed_.wait(lock, [this] { return closing_ || (isDue_ && !waiting_.empty()); });
         if (waiting_.empty()) return;
         const Operation operation = std::move(waiting_.front());
         waiting_.pop_front();

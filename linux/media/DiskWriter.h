@@ -26,6 +26,9 @@ public:
     /// Bytes that may wait for the disk: more than ten seconds at the highest bit rate a window gets by itself.
     static constexpr std::size_t kBufferBytes = 16u << 20u;
 
+    /// Bytes that wait until the whole fragment is there, so that the thread wakes once for it.
+    static constexpr std::size_t kHeldBytes = 1u << 20u;
+
     /// Begins creating the file. `failed` is called once, on the disk's thread, when anything goes wrong. Where the
     /// system has no thread nothing is created, and waitForCreation answers EAGAIN.
     DiskWriter(std::shared_ptr<MovieFiles> files, std::string path, std::function<void(int error)> failed);
@@ -37,6 +40,8 @@ public:
     /// Waits for the creation, at most `limit`: its error's number, 0 for success, none when the disk has not answered.
     std::optional<int> waitForCreation(std::chrono::milliseconds limit);
 
+    /// But for the file's beginning held for a while: until there is much of it, or the next overwrite, sync, drain or
+    /// close.
     [[nodiscard]] bool append(std::span<const std::uint8_t> bytes) override;
     [[nodiscard]] bool overwrite(std::uint64_t offset, std::span<const std::uint8_t> bytes) override;
     [[nodiscard]] bool sync() override;
@@ -61,7 +66,8 @@ private:
         std::vector<std::uint8_t> bytes;
     };
 
-    bool submit(Operation operation);
+    enum class When { Now, WithTheNext };
+    bool submit(Operation operation, When when);
     void work(MovieFile& file);
     void run(const std::shared_ptr<MovieFiles>& files, const std::string& path);
     int perform(MovieFile& file, const Operation& operation);
@@ -80,6 +86,7 @@ private:
     bool busy_ = true;  ///< at first with the creation
     bool created_ = false;
     bool closing_ = false;
+    bool isDue_ = false;  ///< what waits is to be done, not held
     int error_ = 0;
 
     std::thread thread_;  ///< last: it uses the rest

@@ -1,6 +1,7 @@
 #include "linux/media/MoviePipeline.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <ctime>
 #include <utility>
 
@@ -20,7 +21,7 @@ mp4::MovieOptions options() {
 
 }  // namespace
 
-MoviePipeline::MoviePipeline(DiskWriter& disk) : movie_(disk, options()) {}
+MoviePipeline::MoviePipeline(DiskWriter& disk) : disk_(disk), movie_(disk, options()) {}
 
 std::variant<std::unique_ptr<MoviePipeline>, Error> MoviePipeline::open(const std::vector<TrackPlan>& tracks,
                                                                         EncoderChoice& choice, DiskWriter& disk) {
@@ -43,20 +44,27 @@ std::variant<std::unique_ptr<MoviePipeline>, Error> MoviePipeline::open(const st
 }
 
 std::optional<Error> MoviePipeline::add(std::size_t track, SampleRef sample, std::int64_t nanoseconds) {
+    using Content = FlushPace::Content;
     std::optional<Error> error;
     if (auto* const pictures = std::get_if<std::unique_ptr<PictureTrack>>(&tracks_[track])) {
         error = (*pictures)->add(std::move(sample), nanoseconds);
+        pace_.added((*pictures)->hasNews() ? Content::News : Content::Repeat);
     } else {
-        error = std::get<std::unique_ptr<SoundTrack>>(tracks_[track])->add(*sample, nanoseconds);
+        const auto& sound = std::get<std::unique_ptr<SoundTrack>>(tracks_[track]);
+        error = sound->add(*sample, nanoseconds);
+        pace_.added(sound->isSilent() ? Content::Silence : Content::News);
     }
-    if (!flushTime_) flushTime_ = lastFlush_ + kFlushInterval;
     return error;
 }
 
 std::optional<Error> MoviePipeline::flush() {
-    lastFlush_ = std::chrono::steady_clock::now();
-    flushTime_.reset();
-    return movieError(movie_.flushFragment());
+    const bool needsSync = pace_.newsIsUnsure();
+    pace_.flushed(std::chrono::steady_clock::now());
+    const std::uint32_t fragments = movie_.fragmentCount();
+    if (const auto error = movieError(movie_.flushFragment())) return error;
+    // Where nothing waited, what shows the fragment before may not be on the disk yet.
+    if (needsSync && movie_.fragmentCount() == fragments && !disk_.sync()) return systemError(EIO);
+    return std::nullopt;
 }
 
 std::optional<Error> MoviePipeline::finish(const End& end) {

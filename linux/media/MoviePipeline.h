@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "linux/media/DiskWriter.h"
+#include "linux/media/FlushPace.h"
 #include "linux/media/PictureTrack.h"
 #include "linux/media/SoundTrack.h"
 
@@ -23,11 +24,7 @@ struct TrackPlan {
 /// From samples to the movie file: conversion, encoders and box writer of one movie. Belongs to its encoder thread.
 class MoviePipeline final {
 public:
-    using SteadyTime = std::chrono::steady_clock::time_point;
-
-    /// What was encoded is handed to the disk at most this long after (wall time). Together with the encoder's time it
-    /// keeps a killed movie playable up to its last second, however rare the pictures are.
-    static constexpr std::chrono::milliseconds kFlushInterval{500};
+    using SteadyTime = FlushPace::Moment;
 
     /// Opens the encoders and begins the file. `disk` must outlive it.
     static std::variant<std::unique_ptr<MoviePipeline>, Error> open(const std::vector<TrackPlan>& tracks,
@@ -36,8 +33,9 @@ public:
     /// Adds a sample of the track with this number that begins at `nanoseconds` after the movie's zero.
     std::optional<Error> add(std::size_t track, SampleRef sample, std::int64_t nanoseconds);
 
-    /// When flush must be called next; none while nothing waits.
-    std::optional<SteadyTime> flushTime() const { return flushTime_; }
+    /// When flush must be called next; none while nothing waits. Keeps a killed movie playable up to its last second,
+    /// however rare the pictures are.
+    std::optional<SteadyTime> flushTime() const { return pace_.due(); }
     std::optional<Error> flush();
 
     /// When a movie ends, nanoseconds after its zero.
@@ -52,10 +50,10 @@ public:
 private:
     explicit MoviePipeline(DiskWriter& disk);
 
+    DiskWriter& disk_;
     mp4::MovieBoxWriter movie_;
     std::vector<std::variant<std::unique_ptr<PictureTrack>, std::unique_ptr<SoundTrack>>> tracks_;
-    std::optional<SteadyTime> flushTime_;
-    SteadyTime lastFlush_{};
+    FlushPace pace_;
 };
 
 }  // namespace lumacast::media

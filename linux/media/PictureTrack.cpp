@@ -46,8 +46,10 @@ std::optional<Error> PictureTrack::add(SampleRef sample, std::int64_t nanosecond
     if (!sample->image() || !sample->image()->plane()) return std::nullopt;
     const std::int64_t stamp = lastStamp_ ? (nanoseconds + 500) / 1000 : 0;
     if (lastStamp_ && stamp <= *lastStamp_) return std::nullopt;
+    const std::uint64_t converted = converter_.convertedPixels();
     const std::shared_ptr<I420Picture> picture = converter_.convert(*sample->image()->plane());
     if (!picture) return std::nullopt;
+    hasNews_ = converter_.convertedPixels() != converted;
     const std::int64_t stated = nanosecondsOf(sample->duration()).value_or(0);
     sample.reset();
 

@@ -26,6 +26,8 @@ public:
     std::optional<Error> add(SampleRef sample, std::int64_t nanoseconds);
     std::optional<Error> finish();
 
+    /// Whether the picture that was added last showed anything new.
+    bool hasNews() const { return hasNews_; }
     /// When the last picture ends if nobody knows better, nanoseconds after zero.
     std::int64_t naturalEnd() const { return naturalEnd_; }
 
@@ -41,6 +43,7 @@ private:
     KeyFrameClock keyFrames_;
     std::optional<std::int64_t> lastStamp_;  ///< ticks of VideoEncoder::kTimescale
     std::int64_t naturalEnd_ = 0;
+    bool hasNews_ = false;
     std::vector<std::uint8_t> bytes_;  ///< the sample under construction, kept for its memory
     std::optional<Error> error_;
 };

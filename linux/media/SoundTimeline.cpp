@@ -13,6 +13,12 @@ constexpr double kDriftSeconds = 0.002;
 constexpr double kSmoothing = 0.05;
 constexpr int kCorrectionSeconds = 2;
 
+bool isSilence(const StereoSound& sound) {
+    const auto isZero = [](float sample) { return sample == 0.0f; };
+    return std::all_of(sound.planes[0].begin(), sound.planes[0].end(), isZero) &&
+           std::all_of(sound.planes[1].begin(), sound.planes[1].end(), isZero);
+}
+
 }  // namespace
 
 bool SoundTimeline::add(const AudioFormat& format, std::span<const std::uint8_t> bytes, std::size_t frameCount,
@@ -41,6 +47,7 @@ bool SoundTimeline::add(const StereoSound& sound, int rate, std::int64_t nanosec
 
 /// The buffer at hand.
 void SoundTimeline::layOut(std::int64_t nanoseconds) {
+    silentFrames_ = isSilence(incoming_) ? silentFrames_ + static_cast<std::int64_t>(incoming_.frames()) : 0;
     place(av_rescale_rnd(nanoseconds, sampleRate_, 1'000'000'000, AV_ROUND_NEAR_INF));
     if (incoming_.frames() > 0) resample(incoming_);
     take_();

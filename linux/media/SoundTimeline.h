@@ -33,6 +33,8 @@ public:
 
     /// Where the track's sound begins, frames after the movie's zero; none before the first sound.
     std::optional<std::int64_t> origin() const { return origin_; }
+    /// How many frames were added since one that was not silent, at their own rate. Holes don't count.
+    std::int64_t silentFrames() const { return silentFrames_; }
     /// What is laid out and not taken yet.
     StereoSound& sound() { return sound_; }
 
@@ -59,6 +61,7 @@ private:
     double smoothedLate_ = 0;         ///< frames by which stamps run ahead of the sound, averaged
     std::int64_t nextCorrection_ = 0; ///< frames after zero before which the resampler's speed is left alone
     bool corrects_ = false;
+    std::int64_t silentFrames_ = 0;
 };
 
 }  // namespace lumacast::media

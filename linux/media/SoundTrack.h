@@ -27,7 +27,13 @@ public:
     std::optional<Error> add(const StereoSound& sound, int rate, std::int64_t nanoseconds);
     std::optional<Error> finish();
 
+    /// Whether nothing that was added can be heard in what is not encoded yet, or has just been.
+    bool isSilent() const { return timeline_.silentFrames() >= kSilentFrames; }
+
 private:
+    /// More than the encoder and the resampler hold back.
+    static constexpr std::int64_t kSilentFrames = 8192;
+
     SoundTrack(const AudioTrackSettings& settings, std::unique_ptr<AudioEncoder> encoder, mp4::MovieBoxWriter& movie);
     enum class Rest { Keep, Encode };
     void encode(Rest rest);

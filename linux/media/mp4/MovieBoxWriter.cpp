@@ -222,8 +222,9 @@ MovieError MovieBoxWriter::check(const MovieTrack& track, const SampleInfo& info
     return samples_ < kMaxSamples ? MovieError::none : MovieError::tooLong;
 }
 
-// A fragment is closed before a sample that would make it too long or too large, and before a key frame once it is half
-// as long as it may be, so that fragments mostly begin with key frames.
+// A fragment is closed before a sample that would make its track's part too long or all of it too large, and before a key
+// frame once its pictures are half as long as they may be, so that fragments mostly begin with key frames. Each track is
+// measured by itself: sound may come later than the pictures that it belongs to.
 bool MovieBoxWriter::closesFragment(const MovieTrack& track, const SampleInfo& info, std::size_t bytes) const {
     if (pendingBytes_ == 0) {
         return false;
@@ -231,13 +232,11 @@ bool MovieBoxWriter::closesFragment(const MovieTrack& track, const SampleInfo& i
     if (pendingBytes_ + bytes > options_.fragmentBytes) {
         return true;
     }
-    const std::int64_t pts = nanoseconds(info.pts, track.timescale);
-    std::int64_t start = pts;
-    for (const MovieTrack& other : tracks_) {
-        if (other.pendingCount > 0) {
-            start = std::min(start, nanoseconds(other.pendingFirstPts, other.timescale));
-        }
+    if (track.pendingCount == 0) {
+        return false;
     }
+    const std::int64_t pts = nanoseconds(info.pts, track.timescale);
+    const std::int64_t start = nanoseconds(track.pendingFirstPts, track.timescale);
     const auto limit = static_cast<std::int64_t>(options_.fragmentNanoseconds);
     const std::int64_t end = nanoseconds(info.pts + info.duration, track.timescale);
     return pts - start >= limit || end - start > limit || (track.isVideo() && info.isSync && pts - start >= limit / 2);
