@@ -18,6 +18,9 @@ using sound::TapMix;
 constexpr double kPieceSeconds = 0.02;
 /// The same while there is nothing to hear: silence is worth few wake-ups.
 constexpr double kQuietPieceSeconds = 0.2;
+/// And where it may come late. Longer than a still picture stands before it is repeated, so that each picture of a movie
+/// takes along one piece at most; less than the second of sound that a movie's fragment holds.
+constexpr double kLatePieceSeconds = 0.95;
 /// How many buffers are handed over only when full, until one has come back.
 constexpr std::size_t kKeptForLater = 5;
 /// Without a buffer to fill for so long, the stream goes back to the server.
@@ -88,6 +91,11 @@ std::int32_t TapCore::enqueueBuffer(const AudioQueueBufferRef& buffer) {
     return AudioStatus::kSuccess;
 }
 
+void TapCore::allowLateSilence() {
+    const std::lock_guard lock(mutex_);
+    silenceMayBeLate_ = true;
+}
+
 std::int32_t TapCore::freeBuffer(const AudioQueueBufferRef& buffer) {
     const std::lock_guard lock(mutex_);
     if (disposed_) return AudioStatus::kDisposed;
@@ -130,6 +138,9 @@ std::int32_t TapCore::start() {
     if (!hasThread_) hasThread_ = startDetachedThread([self = shared_from_this()] { self->run(); });
     if (!hasThread_) return AudioStatus::kNoResources;
     mix_ = std::make_shared<TapMix>(format_.sampleRate, format_.channelsPerFrame, LinuxClock::currentHostTime());
+    mix_->whenStreamComes([weak = weak_from_this()] {
+        if (const auto self = weak.lock()) self->streamComes();
+    });
     if (!openTapLocked()) return AudioStatus::kNoResources;
     clock_ = services_.clock.captureClock();
     drySince_.reset();
@@ -201,8 +212,16 @@ void TapCore::tellRunning(Lock& lock) {
     lock.lock();
 }
 
+/// On the sound thread: the silence up to now goes before what will be heard.
+void TapCore::streamComes() {
+    const std::lock_guard lock(mutex_);
+    streamCame_ = true;
+    changed_.notify_all();
+}
+
 double TapCore::pieceFramesLocked() const {
-    return format_.sampleRate * (mix_->isQuiet() ? kQuietPieceSeconds : kPieceSeconds);
+    const double quiet = silenceMayBeLate_ ? kLatePieceSeconds : kQuietPieceSeconds;
+    return format_.sampleRate * (mix_->isQuiet() ? quiet : kPieceSeconds);
 }
 
 /// Waits until there is something to fill into a buffer, or a buffer, or less to do.
@@ -216,8 +235,9 @@ void TapCore::rest(Lock& lock) {
             enqueued_.empty() ? 0 : std::min<std::int64_t>(enqueued_.front()->byteSize / format_.bytesPerFrame, piece - 1);
         const std::chrono::steady_clock::time_point moment{
             std::chrono::nanoseconds(mix_->readableFrom(piece - begun).nanoseconds)};
-        changed_.wait_until(lock, moment, [&] { return run_ != run; });
+        changed_.wait_until(lock, moment, [&] { return run_ != run || streamCame_; });
     }
+    streamCame_ = false;
 }
 
 bool TapCore::isDryLocked(HostTime now) const {
@@ -258,6 +278,21 @@ void TapCore::fillLocked() {
             keepLocked(first + done, std::span<const float>(samples_).subspan(skipped, part));
         }
     }
+    endPieceLocked();
+}
+
+/// What has been read is handed over, if there is enough of it for a piece. All of it in few buffers: there may be much
+/// after a stall, or behind a silence.
+void TapCore::endPieceLocked() {
+    if (enqueued_.empty() || (!cameBack_ && enqueued_.size() <= kKeptForLater)) return;
+    // A piece of silence may be longer than a buffer. Its rest is not kept for the next one.
+    const double enough = mix_->isQuiet() ? 1 : format_.sampleRate * kPieceSeconds;
+    if (enqueued_.front()->byteSize / format_.bytesPerFrame >= enough) takeFrontLocked();
+}
+
+void TapCore::takeFrontLocked() {
+    filled_.push_back({std::move(enqueued_.front()), firstStamp_});
+    enqueued_.pop_front();
 }
 
 void TapCore::keepLocked(std::int64_t frame, std::span<const float> samples) {
@@ -276,16 +311,8 @@ void TapCore::keepLocked(std::int64_t frame, std::span<const float> samples) {
         buffer.byteSize += static_cast<std::uint32_t>(frames * format_.bytesPerFrame);
         samples = samples.subspan(frames * channels);
         frame += static_cast<std::int64_t>(frames);
-        if (!isToBeHandedOverLocked(buffer)) continue;
-        filled_.push_back({std::move(enqueued_.front()), firstStamp_});
-        enqueued_.pop_front();
+        if (buffer.bytes.size() - buffer.byteSize < format_.bytesPerFrame) takeFrontLocked();
     }
-}
-
-bool TapCore::isToBeHandedOverLocked(const AudioQueueBuffer& buffer) const {
-    if (buffer.bytes.size() - buffer.byteSize < format_.bytesPerFrame) return true;
-    if (!cameBack_ && enqueued_.size() <= kKeptForLater) return false;
-    return buffer.byteSize / format_.bytesPerFrame >= pieceFramesLocked();
 }
 
 void TapCore::handOver(Lock& lock) {

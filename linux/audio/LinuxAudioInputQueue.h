@@ -25,8 +25,8 @@ struct TapServices {
 };
 
 /// What a queue's owner and its thread share. The thread lives from the first start until dispose; it goes by the clock,
-/// not by the server, and wakes fifty times a second while there are buffers to fill, five times when there has been
-/// nothing to hear for two seconds. Thread-safe.
+/// not by the server, and wakes fifty times a second while there are buffers to fill; when there has been nothing to hear
+/// for two seconds five times, and about once where silence may come late. Thread-safe.
 class TapCore final : public std::enable_shared_from_this<TapCore> {
 public:
     TapCore(TapServices services, const AudioFormat& format, AudioInputQueue::InputCallback callback);
@@ -36,6 +36,7 @@ public:
     std::int32_t maximumOutputPacketSize(std::uint32_t& bytes) const;
     std::int32_t allocateBuffer(std::uint32_t bytes, AudioQueueBufferRef& buffer);
     std::int32_t enqueueBuffer(const AudioQueueBufferRef& buffer);
+    void allowLateSilence();
     std::int32_t freeBuffer(const AudioQueueBufferRef& buffer);
     std::int32_t setIsRunningListener(AudioInputQueue::IsRunningListener listener);
     std::int32_t start();
@@ -62,11 +63,13 @@ private:
     void run();
     void tellRunning(Lock& lock);
     void rest(Lock& lock);
+    void streamComes();
     double pieceFramesLocked() const;
     bool isDryLocked(HostTime now) const;
     void fillLocked();
     void keepLocked(std::int64_t frame, std::span<const float> samples);
-    bool isToBeHandedOverLocked(const AudioQueueBuffer& buffer) const;
+    void endPieceLocked();
+    void takeFrontLocked();
     void handOver(Lock& lock);
 
     const TapServices services_;
@@ -81,6 +84,8 @@ private:
     std::deque<AudioQueueBufferRef> enqueued_;
     std::deque<Filled> filled_;    ///< to be handed over; still the queue's
     bool hasThread_ = false, running_ = false, disposed_ = false, cameBack_ = false;
+    bool silenceMayBeLate_ = false;
+    bool streamCame_ = false;      ///< since the thread looked last
     int changesToTell_ = 0;        ///< of running, to the listener
     std::uint64_t run_ = 0;        ///< counts starts and stops
     std::shared_ptr<CaptureClock> clock_;
@@ -106,6 +111,7 @@ public:
         return core_->allocateBuffer(bytes, buffer);
     }
     std::int32_t enqueueBuffer(const AudioQueueBufferRef& buffer) override { return core_->enqueueBuffer(buffer); }
+    void allowLateSilence() override { core_->allowLateSilence(); }
     std::int32_t freeBuffer(const AudioQueueBufferRef& buffer) override { return core_->freeBuffer(buffer); }
     std::int32_t addIsRunningListener(IsRunningListener listener) override {
         return core_->setIsRunningListener(std::move(listener));

@@ -30,8 +30,11 @@ std::int64_t TapMix::frameAt(HostTime moment) const {
 
 std::shared_ptr<SoundLane> TapMix::addLane() {
     auto lane = std::make_shared<SoundLane>(laneFrames_);
-    const std::lock_guard lock(mutex_);
-    lanes_.push_back(lane);
+    {
+        const std::lock_guard lock(mutex_);
+        lanes_.push_back(lane);
+    }
+    if (streamComes_) streamComes_();
     return lane;
 }
 

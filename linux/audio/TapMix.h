@@ -2,9 +2,11 @@
 // Where a tap's streams meet: each laid out in time by itself, and read together.
 
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <span>
+#include <utility>
 #include <vector>
 
 #include "base/Date.h"
@@ -41,6 +43,9 @@ public:
     HostTime momentOf(std::int64_t frame) const;
     std::int64_t frameAt(HostTime moment) const;
 
+    /// Called on the thread that adds a stream, before anything is written to it, without the lock. To be set before the
+    /// mix is shared.
+    void whenStreamComes(std::function<void()> told) { streamComes_ = std::move(told); }
     /// A new stream; nothing of it is read until it is trusted, but what was written a moment before then is.
     std::shared_ptr<SoundLane> addLane();
     void trust(SoundLane& lane);
@@ -71,6 +76,7 @@ private:
     const std::uint32_t channels_;
     const HostTime start_;
     const std::size_t laneFrames_;
+    std::function<void()> streamComes_;
 
     mutable std::mutex mutex_;
     std::vector<std::shared_ptr<SoundLane>> lanes_;

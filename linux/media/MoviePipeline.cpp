@@ -70,11 +70,14 @@ std::optional<Error> MoviePipeline::flush() {
 std::optional<Error> MoviePipeline::finish(const End& end) {
     std::int64_t lastPictureEnd = 0;
     for (auto& track : tracks_) {
-        const auto error = std::visit([](auto& any) { return any->finish(); }, track);
-        if (error) return error;
+        std::optional<Error> error;
         if (auto* const pictures = std::get_if<std::unique_ptr<PictureTrack>>(&track)) {
+            error = (*pictures)->finish();
             lastPictureEnd = (end.lastPicture.value_or((*pictures)->naturalEnd()) + 500) / 1000;
+        } else {
+            error = std::get<std::unique_ptr<SoundTrack>>(track)->finish(end.lastPicture);
         }
+        if (error) return error;
     }
     return movieError(movie_.finish(lastPictureEnd, end.cut));
 }

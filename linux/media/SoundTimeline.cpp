@@ -57,6 +57,11 @@ void SoundTimeline::finish() {
     if (resampler_) emptyResampler();
 }
 
+void SoundTimeline::extend(std::int64_t nanoseconds, std::int64_t most) {
+    const std::int64_t missing = av_rescale(nanoseconds, sampleRate_, 1'000'000'000) - placed_;
+    if (origin_ && missing <= av_rescale(most, sampleRate_, 1'000'000'000)) fillHole(missing);
+}
+
 bool SoundTimeline::adopt(const AudioFormat& format) {
     if (!isReadable(format)) return false;
     if (resampler_) emptyResampler();

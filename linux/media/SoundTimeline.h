@@ -30,6 +30,8 @@ public:
     bool add(const StereoSound& sound, int rate, std::int64_t nanoseconds);
     /// Adds what the resampler still holds, after the last buffer.
     void finish();
+    /// After finish: adds silence until `nanoseconds` after zero, if that is at most `most` of them.
+    void extend(std::int64_t nanoseconds, std::int64_t most);
 
     /// Where the track's sound begins, frames after the movie's zero; none before the first sound.
     std::optional<std::int64_t> origin() const { return origin_; }

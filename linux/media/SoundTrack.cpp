@@ -5,6 +5,13 @@
 
 namespace lumacast::media {
 
+namespace {
+
+/// How much silence may be missing at the end: a tap's longest piece, and what it is late by.
+constexpr std::int64_t kLatestSilence = 2'000'000'000;
+
+}  // namespace
+
 std::optional<Error> movieError(mp4::MovieError error) {
     switch (error) {
         case mp4::MovieError::none:
@@ -51,9 +58,10 @@ std::optional<Error> SoundTrack::add(const StereoSound& sound, int rate, std::in
     return error_;
 }
 
-std::optional<Error> SoundTrack::finish() {
+std::optional<Error> SoundTrack::finish(std::optional<std::int64_t> end) {
     if (!timeline_.origin()) return error_;
     timeline_.finish();
+    if (end && isSilent()) timeline_.extend(*end, kLatestSilence);
     encode(Rest::Keep);
     total_ = encoder_->primingFrames() + encoded_ + static_cast<std::int64_t>(timeline_.sound().frames());
     encode(Rest::Encode);

@@ -25,7 +25,9 @@ public:
     std::optional<Error> add(const SampleBuffer& sample, std::int64_t nanoseconds);
     /// The same for sound that has been read already, of so many frames a second.
     std::optional<Error> add(const StereoSound& sound, int rate, std::int64_t nanoseconds);
-    std::optional<Error> finish();
+    /// Ends the track. Silence may come late, so where the sound was silent at last it lasts until `end` (nanoseconds after
+    /// zero), unless that is far off.
+    std::optional<Error> finish(std::optional<std::int64_t> end = std::nullopt);
 
     /// Whether nothing that was added can be heard in what is not encoded yet, or has just been.
     bool isSilent() const { return timeline_.silentFrames() >= kSilentFrames; }

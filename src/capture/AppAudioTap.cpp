@@ -36,16 +36,17 @@ SampleRef makeTappedSample(const SampleMaker& maker, const AudioFormat& format, 
 }  // namespace
 
 void LCCaptureManager::startAppAudioCaptureForProcessID(ProcessID pid, SampleHandler outputHandler,
-                                                        Handler didStartHandler) {
+                                                        Handler didStartHandler, SoundUse use) {
     audioDispatchQueue_->async([self = shared_from_this(), pid, outputHandler = std::move(outputHandler),
-                                didStartHandler = std::move(didStartHandler)]() mutable {
-        self->startTap(pid, std::move(outputHandler), std::move(didStartHandler));
+                                didStartHandler = std::move(didStartHandler), use]() mutable {
+        self->startTap(pid, std::move(outputHandler), std::move(didStartHandler), use);
     });
 }
 
-void LCCaptureManager::resumeAppAudioCaptureForProcessID(ProcessID pid, SampleHandler outputHandler) {
+void LCCaptureManager::resumeAppAudioCaptureForProcessID(ProcessID pid, SampleHandler outputHandler,
+                                                         SoundUse use) {
     resumed_ = true;
-    startAppAudioCaptureForProcessID(pid, std::move(outputHandler), nullptr);
+    startAppAudioCaptureForProcessID(pid, std::move(outputHandler), nullptr, use);
 }
 
 void LCCaptureManager::stopAppAudioCapture() {
@@ -57,7 +58,8 @@ void LCCaptureManager::logStartError(std::int32_t status) {
     if (status != AudioStatus::kSuccess) log_.line("LCRecordingManager: startAudioCapture error: %i", status);
 }
 
-void LCCaptureManager::startTap(ProcessID pid, SampleHandler outputHandler, Handler didStartHandler) {
+void LCCaptureManager::startTap(ProcessID pid, SampleHandler outputHandler, Handler didStartHandler,
+                                SoundUse use) {
     appAudioOutputHandler_.set(std::move(outputHandler));
 
     const auto recorder = std::make_shared<AudioRecorderState>();
@@ -81,6 +83,7 @@ void LCCaptureManager::startTap(ProcessID pid, SampleHandler outputHandler, Hand
     logStartError(queue.setProcessTap(pid));
     log_.line("LCRecordingManager: startAudioCapture: Successfully set Audio Queue to PID");
     logStartError(queue.streamFormat(recorder->format));
+    if (use == SoundUse::Movie) queue.allowLateSilence();
 
     std::uint32_t packetBytes = recorder->format.bytesPerPacket;
     if (packetBytes == 0) (void)queue.maximumOutputPacketSize(packetBytes);

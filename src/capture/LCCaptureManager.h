@@ -75,12 +75,16 @@ public:
     const std::shared_ptr<SerialQueue>& sessionSampleBufferQueue() const { return sessionSampleBufferQueue_; }
 
     // The application's sound.
+    /// Who takes it: somebody who hears it as it comes, or a movie, to which silence may come late.
+    enum class SoundUse { Live, Movie };
     /// `startAppAudioCaptureForProcessID:outputHandler:didStartHandler:` — returns at once. A tap there is already is
     /// deliberately replaced without being stopped. `didStartHandler` may be empty.
-    void startAppAudioCaptureForProcessID(ProcessID pid, SampleHandler outputHandler, Handler didStartHandler);
+    void startAppAudioCaptureForProcessID(ProcessID pid, SampleHandler outputHandler, Handler didStartHandler,
+                                          SoundUse use = SoundUse::Live);
     /// `resumeAppAudioCaptureForProcessID:outputHandler:` — the same, and the next buffer is preceded by silence for the
     /// time since the last one.
-    void resumeAppAudioCaptureForProcessID(ProcessID pid, SampleHandler outputHandler);
+    void resumeAppAudioCaptureForProcessID(ProcessID pid, SampleHandler outputHandler,
+                                           SoundUse use = SoundUse::Live);
     /// `stopAppAudioCapture` — no buffer of the tap is delivered after its return.
     void stopAppAudioCapture();
 
@@ -187,7 +191,7 @@ private:
     explicit LCCaptureManager(const Platform& platform);
 
     // On the audio capture queue.
-    void startTap(ProcessID pid, SampleHandler outputHandler, Handler didStartHandler);
+    void startTap(ProcessID pid, SampleHandler outputHandler, Handler didStartHandler, SoundUse use);
     void stopTap();
     void disposeOfFormerTaps();
     void handleInputBuffer(const std::shared_ptr<AudioRecorderState>& recorder, const AudioQueueBufferRef& buffer,

@@ -90,6 +90,9 @@ public:
     virtual std::int32_t allocateBuffer(std::uint32_t bytes, AudioQueueBufferRef& buffer) = 0;
     /// Gives a buffer to be filled.
     virtual std::int32_t enqueueBuffer(const AudioQueueBufferRef& buffer) = 0;
+    /// Nobody listens while it comes: while there is nothing to be had, silence may be handed over up to a second late, and
+    /// so with fewer wake-ups. Sound never is. Before the start. A permission: a queue that has no use for it ignores it.
+    virtual void allowLateSilence() {}
     /// The queue forgets the buffer, enqueued or not.
     virtual std::int32_t freeBuffer(const AudioQueueBufferRef& buffer) = 0;
 

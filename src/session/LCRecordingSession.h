@@ -325,6 +325,8 @@ private:
     void setupMicTapIfWanted();
     /// Starts the tap, which starts the capture source when it runs; the source at once when there is nobody to tap.
     void startAppAudioThenCapture();
+    /// Of a movie nobody hears the sound as it comes; of clips, broadcasts and the frames of a client somebody may.
+    LCCaptureManager::SoundUse useOfAppAudio() const;
     /// Starts the source, once since the last startAppAudioThenCapture. Request lane and audio capture queue.
     void beginCapture();
     void beginCaptureWithoutTap();

@@ -47,7 +47,13 @@ void LCRecordingSession::startAppAudioThenCapture() {
         },
         [weak = weak_from_this()] {
             if (const auto self = weak.lock()) self->beginCapture();
-        });
+        },
+        useOfAppAudio());
+}
+
+LCCaptureManager::SoundUse LCRecordingSession::useOfAppAudio() const {
+    const bool isLive = captureRecording_ || broadcastExtension();
+    return isLive ? LCCaptureManager::SoundUse::Live : LCCaptureManager::SoundUse::Movie;
 }
 
 void LCRecordingSession::beginCapture() {
@@ -131,9 +137,12 @@ void LCRecordingSession::updateProcessIDForAudioCaptureWithPID(ProcessID pid) {
     log_.line("update foreground app bundleId");
     updateBundleIdForFirstForegroundApp();
     log_.line("resuming audio capture for pid: %i", number(pid));
-    capture.resumeAppAudioCaptureForProcessID(pid, [weak = weak_from_this(), pid](const SampleRef& sample) {
-        if (const auto self = weak.lock()) self->takeResumedAppAudioSample(pid, sample);
-    });
+    capture.resumeAppAudioCaptureForProcessID(
+        pid,
+        [weak = weak_from_this(), pid](const SampleRef& sample) {
+            if (const auto self = weak.lock()) self->takeResumedAppAudioSample(pid, sample);
+        },
+        useOfAppAudio());
     beginCaptureWithoutTap();
 }
 
