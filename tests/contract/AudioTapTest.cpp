@@ -124,6 +124,23 @@ TEST_P(AudioTapTest, SilenceOfOneThatPlaysNothingComesInLongPiecesAndWhatItPlays
     EXPECT_TRUE(test::holesIn(heard->pieces()).empty());
 }
 
+TEST_P(AudioTapTest, SilenceThatMayComeLateComesOnceASecondAndSoundAtOnceWithoutAHole) {
+    TonePlayer one(server_->address());
+    const HeardSound heard(queues_, one.pid(), HeardSound::Silence::MayBeLate);
+    // A piece is longer than a buffer of 0.65 s: two come together. Nothing comes for as long before.
+    const auto waits = [&] {
+        int count = 0;
+        const auto pieces = heard.pieces();
+        for (std::size_t i = 1; i < pieces.size(); ++i) count += pieces[i].arrived - pieces[i - 1].arrived >= 900'000'000;
+        return count;
+    };
+    EXPECT_TRUE(eventually([&] { return waits() >= 3; }));
+    ASSERT_TRUE(one.tell("play a 997 0.5 2"));
+    ASSERT_TRUE(heard.waitForTone(kOwn));
+    EXPECT_TRUE(eventually([&] { return heard.pieces().back().frames <= 2 * 882; }));
+    EXPECT_TRUE(test::holesIn(heard.pieces()).empty());
+}
+
 TEST_P(AudioTapTest, WhenTheApplicationEndsNothingElseIsHeardInItsPlace) {
     auto one = play(kOwn);
     const auto other = play(kOther);

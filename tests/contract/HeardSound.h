@@ -47,7 +47,8 @@ public:
         std::int64_t arrived = 0;
     };
 
-    HeardSound(AudioInputQueues& queues, ProcessID pid) : state_(std::make_shared<State>()) {
+    enum class Silence { OnTime, MayBeLate };
+    HeardSound(AudioInputQueues& queues, ProcessID pid, Silence silence = Silence::OnTime) : state_(std::make_shared<State>()) {
         auto made = queues.makeInputQueue(
             recorderFormat(),
             [state = state_](const AudioQueueBufferRef& buffer, const AudioTimeStamp& start, std::uint32_t packets,
@@ -60,6 +61,7 @@ public:
             state_->queue = queue_;
         }
         if (number(pid) != 0 && status_ == AudioStatus::kSuccess) status_ = queue_->setProcessTap(pid);
+        if (silence == Silence::MayBeLate) queue_->allowLateSilence();
         for (int buffer = 0; buffer < 10; ++buffer) {
             AudioQueueBufferRef ref;
             if (queue_->allocateBuffer(57344, ref) == AudioStatus::kSuccess) queue_->enqueueBuffer(ref);

@@ -42,6 +42,7 @@ public:
     std::int32_t maximumOutputPacketSize(std::uint32_t& bytes) const override;
     std::int32_t allocateBuffer(std::uint32_t bytes, AudioQueueBufferRef& buffer) override;
     std::int32_t enqueueBuffer(const AudioQueueBufferRef& buffer) override;
+    void allowLateSilence() override { lateSilence_ = true; }
     std::int32_t freeBuffer(const AudioQueueBufferRef& buffer) override;
     std::int32_t addIsRunningListener(IsRunningListener listener) override;
     std::int32_t removeIsRunningListener() override;
@@ -63,6 +64,7 @@ public:
     std::size_t enqueuedBuffers() const;
     std::uint32_t bufferBytes() const;  ///< of the first buffer ever allocated
     bool hasListener() const;
+    bool mayBeLateWithSilence() const { return lateSilence_; }
     SerialQueue& lane() { return *lane_; }
 
 private:
@@ -77,6 +79,7 @@ private:
     const std::shared_ptr<FakeSoundSettings> settings_;
     AudioFormat format_;
     const std::shared_ptr<SerialQueue> lane_;
+    std::atomic<bool> lateSilence_{false};
 
     mutable std::mutex mutex_;
     InputCallback callback_;

@@ -9,6 +9,7 @@
 #include <fstream>
 #include <set>
 
+#include "linux/media/UnfinishedMovies.h"
 #include "tests/reliability/LostPower.h"
 #include "tests/reliability/Scenario.h"
 
@@ -91,7 +92,49 @@ protected:
         EXPECT_LE(mostLost, std::chrono::seconds(1) + kStall);
     }
 
+    /// Cuts the power after each entry, and has what is left recovered as the next start does: how long the movie is then.
+    void measureLengths() {
+        LostPower disk;
+        const std::string folder = scenario_->world().temporaryDirectory();
+        std::vector<nanoseconds> lengths;
+        for (std::size_t i = 0; i < journal_.size(); ++i) {
+            disk.add(journal_[i]);
+            const auto left = disk.filesBelow(folder, LostPower::Rest::Gone, static_cast<std::uint32_t>(i));
+            lengths.push_back(left.empty() ? nanoseconds(0) : recoveredLength(left.begin()->second));
+        }
+        // The movie began when it is longest for its time; what is left of it is all there is until the next entry.
+        const auto timeOf = [&](std::size_t i) { return nanoseconds(static_cast<std::int64_t>(journal_[i].time)); };
+        nanoseconds begin = nanoseconds::max();
+        for (std::size_t i = 0; i < journal_.size(); ++i)
+            if (lengths[i].count() > 0) begin = std::min(begin, timeOf(i) - lengths[i]);
+        for (std::size_t i = 0; i + 1 < journal_.size(); ++i)
+            if (lengths[i].count() > 0) mostMissing_ = std::max(mostMissing_, timeOf(i + 1) - begin - lengths[i]);
+        std::printf("    %zu entries; the most that was missing after the next start: %.0f ms\n", journal_.size(),
+                    std::chrono::duration<double, std::milli>(mostMissing_).count());
+        RecordProperty("most_missing_ms", static_cast<int>(mostMissing_.count() / 1'000'000));
+    }
+    std::size_t syncsOfTheMovie() const {
+        return static_cast<std::size_t>(std::count_if(journal_.begin(), journal_.end(), [](const JournalEntry& entry) {
+            return entry.kind == JournalEntry::Kind::Sync && entry.path.ends_with(".mp4");
+        }));
+    }
+    nanoseconds mostMissing_{0};
+
 private:
+    nanoseconds recoveredLength(const std::string& bytes) {
+        const fs::path folder = scenario_->world().path("cut");
+        fs::remove_all(folder);
+        fs::create_directory(folder);
+        const std::string movie = folder / "cut.mp4";
+        std::ofstream(movie, std::ios::binary) << bytes;
+        Log log{[](LogLevel, std::string_view) {}};
+        media::UnfinishedMovies movies(folder, log);
+        movies.remember();
+        movies.begin();
+        movies.wait();
+        checkers::MovieReader reader(movie);
+        return reader.error().empty() ? reader.duration() : nanoseconds(0);
+    }
     /// Whether there is a picture in it; fails the test for what a decoder complains of.
     bool play(const std::string& bytes, std::set<std::uint32_t>& shown) {
         const std::string movie = scenario_->world().path("cut.mp4");
@@ -135,6 +178,15 @@ TEST_F(PowerCut, LosesASecondOfAWindowThatMovesTenTimesASecond) {
 TEST_F(PowerCut, LosesASecondOfAWindowThatChangesNowAndThen) {
     record({"--size", "320x180", "--fps", "1"}, 4);
     cutEverywhere();
+}
+
+TEST_F(PowerCut, LosesASecondOfAStillWindowThoughTheDiskIsWokenOncePerPicture) {
+    constexpr double kSeconds = 8;
+    record({"--size", "320x180", "--still"}, kSeconds);
+    measureLengths();
+    EXPECT_LE(mostMissing_, std::chrono::seconds(1) + kStall);
+    // A picture each 0.9 s, and some more at the beginning and at the end.
+    EXPECT_LE(static_cast<double>(syncsOfTheMovie()), kSeconds / 0.9 + 5);
 }
 
 }  // namespace

@@ -124,6 +124,41 @@ TEST(Sound, AfterTheEndOfTheSessionIsNotInTheMovie) {
     EXPECT_NEAR(static_cast<double>(sound->samples.size()), 44100, 1024);
 }
 
+double lengthOfSound(const RecordedMovie& movie) {
+    const auto sound = checkers::MovieReader(movie.path()).readSound();
+    return sound ? static_cast<double>(sound->samples.size()) / sound->rate : -1;
+}
+
+TEST(Sound, ThatIsSilentAtLastIsAsLongAsThePictures) {
+    RecordedMovie movie;
+    movie.start();
+    ASSERT_TRUE(movie.appendGrey(100, 0));
+    appendTone(*movie.sound, tapFormat(), 0, 0, 44100);
+    ASSERT_TRUE(movie.sound->append(soundBuffer(tapFormat(), Data(2 * 11025, 0), 11025, kSecond)));
+    movie.clock.advance(std::chrono::milliseconds(2900));
+    ASSERT_EQ(movie.finish(), ContainerStatus::Completed);
+    EXPECT_NEAR(lengthOfSound(movie), 2.9, 0.005);
+    const auto sound = checkers::MovieReader(movie.path()).readSound();
+    EXPECT_NEAR(loudness(*sound, 0.1, 0.95), kToneLoudness, 0.01);
+    EXPECT_LT(loudness(*sound, 1.05, 2.9), 0.001);
+}
+
+TEST(Sound, ThatCanBeHeardAtLastOrEndedLongBeforeEndsWhereItEnded) {
+    for (const bool isSilent : {false, true}) {
+        RecordedMovie movie;
+        movie.start();
+        ASSERT_TRUE(movie.appendGrey(100, 0));
+        if (isSilent) {
+            ASSERT_TRUE(movie.sound->append(soundBuffer(tapFormat(), Data(2 * 44100, 0), 44100, 0)));
+        } else {
+            appendTone(*movie.sound, tapFormat(), 0, 0, 44100);
+        }
+        movie.clock.advance(std::chrono::milliseconds(isSilent ? 3500 : 1900));
+        ASSERT_EQ(movie.finish(), ContainerStatus::Completed);
+        EXPECT_NEAR(lengthOfSound(movie), 1, 0.03);
+    }
+}
+
 TEST(Sound, HolesAreSilentAndMoveNothing) {
     RecordedMovie movie;
     movie.start();

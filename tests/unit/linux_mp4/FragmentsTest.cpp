@@ -203,6 +203,22 @@ TEST_F(Fragments, AreAtMostASecondLongWhateverTheRates) {
     EXPECT_GT(count, 300U);
 }
 
+TEST_F(Fragments, OfAStillWindowAreNotClosedByTheSoundThatCameLate) {
+    MovieBoxWriter writer(sink);
+    const auto video = writer.addVideoTrack(test::videoDescription());
+    const auto sound = writer.addAudioTrack(test::audioDescription());
+    ASSERT_EQ(writer.start(), MovieError::none);
+    std::int64_t frames = 0;
+    for (int i = 0; i < 10; ++i) {  // each picture with the 0.9 s of sound that lie before it
+        for (; frames * 10 < (i - 1) * 9 * 48000; frames += 1024) {
+            ASSERT_EQ(writer.addSample(*sound, {frames, 1024}, payload(1, 10)), MovieError::none);
+        }
+        ASSERT_EQ(picture(writer, *video, i * 9 * kSecond / 10, true), MovieError::none);
+        EXPECT_EQ(writer.fragmentCount(), static_cast<std::uint32_t>(i));
+        ASSERT_EQ(writer.flushFragment(), MovieError::none);
+    }
+}
+
 TEST_F(Fragments, GiveAPictureOneTickWhenFlushedAndItsTrueTimeWithTheNext) {
     MovieBoxWriter writer(sink);
     const auto video = writer.addVideoTrack(test::videoDescription());

@@ -89,6 +89,26 @@ TEST_F(SessionAudio, TheTapRunsBeforeTheScreenIsCaptured) {
               at("starting capture"));
 }
 
+TEST_F(SessionAudio, SilenceMayComeLateIntoAMovieAndNowhereElse) {
+    struct Case {
+        const char* what;
+        bool extension, frames, late;
+    };
+    for (const Case& c : {Case{"movie", false, false, true}, Case{"broadcast", true, false, false},
+                          Case{"frames for the client", false, true, false}}) {
+        SCOPED_TRACE(c.what);
+        session_->setBroadcastExtension(c.extension ? std::make_shared<StubExtension>(BundleIdentifier("org.example.Upload")) : nullptr);
+        session_->setCaptureRecording(c.frames);
+        startTapped();
+        ASSERT_TRUE(tap());
+        EXPECT_EQ(tap()->mayBeLateWithSilence(), c.late);
+        retarget(kEditor);
+        EXPECT_EQ(tap()->process(), kEditor);
+        EXPECT_EQ(tap()->mayBeLateWithSilence(), c.late) << "after a change of the process too";
+        finish();
+    }
+}
+
 TEST_F(SessionAudio, WithoutAProcessThereIsNoTap) {
     start();
     EXPECT_EQ(fakes_.audioInputQueues.made(), 0u);
