@@ -11,6 +11,7 @@
 #include <thread>
 #include <vector>
 
+#include "linux/audio/ServerWatch.h"
 #include "linux/system/FileDescriptor.h"
 #include "linux/system/Threads.h"
 
@@ -19,6 +20,9 @@ namespace lumacast::sound {
 namespace {
 
 using std::chrono::milliseconds;
+
+/// A socket is there before its server listens.
+constexpr milliseconds kAfterSocket{100};
 
 void drain(int descriptor) {
     std::uint64_t count = 0;
@@ -122,6 +126,15 @@ private:
             api_->io_new(api_, wake_.get(), PA_IO_EVENT_INPUT,
                          [](pa_mainloop_api*, pa_io_event*, int descriptor, pa_io_event_flags_t, void*) { drain(descriptor); },
                          nullptr);
+        ServerWatch watch(options_.server);
+        pa_io_event* const watched =
+            watch.descriptor() < 0 ? nullptr
+                                   : api_->io_new(api_, watch.descriptor(), PA_IO_EVENT_INPUT,
+                                                  [](pa_mainloop_api*, pa_io_event*, int, pa_io_event_flags_t, void* self) {
+                                                      static_cast<Core*>(self)->serverMayBeThere();
+                                                  },
+                                                  this);
+        watch_ = &watch;
         {
             PulseTimer retry(*api_, [this] { connect(); });
             PulseTimer givesUp(*api_, [this] { lost_ = true; });
@@ -137,9 +150,20 @@ private:
             lose();
             retry_ = givesUp_ = nullptr;
         }
+        watch_ = nullptr;
+        if (watched) api_->io_free(watched);
         api_->io_free(woken);
         loop_.reset();
         api_ = nullptr;
+    }
+
+    /// Something has come where its socket is made.
+    void serverMayBeThere() {
+        if (!watch_->take()) return;
+        delay_ = kAfterSocket;
+        if (context_) return;  // an attempt that fails is followed by another at once
+        retry_->cancel();
+        connect();
     }
 
     bool isUnused() const {
@@ -215,7 +239,7 @@ private:
         }
         context_.reset();
         retry_->start(delay_);
-        delay_ = std::min(delay_ * 2, options_.slowestRetry);
+        delay_ = std::min(delay_ * 2, watch_->waitsForServer() ? options_.slowestWithoutSocket : options_.slowestRetry);
     }
 
     void addUser(const std::shared_ptr<PulseUser>& user) {
@@ -246,6 +270,7 @@ private:
     bool ready_ = false, lost_ = false;
     pa_subscription_mask_t interest_ = PA_SUBSCRIPTION_MASK_NULL;
     std::vector<std::shared_ptr<PulseUser>> users_;
+    ServerWatch* watch_ = nullptr;
     PulseTimer* retry_ = nullptr;
     PulseTimer* givesUp_ = nullptr;
     milliseconds delay_{0};

@@ -34,7 +34,8 @@ public:
 
 /// One connection to the user's sound server (PulseAudio, or PipeWire in its place), and one thread on which everything
 /// happens that the server has a say in. Both are there only while a user is attached: nobody attached, no thread, no
-/// wake-up. While there is no server it is looked for every 100 ms to 1 s.
+/// wake-up. While there is no server it is looked for every 100 ms to 1 s; where not even its socket is there, when that
+/// comes, and rarely besides.
 ///
 /// Thread-safe: every operation is callable from any thread, the sound thread included, and waits for nobody. The
 /// library may wait on the sound thread (it reads files and asks the display server where the sound server is), so
@@ -45,6 +46,8 @@ public:
         std::string server;  ///< as in $PULSE_SERVER; empty for the user's own
         std::string applicationName = "lumacastd";
         std::chrono::milliseconds firstRetry{100}, slowestRetry{1000};
+        /// The slowest where its socket is not there and is waited for: the library may know of another place.
+        std::chrono::milliseconds slowestWithoutSocket{10'000};
         /// A server that has not answered by then is given up and tried again.
         std::chrono::milliseconds patience{5000};
     };

@@ -64,6 +64,7 @@ private:
         pthread_setname_np(pthread_self(), "lc-inhibit");
         LoginLocks locks(options_.beforeSleep);
         Moment nextTry{};
+        auto retry = options_.retry;
         while (true) {
             bool busy = false;
             {
@@ -74,18 +75,21 @@ private:
             if (!busy) {
                 locks.letGo();
                 nextTry = {};
+                retry = options_.retry;
             } else {
-                keepConnected(locks, nextTry);
+                keepConnected(locks, nextTry, retry);
             }
             waitForWork(locks, busy ? nextTry : Moment::max());
         }
     }
 
-    void keepConnected(LoginLocks& locks, Moment& nextTry) const {
+    void keepConnected(LoginLocks& locks, Moment& nextTry, std::chrono::milliseconds& retry) const {
+        constexpr int kRarest = 10;  // a device without a bus is asked less and less often
         const auto now = std::chrono::steady_clock::now();
         if (!locks.isConnected() && now >= nextTry) {
-            locks.connect(options_.busAddress);
-            nextTry = now + options_.retry;
+            const bool isThere = locks.connect(options_.busAddress);
+            nextTry = now + retry;
+            retry = isThere ? options_.retry : std::min(retry * 2, options_.retry * kRarest);
         }
         if (locks.isConnected() && !locks.process()) locks.disconnect();
     }

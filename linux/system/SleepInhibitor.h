@@ -26,7 +26,7 @@ public:
         /// Called on the inhibitor's thread when the device is about to sleep while the daemon is busy; the device
         /// waits until it returns, and no longer than its own limit (five seconds by default).
         std::function<void()> beforeSleep;
-        /// Until the bus is tried again.
+        /// Until a bus that isn't there is tried again: at first, and twice as long each time, up to ten times as long.
         std::chrono::milliseconds retry{3000};
     };
 

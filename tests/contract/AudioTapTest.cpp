@@ -291,6 +291,22 @@ TEST_P(AudioTapTest, AServerThatHangsLeavesSilenceAndIsHeardAgain) {
     EXPECT_TRUE(test::holesIn(heard->pieces()).empty());
 }
 
+TEST_P(LateAudioTapTest, AServerThatComesLaterIsJoinedWithoutLookingForIt) {
+    sound::PulseConnection::Options options;
+    options.server = server_->address();
+    options.firstRetry = options.slowestRetry = options.slowestWithoutSocket = std::chrono::hours(1);
+    LinuxAudioInputQueues queues(std::make_shared<sound::PulseConnection>(options), clock_,
+                                 [](ProcessID) { return std::nullopt; });
+    TonePlayer one(server_->address(), {"--later"});
+    ASSERT_TRUE(one.isReady());
+    const HeardSound heard(queues, one.pid());
+    ASSERT_NE(heard.waitFor(0.3), SIZE_MAX);
+    ASSERT_TRUE(server_->start());
+    ASSERT_TRUE(one.tell("connect"));
+    ASSERT_TRUE(one.tell("play a 997 0.5 2"));
+    EXPECT_TRUE(heard.waitForTone(kOwn));
+}
+
 TEST_P(LateAudioTapTest, AServerThatComesLaterIsJoined) {
     TonePlayer one(server_->address(), {"--later"});
     ASSERT_TRUE(one.isReady());

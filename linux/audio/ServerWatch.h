@@ -1,0 +1,34 @@
+#pragma once
+// Tells when a sound server may have come, so that nobody has to look again and again.
+
+#include <string>
+
+#include "linux/system/FileDescriptor.h"
+
+namespace lumacast::sound {
+
+/// Watches the place where the user's sound server makes its socket, or where the folder of it will be made. Only a
+/// server on this machine at a place that is known without the library is watched; for any other there is nothing to
+/// wait for. Belongs to one thread; touches the file system, and never waits for a server.
+class ServerWatch final {
+public:
+    /// `server` as in $PULSE_SERVER, which counts where it is empty, and the user's runtime folder where that is, too.
+    explicit ServerWatch(const std::string& server);
+
+    /// Readable when something has come to the place. Below zero where nothing can be watched.
+    int descriptor() const { return events_.get(); }
+    /// Takes what has come, and watches on; whether it was of interest.
+    bool take();
+    /// Whether the socket is not there now, and the descriptor will tell when it is.
+    bool waitsForServer() const;
+
+private:
+    void arm();
+
+    std::string socket_;  ///< where it is; empty: nowhere that is known
+    FileDescriptor events_;
+    int watched_ = -1;
+    std::string wanted_;  ///< the name that is waited for in what is watched
+};
+
+}  // namespace lumacast::sound
