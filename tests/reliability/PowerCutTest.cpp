@@ -123,6 +123,7 @@ protected:
             return entry.kind == JournalEntry::Kind::Sync && entry.path.ends_with(".mp4");
         }));
     }
+    double secondsOfTheJournal() const { return static_cast<double>(journal_.back().time - journal_.front().time) / 1e9; }
     nanoseconds mostMissing_{0};
 
 private:
@@ -213,7 +214,7 @@ TEST_F(PowerCut, LosesASecondOfAStillWindowThoughTheDiskIsWokenOncePerPicture) {
     measureLengths();
     EXPECT_LE(mostMissing_, std::chrono::seconds(1) + kStall);
     // A picture each 0.9 s, and some more at the beginning and at the end.
-    const double seconds = static_cast<double>(journal_.back().time - journal_.front().time) / 1e9;
+    const double seconds = secondsOfTheJournal();
     EXPECT_LE(static_cast<double>(syncsOfTheMovie()), seconds / 0.9 + 6) << "in " << seconds << " s";
 }
 
