@@ -10,9 +10,8 @@ namespace lumacast::media {
 /// of them as the promise allows: whatever happens, at most a second of the movie is lost. Not thread-safe.
 ///
 /// The newest fragment is seen by a player only once a second write has reached the disk, which the sync of the next one
-/// takes along. So one with news in it has another sync soon after it. One without, of a still and silent window, can
-/// wait for the next picture: should the power go, the next start finds it all the same, and till then nothing is
-/// missing but time in which nothing changed.
+/// takes along. So one with news in it has another sync soon after it. One without, of a still and silent window, is
+/// synced twice at once: the next one comes with the next picture, nearly a second later.
 class FlushPace final {
 public:
     using Moment = std::chrono::steady_clock::time_point;

@@ -58,13 +58,15 @@ std::optional<Error> MoviePipeline::add(std::size_t track, SampleRef sample, std
 }
 
 std::optional<Error> MoviePipeline::flush() {
-    const bool needsSync = pace_.newsIsUnsure();
+    const bool isUnsure = pace_.newsIsUnsure();
     pace_.flushed(std::chrono::steady_clock::now());
     const std::uint32_t fragments = movie_.fragmentCount();
     if (const auto error = movieError(movie_.flushFragment())) return error;
-    // Where nothing waited, what shows the fragment before may not be on the disk yet.
-    if (needsSync && movie_.fragmentCount() == fragments && !disk_.sync()) return systemError(EIO);
-    return std::nullopt;
+    // What shows a fragment is on the disk with the sync behind it. With news there is another one soon, or this is it;
+    // the next one after a repeat would be too late.
+    const bool isNew = movie_.fragmentCount() != fragments;
+    const bool needsSync = isNew ? !pace_.newsIsUnsure() : isUnsure;
+    return needsSync && !disk_.sync() ? std::optional(systemError(EIO)) : std::nullopt;
 }
 
 std::optional<Error> MoviePipeline::finish(const End& end) {

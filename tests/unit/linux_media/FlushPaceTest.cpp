@@ -60,7 +60,7 @@ TEST(FlushPace, WhatShowsNewsIsSyncedHalfASecondLaterThoughNothingElseWaits) {
     EXPECT_EQ(pace.due(), std::nullopt);
 }
 
-TEST(FlushPace, ARepeatedPictureNeedsNoSyncBehindIt) {
+TEST(FlushPace, ARepeatedPictureIsSureAtOnce) {
     FlushPace pace = flushedAtZero();
     pace.added(Content::Repeat);
     pace.added(Content::Silence);
