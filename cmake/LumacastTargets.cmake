@@ -21,34 +21,12 @@ if(LC_FUZZ)
   target_link_options(lc_options INTERFACE -fsanitize=fuzzer-no-link)
 endif()
 
-# LC_PRECOMPILE: the standard library's and GoogleTest's headers are read once instead of with each of the files, a third of
-# a whole build. Files include what they use all the same: builds without it, and headers_alone, show what is missing.
-# lc_precompiled(TARGET FROM): TARGET's files are compiled behind the headers of FROM, with the same options.
-function(lc_precompiled target from)
-  if(LC_PRECOMPILE)
-    target_precompile_headers(${target} REUSE_FROM ${from})
-  endif()
-endfunction()
-# lc_precompiled_headers(NAME LIBS... HEADERS...)
-function(lc_precompiled_headers name)
-  cmake_parse_arguments(arg "" "" "LIBS;HEADERS" ${ARGN})
-  if(LC_PRECOMPILE)
-    file(CONFIGURE OUTPUT ${PROJECT_BINARY_DIR}/${name}.cpp CONTENT "" @ONLY)
-    add_library(${name} OBJECT ${PROJECT_BINARY_DIR}/${name}.cpp)
-    target_link_libraries(${name} PRIVATE ${arg_LIBS} lc_options)
-    target_precompile_headers(${name} PRIVATE ${arg_HEADERS})
-  endif()
-endfunction()
-lc_precompiled_headers(lc_standard_headers HEADERS <algorithm> <array> <chrono> <functional> <map> <memory> <mutex> <optional>
-  <string> <unordered_map> <variant> <vector>)
-
 # lc_library(NAME DIR DEPS...): a static library of all .cpp files of one folder (not of the folders below it).
 function(lc_library name dir)
   file(GLOB sources CONFIGURE_DEPENDS ${dir}/*.cpp)
   if(sources)
     add_library(${name} STATIC ${sources})
     target_link_libraries(${name} PUBLIC ${ARGN} PRIVATE lc_options)
-    lc_precompiled(${name} lc_standard_headers)
     target_include_directories(${name} PUBLIC ${PROJECT_SOURCE_DIR}/src ${PROJECT_SOURCE_DIR})
   else()
     add_library(${name} INTERFACE)
@@ -74,14 +52,6 @@ endfunction()
 # Most of what a test spends is its compiling.
 add_library(lc_test_options INTERFACE)
 target_compile_options(lc_test_options INTERFACE $<$<CONFIG:Release>:-O1>)
-function(lc_test_precompiled target)
-  if(LC_PRECOMPILE AND NOT TARGET lc_test_headers)
-    lc_precompiled_headers(lc_test_headers LIBS GTest::gtest GTest::gmock lc_test_options HEADERS <gmock/gmock.h>
-      <gtest/gtest.h> <algorithm> <array> <chrono> <filesystem> <functional> <map> <memory> <mutex> <optional> <string> <thread>
-      <unordered_map> <variant> <vector>)
-  endif()
-  lc_precompiled(${target} lc_test_headers)
-endfunction()
 
 # lc_test(NAME DIR DEPS...): one GoogleTest binary of all .cpp files below one folder.
 function(lc_test name dir)
@@ -91,7 +61,6 @@ function(lc_test name dir)
     target_link_libraries(${name} PRIVATE ${ARGN} GTest::gtest GTest::gmock GTest::gtest_main lc_options)
     if(NOT name STREQUAL simulation_tests)  # which runs for as long as one wants
       target_link_libraries(${name} PRIVATE lc_test_options)
-      lc_test_precompiled(${name})
     endif()
     target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR}/src ${PROJECT_SOURCE_DIR})
     target_compile_definitions(${name} PRIVATE LC_SOURCE_DIR="${PROJECT_SOURCE_DIR}" LC_BINARY_DIR="${PROJECT_BINARY_DIR}")
