@@ -117,6 +117,7 @@ LinuxFileSystem::LinuxFileSystem(Options options)
           options.resolution ? *options.resolution : availableResolution(), options.beforeEachQuestion)),
       bytesBeingWritten_(options.bytesBeingWritten),
       patience_(options.patience),
+      freeSizeStands_(options.freeSizeStands),
       accounts_(std::move(options.accounts)) {}
 
 std::optional<Error> LinuxFileSystem::prepare() {
@@ -217,13 +218,27 @@ std::optional<Error> LinuxFileSystem::removeForUser(UserID user, const std::stri
 }
 
 Result<std::uint64_t> LinuxFileSystem::freeSize(const std::string& path) {
-    return resultOf(ask<std::uint64_t>([path](const Place& place) -> std::variant<std::uint64_t, int> {
+    const auto answer = ask<std::uint64_t>([path](const Place& place) -> std::variant<std::uint64_t, int> {
         const auto opened = place.isDirectory(path) ? place.openDirectoryAgain() : place.open(path, O_PATH);
         if (const int* error = std::get_if<int>(&opened)) return *error;
         struct statvfs status = {};
         if (calls::statFileSystem(std::get<FileDescriptor>(opened).get(), status) != 0) return errno;
         return static_cast<std::uint64_t>(status.f_bavail) * status.f_frsize;
-    }));
+    });
+    return resultOf(freeSizeNowOrBefore(path, answer));
+}
+
+std::variant<std::uint64_t, int> LinuxFileSystem::freeSizeNowOrBefore(const std::string& path,
+                                                                      const std::variant<std::uint64_t, int>& now) {
+    const auto moment = std::chrono::steady_clock::now();
+    const std::lock_guard lock(mutex_);
+    if (const auto* bytes = std::get_if<std::uint64_t>(&now)) {
+        lastFreeSize_ = FreeSize{path, *bytes, moment};
+    } else if (std::get<int>(now) == ETIMEDOUT && lastFreeSize_ && lastFreeSize_->path == path &&
+               moment - lastFreeSize_->told < freeSizeStands_) {
+        return lastFreeSize_->bytes;
+    }
+    return now;
 }
 
 Result<std::vector<std::string>> LinuxFileSystem::list(const std::string& path) {

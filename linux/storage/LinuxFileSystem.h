@@ -2,6 +2,7 @@
 #include <chrono>
 #include <functional>
 #include <memory>
+#include <mutex>
 #include <string_view>
 
 #include "linux/storage/BeneathDirectory.h"
@@ -29,6 +30,9 @@ public:
         std::string root;  ///< in front of every fixed path; empty for none
         BytesBeingWritten bytesBeingWritten;
         std::chrono::milliseconds patience{40};
+        /// For how long a free size stands in for one that the disk doesn't tell in time: a disk that is busy for a
+        /// moment isn't a full one.
+        std::chrono::milliseconds freeSizeStands{30'000};
         std::optional<Resolution> resolution;  ///< as the kernel offers when not given
         AccountLookup accounts = systemAccount;    ///< of the users whose files are asked for
         std::function<void()> beforeEachQuestion;  ///< tests put a slow disk here; runs on the disk's thread
@@ -59,11 +63,21 @@ private:
     struct Place;
     template <class T>
     std::variant<T, int> ask(std::function<std::variant<T, int>(const Place&)> question);
+    std::variant<std::uint64_t, int> freeSizeNowOrBefore(const std::string& path,
+                                                         const std::variant<std::uint64_t, int>& now);
 
+    struct FreeSize {
+        std::string path;
+        std::uint64_t bytes = 0;
+        std::chrono::steady_clock::time_point told;
+    };
     const std::shared_ptr<const Place> place_;
     const BytesBeingWritten bytesBeingWritten_;
     const std::chrono::milliseconds patience_;
+    const std::chrono::milliseconds freeSizeStands_;
     const AccountLookup accounts_;
+    std::mutex mutex_;  // guards the next
+    std::optional<FreeSize> lastFreeSize_;
     DiskLane disk_;
 };
 

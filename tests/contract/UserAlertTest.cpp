@@ -319,7 +319,7 @@ TEST_F(PlayedDialogTest, AProgramGetsNothingOfThisProcessButItsOutput) {
         answerOf(
             "exec >" + report +
             "; readlink /proc/$$/fd/0; readlink /proc/$$/fd/2; ls /proc/$$/fd; echo end; env; pwd;"
-            " echo group $(($(cut -d' ' -f5 /proc/$$/stat) - $$)); grep -E 'Sig(Blk|Ign)' /proc/$$/status; exit 1"),
+            " echo group $(($(cut -d' ' -f5 /proc/$$/stat) - $$)); grep -E 'Sig(Blk|Ign)' /proc/self/status; exit 1"),
         Response::OtherButton);
     ::close(leaked);
     const std::string text = fileText(report);

@@ -17,8 +17,9 @@ namespace {
 using namespace std::chrono_literals;
 
 struct Disk {
-    explicit Disk(std::chrono::milliseconds patience = 30s) {
+    explicit Disk(std::chrono::milliseconds patience = 30s, std::chrono::milliseconds freeSizeStands = 1h) {
         LinuxFileSystem::Options options;
+        options.freeSizeStands = freeSizeStands;
         options.root = scratch.path("root");
         options.patience = patience;
         options.beforeEachQuestion = [gate = gate] { gate->pass(); };
@@ -79,6 +80,26 @@ TEST(LinuxFileSystem, TheDirectoryThatWasRemovedIsMadeAgainWhenItsFreeSizeIsAske
         EXPECT_EQ(modeOf(disk.directory), 0700u);
         EXPECT_EQ(modeOf(disk.scratch.path("root/private")), 0700u);
     }
+}
+
+TEST(LinuxFileSystem, ADiskThatIsBusyForAMomentHasTheFreeSizeThatItToldBefore) {
+    Disk disk(1s);
+    EXPECT_FALSE(disk.fileSystem->createDirectory(disk.directory));
+    const auto told = disk.fileSystem->freeSize(disk.directory + "/");
+    ASSERT_EQ(code(told), 0);
+    disk.gate->shut();
+    const auto meanwhile = disk.fileSystem->freeSize(disk.directory + "/");
+    ASSERT_EQ(code(meanwhile), 0);
+    EXPECT_EQ(std::get<std::uint64_t>(meanwhile), std::get<std::uint64_t>(told));
+    EXPECT_EQ(code(disk.fileSystem->freeSize(disk.directory + "/a.mp4")), ETIMEDOUT) << "of another place nothing was told";
+}
+
+TEST(LinuxFileSystem, AFreeSizeDoesNotStandForLong) {
+    Disk disk(1s, 0s);
+    EXPECT_FALSE(disk.fileSystem->createDirectory(disk.directory));
+    ASSERT_EQ(code(disk.fileSystem->freeSize(disk.directory)), 0);
+    disk.gate->shut();
+    EXPECT_EQ(code(disk.fileSystem->freeSize(disk.directory)), ETIMEDOUT);
 }
 
 TEST(LinuxFileSystem, WhatSomebodyElsePlantedInItsPlaceIsRefused) {
