@@ -63,6 +63,7 @@ void Microphone::read() {
 void Microphone::decide(const ListedMicrophone* microphone) {
     if (session_->isOutdated || !microphone) {
         const bool isOutdated = std::exchange(session_->isOutdated, false);
+        session_->mustRead = true;
         session_->again.start(isOutdated ? milliseconds(0) : kRetry);
         return;
     }
@@ -82,11 +83,16 @@ void Microphone::decide(const ListedMicrophone* microphone) {
     if (stream->hasEnded()) session_->again.start(kRetry);
 }
 
-/// Also after what closed the stream has passed: whatever is not right any more is read anew.
+/// Also after what closed the stream has passed: whatever is not right any more is read anew, and what has changed while it
+/// was read, though the stream is as it was.
 void Microphone::look() {
+    const bool mustRead = std::exchange(session_->mustRead, false);
     const auto& stream = session_->stream;
-    if (stream && stream->isSuspended()) return setInterrupted(true);
-    if (stream && !stream->hasEnded()) return;
+    if (stream && stream->isSuspended()) setInterrupted(true);
+    if (stream && (stream->isSuspended() || !stream->hasEnded())) {
+        if (mustRead) read();
+        return;
+    }
     const bool hadStream = stream != nullptr;
     closeStream();
     // A source that refuses is asked again, but not without a pause.

@@ -43,6 +43,7 @@ private:
         PulseTimer watch;
         std::unique_ptr<MicrophoneStream> stream;
         bool isOutdated = false;   ///< something changed while the reader read
+        bool mustRead = false;     ///< whatever the stream does
         bool isUndecided = false;  ///< the last reading was, and nothing tells when that has changed
     };
 
