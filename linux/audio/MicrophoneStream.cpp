@@ -73,12 +73,6 @@ MicrophoneStream::MicrophoneStream(const PulseServer& server, const ListedMicrop
         end();
 }
 
-MicrophoneStream::~MicrophoneStream() {
-    if (!stream_) return;
-    pa_stream_set_latency_update_callback(stream_.get(), nullptr, nullptr);
-    pa_stream_set_suspended_callback(stream_.get(), nullptr, nullptr);
-}
-
 bool MicrophoneStream::isSuspended() const {
     return state_ == State::Ready && pa_stream_is_suspended(stream_.get()) > 0;
 }

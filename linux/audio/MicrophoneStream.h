@@ -26,7 +26,6 @@ public:
     /// destroy the stream.
     MicrophoneStream(const PulseServer& server, const ListedMicrophone& microphone, const SoundTimeline& timeline,
                      Heard heard, std::function<void()> changed);
-    ~MicrophoneStream();
     MicrophoneStream(const MicrophoneStream&) = delete;
     MicrophoneStream& operator=(const MicrophoneStream&) = delete;
 

@@ -21,12 +21,30 @@ struct FreeContext {
 };
 struct FreeStream {
     void operator()(pa_stream* stream) const {
+        // First of all: no call comes back to whoever lets go of it.
         pa_stream_set_state_callback(stream, nullptr, nullptr);
         pa_stream_set_read_callback(stream, nullptr, nullptr);
+        pa_stream_set_write_callback(stream, nullptr, nullptr);
         pa_stream_set_latency_update_callback(stream, nullptr, nullptr);
         pa_stream_set_moved_callback(stream, nullptr, nullptr);
-        pa_stream_disconnect(stream);
+        pa_stream_set_suspended_callback(stream, nullptr, nullptr);
+        if (pa_stream_get_state(stream) == PA_STREAM_CREATING)
+            disconnectOnceItIsMade(stream);
+        else
+            pa_stream_disconnect(stream);
         pa_stream_unref(stream);
+    }
+
+private:
+    /// The library can't take back what the server hasn't answered yet, and keeps such a stream until its context goes:
+    /// it would stay at the server, and record on.
+    static void disconnectOnceItIsMade(pa_stream* stream) {
+        pa_stream_set_state_callback(
+            stream,
+            [](pa_stream* made, void*) {
+                if (pa_stream_get_state(made) == PA_STREAM_READY) pa_stream_disconnect(made);
+            },
+            nullptr);
     }
 };
 struct FreePropertyList {
