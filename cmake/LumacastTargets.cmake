@@ -53,6 +53,12 @@ endfunction()
 add_library(lc_test_options INTERFACE)
 target_compile_options(lc_test_options INTERFACE $<$<CONFIG:Release>:-O1>)
 
+# lc_join(TARGET): its files are compiled several at a time, as their headers cost more than they do. What they have in their
+# nameless namespaces must differ, then.
+function(lc_join target)
+  set_target_properties(${target} PROPERTIES UNITY_BUILD ${LC_JOIN} UNITY_BUILD_BATCH_SIZE 6)
+endfunction()
+
 # lc_test(NAME DIR DEPS...): one GoogleTest binary of all .cpp files below one folder.
 function(lc_test name dir)
   file(GLOB_RECURSE sources CONFIGURE_DEPENDS ${dir}/*.cpp)

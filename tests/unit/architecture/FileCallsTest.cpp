@@ -11,7 +11,7 @@
 namespace lumacast::architecture {
 namespace {
 
-constexpr std::string_view kFolders[] = {"linux/media", "linux/storage", "linux/library", "linux/ipc"};
+constexpr std::string_view kRecordingFolders[] = {"linux/media", "linux/storage", "linux/library", "linux/ipc"};
 
 /// Names that only the system has.
 constexpr std::string_view kCalls[] = {"openat",   "SYS_openat2", "creat",     "pwrite",          "pwritev",        "writev",
@@ -62,7 +62,7 @@ std::vector<std::string> directCalls(const SourceFile& file) {
 
 TEST(FileCalls, NoFolderOfARecordingGoesPastThem) {
     std::size_t files = 0;
-    for (const std::string_view folder : kFolders) {
+    for (const std::string_view folder : kRecordingFolders) {
         for (const SourceFile& file : sourcesBelow(std::string(folder))) {
             ++files;
             for (const std::string& line : directCalls(file)) ADD_FAILURE() << line;

@@ -7,13 +7,11 @@
 #include <set>
 
 #include "base/Limits.h"
-#include "platform/IpcEndpoint.h"
 #include "tests/fakes/FakePlane.h"
+#include "tests/unit/base/NamelessEndpoint.h"
 
 namespace lumacast {
 namespace {
-
-class Endpoint final : public IpcEndpoint {};
 
 bool fits(const Value& value, ArgumentType type) { return matches({value}, std::span(&type, 1)); }
 
@@ -144,7 +142,7 @@ TEST(MessageTables, EachTypeTakesItsKindAndNoOther) {
                                     Array{},
                                     Dictionary{},
                                     Error("d", 1),
-                                    Value::EndpointRef(std::make_shared<Endpoint>()),
+                                    Value::EndpointRef(std::make_shared<NamelessEndpoint>()),
                                     Value::PlaneRef(std::make_shared<FakePlane>(1, 1, 1, std::vector<PixelRect>()))};
     const std::vector<Row> rows{{ArgumentType::Bool, {1}, false},
                                 {ArgumentType::Int32, {2}, false},
@@ -175,7 +173,7 @@ TEST(MessageTables, EachTypeTakesItsKindAndNoOther) {
 }
 
 TEST(MessageTables, EndpointsTravelOnlyWhereTheyAreDeclared) {
-    const Value endpoint = Value::EndpointRef(std::make_shared<Endpoint>());
+    const Value endpoint = Value::EndpointRef(std::make_shared<NamelessEndpoint>());
     const Dictionary dictionary{{"deep", Array{Dictionary{{"deeper", endpoint}}}}};
     EXPECT_FALSE(fits(dictionary, ArgumentType::Dictionary));
     EXPECT_FALSE(fits(dictionary, ArgumentType::NullableDictionary));

@@ -1,13 +1,11 @@
 #include "base/Value.h"
 
 #include <gtest/gtest.h>
+#include "tests/unit/base/NamelessEndpoint.h"
 
-#include "platform/IpcEndpoint.h"
 
 namespace lumacast {
 namespace {
-
-class Endpoint final : public IpcEndpoint {};
 
 TEST(Value, ItHoldsOneKindAndConvertsNothing) {
     const Value number(std::int32_t{5});
@@ -38,9 +36,9 @@ TEST(Value, EqualityIsDeep) {
     EXPECT_FALSE(Value(std::int64_t{1}) == Value(std::uint64_t{1}));
     EXPECT_EQ(Value(Error("d", 1, {{"k", 1}})), Value(Error("d", 1, {{"k", 1}})));
     EXPECT_FALSE(Value(Error("d", 1)) == Value(Error("d", 2)));
-    const auto endpoint = std::make_shared<Endpoint>();
+    const auto endpoint = std::make_shared<NamelessEndpoint>();
     EXPECT_EQ(Value(Value::EndpointRef(endpoint)), Value(Value::EndpointRef(endpoint)));
-    EXPECT_FALSE(Value(Value::EndpointRef(endpoint)) == Value(Value::EndpointRef(std::make_shared<Endpoint>())));
+    EXPECT_FALSE(Value(Value::EndpointRef(endpoint)) == Value(Value::EndpointRef(std::make_shared<NamelessEndpoint>())));
 }
 
 TEST(Dictionary, EntriesKeepTheirFirstOrderAndAReplacedOneItsPlace) {

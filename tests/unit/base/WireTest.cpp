@@ -7,14 +7,12 @@
 #include <limits>
 
 #include "base/Limits.h"
-#include "platform/IpcEndpoint.h"
 #include "tests/fakes/FakePlane.h"
 #include "tests/fakes/SimRandom.h"
+#include "tests/unit/base/NamelessEndpoint.h"
 
 namespace lumacast {
 namespace {
-
-class Endpoint final : public IpcEndpoint {};
 
 std::optional<Value> roundTrip(const Value& value) {
     WireBody body;
@@ -48,7 +46,7 @@ Value everything() {
         {"url", URL("file:///a%20b")},
         {"dictionary", Dictionary{{"z", 1}, {"a", Dictionary{}}, {"", Array{}}}},
         {"error", Error("domain", -5803, {{"k", Array{1}}})},
-        {"endpoint", Value::EndpointRef(std::make_shared<Endpoint>())},
+        {"endpoint", Value::EndpointRef(std::make_shared<NamelessEndpoint>())},
         {"plane", Value::PlaneRef(std::make_shared<FakePlane>(2, 2, 1, std::vector<PixelRect>()))},
     };
 }
@@ -68,7 +66,7 @@ TEST(Wire, TheBytesAreWhatTheLayoutSays) {
 }
 
 TEST(Wire, HandlesTravelBesideTheBytesInTheOrderOfTheirNumbers) {
-    const auto first = std::make_shared<Endpoint>(), second = std::make_shared<Endpoint>();
+    const auto first = std::make_shared<NamelessEndpoint>(), second = std::make_shared<NamelessEndpoint>();
     WireBody body;
     ASSERT_TRUE(encode(Value(Array{Value::EndpointRef(first), Value::EndpointRef(second)}), body));
     EXPECT_EQ(body.bytes, (Data{9, 2, 0, 0, 0, 12, 0, 12, 1}));
@@ -161,7 +159,7 @@ TEST(Wire, TheLastValueDoesNotGoOverTheLimitEither) {
 
 TEST(Wire, HandlesEndAtTheLimit) {
     const auto handles = [](std::uint64_t count) {
-        return Value(Array(count, Value(Value::EndpointRef(std::make_shared<Endpoint>()))));
+        return Value(Array(count, Value(Value::EndpointRef(std::make_shared<NamelessEndpoint>()))));
     };
     EXPECT_TRUE(roundTrip(handles(limitOf(Limit::HandlesPerMessage))));
     WireBody body;
@@ -169,7 +167,7 @@ TEST(Wire, HandlesEndAtTheLimit) {
 }
 
 TEST(Wire, AHandleMustBeThereAndOfItsKind) {
-    const std::vector<Value> handles{Value(Value::EndpointRef(std::make_shared<Endpoint>()))};
+    const std::vector<Value> handles{Value(Value::EndpointRef(std::make_shared<NamelessEndpoint>()))};
     EXPECT_TRUE(decode(Data{12, 0}, handles));
     EXPECT_FALSE(decode(Data{12, 1}, handles));
     EXPECT_FALSE(decode(Data{13, 0}, handles));

@@ -16,11 +16,10 @@
 
 #include "tests/unit/linux_media/FaultyFiles.h"
 #include "tests/unit/linux_media/RecordedMovie.h"
+#include "tests/unit/linux_media/Times.h"
 
 namespace lumacast::testing {
 namespace {
-
-constexpr std::int64_t kMillisecond = 1'000'000, kSecond = 1'000'000'000;
 
 struct FaultyMovie {
     std::shared_ptr<FaultyFiles> disk = std::make_shared<FaultyFiles>();

@@ -9,13 +9,11 @@
 #include "linux/media/LinuxMovieExporters.h"
 #include "tests/unit/linux_media/FaultyFiles.h"
 #include "tests/unit/linux_media/RecordedMovie.h"
+#include "tests/unit/linux_media/Times.h"
 #include "tests/unit/linux_media/Tones.h"
 
 namespace lumacast::testing {
 namespace {
-
-constexpr std::int64_t kMillisecond = 1'000'000, kSecond = 1'000'000'000;
-constexpr std::int64_t kTick = 1000;  // of the file's picture track
 
 /// 30 s at 20 pictures a second, each of another grey than those near it, with a tone on the application's track.
 class Export : public ::testing::Test {

@@ -8,13 +8,12 @@
 
 #include "tests/unit/linux_media/FaultyFiles.h"
 #include "tests/unit/linux_media/RecordedMovie.h"
+#include "tests/unit/linux_media/Times.h"
 
 namespace lumacast::testing {
 namespace {
 
 namespace fs = std::filesystem;
-
-constexpr std::int64_t kSecond = 1'000'000'000;
 
 /// Descriptors this process has of the file that is, or was, at `path`.
 std::size_t descriptorsOf(const std::string& path) {

@@ -16,12 +16,11 @@
 #include "linux/system/LowPriority.h"
 #include "tests/unit/linux_media/FaultyFiles.h"
 #include "tests/unit/linux_media/RecordedMovie.h"
+#include "tests/unit/linux_media/Times.h"
 #include "tests/unit/linux_media/Tones.h"
 
 namespace lumacast::testing {
 namespace {
-
-constexpr std::int64_t kSecond = 1'000'000'000, kTick = 1000;
 
 /// A running export, and what it said.
 struct Job {

@@ -7,12 +7,10 @@
 
 #include "linux/media/AvHandles.h"
 #include "tests/unit/linux_media/RecordedMovie.h"
+#include "tests/unit/linux_media/Times.h"
 
 namespace lumacast::testing {
 namespace {
-
-constexpr std::int64_t kMillisecond = 1'000'000, kSecond = 1'000'000'000;
-constexpr std::int64_t kTick = 1000;  // of the file's picture track
 
 TEST(Pictures, AppearAtTheirStampsInTheirOrder) {
     RecordedMovie movie;

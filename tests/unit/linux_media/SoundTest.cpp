@@ -6,12 +6,11 @@
 #include <iterator>
 
 #include "tests/unit/linux_media/RecordedMovie.h"
+#include "tests/unit/linux_media/Times.h"
 #include "tests/unit/linux_media/Tones.h"
 
 namespace lumacast::testing {
 namespace {
-
-constexpr std::int64_t kSecond = 1'000'000'000;
 
 /// Of each sound track in turn: the media time of its first edit, -1 for an empty one (ISO/IEC 14496-12 clause 8.6.6).
 std::vector<std::int64_t> firstEdits(const std::string& path) {

@@ -7,7 +7,7 @@
 namespace lumacast::mp4::test {
 namespace {
 
-using Bytes = std::span<const std::uint8_t>;
+using View = std::span<const std::uint8_t>;
 
 struct Kind {
     const char* what;
@@ -61,7 +61,7 @@ const Kind& kindOf(const std::string& type) {
     return found == kinds.end() ? unknown : found->second;
 }
 
-std::uint64_t number(Bytes bytes, std::size_t count) {
+std::uint64_t number(View bytes, std::size_t count) {
     std::uint64_t value = 0;
     for (std::size_t place = 0; place < count && place < bytes.size(); ++place) value = value << 8 | bytes[place];
     return value;
@@ -69,9 +69,9 @@ std::uint64_t number(Bytes bytes, std::size_t count) {
 
 class Dump final {
 public:
-    explicit Dump(Bytes before) : before_(before) {}
+    explicit Dump(View before) : before_(before) {}
 
-    void boxes(Bytes bytes, std::size_t depth) {
+    void boxes(View bytes, std::size_t depth) {
         while (!bytes.empty()) {
             std::uint64_t size = number(bytes, 4);
             const std::size_t header = size == 1 ? 16 : 8;
@@ -88,7 +88,7 @@ public:
     [[nodiscard]] const std::string& text() const { return text_; }
 
 private:
-    void box(Bytes bytes, std::size_t header, std::size_t depth) {
+    void box(View bytes, std::size_t header, std::size_t depth) {
         const std::string type(bytes.begin() + 4, bytes.begin() + 8);
         const Kind& kind = kindOf(type);
         line(depth, type + (*kind.what != 0 ? "  " : "") + kind.what);
@@ -97,7 +97,7 @@ private:
             hex(bytes.first(own), depth + 1);
             return boxes(bytes.subspan(own), depth + 1);
         }
-        const Bytes content = bytes.subspan(header);
+        const View content = bytes.subspan(header);
         const bool repeats = !before_.empty() && type == "mdat" && content.size() >= before_.size() &&
                              std::equal(before_.begin(), before_.end(), content.begin());
         if (!repeats) return hex(bytes, depth + 1);
@@ -108,7 +108,7 @@ private:
 
     void line(std::size_t depth, const std::string& text) { text_ += std::string(2 * depth, ' ') + text + "\n"; }
 
-    void hex(Bytes bytes, std::size_t depth) {
+    void hex(View bytes, std::size_t depth) {
         constexpr std::size_t kPerLine = 32, kPerNumber = 4;
         std::string row;
         for (std::size_t place = 0; place < bytes.size(); ++place) {
@@ -123,13 +123,13 @@ private:
         }
     }
 
-    Bytes before_;
+    View before_;
     std::string text_;
 };
 
 }  // namespace
 
-std::string dumpOf(Bytes file, Bytes before) {
+std::string dumpOf(View file, View before) {
     Dump dump(before);
     dump.boxes(file, 0);
     return dump.text();

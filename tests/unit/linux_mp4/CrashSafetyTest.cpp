@@ -5,6 +5,7 @@
 
 #include "tests/unit/linux_mp4/BoxParser.h"
 #include "tests/unit/linux_mp4/Media.h"
+#include "tests/unit/linux_mp4/Times.h"
 #include "tests/unit/linux_mp4/Tools.h"
 
 namespace lumacast::mp4 {
@@ -12,9 +13,6 @@ namespace {
 
 using test::Bytes;
 using test::MemorySink;
-
-constexpr std::int64_t kSecond = kDefaultVideoTimescale;
-constexpr std::int64_t kRate = 48000;
 
 class CrashSafety : public ::testing::Test {
 protected:

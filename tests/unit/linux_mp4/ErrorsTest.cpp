@@ -2,14 +2,13 @@
 
 #include "tests/unit/linux_mp4/BoxParser.h"
 #include "tests/unit/linux_mp4/Descriptions.h"
+#include "tests/unit/linux_mp4/Times.h"
 
 namespace lumacast::mp4 {
 namespace {
 
 using test::MemorySink;
 using test::payload;
-
-constexpr std::int64_t kSecond = kDefaultVideoTimescale;
 
 // A short movie of every kind of operation; answers what the finish answered, or the first error before it.
 MovieError writeShortMovie(MemorySink& sink) {

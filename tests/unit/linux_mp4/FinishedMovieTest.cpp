@@ -4,6 +4,7 @@
 
 #include "tests/unit/linux_mp4/BoxParser.h"
 #include "tests/unit/linux_mp4/Descriptions.h"
+#include "tests/unit/linux_mp4/Times.h"
 
 namespace lumacast::mp4 {
 namespace {
@@ -14,8 +15,6 @@ using test::ParsedBox;
 using test::ParsedTrack;
 using test::parseTrack;
 using test::payload;
-
-constexpr std::int64_t kSecond = kDefaultVideoTimescale;
 
 std::vector<ParsedTrack> tracksOf(const ParsedBox& movie) {
     std::vector<ParsedTrack> tracks;

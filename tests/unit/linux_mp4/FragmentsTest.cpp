@@ -2,6 +2,7 @@
 
 #include "tests/unit/linux_mp4/BoxParser.h"
 #include "tests/unit/linux_mp4/Descriptions.h"
+#include "tests/unit/linux_mp4/Times.h"
 
 namespace lumacast::mp4 {
 namespace {
@@ -11,8 +12,6 @@ using test::parseBoxes;
 using test::ParsedBox;
 using test::parseFragment;
 using test::payload;
-
-constexpr std::int64_t kSecond = kDefaultVideoTimescale;
 
 std::vector<const ParsedBox*> fragmentsOf(const std::vector<ParsedBox>& boxes) {
     std::vector<const ParsedBox*> found;

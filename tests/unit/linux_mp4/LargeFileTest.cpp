@@ -6,12 +6,12 @@
 
 #include "tests/unit/linux_mp4/BoxParser.h"
 #include "tests/unit/linux_mp4/Media.h"
+#include "tests/unit/linux_mp4/Times.h"
 #include "tests/unit/linux_mp4/Tools.h"
 
 namespace lumacast::mp4 {
 namespace {
 
-constexpr std::int64_t kSecond = kDefaultVideoTimescale;
 constexpr std::uint64_t kFourGibibytes = 1ULL << 32U;
 
 // A file in which pages of zeros take no room.

@@ -6,15 +6,13 @@
 
 #include "tests/unit/linux_mp4/BoxParser.h"
 #include "tests/unit/linux_mp4/Media.h"
+#include "tests/unit/linux_mp4/Times.h"
 #include "tests/unit/linux_mp4/Tools.h"
 
 namespace lumacast::mp4 {
 namespace {
 
 using test::MemorySink;
-
-constexpr std::int64_t kSecond = kDefaultVideoTimescale;
-constexpr std::int64_t kRate = 48000;
 
 // Times at which the decoded sound sets in after silence, in frames from the beginning of the movie, sound of that
 // stream alone.

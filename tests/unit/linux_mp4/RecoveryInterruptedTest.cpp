@@ -8,6 +8,7 @@
 #include "linux/media/mp4/MovieLook.h"
 #include "tests/unit/linux_mp4/Descriptions.h"
 #include "tests/unit/linux_mp4/Recovery.h"
+#include "tests/unit/linux_mp4/Times.h"
 #include "tests/unit/linux_mp4/Tools.h"
 
 namespace lumacast::mp4 {
@@ -16,9 +17,6 @@ namespace {
 using test::Bytes;
 using test::MemoryFile;
 using test::MemorySink;
-
-constexpr std::int64_t kSecond = kDefaultVideoTimescale;
-constexpr std::int64_t kRate = 48000;
 
 Bytes recordingOf(const test::Material& material) {
     MemorySink sink;

@@ -9,6 +9,7 @@
 #include <set>
 
 #include "linux/media/mp4/MovieLook.h"
+#include "tests/unit/linux_mp4/Times.h"
 #include "tests/unit/linux_mp4/Tools.h"
 
 namespace lumacast::mp4 {
@@ -17,9 +18,6 @@ namespace {
 using test::Bytes;
 using test::MemoryFile;
 using test::MemorySink;
-
-constexpr std::int64_t kSecond = kDefaultVideoTimescale;
-constexpr std::int64_t kRate = 48000;
 
 class MovieRecovery : public ::testing::Test {
 protected:

@@ -7,6 +7,7 @@
 #include <map>
 
 #include "tests/contract/ScratchDirectory.h"
+#include "tests/unit/linux_services/ModeOf.h"
 
 namespace lumacast {
 namespace {
@@ -20,11 +21,6 @@ LinuxEnvironment from(std::map<std::string, std::string, std::less<>> variables,
         return found == variables.end() ? std::nullopt : std::optional(found->second);
     };
     return LinuxEnvironment::from(variable, 1234, executable, systemDirectory);
-}
-
-mode_t modeOf(const std::string& path) {
-    struct stat status = {};
-    return ::stat(path.c_str(), &status) == 0 ? status.st_mode & 07777 : 0;
 }
 
 TEST(LinuxEnvironment, WithoutVariablesTheUsualPlacesCount) {

@@ -9,6 +9,7 @@
 #include <map>
 
 #include "tests/contract/ScratchDirectory.h"
+#include "tests/unit/linux_services/ModeOf.h"
 #include "tests/unit/linux_services/Until.h"
 
 namespace lumacast {
@@ -44,11 +45,6 @@ template <class T>
 std::int64_t code(const Result<T>& result) {
     const Error* error = std::get_if<Error>(&result);
     return error ? error->code() : 0;
-}
-
-mode_t modeOf(const std::string& path) {
-    struct stat status = {};
-    return ::stat(path.c_str(), &status) == 0 ? status.st_mode & 07777 : 0;
 }
 
 TEST(LinuxFileSystem, PreparingMakesTheParentsAndNotTheDirectory) {

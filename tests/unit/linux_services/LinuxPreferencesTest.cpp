@@ -5,11 +5,10 @@
 
 #include "linux/system/LinuxDeviceInfo.h"
 #include "tests/contract/ScratchDirectory.h"
+#include "tests/unit/linux_services/Until.h"
 
 namespace lumacast {
 namespace {
-
-constexpr std::chrono::seconds kPatience{30};
 
 TEST(LinuxPreferences, TheUsersFileGoesBeforeTheAdministrators) {
     ScratchDirectory scratch;

@@ -14,8 +14,6 @@
 namespace lumacast {
 namespace {
 
-constexpr std::chrono::seconds kPatience{30};
-
 std::optional<Error> send(LinuxTelemetry& telemetry, std::int64_t type) {
     return telemetry.send({23, 1, 0, true, true}, {"Lumacast", "InAppRecording"}, 2, type, {{"Key", "text"}});
 }

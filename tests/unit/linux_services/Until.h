@@ -5,10 +5,13 @@
 
 namespace lumacast {
 
-/// Waits until `condition` holds, at most half a minute; whether it does.
+/// For what is sure to come.
+inline constexpr std::chrono::seconds kPatience{30};
+
+/// Waits until `condition` holds, as long as that; whether it does.
 template <class Condition>
 bool until(Condition condition) {
-    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(30);
+    const auto deadline = std::chrono::steady_clock::now() + kPatience;
     while (!condition()) {
         if (std::chrono::steady_clock::now() > deadline) return false;
         std::this_thread::yield();

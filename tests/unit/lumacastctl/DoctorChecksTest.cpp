@@ -14,9 +14,6 @@ namespace {
 using ::testing::Contains;
 using ::testing::ElementsAre;
 using ::testing::Not;
-constexpr auto kOk = Severity::Ok;
-constexpr auto kWarning = Severity::Warning;
-constexpr auto kProblem = Severity::Problem;
 
 TEST(Findings, AreALineEachWithTheirSeverityFirst) {
     EXPECT_EQ(findingsText({ok("a", "good."), warning("b", "fair."), problem("c", "bad\x1B.")}),

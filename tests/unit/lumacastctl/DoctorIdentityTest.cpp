@@ -12,9 +12,6 @@ namespace {
 using ::testing::Contains;
 using ::testing::ElementsAre;
 using ::testing::Not;
-constexpr auto kOk = Severity::Ok;
-constexpr auto kWarning = Severity::Warning;
-constexpr auto kProblem = Severity::Problem;
 
 // --- the checks ---
 

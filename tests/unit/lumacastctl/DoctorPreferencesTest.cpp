@@ -8,9 +8,6 @@ namespace lumacast::ctl {
 namespace {
 
 using ::testing::Contains;
-constexpr auto kOk = Severity::Ok;
-constexpr auto kWarning = Severity::Warning;
-constexpr auto kProblem = Severity::Problem;
 
 constexpr char kFile[] = "lumacast/com.orvane.lumacastd.conf";
 

@@ -6,6 +6,10 @@
 
 namespace lumacast::ctl {
 
+inline constexpr auto kOk = Severity::Ok;
+inline constexpr auto kWarning = Severity::Warning;
+inline constexpr auto kProblem = Severity::Problem;
+
 inline void PrintTo(const Finding& finding, std::ostream* out) { *out << findingsText({finding}); }
 
 /// A finding of that severity whose text has `part` in it.
