@@ -10,7 +10,7 @@ namespace lumacast::test {
 namespace {
 
 TEST(ClientReadme, ShowsTheExampleThatIsBuilt) {
-    const std::string code = ScratchDirectory::read(LC_SOURCE_DIR "/examples/minimal/main.cpp");
+    const std::string code = ScratchDirectory::read(LC_SOURCE_DIR "/tests/consumer/recorder/main.cpp");
     const std::string begin = "// [record]\n";
     const auto from = code.find(begin);
     const auto to = code.find("// [/record]");

@@ -10,7 +10,7 @@ namespace lumacast::test {
 namespace {
 
 TEST(ExtensionReadme, ShowsTheExampleThatIsBuilt) {
-    const std::string code = ScratchDirectory::read(LC_SOURCE_DIR "/examples/minimal_extension/main.cpp");
+    const std::string code = ScratchDirectory::read(LC_SOURCE_DIR "/tests/consumer/extension/main.cpp");
     const std::string begin = "// [extension]\n";
     const auto from = code.find(begin);
     const auto to = code.find("// [/extension]");
