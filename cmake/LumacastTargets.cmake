@@ -21,12 +21,21 @@ if(LC_FUZZ)
   target_link_options(lc_options INTERFACE -fsanitize=fuzzer-no-link)
 endif()
 
+# What is installed is hardened as Debian wants its packages, so that they can be made of any Release build. (The compiler's
+# default there makes executables position-independent.) Tests are not: this would be none of what they look for.
+add_library(lc_hardening INTERFACE)
+if(NOT LC_SANITIZE)
+  target_compile_options(lc_hardening INTERFACE $<$<CONFIG:Release>:-fstack-protector-strong>
+    $<$<CONFIG:Release>:-D_FORTIFY_SOURCE=2>)
+  target_link_options(lc_hardening INTERFACE $<$<CONFIG:Release>:-Wl,-z,relro,-z,now>)
+endif()
+
 # lc_library(NAME DIR DEPS...): a static library of all .cpp files of one folder (not of the folders below it).
 function(lc_library name dir)
   file(GLOB sources CONFIGURE_DEPENDS ${dir}/*.cpp)
   if(sources)
     add_library(${name} STATIC ${sources})
-    target_link_libraries(${name} PUBLIC ${ARGN} PRIVATE lc_options)
+    target_link_libraries(${name} PUBLIC ${ARGN} PRIVATE lc_options lc_hardening)
     target_include_directories(${name} PUBLIC ${PROJECT_SOURCE_DIR}/src ${PROJECT_SOURCE_DIR})
   else()
     add_library(${name} INTERFACE)
@@ -44,7 +53,7 @@ endfunction()
 function(lc_executable name)
   cmake_parse_arguments(arg "" "" "SOURCES;DEPS" ${ARGN})
   add_executable(${name} ${arg_SOURCES})
-  target_link_libraries(${name} PRIVATE ${arg_DEPS} lc_options)
+  target_link_libraries(${name} PRIVATE ${arg_DEPS} lc_options lc_hardening)
   target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR}/src ${PROJECT_SOURCE_DIR})
   set_target_properties(${name} PROPERTIES RUNTIME_OUTPUT_DIRECTORY ${PROJECT_BINARY_DIR}/bin)
 endfunction()

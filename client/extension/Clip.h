@@ -9,8 +9,11 @@
 
 #include "base/Value.h"
 #include "broadcast/LCBroadcastConfiguration.h"
-#include "linux/ipc/ExtensionRequests.h"
 #include "linux/ipc/Fd.h"
+
+namespace lumacast {
+struct ExtensionItem;
+}
 
 namespace lumacast::extension {
 

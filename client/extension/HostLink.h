@@ -11,6 +11,8 @@
 #include "client/extension/Clip.h"
 #include "client/extension/Extension.h"
 #include "client/extension/World.h"
+#include "linux/ipc/ExtensionRequests.h"
+#include "platform/IpcConnection.h"
 
 namespace lumacast::extension {
 

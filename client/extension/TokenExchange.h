@@ -6,7 +6,10 @@
 
 #include "base/Value.h"
 #include "linux/ipc/Fd.h"
-#include "platform/IpcConnection.h"
+
+namespace lumacast {
+class IpcConnection;
+}
 
 namespace lumacast::extension {
 
