@@ -30,13 +30,18 @@ if(NOT LC_SANITIZE)
   target_link_options(lc_hardening INTERFACE $<$<CONFIG:Release>:-Wl,-z,relro,-z,now>)
 endif()
 
+# lc_sources_library(NAME SOURCES DEPS...): a static library of these sources, a list.
+function(lc_sources_library name sources)
+  add_library(${name} STATIC ${sources})
+  target_link_libraries(${name} PUBLIC ${ARGN} PRIVATE lc_options lc_hardening)
+  target_include_directories(${name} PUBLIC ${PROJECT_SOURCE_DIR}/src ${PROJECT_SOURCE_DIR})
+endfunction()
+
 # lc_library(NAME DIR DEPS...): a static library of all .cpp files of one folder (not of the folders below it).
 function(lc_library name dir)
   file(GLOB sources CONFIGURE_DEPENDS ${dir}/*.cpp)
   if(sources)
-    add_library(${name} STATIC ${sources})
-    target_link_libraries(${name} PUBLIC ${ARGN} PRIVATE lc_options lc_hardening)
-    target_include_directories(${name} PUBLIC ${PROJECT_SOURCE_DIR}/src ${PROJECT_SOURCE_DIR})
+    lc_sources_library(${name} "${sources}" ${ARGN})
   else()
     add_library(${name} INTERFACE)
     target_link_libraries(${name} INTERFACE ${ARGN})

@@ -39,9 +39,9 @@ std::int32_t TapCore::setProcessTap(ProcessID pid) {
     const std::lock_guard lock(mutex_);
     if (disposed_) return AudioStatus::kDisposed;
     if (running_) return AudioStatus::kBadState;
-    auto owner = sound::TapOwner::hold(pid, services_.applicationOf);
-    if (!owner) return AudioStatus::kNoSuchProcess;
-    owner_ = std::move(owner);
+    auto process = services_.source->hold(pid);
+    if (!process) return AudioStatus::kNoSuchProcess;
+    process_ = std::move(process);
     return AudioStatus::kSuccess;
 }
 
@@ -119,17 +119,12 @@ std::int32_t TapCore::setIsRunningListener(AudioInputQueue::IsRunningListener li
 
 bool TapCore::openTapLocked() {
     // Nobody's sound needs no server.
-    if (!owner_ || tap_) return true;
-    auto tap = std::make_shared<sound::ProcessTap>(owner_, mix_);
-    if (!services_.connection->attach(tap)) return false;
-    tap_ = std::move(tap);
-    return true;
+    if (!process_ || tap_) return true;
+    tap_ = process_->listen(mix_);
+    return tap_ != nullptr;
 }
 
-void TapCore::closeTapLocked() {
-    if (tap_) services_.connection->detach(tap_);
-    tap_.reset();
-}
+void TapCore::closeTapLocked() { tap_.reset(); }
 
 std::int32_t TapCore::start() {
     const std::lock_guard lock(mutex_);
@@ -181,7 +176,7 @@ std::int32_t TapCore::dispose() {
     std::swap(listener_, listener);
     allocated_.clear();
     enqueued_.clear();
-    owner_.reset();
+    process_.reset();
     changed_.notify_all();
     return AudioStatus::kSuccess;
 }

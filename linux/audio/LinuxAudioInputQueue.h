@@ -8,10 +8,8 @@
 #include <span>
 #include <vector>
 
-#include "linux/audio/ProcessTap.h"
-#include "linux/audio/PulseConnection.h"
 #include "linux/audio/TapMix.h"
-#include "linux/audio/TapOwner.h"
+#include "linux/audio/TapSource.h"
 #include "platform/AudioInputQueue.h"
 #include "platform/Clock.h"
 
@@ -19,13 +17,12 @@ namespace lumacast {
 
 /// What a queue needs of the port.
 struct TapServices {
-    std::shared_ptr<sound::PulseConnection> connection;
+    std::shared_ptr<sound::TapSource> source;
     Clock& clock;  ///< asked only at a start
-    sound::ApplicationOf applicationOf;
 };
 
 /// What a queue's owner and its thread share. The thread lives from the first start until dispose; it goes by the clock,
-/// not by the server, and wakes fifty times a second while there are buffers to fill; when there has been nothing to hear
+/// not by who plays, and wakes fifty times a second while there are buffers to fill; when there has been nothing to hear
 /// for two seconds five times, and about once where silence may come late. Thread-safe.
 class TapCore final : public std::enable_shared_from_this<TapCore> {
 public:
@@ -79,7 +76,7 @@ private:
     std::condition_variable changed_;
     std::shared_ptr<const AudioInputQueue::InputCallback> callback_;
     std::shared_ptr<const AudioInputQueue::IsRunningListener> listener_;
-    std::shared_ptr<sound::TapOwner> owner_;
+    std::shared_ptr<sound::TappedProcess> process_;
     std::vector<Allocated> allocated_;
     std::deque<AudioQueueBufferRef> enqueued_;
     std::deque<Filled> filled_;    ///< to be handed over; still the queue's
@@ -90,7 +87,7 @@ private:
     std::uint64_t run_ = 0;        ///< counts starts and stops
     std::shared_ptr<CaptureClock> clock_;
     std::shared_ptr<sound::TapMix> mix_;
-    std::shared_ptr<sound::ProcessTap> tap_;
+    std::unique_ptr<sound::Listening> tap_;
     AudioTimeStamp firstStamp_;    ///< of the buffer that is being filled
     std::optional<HostTime> drySince_;
     std::vector<float> samples_;

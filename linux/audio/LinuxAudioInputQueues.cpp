@@ -15,7 +15,7 @@ AudioInputQueues::Made LinuxAudioInputQueues::makeInputQueue(const AudioFormat& 
     if (flags != kCaptureProcessOutput) return refused(AudioStatus::kBadFlags);
     const auto whole = sound::completed(format);
     if (!whole) return refused(AudioStatus::kBadFormat);
-    auto core = std::make_shared<TapCore>(TapServices{connection_, clock_, applicationOf_}, *whole, std::move(callback));
+    auto core = std::make_shared<TapCore>(TapServices{source_, clock_}, *whole, std::move(callback));
     return {AudioStatus::kSuccess, std::make_shared<LinuxAudioInputQueue>(std::move(core))};
 }
 

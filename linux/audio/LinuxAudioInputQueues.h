@@ -1,24 +1,20 @@
 #pragma once
 #include <memory>
 
-#include "linux/audio/PulseConnection.h"
-#include "linux/audio/TapOwner.h"
+#include "linux/audio/TapSource.h"
 #include "platform/AudioInputQueue.h"
 #include "platform/Clock.h"
 
 namespace lumacast {
 
-/// Taps at the user's sound server, PulseAudio or PipeWire. Callable from any lane; waits for nobody.
+/// Taps of what a source knows processes to play. Callable from any lane; waits for nobody.
 class LinuxAudioInputQueues final : public AudioInputQueues {
 public:
-    /// `clock` outlives this and every queue. `applicationOf` is asked on the sound thread whether a descendant of a
-    /// tapped process counts as it; empty: none does.
-    LinuxAudioInputQueues(std::shared_ptr<sound::PulseConnection> connection, Clock& clock,
-                          sound::ApplicationOf applicationOf)
-        : connection_(std::move(connection)), clock_(clock), applicationOf_(std::move(applicationOf)) {}
+    /// `clock` outlives this and every queue.
+    LinuxAudioInputQueues(std::shared_ptr<sound::TapSource> source, Clock& clock) : source_(std::move(source)), clock_(clock) {}
 
-    /// Ends the connection, for whoever else uses it too: from then on nobody is asked anything.
-    ~LinuxAudioInputQueues() override { connection_->end(); }
+    /// Ends the source, which queues may outlive.
+    ~LinuxAudioInputQueues() override { source_->end(); }
     LinuxAudioInputQueues(const LinuxAudioInputQueues&) = delete;
     LinuxAudioInputQueues& operator=(const LinuxAudioInputQueues&) = delete;
 
@@ -26,9 +22,8 @@ public:
                         std::uint32_t flags) override;
 
 private:
-    const std::shared_ptr<sound::PulseConnection> connection_;
+    const std::shared_ptr<sound::TapSource> source_;
     Clock& clock_;
-    const sound::ApplicationOf applicationOf_;
 };
 
 }  // namespace lumacast

@@ -11,10 +11,6 @@ using sound::DeviceAudioOutput;
 LinuxDeviceCaptureSession::LinuxDeviceCaptureSession(DeviceServices services, Scheduler& scheduler)
     : services_(std::move(services)), lane_(scheduler.serialQueue("capture session")) {}
 
-LinuxDeviceCaptureSession::~LinuxDeviceCaptureSession() {
-    if (opening_.microphone) services_.connection->detach(opening_.microphone);
-}
-
 void LinuxDeviceCaptureSession::setUsesApplicationAudioSession(bool uses) {
     const std::lock_guard lock(mutex_);
     usesAudioSession_ = uses;
@@ -112,14 +108,13 @@ LinuxDeviceCaptureSession::Opening LinuxDeviceCaptureSession::updateLocked() {
     ++openings_;
     // Before the microphone is told that its server has gone: a stop is no interruption.
     if (opening_.part) opening_.part->close();
-    services_.connection->detach(opening_.microphone);
     return std::exchange(opening_, {});
 }
 
 void LinuxDeviceCaptureSession::openLocked() {
     Opening opening;
     if (usesAudioSession_) opening.part = services_.audioSession.makePart();
-    opening.microphone = std::make_shared<sound::Microphone>(sound::Microphone::Listener{
+    opening.microphone = services_.openMicrophone({
         [weak = weak_from_this(), number = ++openings_](const sound::SoundTimeline& timeline, std::int64_t first,
                                                         std::span<const float> samples) {
             if (const auto self = weak.lock()) self->heard(number, timeline, first, samples);
@@ -128,7 +123,7 @@ void LinuxDeviceCaptureSession::openLocked() {
             if (const auto part = weak.lock()) part->setInterrupted(isInterrupted);
         }});
     // Without a thread for it there are no samples; the next change tries again.
-    if (services_.connection->attach(opening.microphone)) opening_ = std::move(opening);
+    if (opening.microphone) opening_ = std::move(opening);
 }
 
 void LinuxDeviceCaptureSession::heard(std::uint64_t number, const sound::SoundTimeline& timeline, std::int64_t first,

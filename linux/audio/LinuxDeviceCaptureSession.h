@@ -9,31 +9,29 @@
 
 #include "linux/audio/DeviceAudioOutput.h"
 #include "linux/audio/DeviceAudioSession.h"
-#include "linux/audio/Microphone.h"
-#include "linux/audio/PulseConnection.h"
+#include "linux/audio/TapSource.h"
 #include "platform/Clock.h"
 #include "platform/DeviceCapture.h"
 #include "platform/Scheduler.h"
 
 namespace lumacast {
 
-/// The default microphone of the user's sound server, whichever it is at the time.
+/// The default microphone, whichever it is at the time.
 class MicrophoneInput final : public CaptureInput {};
 
 /// What a session needs of the port.
 struct DeviceServices {
-    std::shared_ptr<sound::PulseConnection> connection;
+    sound::OpenMicrophone openMicrophone;
     Clock& clock;  ///< asked only at a start
     sound::DeviceAudioSession& audioSession;  ///< asked only while an operation of the session runs
 };
 
 /// The microphone is open only while the session runs and has both an input and an output. Thread-safe; samples are
-/// made on the sound thread, changes are told on a queue of the session.
+/// made on the microphone's thread, changes are told on a queue of the session.
 class LinuxDeviceCaptureSession final : public DeviceCaptureSession,
                                         public std::enable_shared_from_this<LinuxDeviceCaptureSession> {
 public:
     LinuxDeviceCaptureSession(DeviceServices services, Scheduler& scheduler);
-    ~LinuxDeviceCaptureSession() override;
 
     /// Both count from when the microphone is opened next. Nothing of the shared audio session has to be changed for a
     /// recording here, so it never is.
@@ -62,7 +60,7 @@ private:
     };
     /// One opening of the microphone.
     struct Opening {
-        std::shared_ptr<sound::Microphone> microphone;
+        std::unique_ptr<sound::Listening> microphone;
         std::shared_ptr<sound::DeviceAudioSession::Part> part;
     };
 

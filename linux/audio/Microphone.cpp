@@ -18,7 +18,7 @@ constexpr int kSilentWatches = 6;
 
 }  // namespace
 
-Microphone::Microphone(Listener listener)
+Microphone::Microphone(MicrophoneListener listener)
     : listener_(std::move(listener)), timeline_{LinuxClock::currentHostTime(), microphoneFormat().sampleRate} {}
 
 Microphone::Session::Session(const PulseServer& there, Microphone& microphone)

@@ -1,7 +1,6 @@
 #pragma once
 // The default microphone, for as long as somebody wants to hear it.
 
-#include <functional>
 #include <memory>
 #include <span>
 
@@ -9,6 +8,7 @@
 #include "linux/audio/MicrophoneStream.h"
 #include "linux/audio/PulseConnection.h"
 #include "linux/audio/SoundTimeline.h"
+#include "linux/audio/TapSource.h"
 
 namespace lumacast::sound {
 
@@ -17,16 +17,8 @@ namespace lumacast::sound {
 /// Made on any thread; everything else is the sound thread's, and so are both functions: neither may wait.
 class Microphone final : public PulseUser {
 public:
-    struct Listener {
-        /// Frames that follow each other in time, from frame `first` of the timeline on; mono, full scale 1.
-        std::function<void(const SoundTimeline& timeline, std::int64_t first, std::span<const float> samples)> heard;
-        /// That the microphone is interrupted (it is suspended, taken, silent since it was heard, or gone since then),
-        /// and that it is heard again; in turns, the latter before the sound.
-        std::function<void(bool isInterrupted)> interrupted;
-    };
-
     /// Its timeline begins now.
-    explicit Microphone(Listener listener);
+    explicit Microphone(MicrophoneListener listener);
 
     void serverCame(const PulseServer& server) override;
     void serverWent() override;
@@ -55,7 +47,7 @@ private:
     void heard(std::int64_t first, std::span<const float> samples);
     void setInterrupted(bool isInterrupted);
 
-    const Listener listener_;
+    const MicrophoneListener listener_;
     const SoundTimeline timeline_;
     std::int64_t next_ = 0;      ///< the frame after the last one that was handed over
     bool wasHeard_ = false;

@@ -38,6 +38,14 @@ std::shared_ptr<SoundLane> TapMix::addLane() {
     return lane;
 }
 
+std::shared_ptr<SoundLane> TapMix::addComputedLane(SoundLane::Computed computed) {
+    auto lane = std::make_shared<SoundLane>(0, std::move(computed));
+    lane->isTrusted_ = true;
+    const std::lock_guard lock(mutex_);
+    lanes_.push_back(lane);
+    return lane;
+}
+
 void TapMix::trust(SoundLane& lane) {
     const std::lock_guard lock(mutex_);
     lane.isTrusted_ = true;
@@ -121,6 +129,7 @@ void TapMix::read(std::span<float> interleaved) {
     std::fill(interleaved.begin(), interleaved.end(), 0.0f);
     const std::lock_guard lock(mutex_);
     for (const auto& lane : lanes_) {
+        if (lane->isTrusted_ && lane->computed_) lane->computed_(momentOf(position_), interleaved);
         if (!lane->isTrusted_ || lane->samples_.empty()) continue;
         const std::int64_t from = std::max(position_, lane->begin_), to = std::min(position_ + count, lane->end_);
         for (std::int64_t frame = from; frame < to; ++frame) {

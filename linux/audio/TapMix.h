@@ -16,11 +16,16 @@ namespace lumacast::sound {
 /// The last second or so of one stream, by frame number. What was not written is silence. Not thread-safe: the mix's.
 class SoundLane final {
 public:
-    explicit SoundLane(std::size_t capacityFrames) : frames_(capacityFrames) {}
+    /// Adds what is heard from `moment` on to samples that are there already. Pure.
+    using Computed = std::function<void(HostTime moment, std::span<float> interleaved)>;
+
+    explicit SoundLane(std::size_t capacityFrames, Computed computed = {})
+        : frames_(capacityFrames), computed_(std::move(computed)) {}
 
 private:
     friend class TapMix;
     const std::size_t frames_;
+    const Computed computed_;     ///< in place of samples
     std::vector<float> samples_;  ///< empty until something is written
     std::int64_t begin_ = 0, end_ = 0;  ///< frames that may be other than silence
     bool isTrusted_ = false;
@@ -48,6 +53,9 @@ public:
     void whenStreamComes(std::function<void()> told) { streamComes_ = std::move(told); }
     /// A new stream; nothing of it is read until it is trusted, but what was written a moment before then is.
     std::shared_ptr<SoundLane> addLane();
+    /// A stream that nobody writes: what it plays is computed when it is read, under the mix's lock. Trusted at once, and
+    /// nobody is told of it: it may be added by whoever reads.
+    std::shared_ptr<SoundLane> addComputedLane(SoundLane::Computed computed);
     void trust(SoundLane& lane);
     /// Nothing more comes; what is there is read if the lane is trusted, or thrown away.
     void closeLane(const std::shared_ptr<SoundLane>& lane);

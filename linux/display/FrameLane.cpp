@@ -7,7 +7,7 @@
 #include <chrono>
 #include <ctime>
 
-#include "linux/display/X11DisplayCapture.h"
+#include "linux/display/CaptureStatus.h"
 
 namespace lumacast::x11 {
 namespace {
@@ -157,8 +157,8 @@ bool FrameLane::beginRun(const Order& order) {
 
 bool FrameLane::connect(const Order& order) {
     connection_ = X11Connection::open(setup_.display, interrupt_);
-    if (!connection_) return fail(order, X11CaptureStatus::kNoDisplay), false;
-    if (!connection_->canCapture()) return fail(order, X11CaptureStatus::kNotSupported), false;
+    if (!connection_) return fail(order, CaptureStatus::kNoDisplay), false;
+    if (!connection_->canCapture()) return fail(order, CaptureStatus::kNotSupported), false;
     scene_ = std::make_unique<CaptureScene>(*connection_, pacer_.interval());
     makeMaker();
     return true;
@@ -185,7 +185,7 @@ bool FrameLane::followSelection(const Order& order) {
     if (connection_->broken()) return displayIsLost(order), false;
     if (wanted.mode == DisplayCloneControl::kCloneContexts)
         for (const ContextID context : scene_->missing(wanted)) setup_.selection->forget(context);
-    if (!any) return fail(order, X11CaptureStatus::kWindowGone), false;
+    if (!any) return fail(order, CaptureStatus::kWindowGone), false;
     if (shown_ && shown_->id() != before) pictureWanted_ = true;
     if (shown_) makeMaker();
     drainEvents(true);
@@ -309,7 +309,7 @@ void FrameLane::fail(const Order& order, std::int32_t status) {
 
 void FrameLane::displayIsLost(const Order& order) {
     forgetWindows();
-    if (!mirrors_) return fail(order, X11CaptureStatus::kDisplayLost);
+    if (!mirrors_) return fail(order, CaptureStatus::kDisplayLost);
     end(order, [](auto& delegate, auto& source) { delegate.screenCaptureControllerMediaServicesWereReset(source); });
 }
 

@@ -10,6 +10,7 @@
 #include <string>
 
 #include "linux/display/CaptureControl.h"
+#include "linux/display/CaptureLane.h"
 #include "linux/display/CaptureScene.h"
 #include "linux/display/CloneSelection.h"
 #include "linux/display/FramePacer.h"
@@ -34,17 +35,14 @@ struct FrameLaneSetup {
 
 /// Captures and delivers while the control says so; sleeps otherwise. It waits for the display server on its own
 /// connection, so nobody else ever waits for a server that hangs.
-class FrameLane final {
+class FrameLane final : public CaptureLane {
 public:
     explicit FrameLane(FrameLaneSetup setup);
 
-    /// The thread's body: returns after quit().
-    void run();
-    bool finished() const { return finished_.load(std::memory_order_acquire); }
-    /// Callable from any thread, returns at once: there is a new order.
-    void wake() { wake_->signal(); }
-    /// Callable from any thread, returns at once; ends a wait for the server too.
-    void quit();
+    void run() override;
+    bool finished() const override { return finished_.load(std::memory_order_acquire); }
+    void wake() override { wake_->signal(); }
+    void quit() override;
 
 private:
     using Order = CaptureControl::Order;

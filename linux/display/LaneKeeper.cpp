@@ -12,7 +12,7 @@ LaneKeeper::~LaneKeeper() {
     for (Entry& entry : entries_) entry.thread.join();
 }
 
-bool LaneKeeper::launch(std::shared_ptr<FrameLane> lane) {
+bool LaneKeeper::launch(std::shared_ptr<CaptureLane> lane) {
     const std::lock_guard lock(mutex_);
     std::erase_if(entries_, [](Entry& entry) {
         const bool over = entry.lane->finished();

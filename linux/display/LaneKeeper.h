@@ -4,11 +4,11 @@
 #include <thread>
 #include <vector>
 
-#include "linux/display/FrameLane.h"
+#include "linux/display/CaptureLane.h"
 
 namespace lumacast::x11 {
 
-/// Owns the threads of the frame lanes, so that a source can end on its own lane and the process still joins every
+/// Owns the threads of the capture lanes, so that a source can end on its own lane and the process still joins every
 /// thread. Thread-safe.
 class LaneKeeper final {
 public:
@@ -19,11 +19,11 @@ public:
     LaneKeeper& operator=(const LaneKeeper&) = delete;
 
     /// Runs the lane on a thread of its own. False when there is none to be had.
-    [[nodiscard]] bool launch(std::shared_ptr<FrameLane> lane);
+    [[nodiscard]] bool launch(std::shared_ptr<CaptureLane> lane);
 
 private:
     struct Entry {
-        std::shared_ptr<FrameLane> lane;
+        std::shared_ptr<CaptureLane> lane;
         std::thread thread;
     };
     std::mutex mutex_;

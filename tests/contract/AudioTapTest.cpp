@@ -11,6 +11,7 @@
 #include <utility>
 
 #include "linux/audio/LinuxAudioInputQueues.h"
+#include "linux/audio/PulseTaps.h"
 #include "linux/system/LinuxClock.h"
 #include "tests/contract/HeardSound.h"
 #include "tests/sound/PrivateSoundServer.h"
@@ -54,12 +55,13 @@ protected:
     std::mutex familyMutex_;
     std::map<ProcessID, std::string> family_;  ///< bundle identifiers by process
     std::shared_ptr<sound::PulseConnection> connection_ = connectTo(server_->address());
-    LinuxAudioInputQueues queues_{connection_, clock_, [this](ProcessID pid) -> std::optional<BundleIdentifier> {
-                                      const std::lock_guard lock(familyMutex_);
-                                      const auto found = family_.find(pid);
-                                      if (found == family_.end()) return std::nullopt;
-                                      return BundleIdentifier(found->second);
-                                  }};
+    LinuxAudioInputQueues queues_{
+        std::make_shared<sound::PulseTaps>(connection_, [this](ProcessID pid) -> std::optional<BundleIdentifier> {
+            const std::lock_guard lock(familyMutex_);
+            const auto found = family_.find(pid);
+            if (found == family_.end()) return std::nullopt;
+            return BundleIdentifier(found->second);
+        }), clock_};
 };
 
 class LateAudioTapTest : public AudioTapTest {
@@ -295,8 +297,8 @@ TEST_P(LateAudioTapTest, AServerThatComesLaterIsJoinedWithoutLookingForIt) {
     sound::PulseConnection::Options options;
     options.server = server_->address();
     options.firstRetry = options.slowestRetry = options.slowestWithoutSocket = std::chrono::hours(1);
-    LinuxAudioInputQueues queues(std::make_shared<sound::PulseConnection>(options), clock_,
-                                 [](ProcessID) { return std::nullopt; });
+    LinuxAudioInputQueues queues(std::make_shared<sound::PulseTaps>(std::make_shared<sound::PulseConnection>(options), nullptr),
+                                 clock_);
     TonePlayer one(server_->address(), {"--later"});
     ASSERT_TRUE(one.isReady());
     const HeardSound heard(queues, one.pid());

@@ -16,6 +16,7 @@
 
 #include "linux/audio/DeviceSamples.h"
 #include "linux/audio/LinuxDeviceCapture.h"
+#include "linux/audio/PulseTaps.h"
 #include "linux/system/LinuxClock.h"
 #include "platform/DeviceCapture.h"
 #include "support/ThreadScheduler.h"
@@ -222,7 +223,7 @@ private:
     LinuxClock clock_;
     ThreadScheduler scheduler_{std::make_shared<ThreadLoop>()};
     const std::shared_ptr<sound::PulseConnection> connection_;
-    LinuxDeviceCapture devices_{connection_, clock_, scheduler_};
+    LinuxDeviceCapture devices_{sound::pulseMicrophone(connection_), clock_, scheduler_};
 };
 
 }  // namespace lumacast::testing

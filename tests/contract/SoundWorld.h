@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "linux/audio/LinuxAudioInputQueues.h"
+#include "linux/audio/PulseTaps.h"
 #include "linux/system/LinuxClock.h"
 #include "support/ThreadScheduler.h"
 #include "tests/fakes/FakeAudioInputQueue.h"
@@ -90,16 +91,16 @@ public:
     void passTime() override { std::this_thread::sleep_for(std::chrono::milliseconds(2)); }
 
 private:
-    static std::shared_ptr<sound::PulseConnection> connectTo(const std::string& address) {
+    static std::shared_ptr<sound::TapSource> connectTo(const std::string& address) {
         sound::PulseConnection::Options options;
         options.server = address;
-        return std::make_shared<sound::PulseConnection>(options);
+        return std::make_shared<sound::PulseTaps>(std::make_shared<sound::PulseConnection>(options), nullptr);
     }
 
     PrivateSoundServer server_{PrivateSoundServer::Begin::Later};
     std::unique_ptr<TonePlayer> player_;
     LinuxClock clock_;
-    LinuxAudioInputQueues queues_{connectTo(server_.address()), clock_, {}};
+    LinuxAudioInputQueues queues_{connectTo(server_.address()), clock_};
 };
 
 }  // namespace lumacast::test

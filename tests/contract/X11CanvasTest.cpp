@@ -9,6 +9,7 @@
 #include <utility>
 #include <vector>
 
+#include "linux/display/CaptureStatus.h"
 #include "base/Limits.h"
 #include "tests/contract/TestScreen.h"
 #include "tests/contract/X11CaptureFixture.h"
@@ -192,7 +193,7 @@ TEST_F(X11Canvas, KeepsTheOthersWhenOneIsDestroyedAndFailsOnceWithTheLast) {
     EXPECT_TRUE(shows({{0, 0, kWhite}, {199, 199, kWhite}}));
     EXPECT_TRUE(frames->failures().empty());
     second.destroy();
-    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kWindowGone);
+    EXPECT_EQ(frames->waitForFailure(), CaptureStatus::kWindowGone);
     EXPECT_EQ(frames->failures().size(), 1u);
 }
 
@@ -203,7 +204,7 @@ TEST_F(X11Canvas, FailsOnceWhenAllAreDestroyedTogether) {
     const auto made = startOn({first.context(), second.context()}, 200, 100);
     EXPECT_TRUE(shows({{50, 50, kRed}, {150, 50, kGreen}}));
     parent.destroy();
-    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kWindowGone);
+    EXPECT_EQ(frames->waitForFailure(), CaptureStatus::kWindowGone);
     // A start of another selection works, and no second failure came before it.
     TestWindow next(display.name(), {.place = {0, 0, 200, 100}, .colour = kBlue});
     capture.setContexts({next.context()});

@@ -11,6 +11,7 @@
 #include <random>
 #include <utility>
 
+#include "linux/display/CaptureStatus.h"
 #include "linux/display/X11DisplayCapture.h"
 #include "linux/system/LinuxClock.h"
 #include "support/ThreadScheduler.h"
@@ -290,7 +291,7 @@ TEST_F(X11Capture, FailsOnceWhenTheWindowIsDestroyed) {
     const auto made = startOn(window, 320, 240);
     ASSERT_TRUE(frames->waitForColour(kRed));
     window.destroy();
-    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kWindowGone);
+    EXPECT_EQ(frames->waitForFailure(), CaptureStatus::kWindowGone);
     EXPECT_EQ(frames->failures().size(), 1u);
 }
 
@@ -316,7 +317,7 @@ TEST_F(X11Capture, FailsForAWindowThatDoesNotExist) {
     const auto made = source(320, 240);
     made->openGate();
     made->start();
-    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kWindowGone);
+    EXPECT_EQ(frames->waitForFailure(), CaptureStatus::kWindowGone);
 }
 
 TEST_F(X11Capture, NeverTakesTheScreenForAWindow) {
@@ -326,7 +327,7 @@ TEST_F(X11Capture, NeverTakesTheScreenForAWindow) {
     const auto made = source(320, 240);
     made->openGate();
     made->start();
-    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kWindowGone);
+    EXPECT_EQ(frames->waitForFailure(), CaptureStatus::kWindowGone);
     EXPECT_EQ(frames->count(), 0u);
 }
 
@@ -340,7 +341,7 @@ TEST_F(X11Capture, ShowsTheWindowThatExistsOfSeveral) {
     ASSERT_TRUE(frames->waitForColour(kRed));
     EXPECT_TRUE(frames->failures().empty());
     window.destroy();
-    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kWindowGone);
+    EXPECT_EQ(frames->waitForFailure(), CaptureStatus::kWindowGone);
 }
 
 TEST_F(X11Capture, FollowsTheSelectionWhileItRuns) {
@@ -506,11 +507,11 @@ TEST_F(X11Capture, FailsOnceWhenTheServerDiesAndWorksWithTheNextOne) {
     made->start();
     ASSERT_TRUE(frames->waitForColour(kRed));
     first->crash();
-    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kDisplayLost);
+    EXPECT_EQ(frames->waitForFailure(), CaptureStatus::kDisplayLost);
     first.reset();
     made->start();
     ASSERT_TRUE(frames->waitFor([&](const Frames&) { return frames->failuresUnlocked() >= 2; }));
-    EXPECT_EQ(frames->failures()[1], X11CaptureStatus::kNoDisplay);
+    EXPECT_EQ(frames->failures()[1], CaptureStatus::kNoDisplay);
     window.reset();
 
     const PrivateDisplay next("800x600x24", name);
@@ -518,7 +519,7 @@ TEST_F(X11Capture, FailsOnceWhenTheServerDiesAndWorksWithTheNextOne) {
     TestWindow another(name, {.colour = kGreen});
     made->start();
     ASSERT_TRUE(frames->waitFor([&](const Frames&) { return frames->failuresUnlocked() >= 3; }));
-    EXPECT_EQ(frames->failures()[2], X11CaptureStatus::kWindowGone) << "the old server's windows are nobody's";
+    EXPECT_EQ(frames->failures()[2], CaptureStatus::kWindowGone) << "the old server's windows are nobody's";
     lasting.setContexts({another.context()});
     made->start();
     ASSERT_TRUE(frames->waitForColour(kGreen));
@@ -584,7 +585,7 @@ TEST(X11CaptureWithoutDisplay, FailsAfterTheStart) {
         made->setDelegate(frames);
         made->openGate();
         made->start();
-        EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kNoDisplay) << name;
+        EXPECT_EQ(frames->waitForFailure(), CaptureStatus::kNoDisplay) << name;
     }
 }
 
@@ -596,7 +597,7 @@ TEST_F(X11Capture, RefusesSizesThatNoFrameHas) {
         made->setDelegate(failed);
         made->openGate();
         made->start();
-        EXPECT_EQ(failed->waitForFailure(), X11CaptureStatus::kNotSupported);
+        EXPECT_EQ(failed->waitForFailure(), CaptureStatus::kNotSupported);
     }
 }
 

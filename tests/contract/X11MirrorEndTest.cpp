@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include "linux/display/CaptureStatus.h"
 #include "tests/contract/MirrorWorld.h"
 #include "tests/contract/PoweredDisplay.h"
 
@@ -46,7 +47,7 @@ TEST_F(LandscapeMirror, TellsThatTheMediaServicesWereResetWhenTheServerDies) {
     ASSERT_TRUE(frames->waitForReset());
     EXPECT_EQ(frames->failureThread(), mainThread);
     made->start();
-    EXPECT_EQ(frames->waitForFailure(), X11CaptureStatus::kNoDisplay);
+    EXPECT_EQ(frames->waitForFailure(), CaptureStatus::kNoDisplay);
     EXPECT_EQ(frames->resets(), 1u);
     EXPECT_EQ(frames->preemptions(), 0u);
 }

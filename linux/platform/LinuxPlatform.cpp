@@ -1,4 +1,4 @@
-// The Linux port's platform: every role made of real services, in the order in which they need each other.
+#include "linux/platform/LinuxPlatform.h"
 
 #include <signal.h>
 #include <sysexits.h>
@@ -16,12 +16,6 @@
 #include "linux/admin/LinuxAdminService.h"
 #include "linux/apps/Entitlements.h"
 #include "linux/apps/LinuxBundles.h"
-#include "linux/audio/LinuxAudioInputQueues.h"
-#include "linux/audio/LinuxDeviceCapture.h"
-#include "linux/desktop/LinuxUserAlerts.h"
-#include "linux/display/X11AppStateMonitor.h"
-#include "linux/display/X11DisplayCapture.h"
-#include "linux/display/X11RenderServer.h"
 #include "linux/extensions/LinuxAppExtensions.h"
 #include "linux/ipc/LinuxIpc.h"
 #include "linux/ipc/LinuxKeyedArchive.h"
@@ -31,7 +25,6 @@
 #include "linux/media/MoviesCommand.h"
 #include "linux/media/UnfinishedMovies.h"
 #include "linux/network/LinuxNetworkReachability.h"
-#include "linux/sounds/LinuxSystemSounds.h"
 #include "linux/storage/LinuxFileSystem.h"
 #include "linux/storage/LinuxStoragePurgeService.h"
 #include "linux/store/LinuxStoreLookup.h"
@@ -47,7 +40,6 @@
 #include "linux/system/LinuxTelemetry.h"
 #include "linux/system/Termination.h"
 #include "linux/system/UsageCommand.h"
-#include "platform/Platform.h"
 #include "support/ThreadScheduler.h"
 
 namespace lumacast {
@@ -83,7 +75,7 @@ std::string temporaryDirectory(const LinuxEnvironment& environment) {
 /// Members are made in this order and unmade in the opposite one.
 class LinuxPlatform final : public PlatformOwner {
 public:
-    explicit LinuxPlatform(const LinuxEnvironment& environment)
+    LinuxPlatform(const LinuxEnvironment& environment, const MakeDesktopRoles& makeDesktop)
         : environment_(environment),
           sink_({.journalStream = environment.journalStream}),
           log_([this](LogLevel level, std::string_view text) { sink_.write(level, text); }),
@@ -96,9 +88,9 @@ public:
                 .entitlements = [this](ProcessID pid, std::string_view name) { return entitlements_.value(pid, name); },
                 .activated = ActivatedSockets::fromEnvironment(),
                 .serviceUnavailable = endUnreachable}),
-          soundServer_(std::make_shared<sound::PulseConnection>()),
-          audioInputQueues_(soundServer_, clock_, [this](ProcessID pid) { return applicationOf(pid); }),
-          deviceCapture_(soundServer_, clock_, scheduler_),
+          desktop_(makeDesktop({environment_, log_, clock_, scheduler_, bundles_,
+                                [this](ProcessID pid) { return applicationOf(pid); }})),
+          sound_(desktop_->makeSound()),
           movieFiles_(std::make_shared<media::PosixMovieFiles>(temporaryDirectory(environment))),
           writers_(clock_, movieFiles_),
           exporters_(movieFiles_),
@@ -111,29 +103,24 @@ public:
           deviceInfo_(environment.systemDirectories),
           telemetry_(environment.stateDirectory + "/telemetry.jsonl"),
           keepAlive_(environment.notifySocket, sleepInhibitor()),
-          capture_(environmentVariable("DISPLAY"), clock_, scheduler_),
-          renderServer_(environmentVariable("DISPLAY")),
-          appState_(environmentVariable("DISPLAY"), scheduler_, [this](ProcessID pid) { return applicationOf(pid); }),
+          display_(desktop_->makeDisplay()),
           admin_(scheduler_, environment.runtimeDirectory + "/admin.sock", {},
                  [this](std::string_view reason) {
                      log_.error("the administrator's socket admin.sock is not available: %s", reason);
                      endUnreachable();
                  }),
           storagePurge_(scheduler_, fileSystem_),
-          userAlerts_(alertOptions(environment)),
-          systemSounds_(soundServer_, {environment.dataDirectories, environment.configDirectories}),
+          attention_(desktop_->makeAttention()),
           screenReader_({.address = LinuxScreenReader::sessionBus(environmentVariable("DBUS_SESSION_BUS_ADDRESS"),
                                                                   environmentVariable("XDG_RUNTIME_DIR"))}),
           storeLookup_(scheduler_, LinuxStoreLookup::optionsFrom(environment)),
           appExtensions_(*reactor_, scheduler_, ipc_, log_,
                          LinuxAppExtensions::optionsFrom(environment, temporaryDirectory(environment))),
-          platform_{log_,       scheduler_, clock_,   ipc_,
-                    bundles_,   renderServer_, appState_, capture_,
-                    capture_,   audioInputQueues_, deviceCapture_, writers_,
-                    exporters_, photoLibrary_, fileSystem_, preferences_,
-                    deviceInfo_, telemetry_, keepAlive_, admin_,
-                    storagePurge_, userAlerts_, systemSounds_, screenReader_,
-                    storeLookup_, networkReachability_, appExtensions_, keyedArchive_},
+          platform_{log_, scheduler_, clock_, ipc_, bundles_,
+                    *display_.renderServer, *display_.appStateMonitor, *display_.displayCapture, *display_.displayCloneControl,
+                    *sound_.audioInputQueues, *sound_.deviceCapture, writers_, exporters_, photoLibrary_, fileSystem_, preferences_,
+                    deviceInfo_, telemetry_, keepAlive_, admin_, storagePurge_, *attention_.userAlerts, *attention_.systemSounds,
+                    screenReader_, storeLookup_, networkReachability_, appExtensions_, keyedArchive_},
           termination_([this] { closeMovies(); }, kTimeToEnd,
                        {[this] { keepAlive_.announceStopping(static_cast<int>(kMoreTime.count())); }, kAskForTimeEvery}) {
         admin_.addCommand("usage", usageCommand(telemetry_));
@@ -182,21 +169,6 @@ private:
         return options;
     }
 
-    LinuxUserAlerts::Options alertOptions(const LinuxEnvironment& environment) {
-        LinuxUserAlerts::Options options;
-        options.display = environmentVariable("DISPLAY");
-        options.searchPath = environment.searchPath;
-        options.styleDirectory = environment.runtimeDirectory + "/dialog";
-        options.environment = dialogEnvironment(environ, options.display);
-        options.icon = [this](const BundleIdentifier& application) {
-            const auto bundle = bundles_.withIdentifier(application);
-            return bundle ? bundle->info(kInfoIcon) : std::nullopt;
-        };
-        options.explain = [this](std::string_view reason) { log_.error("the user can't be asked: %s", reason); };
-        options.note = [this](std::string_view what) { log_.error("%s", what); };
-        return options;
-    }
-
     LinuxFileSystem::Options fileSystemOptions(const LinuxEnvironment& environment) {
         LinuxFileSystem::Options options;
         options.root = environment.root;
@@ -213,9 +185,8 @@ private:
     LinuxBundles bundles_;
     Entitlements entitlements_;
     LinuxIpc ipc_;
-    const std::shared_ptr<sound::PulseConnection> soundServer_;
-    LinuxAudioInputQueues audioInputQueues_;
-    LinuxDeviceCapture deviceCapture_;
+    const std::unique_ptr<DesktopRoles> desktop_;
+    SoundRoles sound_;
     const std::shared_ptr<media::MovieFiles> movieFiles_;
     LinuxContainerWriters writers_;
     LinuxMovieExporters exporters_;
@@ -226,13 +197,10 @@ private:
     LinuxDeviceInfo deviceInfo_;
     LinuxTelemetry telemetry_;
     LinuxKeepAlive keepAlive_;
-    X11DisplayCapture capture_;
-    X11RenderServer renderServer_;
-    X11AppStateMonitor appState_;
+    DisplayRoles display_;
     LinuxAdminService admin_;
     LinuxStoragePurgeService storagePurge_;
-    LinuxUserAlerts userAlerts_;
-    LinuxSystemSounds systemSounds_;
+    AttentionRoles attention_;
     LinuxScreenReader screenReader_;
     LinuxStoreLookup storeLookup_;
     LinuxNetworkReachability networkReachability_;
@@ -244,7 +212,7 @@ private:
 
 }  // namespace
 
-std::unique_ptr<PlatformOwner> makePlatform() {
+std::unique_ptr<PlatformOwner> makePlatformOn(const MakeDesktopRoles& makeDesktop) {
     keepMemoryFlat();
     allowDescriptors(kDescriptors);
     blockTerminationSignals();
@@ -255,7 +223,7 @@ std::unique_ptr<PlatformOwner> makePlatform() {
                      describe(*error).c_str());
         return nullptr;
     }
-    auto platform = std::make_unique<LinuxPlatform>(environment);
+    auto platform = std::make_unique<LinuxPlatform>(environment, makeDesktop);
     if (const auto error = platform->prepare()) {
         std::fprintf(stderr, "lumacastd: the temporary directory %s%s can't be used: %s\n",
                      environment.root.c_str(), std::string(kDeviceTemporaryDirectory).c_str(), describe(*error).c_str());
