@@ -13,6 +13,10 @@ namespace lumacast::test {
 
 namespace fs = std::filesystem;
 
+bool becomesGone(const std::string& path) {
+    return waitUntil([&] { return !fs::exists(path); });
+}
+
 std::function<float(double seconds)> tone(double frequency) {
     return [frequency](double seconds) {
         return static_cast<float>(0.3 * std::sin(2 * 3.14159265358979 * frequency * seconds));

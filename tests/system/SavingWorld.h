@@ -4,6 +4,7 @@
 #include <sys/types.h>
 
 #include <chrono>
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <optional>
@@ -18,6 +19,12 @@ namespace lumacast::test {
 
 /// For a save: what mixes has the time that the machine's other work leaves, which may be little.
 inline constexpr std::chrono::seconds kPatience{300};
+
+inline constexpr std::int64_t kFailedToSave = -5812;
+inline constexpr char kNotMixed[] = "Error Mixing video Audio tracks";  // in the log
+
+/// Whether it goes: a save is answered once the removals are asked for.
+bool becomesGone(const std::string& path);
 
 /// A tone of a sound track.
 std::function<float(double seconds)> tone(double frequency);

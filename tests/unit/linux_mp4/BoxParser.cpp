@@ -269,6 +269,22 @@ ParsedTrack parseTrack(const ParsedBox& trak) {
     return track;
 }
 
+std::vector<ParsedTrack> tracksOf(const ParsedBox& movie) {
+    std::vector<ParsedTrack> tracks;
+    for (const ParsedBox* trak : movie.all("trak")) {
+        tracks.push_back(parseTrack(*trak));
+    }
+    return tracks;
+}
+
+std::uint64_t movieDuration(const ParsedBox& movie) {
+    const ParsedBox& header = movie.at("mvhd");
+    const std::size_t wide = header.version() == 1 ? 8 : 4;
+    Fields fields(header.payload);
+    fields.skip(4 + 2 * wide + 4);
+    return fields.number(wide);
+}
+
 std::vector<ParsedRun> parseFragment(const ParsedBox& moof) {
     std::vector<ParsedRun> runs;
     for (const ParsedBox* traf : moof.all("traf")) {

@@ -83,6 +83,9 @@ struct ParsedTrack {
 
 // A track box with its tables expanded to samples.
 [[nodiscard]] ParsedTrack parseTrack(const ParsedBox& trak);
+// Of a moov: all its tracks, and how long it says that it is.
+[[nodiscard]] std::vector<ParsedTrack> tracksOf(const ParsedBox& movie);
+[[nodiscard]] std::uint64_t movieDuration(const ParsedBox& movie);
 
 struct ParsedRun {
     std::uint32_t trackId = 0;

@@ -7,14 +7,6 @@
 namespace lumacast::mp4::test {
 namespace {
 
-std::vector<ParsedTrack> tracksOf(const ParsedBox& movie) {
-    std::vector<ParsedTrack> tracks;
-    for (const ParsedBox* trak : movie.all("trak")) {
-        tracks.push_back(parseTrack(*trak));
-    }
-    return tracks;
-}
-
 Bytes bytesOf(const Bytes& file, const ParsedSample& sample) {
     const auto start = file.begin() + static_cast<std::ptrdiff_t>(sample.offset);
     return {start, start + sample.size};
