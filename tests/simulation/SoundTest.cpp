@@ -229,7 +229,7 @@ private:
         ASSERT_EQ(saved->answers, 1);
         EXPECT_TRUE(saved->values[0].isNull()) << describe(saved->values[0]);
         ASSERT_EQ(fakes().photoLibrary.assets().size(), before + 1);
-        const auto& asset = fakes().photoLibrary.assets().back();
+        const auto asset = fakes().photoLibrary.assets().back();
         EXPECT_EQ(asset.content->tracks.size(), 2u) << "one of the picture, one of all the sound";
         EXPECT_NEAR(asset.content->duration().seconds(), 3.0, 0.15);
         EXPECT_FALSE(fakes().fileSystem.exists(url->path()));
