@@ -7,7 +7,8 @@
 namespace lumacast::ctl {
 
 /// Asks the daemon whose runtime directory this is and answers the line that comes back; none after writing to
-/// `complaints` why there is none and what to do. Blocks for at most `limit`.
+/// `complaints` why there is none and what to do. A daemon that its service manager starts when it is needed is started.
+/// Blocks for at most `limit`, and as long again where the daemon has to be started.
 std::optional<std::string> askDaemon(const std::string& runtimeDirectory, const std::string& request,
                                      std::FILE* complaints, std::chrono::milliseconds limit);
 

@@ -1,5 +1,5 @@
 #pragma once
-// The shipped service unit, as text.
+// The shipped units, as text.
 
 #include <fstream>
 #include <iterator>
@@ -11,6 +11,10 @@ namespace lumacast::test {
 
 inline std::string shippedUnit() {
     return std::string(LC_SOURCE_DIR) + "/packaging/systemd/lumacastd@.service";
+}
+/// The folder of those of users' own managers.
+inline std::string shippedUserUnits() {
+    return std::string(LC_SOURCE_DIR) + "/packaging/systemd/user/";
 }
 inline std::string packagingText() {
     return std::string(LC_SOURCE_DIR) + "/packaging/README.md";

@@ -51,6 +51,10 @@ DaemonFacts probeDaemon(const std::string& runtimeDirectory, bool runtimeVariabl
     facts.adminPath = runtimeDirectory + "/admin.sock";
     facts.servicePath = runtimeDirectory + "/" + kService + ".sock";
     facts.pathFits = fits(facts.adminPath) && fits(facts.servicePath);
+    // This one first: a service manager may hold it, and start the daemon that opens the other.
+    const ServiceCall call = callServiceSocket(runtimeDirectory, kService);
+    if (call.socket) facts.service = greets(call.socket.get(), patience) ? Socket::Answers : Socket::Silent;
+    else if (call.isBusy) facts.service = Socket::Silent;
     if (const auto answer = askAdminService(facts.adminPath, "status", patience)) {
         const auto status = readStatus(*answer);
         const auto* read = std::get_if<DaemonStatus>(&status);
@@ -59,9 +63,6 @@ DaemonFacts probeDaemon(const std::string& runtimeDirectory, bool runtimeVariabl
     } else if (connectTo(facts.adminPath)) {
         facts.admin = Socket::Silent;
     }
-    const ServiceCall call = callServiceSocket(runtimeDirectory, kService);
-    if (call.socket) facts.service = greets(call.socket.get(), patience) ? Socket::Answers : Socket::Silent;
-    else if (call.isBusy) facts.service = Socket::Silent;
     return facts;
 }
 

@@ -47,8 +47,8 @@ std::vector<std::string> environmentOf(ServiceSection& service) {
         if (path != std::string::npos) value = value.substr(0, path) + service.moved(value.substr(path));
         environment.push_back(word.substr(0, equals + 1) + value);
     }
-    if (const char* socket = std::getenv("NOTIFY_SOCKET"))
-        environment.push_back(std::string("NOTIFY_SOCKET=") + socket);
+    for (const char* name : {"NOTIFY_SOCKET", "LISTEN_PID", "LISTEN_FDS", "LISTEN_FDNAMES"})
+        if (const char* value = std::getenv(name)) environment.push_back(std::string(name) + "=" + value);
     return environment;
 }
 

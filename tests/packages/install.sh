@@ -1,0 +1,32 @@
+# Installation: the packages bring all that they need.
+
+paths() { (cd "$root" && find . -xdev \( -path ./home -o -path ./packages -o -path ./var/log -o -path ./var/cache -o -path ./var/lib/dpkg -o -path ./var/lib/apt \) -prune \
+  -o -print | sort); }
+installs() { in_root sh -c 'exec "$@" /packages/*.deb' sh apt-get -q -y --no-install-recommends \
+  -o Dpkg::Options::=--force-unsafe-io -o APT::Sandbox::User=root install; }
+finds_its_libraries() {
+  local program missing
+  for program in /usr/bin/lumacastd /usr/bin/lumacastctl /usr/libexec/lumacast/lumacast-catalog \
+    /usr/libexec/lumacast/lumacast-extension-launcher /usr/share/lumacast/extensions/hls-clips/hls-clips \
+    /usr/share/lumacast/extensions/live-push/live-push /usr/lib/*/liblumacast.so.1; do
+    missing=$(in_root sh -c "ldd $program" | grep 'not found') && { echo "$program: $missing"; return 1; }
+    [ -e "$(echo "$root"$program)" ] || { echo "$program isn't there"; return 1; }
+  done
+}
+is_enabled() { [ -L "$root/etc/systemd/user/sockets.target.wants/lumacastd.socket" ]; }
+verifies_units() {
+  local said
+  said=$(as_ann systemd-analyze --user --man=no verify /usr/lib/systemd/user/lumacastd.socket /usr/lib/systemd/user/lumacastd.service 2>&1) &&
+    [ -z "$said" ] || { echo "$said"; return 1; }
+}
+
+check "the packages install with what they depend on" installs
+check "every program finds its libraries" finds_its_libraries
+check "the socket is enabled for all users' managers" is_enabled
+# From here on the root has what the checks need.
+check "(the tools of the checks install)" apt_in_root install $(grep -v '^#' tests/packages/tools)
+in_root useradd --create-home --shell /bin/sh ann
+mkdir -p "$root/run/user/1000"
+chown 1000:1000 "$root/run/user/1000"
+chmod 700 "$root/run/user/1000"
+check "the service manager understands the user's units" verifies_units
