@@ -9,6 +9,7 @@ namespace lumacast::ctl {
 namespace {
 
 constexpr std::string_view kUnixPrefix = "unix:";
+constexpr char kPulseAudio[] = "PulseAudio";
 
 std::string pulseSocket(const LinuxEnvironment::Variables& variables, const std::string& runtime) {
     const std::string server = variables("PULSE_SERVER").value_or("");
@@ -31,19 +32,30 @@ SoundFacts probeSound(const LinuxEnvironment::Variables& variables) {
     std::string runtime = variables("XDG_RUNTIME_DIR").value_or("");
     if (runtime.empty()) runtime = "/run/user/" + std::to_string(::getuid());
     SoundFacts facts;
-    facts.sockets = {{"PulseAudio", pulseSocket(variables, runtime)}, {"PipeWire", pipeWireSocket(variables, runtime)}};
+    facts.sockets = {{kPulseAudio, pulseSocket(variables, runtime)}, {"PipeWire", pipeWireSocket(variables, runtime)}};
     for (SoundFacts::Socket& socket : facts.sockets) socket.answers = static_cast<bool>(connectTo(socket.path));
     return facts;
 }
 
 Findings checkSound(const SoundFacts& facts) {
-    std::vector<std::string> answering, silent;
-    for (const SoundFacts::Socket& socket : facts.sockets)
-        (socket.answers ? answering : silent).push_back(socket.server + " at " + socket.path);
-    const std::string servers = answering.empty() ? "no sound server answers (looked for " + listText(silent) + ")"
-                                                  : listText(answering) + " can be reached";
-    return {warning("sound", "this daemon does not record sound yet, so movies are silent whatever is played; " +
-                                 servers + ", which makes no difference for now. There is nothing to do.")};
+    constexpr char kSubject[] = "sound";
+    std::vector<std::string> silent;
+    const SoundFacts::Socket* pipeWire = nullptr;
+    for (const SoundFacts::Socket& socket : facts.sockets) {
+        if (!socket.answers)
+            silent.push_back(socket.server + " at " + socket.path);
+        else if (socket.server == kPulseAudio)
+            return {ok(kSubject, "applications' sound is recorded through the sound server at " + socket.path + ".")};
+        else
+            pipeWire = &socket;
+    }
+    if (pipeWire)
+        return {warning(kSubject, pipeWire->server + " at " + pipeWire->path +
+                                      " can be reached, but movies are silent: nobody answers as " + listText(silent) +
+                                      "; start pipewire-pulse.")};
+    return {warning(
+        kSubject, "no sound server answers (looked for " + listText(silent) +
+                      "), so movies are silent until one does; start one, or set PULSE_SERVER as the session has it.")};
 }
 
 }  // namespace lumacast::ctl

@@ -1,5 +1,5 @@
 #pragma once
-// The sound server. This daemon records no sound yet, so what is found here is for information.
+// The sound server: the daemon speaks to PulseAudio's socket, which PipeWire has too where its pulse server runs.
 
 #include <optional>
 #include <string>

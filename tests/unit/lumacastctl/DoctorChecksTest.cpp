@@ -109,14 +109,16 @@ TEST(DisplayCheck, OfAWaylandSessionSaysWhatWorksAndWhatDoesNot) {
 
 // --- sound ---
 
-TEST(SoundCheck, SaysThatSoundIsNotRecordedWhateverServerThereIs) {
+TEST(SoundCheck, SaysWhereSoundIsRecordedFromOrWhyMoviesAreSilent) {
     SoundFacts facts{{{"PulseAudio", "/p", false}, {"PipeWire", "/w", false}}};
-    EXPECT_THAT(checkSound(facts),
-                ElementsAre(Finds(kWarning,
-                                  "does not record sound yet, so movies are silent whatever is played; no sound server "
-                                  "answers (looked for PulseAudio at /p, PipeWire at /w)")));
+    EXPECT_THAT(checkSound(facts), ElementsAre(Finds(kWarning, "no sound server answers (looked for PulseAudio at /p, PipeWire at "
+                                                               "/w), so movies are silent until one does")));
     facts.sockets[1].answers = true;
-    EXPECT_THAT(checkSound(facts), ElementsAre(Finds(kWarning, "; PipeWire at /w can be reached")));
+    EXPECT_THAT(checkSound(facts), ElementsAre(Finds(kWarning, "nobody answers as PulseAudio at /p; start pipewire-pulse")));
+    facts.sockets[0].answers = true;
+    EXPECT_THAT(checkSound(facts), ElementsAre(Finds(kOk, "recorded through the sound server at /p")));
+    facts.sockets[1].answers = false;
+    EXPECT_THAT(checkSound(facts), ElementsAre(Finds(kOk, "recorded through the sound server at /p")));
 }
 
 // --- encoders ---
