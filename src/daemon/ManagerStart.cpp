@@ -5,6 +5,7 @@
 #include <utility>
 
 #include "daemon/LCRecordingManager.h"
+#include "platform/PreferenceKeys.h"
 
 namespace lumacast {
 
@@ -96,7 +97,7 @@ void LCRecordingManager::startProper(const WaitingStartRef& start) {
     }
     microphoneRecording_ = start->request.microphoneEnabled;
     cameraRecording_ = start->request.cameraEnabled;
-    const bool suppressAlert = isTrue(platform_.preferences.value(kPreferenceDomain, "LCSuppressAlert"));
+    const bool suppressAlert = isTrue(platform_.preferences.value(kPreferenceDomain, kSuppressAlertKey));
     log_.line("LCRecordingManager: suppressAlert=%d", suppressAlert);
     if (suppressAlert)
         beginRecording(start);

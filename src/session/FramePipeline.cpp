@@ -4,6 +4,7 @@
 #include <functional>
 #include <limits>
 
+#include "platform/PreferenceKeys.h"
 #include "session/FrameGeometry.h"
 #include "session/LCRecordingSession.h"
 
@@ -129,7 +130,7 @@ bool LCRecordingSession::canCaptureSize(Size size) {
 }
 
 bool LCRecordingSession::hasFullResolution() const {
-    return isTrue(services_.platform.preferences.value(kPreferenceDomain, "LCFullResCapture"));
+    return isTrue(services_.platform.preferences.value(kPreferenceDomain, kFullResCaptureKey));
 }
 
 Size LCRecordingSession::cappedSize(Size size) {

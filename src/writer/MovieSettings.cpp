@@ -3,6 +3,8 @@
 #include <cmath>
 #include <cstdlib>
 
+#include "platform/PreferenceKeys.h"
+
 namespace lumacast {
 
 namespace {
@@ -43,7 +45,7 @@ std::int64_t averageVideoBitRate(const Preferences& preferences, const DeviceInf
         rate = kTabletBitRate;
     else if (windowSize.width >= kLargeLength || windowSize.height >= kLargeLength)
         rate = kLargeBitRate;
-    if (const auto override = preferences.value(kPreferenceDomain, "LCBitRateOverride")) rate = integerValue(*override);
+    if (const auto override = preferences.value(kPreferenceDomain, kBitRateOverrideKey)) rate = integerValue(*override);
     return rate;
 }
 

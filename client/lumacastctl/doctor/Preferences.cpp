@@ -6,6 +6,7 @@
 #include "linux/system/IniFile.h"
 #include "linux/system/LinuxPreferences.h"
 #include "linux/system/SmallFile.h"
+#include "platform/PreferenceKeys.h"
 
 namespace lumacast::ctl {
 
@@ -110,9 +111,9 @@ PreferenceFacts probePreferences(const std::vector<std::string>& configDirectori
         facts.files.push_back(std::move(file));
     }
     const LinuxPreferences preferences(configDirectories);
-    facts.suppressAlert = probePreference(preferences, facts, "LCSuppressAlert");
-    facts.bitRate = probePreference(preferences, facts, "LCBitRateOverride");
-    facts.fullResolution = probePreference(preferences, facts, "LCFullResCapture");
+    facts.suppressAlert = probePreference(preferences, facts, kSuppressAlertKey);
+    facts.bitRate = probePreference(preferences, facts, kBitRateOverrideKey);
+    facts.fullResolution = probePreference(preferences, facts, kFullResCaptureKey);
     return facts;
 }
 
