@@ -558,6 +558,9 @@ INSTANTIATE_TEST_SUITE_P(Fake, AudioInputQueueContract, ::testing::Values(Maker(
 INSTANTIATE_TEST_SUITE_P(Port, AudioInputQueueContract, ::testing::Values(Maker([]() -> std::unique_ptr<test::SoundWorld> {
                              return std::make_unique<test::PortSoundWorld>();
                          })));
+INSTANTIATE_TEST_SUITE_P(Headless, AudioInputQueueContract, ::testing::Values(Maker([]() -> std::unique_ptr<test::SoundWorld> {
+                             return std::make_unique<test::HeadlessSoundWorld>();
+                         })));
 
 }  // namespace
 }  // namespace lumacast

@@ -4,6 +4,7 @@
 #include <functional>
 #include <set>
 
+#include "headless/sound/SyntheticMicrophone.h"
 #include "tests/contract/DeviceCaptureWorld.h"
 #include "tests/fakes/FakeDeviceCapture.h"
 
@@ -86,6 +87,32 @@ public:
 private:
     testing::SoundServerWorld world_{std::make_unique<test::PrivateSoundServer>()};
     std::unique_ptr<test::SoundProcess> call_;
+};
+
+class HeadlessDeviceCaptureWorld final : public DeviceCaptureWorld {
+public:
+    HeadlessDeviceCaptureWorld() {
+        clock_.startCaptureClock();
+        clock_.captureClock()->run();
+    }
+    DeviceCapture& devices() override { return devices_; }
+    Scheduler& scheduler() override { return scheduler_; }
+    void hear() override {}
+    void letSoundPass() override {
+        // Every opening has a thread of its own, which hears something each 20 ms.
+        const ListenedSession witness(devices_, scheduler_, false);
+        witness.session->startRunning();
+        ASSERT_TRUE(eventually([&] { return witness.listener->count() >= 5; }));
+    }
+    void setSuspended(bool suspended) override { setTakenByACall(suspended); }
+    void setTakenByACall(bool taken) override { microphone_.setTaken(taken); }
+
+private:
+    LinuxClock clock_;
+    ThreadScheduler scheduler_{std::make_shared<ThreadLoop>()};
+    headless::SyntheticMicrophone microphone_;
+    LinuxDeviceCapture devices_{
+        [this](sound::MicrophoneListener listener) { return microphone_.open(std::move(listener)); }, clock_, scheduler_};
 };
 
 /// Counts what it is told.
@@ -441,6 +468,8 @@ INSTANTIATE_TEST_SUITE_P(Fake, DeviceCaptureContract,
                          ::testing::Values(Maker([] { return std::make_unique<FakeDeviceCaptureWorld>(); })));
 INSTANTIATE_TEST_SUITE_P(Port, DeviceCaptureContract,
                          ::testing::Values(Maker([] { return std::make_unique<PortDeviceCaptureWorld>(); })));
+INSTANTIATE_TEST_SUITE_P(Headless, DeviceCaptureContract,
+                         ::testing::Values(Maker([] { return std::make_unique<HeadlessDeviceCaptureWorld>(); })));
 
 }  // namespace
 }  // namespace lumacast

@@ -4,6 +4,9 @@
 #include <memory>
 #include <thread>
 
+#include "headless/display/Painter.h"
+#include "headless/display/SyntheticDisplay.h"
+#include "headless/display/SyntheticWindows.h"
 #include "linux/display/X11DisplayCapture.h"
 #include "linux/system/LinuxClock.h"
 #include "support/ThreadScheduler.h"
@@ -101,6 +104,54 @@ private:
     const std::shared_ptr<DisplayCaptureSource> source_ = capture_.makeSource({400, 300}, MediaTime::make(1, 60));
 };
 
+/// Two windows of this process; what is shown is said by the squares in a running source's pictures.
+class HeadlessCloneWorld final : public CloneWorld {
+public:
+    HeadlessCloneWorld() {
+        clock_.startCaptureClock();
+        frames_->keepPlanes = true;
+        source_->setDelegate(frames_);
+        source_->openGate();
+        source_->start();
+    }
+    DisplayCloneControl& control() override { return display_; }
+    ContextID first() override { return headless::windowOf(ProcessID{::getpid()}, 0); }
+    ContextID second() override { return headless::windowOf(ProcessID{::getpid()}, 1); }
+    bool shows(ContextID window) override { return showsOnly(headless::colourOf(window)); }
+    bool showsTheScreen() override { return showsOnly(headless::kScreenColour); }
+    // Nothing more is delivered, while a source of another display delivers on.
+    bool showsNothing() override {
+        const std::size_t before = frames_->count();
+        headless::SyntheticDisplay other(headless::Show(clock_.hostTime()), clock_, scheduler_);
+        other.setMirroringMode(DisplayCloneControl::kMirrorDisplay);
+        const auto seen = std::make_shared<test::CapturedFrames>();
+        const auto source = other.makeSource({400, 300}, MediaTime::make(1, 60));
+        source->setDelegate(seen);
+        source->openGate();
+        source->start();
+        return seen->waitForCount(10) && frames_->count() <= before + 1;
+    }
+
+private:
+    bool showsOnly(std::uint32_t colour) {
+        return frames_->waitFor([this, colour](const test::CapturedFrames::Frames& got) {
+            if (got.empty() || !got.back().plane) return false;
+            const test::Pixels upright = test::uprightPixels(*got.back().plane, got.back().transformFlags);
+            const int side = upright.height / 8, middle = side + side / 2;
+            const auto square = [&](int place) { return upright.at(middle + place * 2 * side, middle); };
+            return square(0) == colour && square(1) != headless::colourOf(first()) && square(1) != headless::colourOf(second());
+        });
+    }
+
+    LinuxClock clock_;
+    const std::shared_ptr<ThreadLoop> loop_ = std::make_shared<ThreadLoop>();
+    ThreadScheduler scheduler_{loop_};
+    RunningThreadLoop running_{*loop_};
+    headless::SyntheticDisplay display_{headless::Show(clock_.hostTime()), clock_, scheduler_};
+    const std::shared_ptr<test::CapturedFrames> frames_ = std::make_shared<test::CapturedFrames>();
+    const std::shared_ptr<DisplayCaptureSource> source_ = display_.makeSource({400, 300}, MediaTime::make(1, 60));
+};
+
 using Maker = std::function<std::unique_ptr<CloneWorld>()>;
 
 class DisplayCloneControlContract : public ::testing::TestWithParam<Maker> {
@@ -150,6 +201,8 @@ INSTANTIATE_TEST_SUITE_P(Fake, DisplayCloneControlContract,
                          ::testing::Values([] { return std::make_unique<FakeCloneWorld>(); }));
 INSTANTIATE_TEST_SUITE_P(Port, DisplayCloneControlContract,
                          ::testing::Values([] { return std::make_unique<PortCloneWorld>(); }));
+INSTANTIATE_TEST_SUITE_P(Headless, DisplayCloneControlContract,
+                         ::testing::Values([] { return std::make_unique<HeadlessCloneWorld>(); }));
 
 }  // namespace
 }  // namespace lumacast

@@ -16,14 +16,20 @@ std::vector<std::string> platformRoles() {
             "NetworkReachability", "AppExtension", "KeyedArchive"};
 }
 
-RoleMatrix::RoleMatrix(std::vector<std::string> roles, const std::vector<ContractOutcome>& outcomes)
-    : roles_(std::move(roles)) {
+std::set<std::string> headlessRoles() {
+    return {"RenderServer",    "AppStateMonitor", "DisplayCapture", "DisplayCloneControl",
+            "AudioInputQueue", "DeviceCapture",   "UserAlert",      "SystemSounds"};
+}
+
+RoleMatrix::RoleMatrix(std::vector<std::string> roles, std::set<std::string> headless,
+                       const std::vector<ContractOutcome>& outcomes)
+    : roles_(std::move(roles)), headless_(std::move(headless)) {
     for (const std::string& role : roles_) rows_[role];
     for (const ContractOutcome& outcome : outcomes) {
         std::string_view name = outcome.suite;
-        const bool isFake = name.starts_with("Fake"), isPort = name.starts_with("Port");
+        const bool isFake = name.starts_with("Fake"), isPort = name.starts_with("Port"), isHeadless = name.starts_with("Headless");
         const std::size_t slash = name.find('/');
-        if ((!isFake && !isPort) || slash == std::string_view::npos || !name.ends_with("Contract")) continue;
+        if ((!isFake && !isPort && !isHeadless) || slash == std::string_view::npos || !name.ends_with("Contract")) continue;
         name = name.substr(slash + 1, name.size() - slash - 1 - std::string_view("Contract").size());
         const auto row = rows_.find(name);
         if (row == rows_.end()) {
@@ -31,7 +37,7 @@ RoleMatrix::RoleMatrix(std::vector<std::string> roles, const std::vector<Contrac
                 unknownSuites_.push_back(outcome.suite);
             continue;
         }
-        MatrixCell& cell = isFake ? row->second.fake : row->second.port;
+        MatrixCell& cell = isFake ? row->second.fake : isPort ? row->second.port : row->second.headless;
         ++(outcome.passed ? cell.passed : cell.failed);
     }
 }
@@ -42,6 +48,7 @@ std::vector<std::string> RoleMatrix::emptyCells() const {
         const Row& row = rows_.at(role);
         if (row.fake.passed == 0) cells.push_back(role + " on fake");
         if (row.port.passed == 0) cells.push_back(role + " on port");
+        if (headless_.contains(role) && row.headless.passed == 0) cells.push_back(role + " on headless");
     }
     return cells;
 }
@@ -51,12 +58,13 @@ std::string RoleMatrix::text() const {
         if (cell.passed + cell.failed == 0) return std::string("-");
         return std::to_string(cell.passed) + (cell.failed > 0 ? " (" + std::to_string(cell.failed) + " failed)" : "");
     };
-    std::string text = "role                  fake              port\n";
+    std::string text = "role                  fake              port              headless\n";
     for (const std::string& role : roles_) {
         const Row& row = rows_.at(role);
+        const bool isOwn = headless_.contains(role) || row.headless.passed + row.headless.failed > 0;
         char line[120];
-        std::snprintf(line, sizeof line, "%-20s  %-16s  %s\n", role.c_str(), cellText(row.fake).c_str(),
-                      cellText(row.port).c_str());
+        std::snprintf(line, sizeof line, "%-20s  %-16s  %-16s  %s\n", role.c_str(), cellText(row.fake).c_str(),
+                      cellText(row.port).c_str(), isOwn ? cellText(row.headless).c_str() : "the port's");
         text += line;
     }
     return text;
@@ -87,7 +95,7 @@ bool isWholeRun() {
 class MatrixAtTheEnd final : public ::testing::Environment {
 public:
     void TearDown() override {
-        const RoleMatrix matrix(platformRoles(), outcomesOfThisRun());
+        const RoleMatrix matrix(platformRoles(), headlessRoles(), outcomesOfThisRun());
         std::printf("%s", matrix.text().c_str());
         if (!isWholeRun()) return;
         for (const std::string& cell : matrix.emptyCells()) ADD_FAILURE() << "no contract test passed: " << cell;
@@ -102,19 +110,21 @@ public:
 
 TEST(RoleMatrix, ACellIsEmptyUntilATestOfItHasPassed) {
     const std::vector<std::string> roles{"Clock", "Ipc"};
-    EXPECT_EQ(RoleMatrix(roles, {}).emptyCells(),
-              (std::vector<std::string>{"Clock on fake", "Clock on port", "Ipc on fake", "Ipc on port"}));
-    const RoleMatrix matrix(roles, {{"Fake/ClockContract", true},
+    EXPECT_EQ(RoleMatrix(roles, {"Ipc"}, {}).emptyCells(),
+              (std::vector<std::string>{"Clock on fake", "Clock on port", "Ipc on fake", "Ipc on port", "Ipc on headless"}));
+    const RoleMatrix matrix(roles, {"Clock", "Ipc"}, {{"Fake/ClockContract", true},
                                     {"Port/ClockContract", true},
                                     {"Port/ClockContract", false},
                                     {"Port/IpcContract", false},
+                                    {"Headless/ClockContract", true},
+                                    {"Headless/IpcContract", false},
                                     {"FakeThreads/IpcContract", true}});
-    EXPECT_EQ(matrix.emptyCells(), (std::vector<std::string>{"Ipc on port"}));
+    EXPECT_EQ(matrix.emptyCells(), (std::vector<std::string>{"Ipc on port", "Ipc on headless"}));
     EXPECT_NE(matrix.text().find("1 (1 failed)"), std::string::npos);
 }
 
 TEST(RoleMatrix, ASuiteOfAnUnknownRoleIsNamed) {
-    const RoleMatrix matrix({"Clock"},
+    const RoleMatrix matrix({"Clock"}, {},
                             {{"Fake/ClocksContract", true}, {"Fake/ClocksContract", true}, {"LimitsTest", true}});
     EXPECT_EQ(matrix.unknownSuites(), (std::vector<std::string>{"Fake/ClocksContract"}));
 }

@@ -10,6 +10,7 @@
 #include <thread>
 #include <vector>
 
+#include "headless/sound/ToneTaps.h"
 #include "linux/audio/LinuxAudioInputQueues.h"
 #include "linux/audio/PulseTaps.h"
 #include "linux/system/LinuxClock.h"
@@ -71,6 +72,26 @@ private:
     FakeClock clock_;
     FaultPlan faults_;
     FakeAudioInputQueues queues_{scheduler_, clock_, faults_};
+};
+
+/// Tones of the headless port, where this process alone is an application's; the quiet one is its parent.
+class HeadlessSoundWorld final : public SoundWorld {
+public:
+    AudioInputQueues& queues() override { return queues_; }
+    Clock& clock() override { return clock_; }
+    ProcessID playing() override { return ProcessID{::getpid()}; }
+    ProcessID quiet() override { return ProcessID{::getppid()}; }
+    void passTime() override { std::this_thread::sleep_for(std::chrono::milliseconds(2)); }
+
+private:
+    LinuxClock clock_;
+    LinuxAudioInputQueues queues_{
+        std::make_shared<headless::ToneTaps>(headless::Show(clock_.hostTime()),
+                                             [](ProcessID pid) -> std::optional<BundleIdentifier> {
+                                                 if (number(pid) != ::getpid()) return std::nullopt;
+                                                 return BundleIdentifier("org.example.Player");
+                                             }),
+        clock_};
 };
 
 /// PulseAudio, with a tone that is played by a process of its own; the quiet process is this one. The server is there

@@ -3,9 +3,12 @@
 #include <unistd.h>
 #include <cmath>
 #include <functional>
+#include <mutex>
 #include <numbers>
+#include <set>
 #include <thread>
 
+#include "headless/sound/NotedSystemSounds.h"
 #include "linux/sounds/LinuxSystemSounds.h"
 #include "tests/contract/MonitorSound.h"
 #include "tests/contract/ScratchDirectory.h"
@@ -89,6 +92,25 @@ private:
         {{data_.path()}, {}}};
 };
 
+/// What is noted counts as heard.
+class HeadlessSystemSoundsWorld final : public SystemSoundsWorld {
+public:
+    SystemSounds& sounds() override { return sounds_; }
+    bool isHeard(std::uint32_t sound) override { return wasHeard(sound); }
+    bool wasHeard(std::uint32_t sound) override {
+        const std::lock_guard lock(mutex_);
+        return noted_.contains(sound);
+    }
+
+private:
+    std::mutex mutex_;
+    std::set<std::uint32_t> noted_;
+    headless::NotedSystemSounds sounds_{[this](std::uint32_t sound) {
+        const std::lock_guard lock(mutex_);
+        noted_.insert(sound);
+    }};
+};
+
 using Maker = std::function<std::unique_ptr<SystemSoundsWorld>()>;
 
 class SystemSoundsContract : public ::testing::TestWithParam<Maker> {
@@ -129,6 +151,8 @@ INSTANTIATE_TEST_SUITE_P(Fake, SystemSoundsContract,
                          ::testing::Values(Maker([] { return std::make_unique<FakeSystemSoundsWorld>(); })));
 INSTANTIATE_TEST_SUITE_P(Port, SystemSoundsContract,
                          ::testing::Values(Maker([] { return std::make_unique<PortSystemSoundsWorld>(); })));
+INSTANTIATE_TEST_SUITE_P(Headless, SystemSoundsContract,
+                         ::testing::Values(Maker([] { return std::make_unique<HeadlessSystemSoundsWorld>(); })));
 
 /// A server, a theme if the test writes one, and the sounds.
 class LinuxSystemSoundsTest : public ::testing::Test {

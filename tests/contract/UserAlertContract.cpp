@@ -1,5 +1,6 @@
 #include <gtest/gtest.h>
 
+#include "headless/user/SyntheticUserAlerts.h"
 #include "support/ThreadScheduler.h"
 #include "tests/contract/DialogWorld.h"
 #include "tests/fakes/FakeUserAlerts.h"
@@ -24,6 +25,8 @@ public:
     virtual std::size_t standing() = 0;
     /// From now on nothing can be shown.
     virtual void loseTheScreen() = 0;
+    /// Why there is always something to show an alert on; empty where that can be lost.
+    virtual std::string whyTheScreenStays() const { return {}; }
 };
 
 class FakeUserAlertWorld final : public UserAlertWorld {
@@ -62,6 +65,21 @@ public:
 
 private:
     test::DialogWorld world_;
+};
+
+/// Alerts that are left standing, as this test's user takes the time that users take.
+class HeadlessUserAlertWorld final : public UserAlertWorld {
+public:
+    UserAlerts& alerts() override { return alerts_; }
+    void press(Response button) override { EXPECT_TRUE(alerts_.answer(button)); }
+    void dismiss() override { press(Response::OtherButton); }
+    std::size_t standing() override { return alerts_.standing(); }
+    void loseTheScreen() override {}
+    std::string whyTheScreenStays() const override { return "there is no screen that could be lost"; }
+
+private:
+    ThreadScheduler scheduler_{std::make_shared<ThreadLoop>()};
+    headless::SyntheticUserAlerts alerts_{headless::Consent::Wait, scheduler_, [](const auto&, auto) {}};
 };
 
 using Maker = std::function<std::unique_ptr<UserAlertWorld>()>;
@@ -189,6 +207,7 @@ TEST_P(UserAlertContract, TwoAlertsAreTwo) {
 }
 
 TEST_P(UserAlertContract, WithoutAScreenThereIsNoAlert) {
+    if (const std::string why = world_->whyTheScreenStays(); !why.empty()) GTEST_SKIP() << why;
     world_->loseTheScreen();
     EXPECT_EQ(world_->alerts().show(twoButtons()), nullptr);
 }
@@ -197,6 +216,34 @@ INSTANTIATE_TEST_SUITE_P(Fake, UserAlertContract,
                          ::testing::Values(Maker([] { return std::make_unique<FakeUserAlertWorld>(); })));
 INSTANTIATE_TEST_SUITE_P(Port, UserAlertContract,
                          ::testing::Values(Maker([] { return std::make_unique<PortUserAlertWorld>(); })));
+INSTANTIATE_TEST_SUITE_P(Headless, UserAlertContract,
+                         ::testing::Values(Maker([] { return std::make_unique<HeadlessUserAlertWorld>(); })));
+
+TEST(SyntheticUserAlerts, AnswerEveryAlertAsConfigured) {
+    ThreadScheduler scheduler(std::make_shared<ThreadLoop>());
+    for (const auto& [consent, expected] : {std::pair{headless::Consent::Refuse, Response::OtherButton},
+                                            {headless::Consent::Allow, Response::DefaultButton}}) {
+        std::vector<std::optional<Response>> noted;
+        headless::SyntheticUserAlerts alerts(consent, scheduler, [&](const AlertContent& content, auto response) {
+            EXPECT_EQ(content.header, threeButtons().header);
+            noted.push_back(response);
+        });
+        const auto alert = alerts.show(threeButtons());
+        ASSERT_TRUE(alert);
+        const Answer answer;
+        alert->receiveResponse(answer.handler());
+        EXPECT_EQ(answer.wait(), expected);
+        EXPECT_TRUE(alert->wasShown());
+        EXPECT_EQ(noted, std::vector{std::optional(expected)});
+    }
+}
+
+TEST(SyntheticUserAlerts, TakeNoOtherWordForConsent) {
+    EXPECT_EQ(headless::consentFrom("refuse"), headless::Consent::Refuse);
+    EXPECT_EQ(headless::consentFrom("allow"), headless::Consent::Allow);
+    EXPECT_EQ(headless::consentFrom("wait"), headless::Consent::Wait);
+    for (const char* word : {"", "yes", "Allow", "allow ", "1"}) EXPECT_EQ(headless::consentFrom(word), std::nullopt) << word;
+}
 
 }  // namespace
 }  // namespace lumacast

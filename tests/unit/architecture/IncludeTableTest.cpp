@@ -13,7 +13,7 @@ namespace {
 /// The folders that stand for layers, longest first where one lies in another.
 constexpr std::string_view kFolders[] = {"src/base",    "src/writer/media", "src/platform", "src/support",
                                          "src/broadcast", "src/writer",     "src/capture",  "src/session",
-                                         "src/daemon",  "linux/ipc",        "linux",        "client/lumacastctl",
+                                         "src/daemon",  "linux/ipc",        "linux",        "headless", "client/lumacastctl",
                                          "client/extension", "client",      "extensions",   "examples",     "tests"};
 
 /// What each layer may include besides itself: layers, and single headers.
@@ -33,6 +33,10 @@ const std::map<std::string_view, std::set<std::string_view>> kMayInclude{
     // The port gives its reactor to the thread scheduler.
     {"linux", {"linux/ipc", "src/platform", "src/writer/media", "src/base", "src/support/ThreadScheduler.h"}},
     {"linux/ipc", {"linux", "src/platform", "src/writer/media", "src/base"}},
+    // The second port has the first one's services, and shows the examples' scene.
+    {"headless",
+     {"linux", "linux/ipc", "src/platform", "src/writer/media", "src/base", "examples/scene/Scene.h", "examples/scene/FramePattern.h",
+      "client/Recorder.h"}},
     {"client",
      {"src/base", "src/writer/media", "src/broadcast/LCBroadcastConfiguration.h",
       "src/broadcast/ConfigurationArchive.h", "linux/ipc",
@@ -82,7 +86,7 @@ std::vector<std::string> forbiddenEdges(const SourceFile& file) {
 
 TEST(IncludeTable, EveryIncludeOfTheTreeIsAllowed) {
     std::size_t files = 0;
-    for (const char* folder : {"src", "linux", "client", "extensions"}) {
+    for (const char* folder : {"src", "linux", "headless", "client", "extensions"}) {
         for (const SourceFile& file : sourcesBelow(folder)) {
             ++files;
             for (const std::string& edge : forbiddenEdges(file)) ADD_FAILURE() << edge;
@@ -107,6 +111,9 @@ TEST(IncludeTable, AForbiddenEdgeIsSeen) {
     EXPECT_EQ(edge("src/daemon/Planted.cpp", "session/LCRecordingSession.h"), 0u);
     EXPECT_EQ(edge("linux/apps/Planted.cpp", "support/TempStore.h"), 1u);
     EXPECT_EQ(edge("linux/apps/Planted.cpp", "support/ThreadScheduler.h"), 0u);
+    EXPECT_EQ(edge("linux/desktop/Planted.cpp", "headless/user/SyntheticUserAlerts.h"), 1u);
+    EXPECT_EQ(edge("headless/Planted.cpp", "linux/system/LinuxClock.h"), 0u);
+    EXPECT_EQ(edge("headless/Planted.cpp", "tests/fakes/FakeClock.h"), 1u);
     EXPECT_EQ(edge("client/Planted.cpp", "linux/system/IniFile.h"), 1u);
     EXPECT_EQ(edge("client/Planted.cpp", "platform/Platform.h"), 1u);
     EXPECT_EQ(edge("client/Planted.cpp", "linux/ipc/LinuxIpc.h"), 0u);
