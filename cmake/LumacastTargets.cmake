@@ -1,5 +1,7 @@
 # One place for what every target of the project shares: warnings, sanitizers, include roots.
 
+include(BuildSummary)
+
 add_library(lc_options INTERFACE)
 target_compile_options(lc_options INTERFACE
   -Wall -Wextra -Wpedantic $<$<CXX_COMPILER_ID:GNU>:-Wshadow=local> $<$<CXX_COMPILER_ID:Clang>:-Wshadow> -Wnon-virtual-dtor -Woverloaded-virtual
@@ -51,7 +53,32 @@ endfunction()
 
 # lc_pkg(NAME MODULES...): imported target PkgConfig::NAME for pkg-config modules, its headers as system headers.
 function(lc_pkg name)
-  pkg_check_modules(${name} REQUIRED IMPORTED_TARGET GLOBAL ${ARGN})
+  pkg_check_modules(${name} QUIET IMPORTED_TARGET GLOBAL ${ARGN})
+  if(NOT TARGET PkgConfig::${name})
+    string(JOIN ", " modules ${ARGN})
+    message(FATAL_ERROR "pkg-config does not find all of: ${modules} (scripts/setup installs what is needed)")
+  endif()
+  lc_note_packages(${name} ${ARGN})
+endfunction()
+
+# lc_optional_pkg(NAME MODULE CONSEQUENCE): the same for one module that may be missing, and what the build lacks then.
+function(lc_optional_pkg name module consequence)
+  pkg_check_modules(${name} QUIET IMPORTED_TARGET GLOBAL ${module})
+  if(TARGET PkgConfig::${name})
+    lc_note_packages(${name} ${module})
+  else()
+    lc_note_missing("${module}" "${consequence}")
+  endif()
+endfunction()
+
+function(lc_note_packages name)
+  foreach(module ${ARGN})
+    set(version "${${name}_${module}_VERSION}")
+    if(NOT version)
+      set(version "${${name}_VERSION}")
+    endif()
+    lc_note_package("${module}" "${version}")
+  endforeach()
 endfunction()
 
 # lc_executable(NAME SOURCES... DEPS libs...)
