@@ -26,17 +26,20 @@ SoundRoles HeadlessDesktop::makeSound() {
 
 DisplayRoles HeadlessDesktop::makeDisplay() {
     auto display = std::make_shared<SyntheticDisplay>(show_, services_.clock, services_.scheduler);
+    auto isKnown = [&bundles = services_.bundles](const BundleIdentifier& identifier) {
+        return bundles.withIdentifier(identifier) != nullptr;
+    };
     return {display, display, std::make_unique<SyntheticRenderServer>(),
-            std::make_unique<SyntheticAppStateMonitor>(services_.applicationOf)};
+            std::make_unique<SyntheticAppStateMonitor>(std::move(isKnown), services_.applicationOf)};
 }
 
 AttentionRoles HeadlessDesktop::makeAttention() {
     Log& log = services_.log;
     auto noteAlert = [&log](const AlertContent& content, std::optional<UserAlert::Response> response) {
         log.line("nobody is here to be asked “%s”: %s", content.header,
-                 !response                                              ? "it stays unanswered"
+                 !response                                       ? "it stays unanswered"
                  : *response == UserAlert::Response::OtherButton ? "refused by configuration"
-                                                                        : "allowed by configuration");
+                                                                 : "allowed by configuration");
     };
     auto noteSound = [&log](std::uint32_t sound) { log.line("the sound %u would be heard now", sound); };
     return {std::make_unique<SyntheticUserAlerts>(consent_, services_.scheduler, std::move(noteAlert)),

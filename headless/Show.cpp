@@ -37,7 +37,8 @@ void Show::addTones(HostTime moment, double rate, std::uint32_t channels, std::s
     for (std::size_t frame = 0; frame < frames; ++frame) {
         const double seconds = static_cast<double>(since) / kSecond + static_cast<double>(frame) / rate;
         const auto sample = static_cast<float>(toneAt(std::fmod(seconds, kBetween)));
-        for (std::uint32_t channel = 0; channel < channels; ++channel) interleaved[frame * channels + channel] += sample;
+        for (std::uint32_t channel = 0; channel < channels; ++channel)
+            interleaved[frame * channels + channel] += sample;
     }
 }
 

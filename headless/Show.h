@@ -8,15 +8,15 @@
 
 namespace lumacast::headless {
 
-/// A picture thirty times a second, and every half second a mark on the picture and a tone that begins with it. All of it
-/// follows from the host time alone, so a machine that is late shows and plays the same, only later. A value.
+/// A picture thirty times a second, and every half second a mark on the picture and a tone that begins with it. All of
+/// it follows from the host time alone, so a machine that is late shows and plays the same, only later. A value.
 class Show final {
 public:
     static constexpr int kPicturesPerSecond = 30;
     static constexpr std::uint32_t kPicturesPerMark = 15;
     /// A recorder that takes fewer pictures than are shown must see the mark too.
     static constexpr std::uint32_t kMarkedPictures = 3;
-    static constexpr double kTone = 1000;       ///< Hz
+    static constexpr double kTone = 1000;  ///< Hz
     static constexpr double kToneSeconds = 0.05;
     static constexpr double kAmplitude = 0.4;
 

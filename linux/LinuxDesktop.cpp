@@ -36,7 +36,9 @@ LinuxUserAlerts::Options alertOptions(const DesktopServices& services) {
         const auto bundle = bundles.withIdentifier(application);
         return bundle ? bundle->info(kInfoIcon) : std::nullopt;
     };
-    options.explain = [&log = services.log](std::string_view reason) { log.error("the user can't be asked: %s", reason); };
+    options.explain = [&log = services.log](std::string_view reason) {
+        log.error("the user can't be asked: %s", reason);
+    };
     options.note = [&log = services.log](std::string_view what) { log.error("%s", what); };
     return options;
 }
@@ -48,7 +50,8 @@ public:
     SoundRoles makeSound() override {
         auto taps = std::make_shared<sound::PulseTaps>(soundServer_, services_.applicationOf);
         return {std::make_unique<LinuxAudioInputQueues>(std::move(taps), services_.clock),
-                std::make_unique<LinuxDeviceCapture>(sound::pulseMicrophone(soundServer_), services_.clock, services_.scheduler)};
+                std::make_unique<LinuxDeviceCapture>(sound::pulseMicrophone(soundServer_), services_.clock,
+                                                     services_.scheduler)};
     }
     DisplayRoles makeDisplay() override {
         auto capture = std::make_shared<X11DisplayCapture>(displayName(), services_.clock, services_.scheduler);
@@ -70,8 +73,7 @@ private:
 }  // namespace
 
 std::unique_ptr<PlatformOwner> makePlatform() {
-    return makePlatformOn(
-        [](const DesktopServices& services) { return std::make_unique<LinuxDesktop>(services); });
+    return makePlatformOn([](const DesktopServices& services) { return std::make_unique<LinuxDesktop>(services); });
 }
 
 }  // namespace lumacast

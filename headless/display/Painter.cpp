@@ -43,14 +43,16 @@ Painter::Painter(std::int32_t width, std::int32_t height, Lies lies)
 }
 
 void Painter::paint(PlaneMemory& memory, std::int64_t number, const std::vector<std::uint32_t>& colours) {
-    if (lies_ == Lies::Upright) return paintUpright({memory.pixels(), width_, height_, memory.stride()}, number, colours);
+    if (lies_ == Lies::Upright)
+        return paintUpright({memory.pixels(), width_, height_, memory.stride()}, number, colours);
     const std::size_t stride = static_cast<std::size_t>(width_) * sizeof(std::uint32_t);
     auto* const pixels = reinterpret_cast<std::uint8_t*>(upright_.data());
     paintUpright({pixels, width_, height_, stride}, number, colours);
     x11::turnCounterclockwise(pixels, stride, memory.pixels(), memory.stride(), width_, height_);
 }
 
-void Painter::paintUpright(const scene::Picture& picture, std::int64_t number, const std::vector<std::uint32_t>& colours) {
+void Painter::paintUpright(const scene::Picture& picture, std::int64_t number,
+                           const std::vector<std::uint32_t>& colours) {
     if (!scene_) return fill(picture, {0, 0, picture.width, picture.height}, colours.front());
     scene_->draw(picture, static_cast<std::uint32_t>(number) & scene::kFrameNumberMask, wallTime(),
                  Show::isMarked(number) ? scene::Mark::Border : scene::Mark::None);

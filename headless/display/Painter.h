@@ -16,9 +16,9 @@ std::uint32_t colourOf(ContextID window);
 inline constexpr std::uint32_t kScreenColour = 0xF0F0F0;
 
 /// The scene of the examples, with the picture's number in it and the mark on it, and one square for each thing that is
-/// shown, side by side from the left. The screen is wider than high, so its frames, which are always portrait, have it lying
-/// in them turned by a quarter counterclockwise. What is too small for the scene is of the first thing's colour all over.
-/// Serves one lane.
+/// shown, side by side from the left. The screen is wider than high, so its frames, which are always portrait, have it
+/// lying in them turned by a quarter counterclockwise. What is too small for the scene is of the first thing's colour
+/// all over. Serves one lane.
 class Painter final {
 public:
     enum class Lies : bool { Upright, TurnedCounterclockwise };

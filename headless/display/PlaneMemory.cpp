@@ -47,7 +47,9 @@ SyntheticPicture::SyntheticPicture(std::shared_ptr<PlaneMemory> memory, Differs 
 }
 
 // Whatever the holder read, it read before the memory is drawn into again.
-SyntheticPicture::~SyntheticPicture() { memory_->pictures_.fetch_sub(1, std::memory_order_release); }
+SyntheticPicture::~SyntheticPicture() {
+    memory_->pictures_.fetch_sub(1, std::memory_order_release);
+}
 
 std::shared_ptr<PlaneMemory> PlaneStore::acquire() {
     for (auto& plane : planes_) {

@@ -16,8 +16,8 @@
 
 namespace lumacast::headless {
 
-/// One piece of frame memory: a memfd whose size is sealed, and which nobody can map for writing but who made it. Pictures
-/// count themselves in and out.
+/// One piece of frame memory: a memfd whose size is sealed, and which nobody can map for writing but who made it.
+/// Pictures count themselves in and out.
 class PlaneMemory final {
 public:
     /// Null when there is no memory.

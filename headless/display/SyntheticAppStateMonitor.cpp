@@ -1,5 +1,6 @@
 #include "headless/display/SyntheticAppStateMonitor.h"
 
+#include <algorithm>
 #include <chrono>
 
 #include "linux/display/Processes.h"
@@ -14,7 +15,10 @@ constexpr std::chrono::milliseconds kPatience{90};
 
 std::optional<ProcessID> SyntheticAppStateMonitor::applicationProcess(const BundleIdentifier& identifier) {
     const auto end = std::chrono::steady_clock::now() + kPatience;
-    for (const ProcessID pid : x11::processesOfThisUser()) {
+    auto processes = x11::processesOfThisUser();
+    std::sort(processes.begin(), processes.end(),
+              [](ProcessID one, ProcessID other) { return number(one) > number(other); });
+    for (const ProcessID pid : processes) {
         if (std::chrono::steady_clock::now() > end) break;
         if (applicationOf_(pid) == identifier) return pid;
     }

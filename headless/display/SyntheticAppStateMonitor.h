@@ -7,23 +7,27 @@
 
 namespace lumacast::headless {
 
-/// Every application that runs is in front: nothing covers anything here. Which of them the user has in front nobody
-/// knows, as there is no user; and nothing is ever told, as nothing comes to the front or leaves it.
+/// Every application that is known is in front: nothing covers anything here. Whether it runs is not asked, as looking
+/// at all processes may take longer than an answer has, and whoever records does run. Which of them the user has in
+/// front nobody knows, as there is no user; and nothing is ever told, as nothing comes to the front or leaves it.
 class SyntheticAppStateMonitor final : public AppStateMonitor {
 public:
+    using IsKnown = std::function<bool(const BundleIdentifier& identifier)>;
     using ApplicationOf = std::function<std::optional<BundleIdentifier>(ProcessID pid)>;
 
-    explicit SyntheticAppStateMonitor(ApplicationOf applicationOf) : applicationOf_(std::move(applicationOf)) {}
+    SyntheticAppStateMonitor(IsKnown isKnown, ApplicationOf applicationOf)
+        : isKnown_(std::move(isKnown)), applicationOf_(std::move(applicationOf)) {}
 
     std::uint32_t applicationState(const BundleIdentifier& identifier) override {
-        return applicationProcess(identifier) ? kRunningForeground : 0;
+        return isKnown_(identifier) ? kRunningForeground : 0;
     }
     std::optional<BundleIdentifier> frontmostApplication() override { return std::nullopt; }
-    /// Asks this user's processes who they are, for 90 ms at most.
+    /// Asks this user's processes who they are, the newest first, for 90 ms at most.
     std::optional<ProcessID> applicationProcess(const BundleIdentifier& identifier) override;
     void setHandler(Handler /*handler*/) override {}
 
 private:
+    const IsKnown isKnown_;
     const ApplicationOf applicationOf_;
 };
 

@@ -11,12 +11,14 @@
 
 namespace lumacast::headless {
 
-/// A display that shows a show on everything: on the screen and in every window there is (SyntheticWindows). Makes sources and
-/// chooses what they show. Outlives its sources' last start; its end joins their lanes and must not come on one.
+/// A display that shows a show on everything: on the screen and in every window there is (SyntheticWindows). Makes
+/// sources and chooses what they show. Outlives its sources' last start; its end joins their lanes and must not come on
+/// one.
 class SyntheticDisplay final : public DisplayCapture, public DisplayCloneControl {
 public:
     /// Clock and scheduler are borrowed.
-    SyntheticDisplay(const Show& show, Clock& clock, Scheduler& scheduler) : show_(show), clock_(clock), scheduler_(scheduler) {}
+    SyntheticDisplay(const Show& show, Clock& clock, Scheduler& scheduler)
+        : show_(show), clock_(clock), scheduler_(scheduler) {}
 
     std::shared_ptr<DisplayCaptureSource> makeSource(Size captureSize, MediaTime minimumInterval) override;
     void setMirroringMode(int mode) override { selection_->setMode(mode); }

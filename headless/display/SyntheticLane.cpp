@@ -27,7 +27,8 @@ std::int64_t intervalOf(const MediaTime& interval) {
 
 }  // namespace
 
-SyntheticLane::SyntheticLane(SyntheticLaneSetup setup) : setup_(std::move(setup)), pacer_(intervalOf(setup_.minimumInterval)) {
+SyntheticLane::SyntheticLane(SyntheticLaneSetup setup)
+    : setup_(std::move(setup)), pacer_(intervalOf(setup_.minimumInterval)) {
     setup_.selection->watch(wake_);
 }
 
@@ -58,7 +59,8 @@ void SyntheticLane::sleep(std::int64_t deadline) {
 std::int64_t SyntheticLane::work(const Order& order) {
     if (order.run != run_ && !beginRun(order)) return kNever;
     if (wanted_.version != setup_.selection->version() && !followSelection(order)) return kNever;
-    if (std::any_of(owners_.begin(), owners_.end(), [](const auto& owner) { return owner.ended(); }) && !followSelection(order))
+    if (std::any_of(owners_.begin(), owners_.end(), [](const auto& owner) { return owner.ended(); }) &&
+        !followSelection(order))
         return kNever;
     return colours_.empty() ? kNever : takePictures(order);
 }
@@ -68,7 +70,8 @@ bool SyntheticLane::beginRun(const Order& order) {
     isFirst_ = true;
     if (last_.picture && last_.clock == order.clock) {
         Delivered again = last_;
-        again.picture = std::make_shared<SyntheticPicture>(last_.picture->memory(), SyntheticPicture::Differs::Nowhere, ++pictures_);
+        again.picture = std::make_shared<SyntheticPicture>(last_.picture->memory(), SyntheticPicture::Differs::Nowhere,
+                                                           ++pictures_);
         deliver(order, std::move(again), Stamp::Kept);
     } else {
         last_ = {};
@@ -144,7 +147,8 @@ bool SyntheticLane::takePicture(const Order& order, std::int64_t picture) {
     }
     painter_->paint(*memory, picture, colours_);
     const std::uint32_t flags = lies_ == Painter::Lies::Upright ? 0 : kRotateClockwise;
-    auto shown = std::make_shared<SyntheticPicture>(std::move(memory), SyntheticPicture::Differs::Everywhere, ++pictures_);
+    auto shown =
+        std::make_shared<SyntheticPicture>(std::move(memory), SyntheticPicture::Differs::Everywhere, ++pictures_);
     if (!deliver(order, {std::move(shown), stamp, order.clock, flags}, Stamp::Fresh)) return false;
     isFirst_ = false;
     return true;
@@ -159,7 +163,8 @@ bool SyntheticLane::deliver(const Order& order, Delivered what, Stamp kind) {
     what.stamp = *given;
     last_ = what;
     delegate->screenCaptureControllerDidReceiveSampleBuffer(
-        *source, samples_.video(PixelBuffer(std::move(what.picture)), *given, setup_.minimumInterval), what.transformFlags);
+        *source, samples_.video(PixelBuffer(std::move(what.picture)), *given, setup_.minimumInterval),
+        what.transformFlags);
     setup_.control->countDelivered();
     setup_.control->endDelivery();
     return true;

@@ -33,9 +33,9 @@ struct SyntheticLaneSetup {
     Scheduler* scheduler = nullptr;  ///< borrowed; for failures, which go to the main queue
 };
 
-/// Draws and delivers the show's pictures while the control says so. Each is stamped with the moment at which it began, so
-/// that a machine that is late by less than a second delivers all of them, with the stamps they should have; what is later
-/// than that is dropped and counted.
+/// Draws and delivers the show's pictures while the control says so. Each is stamped with the moment at which it began,
+/// so that a machine that is late by less than a second delivers all of them, with the stamps they should have; what is
+/// later than that is dropped and counted.
 class SyntheticLane final : public x11::CaptureLane {
 public:
     explicit SyntheticLane(SyntheticLaneSetup setup);
@@ -79,9 +79,9 @@ private:
     Painter::Lies lies_ = Painter::Lies::Upright;
     std::unique_ptr<PlaneStore> planes_;
     x11::FramePacer pacer_;
-    std::int64_t next_ = 0;                 ///< the show's picture that is due next
-    bool isFirst_ = true;                   ///< of the run
-    std::uint64_t pictures_ = 0;            ///< numbered so far
+    std::int64_t next_ = 0;       ///< the show's picture that is due next
+    bool isFirst_ = true;         ///< of the run
+    std::uint64_t pictures_ = 0;  ///< numbered so far
     SampleMaker samples_;
     Delivered last_;
 };

@@ -1,4 +1,5 @@
-// The shortest application that records itself where there is no display: the first of the windows that every process has.
+// The shortest application that records itself where there is no display: the first of the windows that every process
+// has.
 
 #include <unistd.h>
 

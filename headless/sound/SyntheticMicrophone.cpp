@@ -52,7 +52,8 @@ private:
         if (isTaken || first >= end) return;
         std::vector<float> samples(static_cast<std::size_t>(end - first));
         for (std::size_t frame = 0; frame < samples.size(); ++frame) {
-            const double seconds = std::fmod(static_cast<double>(first) + static_cast<double>(frame), timeline_.rate) / timeline_.rate;
+            const double seconds =
+                std::fmod(static_cast<double>(first) + static_cast<double>(frame), timeline_.rate) / timeline_.rate;
             samples[frame] = static_cast<float>(SyntheticMicrophone::kAmplitude *
                                                 std::sin(2 * std::numbers::pi * SyntheticMicrophone::kTone * seconds));
         }

@@ -30,9 +30,8 @@ public:
 
     std::unique_ptr<sound::Listening> listen(std::shared_ptr<TapMix> mix) override {
         if (!plays_) return std::make_unique<Silence>();
-        auto tones = [show = show_, rate = mix->rate(), channels = mix->channels()](HostTime moment, std::span<float> samples) {
-            show.addTones(moment, rate, channels, samples);
-        };
+        auto tones = [show = show_, rate = mix->rate(), channels = mix->channels()](
+                         HostTime moment, std::span<float> samples) { show.addTones(moment, rate, channels, samples); };
         return std::make_unique<Stream>(std::move(mix), std::move(tones));
     }
 

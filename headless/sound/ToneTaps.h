@@ -9,8 +9,8 @@
 
 namespace lumacast::headless {
 
-/// What processes play where there is no sound server: every application the show's tones, everybody else nothing. The tones
-/// are computed when they are read, so there is no thread, and nothing that could be late.
+/// What processes play where there is no sound server: every application the show's tones, everybody else nothing. The
+/// tones are computed when they are read, so there is no thread, and nothing that could be late.
 class ToneTaps final : public sound::TapSource {
 public:
     using ApplicationOf = std::function<std::optional<BundleIdentifier>(ProcessID pid)>;

@@ -13,7 +13,8 @@ namespace {
 class Attachment final : public Listening {
 public:
     /// Null when the system has no thread left.
-    static std::unique_ptr<Listening> make(std::shared_ptr<PulseConnection> connection, std::shared_ptr<PulseUser> user) {
+    static std::unique_ptr<Listening> make(std::shared_ptr<PulseConnection> connection,
+                                           std::shared_ptr<PulseUser> user) {
         if (!connection->attach(user)) return nullptr;
         return std::unique_ptr<Listening>(new Attachment(std::move(connection), std::move(user)));
     }

@@ -10,7 +10,8 @@ namespace lumacast::sound {
 /// What processes play at the user's sound server, PulseAudio or PipeWire.
 class PulseTaps final : public TapSource {
 public:
-    /// `applicationOf` is asked on the sound thread whether a descendant of a tapped process counts as it; empty: none does.
+    /// `applicationOf` is asked on the sound thread whether a descendant of a tapped process counts as it; empty: none
+    /// does.
     PulseTaps(std::shared_ptr<PulseConnection> connection, ApplicationOf applicationOf)
         : connection_(std::move(connection)), applicationOf_(std::move(applicationOf)) {}
 

@@ -27,7 +27,9 @@ void LaneCaptureSource::setDelegate(std::weak_ptr<DisplayCaptureDelegate> delega
     control_->setDelegate(std::move(delegate));
 }
 
-void LaneCaptureSource::openGate() { control_->openGate(setup_.clock.captureClock()); }
+void LaneCaptureSource::openGate() {
+    control_->openGate(setup_.clock.captureClock());
+}
 
 void LaneCaptureSource::closeGate(GateWait wait) {
     control_->closeGate(wait);
@@ -60,12 +62,12 @@ std::shared_ptr<x11::CaptureLane> LaneCaptureSource::lane() {
 
 void LaneCaptureSource::fail(std::int32_t status) {
     control_->stop();
-    setup_.scheduler.mainQueue().async([source = weak_from_this(), control = control_, run = control_->order().run,
-                                        status] {
-        const auto failed = source.lock();
-        const auto delegate = control->delegateOfEnded(run);
-        if (failed && delegate) delegate->screenCaptureControllerDidFailWithStatus(*failed, status);
-    });
+    setup_.scheduler.mainQueue().async(
+        [source = weak_from_this(), control = control_, run = control_->order().run, status] {
+            const auto failed = source.lock();
+            const auto delegate = control->delegateOfEnded(run);
+            if (failed && delegate) delegate->screenCaptureControllerDidFailWithStatus(*failed, status);
+        });
 }
 
 }  // namespace lumacast

@@ -29,7 +29,8 @@ struct DesktopServices {
     Clock& clock;
     Scheduler& scheduler;
     Bundles& bundles;
-    /// The application that a process runs; none for one that is no application's. Callable from any lane, may take a moment.
+    /// The application that a process runs; none for one that is no application's. Callable from any lane, may take a
+    /// moment.
     std::function<std::optional<BundleIdentifier>(ProcessID pid)> applicationOf;
 };
 
@@ -52,8 +53,8 @@ struct AttentionRoles {
     std::unique_ptr<SystemSounds> systemSounds;
 };
 
-/// Makes the desktop's roles, each group once and none of them null, in this order: between them the platform makes what
-/// is its own. Outlives what it made.
+/// Makes the desktop's roles, each group once and none of them null, in this order: between them the platform makes
+/// what is its own. Outlives what it made.
 class DesktopRoles {
 public:
     virtual ~DesktopRoles() = default;

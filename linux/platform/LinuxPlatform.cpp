@@ -57,11 +57,14 @@ constexpr std::chrono::seconds kMoreTime{10}, kAskForTimeEvery{2};
 constexpr std::chrono::seconds kTimeToSecure{4};
 
 /// Two for each connection that one user may have, and as many again for other users and everything else.
-constexpr std::uint64_t kDescriptors = 4 * (limitOf(Limit::ConnectionsPerUser) + limitOf(Limit::ConnectionsBeforeHello));
+constexpr std::uint64_t kDescriptors =
+    4 * (limitOf(Limit::ConnectionsPerUser) + limitOf(Limit::ConnectionsBeforeHello));
 
-/// A daemon that nobody can reach must not run on: whoever started it hears of it by its exit status. At once, like every
-/// end of this process: other lanes may be in the middle of their work.
-[[noreturn]] void endUnreachable() { ::_exit(EX_UNAVAILABLE); }
+/// A daemon that nobody can reach must not run on: whoever started it hears of it by its exit status. At once, like
+/// every end of this process: other lanes may be in the middle of their work.
+[[noreturn]] void endUnreachable() {
+    ::_exit(EX_UNAVAILABLE);
+}
 
 std::string environmentVariable(const char* name) {
     const char* value = std::getenv(name);
@@ -116,13 +119,37 @@ public:
           storeLookup_(scheduler_, LinuxStoreLookup::optionsFrom(environment)),
           appExtensions_(*reactor_, scheduler_, ipc_, log_,
                          LinuxAppExtensions::optionsFrom(environment, temporaryDirectory(environment))),
-          platform_{log_, scheduler_, clock_, ipc_, bundles_,
-                    *display_.renderServer, *display_.appStateMonitor, *display_.displayCapture, *display_.displayCloneControl,
-                    *sound_.audioInputQueues, *sound_.deviceCapture, writers_, exporters_, photoLibrary_, fileSystem_, preferences_,
-                    deviceInfo_, telemetry_, keepAlive_, admin_, storagePurge_, *attention_.userAlerts, *attention_.systemSounds,
-                    screenReader_, storeLookup_, networkReachability_, appExtensions_, keyedArchive_},
-          termination_([this] { closeMovies(); }, kTimeToEnd,
-                       {[this] { keepAlive_.announceStopping(static_cast<int>(kMoreTime.count())); }, kAskForTimeEvery}) {
+          platform_{log_,
+                    scheduler_,
+                    clock_,
+                    ipc_,
+                    bundles_,
+                    *display_.renderServer,
+                    *display_.appStateMonitor,
+                    *display_.displayCapture,
+                    *display_.displayCloneControl,
+                    *sound_.audioInputQueues,
+                    *sound_.deviceCapture,
+                    writers_,
+                    exporters_,
+                    photoLibrary_,
+                    fileSystem_,
+                    preferences_,
+                    deviceInfo_,
+                    telemetry_,
+                    keepAlive_,
+                    admin_,
+                    storagePurge_,
+                    *attention_.userAlerts,
+                    *attention_.systemSounds,
+                    screenReader_,
+                    storeLookup_,
+                    networkReachability_,
+                    appExtensions_,
+                    keyedArchive_},
+          termination_(
+              [this] { closeMovies(); }, kTimeToEnd,
+              {[this] { keepAlive_.announceStopping(static_cast<int>(kMoreTime.count())); }, kAskForTimeEvery}) {
         admin_.addCommand("usage", usageCommand(telemetry_));
         admin_.addCommand("movies", media::moviesCommand(scheduler_, temporaryDirectory(environment)));
     }
@@ -145,7 +172,8 @@ private:
     /// At the end of the process, waiting for no lane.
     void closeMovies() {
         exporters_.forgetAll();  // an export can be made again
-        // A recording that ended by itself, whose movie nobody has asked for, has had its summary: only the newest ones run.
+        // A recording that ended by itself, whose movie nobody has asked for, has had its summary: only the newest ones
+        // run.
         const auto running = static_cast<std::size_t>(keepAlive_.openTransactions());
         const auto closed = writers_.closeOpenMovies();
         const auto first = closed.end() - static_cast<std::ptrdiff_t>(std::min(running, closed.size()));
@@ -225,8 +253,8 @@ std::unique_ptr<PlatformOwner> makePlatformOn(const MakeDesktopRoles& makeDeskto
     }
     auto platform = std::make_unique<LinuxPlatform>(environment, makeDesktop);
     if (const auto error = platform->prepare()) {
-        std::fprintf(stderr, "lumacastd: the temporary directory %s%s can't be used: %s\n",
-                     environment.root.c_str(), std::string(kDeviceTemporaryDirectory).c_str(), describe(*error).c_str());
+        std::fprintf(stderr, "lumacastd: the temporary directory %s%s can't be used: %s\n", environment.root.c_str(),
+                     std::string(kDeviceTemporaryDirectory).c_str(), describe(*error).c_str());
         return nullptr;
     }
     return platform;

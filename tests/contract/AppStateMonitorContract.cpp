@@ -166,15 +166,18 @@ public:
         return ProcessID{process ? process->pid() : 0};
     }
     void stopAnswering() override {}
-    std::string whyAllAreInFront() const override { return "every application that runs is in front, and nobody can hang"; }
+    std::string whyAllAreInFront() const override { return "every application is in front, and nobody can hang"; }
 
 private:
     std::unique_ptr<test::ChildProcess> first_, second_;
-    headless::SyntheticAppStateMonitor monitor_{[this](ProcessID pid) -> std::optional<BundleIdentifier> {
+    static bool isKnown(const BundleIdentifier& identifier) { return identifier == kFirst || identifier == kSecond; }
+    std::optional<BundleIdentifier> applicationOf(ProcessID pid) {
         for (const BundleIdentifier& identifier : {kFirst, kSecond})
             if (process(identifier) == pid) return identifier;
         return std::nullopt;
-    }};
+    }
+
+    headless::SyntheticAppStateMonitor monitor_{isKnown, [this](ProcessID pid) { return applicationOf(pid); }};
 };
 
 bool becomes(const std::function<bool()>& condition) {

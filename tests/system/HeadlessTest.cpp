@@ -68,11 +68,14 @@ protected:
 
     /// `consent` is the variable that answers every question; without it, as the port has it.
     void startDaemon(const std::string& consent = {}) {
-        daemon_ = run({LC_HEADLESS_DAEMON}, consent.empty() ? "HEADLESS_TEST=1" : "LUMACAST_HEADLESS_CONSENT=" + consent,
-                      "daemon.log");
-        EXPECT_TRUE(waitUntil([this] {
-            return askAdminService(path("run/lumacast/admin.sock"), "status", std::chrono::milliseconds(5000)).has_value();
-        }, std::chrono::seconds(60)));
+        daemon_ = run({LC_HEADLESS_DAEMON},
+                      consent.empty() ? "HEADLESS_TEST=1" : "LUMACAST_HEADLESS_CONSENT=" + consent, "daemon.log");
+        EXPECT_TRUE(waitUntil(
+            [this] {
+                return askAdminService(path("run/lumacast/admin.sock"), "status", std::chrono::milliseconds(5000))
+                    .has_value();
+            },
+            std::chrono::seconds(60)));
     }
     /// The application's exit status.
     int record() { return run({LC_MINIMAL_HEADLESS, movie()}, "HEADLESS_TEST=1", "application.log")->wait(); }
@@ -80,9 +83,11 @@ protected:
     std::string path(const std::string& name) const { return folder_ + "/" + name; }
 
 private:
-    std::unique_ptr<checkers::Child> run(std::vector<std::string> command, const std::string& variable, const std::string& log) {
-        std::vector<std::string> whole{"env",  "-u", "DISPLAY", "-u", "WAYLAND_DISPLAY", "-u", "PULSE_SERVER",
-                                       "-u", "DBUS_SESSION_BUS_ADDRESS", variable};
+    std::unique_ptr<checkers::Child> run(std::vector<std::string> command, const std::string& variable,
+                                         const std::string& log) {
+        std::vector<std::string> whole{
+            "env",   "-u", "DISPLAY", "-u", "WAYLAND_DISPLAY", "-u", "PULSE_SERVER", "-u", "DBUS_SESSION_BUS_ADDRESS",
+            variable};
         whole.insert(whole.end(), command.begin(), command.end());
         return std::make_unique<checkers::Child>(whole, environment_, path(log));
     }
@@ -120,8 +125,10 @@ TEST_F(Headless, RefusesEveryRecordingThatNobodyAllowed) {
 
 TEST_F(Headless, LinksNoDisplayAndNoSoundServer) {
     for (const char* library : {"libxcb", "libpulse"}) {
-        EXPECT_THAT(outputOf(std::string("readelf -d ") + LC_HEADLESS_DAEMON), Not(HasSubstr(std::string("[") + library)));
-        EXPECT_THAT(outputOf(std::string("readelf -d ") + LC_DAEMON), HasSubstr(std::string("[") + library)) << "so that it can fail";
+        EXPECT_THAT(outputOf(std::string("readelf -d ") + LC_HEADLESS_DAEMON),
+                    Not(HasSubstr(std::string("[") + library)));
+        EXPECT_THAT(outputOf(std::string("readelf -d ") + LC_DAEMON), HasSubstr(std::string("[") + library))
+            << "so that it can fail";
     }
 }
 
@@ -140,7 +147,8 @@ TEST_F(Headless, IsConfiguredOnAMachineWithoutTheLibrariesOfADesktop) {
     std::string folders = outputOf("pkg-config --variable pc_path pkg-config");
     for (char& letter : folders) letter = letter == ':' || letter == '\n' ? ' ' : letter;
     for (const std::string& name : {std::string("*.pc")})
-        outputOf("for f in $(find " + folders + " -name '" + name + "' 2>/dev/null); do ln -sf $f " + packages.string() + "/; done");
+        outputOf("for f in $(find " + folders + " -name '" + name + "' 2>/dev/null); do ln -sf $f " +
+                 packages.string() + "/; done");
     for (const auto& entry : fs::directory_iterator(packages)) {
         const std::string name = entry.path().filename().string();
         if (!name.starts_with("xcb") && !name.starts_with("libpulse") && !name.starts_with("x11")) continue;
@@ -148,9 +156,12 @@ TEST_F(Headless, IsConfiguredOnAMachineWithoutTheLibrariesOfADesktop) {
         ++left;
     }
     EXPECT_GT(left, 2u) << "so that there was something to leave out";
-    const std::string configure = "PKG_CONFIG_PATH= PKG_CONFIG_LIBDIR=" + packages.string() + " cmake -S " LC_SOURCE_DIR " -B ";
-    EXPECT_THAT(outputOf(configure + path("headless") + " -DLUMACAST_PORT=headless 2>&1"), HasSubstr("Generating done"));
-    EXPECT_THAT(outputOf("! " + configure + path("linux") + " -DLUMACAST_PORT=linux 2>&1"), HasSubstr("xcb")) << "so that it can fail";
+    const std::string configure =
+        "PKG_CONFIG_PATH= PKG_CONFIG_LIBDIR=" + packages.string() + " cmake -S " LC_SOURCE_DIR " -B ";
+    EXPECT_THAT(outputOf(configure + path("headless") + " -DLUMACAST_PORT=headless 2>&1"),
+                HasSubstr("Generating done"));
+    EXPECT_THAT(outputOf("! " + configure + path("linux") + " -DLUMACAST_PORT=linux 2>&1"), HasSubstr("xcb"))
+        << "so that it can fail";
 }
 
 }  // namespace
