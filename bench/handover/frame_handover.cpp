@@ -19,6 +19,7 @@
 #include "bench/handover/Handover.h"
 #include "broadcast/PayloadKeys.h"
 #include "client/extension/Extension.h"
+#include "linux/ipc/ExtensionRequests.h"
 #include "linux/ipc/LinuxIpc.h"
 #include "linux/ipc/Reactor.h"
 #include "writer/media/SampleBuffer.h"
