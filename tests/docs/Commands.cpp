@@ -253,7 +253,7 @@ std::string faultOf(const Command& command) {
         return faultOfScript(command);
     if (program.starts_with("build/")) return faultOfProgram(command);
     if (program == "cmake" || program == "ninja") return faultOfBuild(command);
-    if (program.starts_with('/')) return {};  // the reader's own
+    if (program.starts_with('/') || program.starts_with('$')) return {};  // the reader's own
     if (program == "lumacastctl" || kOfTheSystem.contains(program)) return {};
     if (isOfTheTree(program)) return faultOfProgram(command);
     return program + " is no program that is known";

@@ -72,6 +72,16 @@ TEST(Commands, NameProgramsAndOptionsThatExist) {
     EXPECT_GT(commands, 60u) << "the pages were not found";
 }
 
+TEST(Commands, OfCIAreTheOnesThatThePagesName) {
+    const std::string script = fileText(".ci/run"), exec = "\nexec ";
+    ASSERT_NE(script.find(exec), std::string::npos);
+    const std::string command = script.substr(script.find(exec) + exec.size());
+    const std::string named = "`" + command.substr(0, command.find('\n')) + "`";
+    EXPECT_NE(docs::page("docs/maintaining.md").text.find("`.ci/run`, which is " + named), std::string::npos) << named;
+    const std::string option = "`" + command.substr(command.rfind("--"), command.find('\n') - command.rfind("--")) + "`";
+    EXPECT_NE(docs::page("README.md").text.find(option + " is what\nCI runs"), std::string::npos) << option;
+}
+
 TEST(Commands, OfLumacastctlAreUnderstoodByIt) {
     LumacastCtl tool;
     std::set<std::vector<std::string>> tried;
