@@ -1,9 +1,10 @@
 # Installation: the packages bring all that they need.
 
-paths() { (cd "$root" && find . -xdev \( -path ./home -o -path ./packages -o -path ./var/log -o -path ./var/cache -o -path ./var/lib/dpkg -o -path ./var/lib/apt \) -prune \
-  -o -print | sort); }
-installs() { in_root sh -c 'exec "$@" /packages/*.deb' sh apt-get -q -y --no-install-recommends \
-  -o Dpkg::Options::=--force-unsafe-io -o APT::Sandbox::User=root install; }
+paths() {
+  (cd "$root" && find . -xdev \( -path ./home -o -path ./packages -o -path ./var/log -o -path ./var/cache/apt -o -path ./var/lib/dpkg \
+    -o -path ./usr/local/bin \) -prune -o -print)
+}
+installs() { apt_in_root install $(cd "$root" && ls packages/*.deb | sed 's|^|/|'); }
 finds_its_libraries() {
   local program missing
   for program in /usr/bin/lumacastd /usr/bin/lumacastctl /usr/libexec/lumacast/lumacast-catalog \
