@@ -78,7 +78,8 @@ TEST(Commands, OfCIAreTheOnesThatThePagesName) {
     const std::string command = script.substr(script.find(exec) + exec.size());
     const std::string named = "`" + command.substr(0, command.find('\n')) + "`";
     EXPECT_NE(docs::page("docs/maintaining.md").text.find("`.ci/run`, which is " + named), std::string::npos) << named;
-    const std::string option = "`" + command.substr(command.rfind("--"), command.find('\n') - command.rfind("--")) + "`";
+    const std::string option =
+        "`" + command.substr(command.rfind("--"), command.find('\n') - command.rfind("--")) + "`";
     EXPECT_NE(docs::page("README.md").text.find(option + " is what\nCI runs"), std::string::npos) << option;
 }
 

@@ -22,7 +22,8 @@ namespace fs = std::filesystem;
 bool isPathThere(const Page& page, std::string path) {
     while (path.ends_with('/')) path.pop_back();
     const std::string here = fs::path(page.path).parent_path().string();
-    for (const std::string& base : {std::string(), std::string("src"), here, std::string("linux"), std::string("linux/media")})
+    for (const std::string& base :
+         {std::string(), std::string("src"), here, std::string("linux"), std::string("linux/media")})
         for (const char* ending : {"", ".h", ".cpp", ".py"}) {
             const std::string candidate = (fs::path(base) / (path + ending)).lexically_normal().string();
             if (!candidate.starts_with("..") && isThere(candidate)) return true;
