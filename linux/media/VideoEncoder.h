@@ -6,11 +6,8 @@
 #include <memory>
 #include <optional>
 #include <span>
-#include <string_view>
 #include <variant>
-#include <vector>
 
-#include "linux/media/AvHandles.h"
 #include "linux/media/I420Picture.h"
 #include "linux/media/TrackSettings.h"
 
@@ -20,7 +17,8 @@ namespace lumacast::media {
 /// thread-safe.
 class EncoderChoice final {
 public:
-    /// libavcodec's encoders in the order of preference; the last one is software.
+    /// libavcodec's encoders in the order of preference; the last one is software, and in its place stands the software
+    /// encoder that the build has chosen.
     static constexpr std::array<const char*, 3> kCandidates{"h264_nvenc", "h264_vaapi", "libx264"};
 
     std::size_t first() const { return first_.load(std::memory_order_relaxed); }
@@ -41,45 +39,27 @@ struct EncodedPicture {
     bool isKeyFrame = false;
 };
 
-/// H.264, High profile, level as needed, no B-pictures and no delay: a picture that goes in comes out. Hardware is
-/// probed by encoding a picture with it, quietly and once; then libx264. Belongs to one thread; opening takes tens of
-/// milliseconds. BT.601 limited range, tagged so.
-class VideoEncoder final {
+/// H.264, High profile, level as needed, no B-pictures and no delay: a picture that goes in comes out. Belongs to one
+/// thread; opening takes tens of milliseconds. BT.601 limited range, tagged so.
+class VideoEncoder {
 public:
     static constexpr int kTimescale = 1'000'000;  ///< ticks a second of the stamps
 
     using Output = std::function<void(const EncodedPicture&)>;
+    using Opened = std::variant<std::unique_ptr<VideoEncoder>, Error>;
 
-    static std::variant<std::unique_ptr<VideoEncoder>, Error> open(const VideoTrackSettings& settings,
-                                                                   EncoderChoice& choice);
+    /// Hardware is probed by encoding a picture with it, quietly and once; then the software encoder of this build.
+    static Opened open(const VideoTrackSettings& settings, EncoderChoice& choice);
+
+    virtual ~VideoEncoder() = default;
     /// Encodes one picture; stamps rise. The picture is read during the call.
-    std::optional<Error> encode(const std::shared_ptr<I420Picture>& picture, std::int64_t stamp, KeyFrame key,
-                                const Output& output);
+    virtual std::optional<Error> encode(const std::shared_ptr<I420Picture>& picture, std::int64_t stamp, KeyFrame key,
+                                        const Output& output) = 0;
     /// Delivers what an encoder may still hold, at the end.
-    std::optional<Error> drain(const Output& output);
+    virtual std::optional<Error> drain(const Output& output) = 0;
 
     /// The parameter sets, an Annex B byte stream.
-    std::span<const std::uint8_t> header() const;
-    std::string_view name() const { return context_->codec->name; }
-
-private:
-    VideoEncoder(AvOwned<AVCodecContext> context, AvOwned<AVBufferRef> uploads);
-
-    static std::variant<std::unique_ptr<VideoEncoder>, Error> openNamed(const char* name,
-                                                                        const VideoTrackSettings& settings);
-    static bool works(VideoEncoder& encoder, const VideoTrackSettings& settings);
-    void paceRate(std::int64_t stamp);
-    bool show(const std::shared_ptr<I420Picture>& picture);
-    int send(AVFrame* frame);
-    std::optional<Error> receive(const Output& output);
-
-    AvOwned<AVCodecContext> context_;
-    AvOwned<AVBufferRef> uploads_;  ///< frames in the device's memory; null for encoders that read ours
-    AvOwned<AVFrame> frame_;        ///< keeps the picture alive that it shows: mostly it is one all the time
-    const I420Picture* shown_ = nullptr;
-    AvOwned<AVFrame> uploaded_;
-    AvOwned<AVPacket> packet_;
-    std::optional<std::int64_t> lastStamp_;
+    virtual std::span<const std::uint8_t> header() const = 0;
 };
 
 /// Decides by stamps where key frames must stand. A value; one per track.
