@@ -38,10 +38,7 @@ wait_for() { # seconds, command…
   done
 }
 
-in_root() { chroot "$root" /usr/bin/env -i PATH=/usr/sbin:/usr/bin:/sbin:/bin LANG=C.UTF-8 DEBIAN_FRONTEND=noninteractive "$@"; }
-apt_in_root() {
-  in_root apt-get -q -y --no-install-recommends -o Dpkg::Options::=--force-unsafe-io -o APT::Sandbox::User=root "$@"
-}
 # An ordinary user of that root, with nothing but what a session gives.
 session=(HOME=/home/ann USER=ann LANG=C.UTF-8 PATH=/usr/local/bin:/usr/bin:/bin XDG_RUNTIME_DIR=/run/user/1000 DISPLAY=:7)
-as_ann() { chroot --userspec=ann:ann "$root" /usr/bin/env -i "${session[@]}" "$@"; }
+ann=(chroot --userspec=ann:ann "$root" /usr/bin/env -i "${session[@]}")
+as_ann() { "${ann[@]}" "$@"; }

@@ -4,7 +4,6 @@ paths() {
   (cd "$root" && find . -xdev \( -path ./home -o -path ./packages -o -path ./var/log -o -path ./var/cache/apt -o -path ./var/lib/dpkg \
     -o -path ./usr/local/bin \) -prune -o -print)
 }
-installs() { apt_in_root install $(cd "$root" && ls packages/*.deb | sed 's|^|/|'); }
 finds_its_libraries() {
   local program missing
   for program in /usr/bin/lumacastd /usr/bin/lumacastctl /usr/libexec/lumacast/lumacast-catalog \
@@ -21,11 +20,15 @@ verifies_units() {
     [ -z "$said" ] || { echo "$said"; return 1; }
 }
 
+# In a root that has what they depend on, and nothing more.
+enter "$kept/needed.tar"
 check "the packages install with what they depend on" installs
 check "every program finds its libraries" finds_its_libraries
 check "the socket is enabled for all users' managers" is_enabled
-# From here on the root has what the checks need.
-check "(the tools of the checks install)" apt_in_root install $(grep -v '^#' tests/packages/tools)
+# From here on in one that also has what the checks need.
+leave
+enter "$kept/with-tools.tar"
+installs >/dev/null 2>&1
 in_root useradd --create-home --shell /bin/sh ann
 mkdir -p "$root/run/user/1000"
 chown 1000:1000 "$root/run/user/1000"

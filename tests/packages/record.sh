@@ -5,9 +5,9 @@ socket=$(sed -n 's/^ListenStream=//p' "$root/usr/lib/systemd/user/lumacastd.sock
 socket=${socket/\%t/\/run\/user\/1000}
 
 start_session() {
-  as_ann Xvfb :7 -noreset -screen 0 1280x800x24 -nolisten tcp >"$root/tmp/display.log" 2>&1 &
+  "${ann[@]}" Xvfb :7 -noreset -screen 0 1280x800x24 -nolisten tcp >"$root/tmp/display.log" 2>&1 &
   pids+=($!)
-  as_ann pulseaudio -n --daemonize=no --exit-idle-time=-1 --disallow-exit --use-pid-file=no \
+  "${ann[@]}" pulseaudio -n --daemonize=no --exit-idle-time=-1 --disallow-exit --use-pid-file=no \
     -L "module-null-sink sink_name=null0 rate=48000 norewinds=1" -L "module-native-protocol-unix" >"$root/tmp/sound.log" 2>&1 &
   pids+=($!)
   mkdir -m 700 "$root/run/user/1000/lumacast"
@@ -17,7 +17,7 @@ start_session() {
   cp "$confine" "$root/usr/local/bin/confine"
   printf '[Service]\nUser=1000\n' >"$root/home/user.conf"
   printf 'Environment=%s\n' "${session[@]}" >>"$root/home/user.conf"
-  as_ann systemd-socket-activate --listen="$socket" --fdname=lumacastd.socket "${session[@]/#/--setenv=}" \
+  "${ann[@]}" systemd-socket-activate --listen="$socket" --fdname=lumacastd.socket "${session[@]/#/--setenv=}" \
     confine --unit /usr/lib/systemd/user/lumacastd.service --drop-in /home/user.conf --instance 1000 --program /usr/bin/lumacastd \
     >"$root/tmp/daemon.log" 2>&1 &
   pids+=($!)
