@@ -22,6 +22,11 @@ public:
         if (auto* const error = std::get_if<int>(&made)) return *error;
         return std::make_unique<File>(*this, std::move(std::get<0>(made)));
     }
+    /// Whether somebody waits to write.
+    bool isHolding() const {
+        const std::lock_guard lock(mutex_);
+        return isHolding_;
+    }
     void goOn() {
         const std::lock_guard lock(mutex_);
         isStuck_ = false;
@@ -34,6 +39,7 @@ private:
         File(StuckFiles& disk, std::unique_ptr<media::MovieFile> real) : disk_(disk), real_(std::move(real)) {}
         int write(std::uint64_t offset, std::span<const std::uint8_t> bytes) override {
             std::unique_lock lock(disk_.mutex_);
+            disk_.isHolding_ = disk_.isStuck_;
             disk_.changed_.wait(lock, [this] { return !disk_.isStuck_; });
             return real_->write(offset, bytes);
         }
@@ -45,9 +51,9 @@ private:
         const std::unique_ptr<media::MovieFile> real_;
     };
 
-    std::mutex mutex_;
+    mutable std::mutex mutex_;
     std::condition_variable changed_;
-    bool isStuck_ = true;
+    bool isStuck_ = true, isHolding_ = false;
 };
 
 class EndingExport : public ::testing::TestWithParam<ExportPreset> {
@@ -80,7 +86,7 @@ TEST_P(EndingExport, ThatIsStuckLosesItsHalfMadeFileAndNobodyHears) {
         LinuxMovieExporters exporters(files, media::EncodingPriority::AsUsual);
         run(exporters, "first.mp4");
         run(exporters, "second.mp4");  // of encodings one that waits
-        ASSERT_TRUE(eventually([&] { return exists("first.mp4"); }));
+        ASSERT_TRUE(eventually([&] { return files->isHolding(); }));
         exporters.forgetAll();
         exporters.removeUnfinished(milliseconds(0));
         EXPECT_FALSE(exists("first.mp4"));
@@ -97,7 +103,7 @@ TEST_P(EndingExport, ThatSeesItInTimeIsNotWaitedForAnyLonger) {
     const auto files = std::make_shared<StuckFiles>();
     LinuxMovieExporters exporters(files, media::EncodingPriority::AsUsual);
     run(exporters, "first.mp4");
-    ASSERT_TRUE(eventually([&] { return exists("first.mp4"); }));
+    ASSERT_TRUE(eventually([&] { return files->isHolding(); }));
     exporters.forgetAll();
     files->goOn();
     const auto before = std::chrono::steady_clock::now();
