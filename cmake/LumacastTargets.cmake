@@ -9,7 +9,7 @@ target_compile_options(lc_options INTERFACE
   # GCC 12 reports its own string code (GCC bug 105651), and reads of empty optionals that don't happen (bug 80635); the
   # sanitizers and clang watch for the real thing.
   $<$<CXX_COMPILER_ID:GNU>:-Wno-restrict> $<$<CXX_COMPILER_ID:GNU>:-Wno-maybe-uninitialized>
-  -fno-omit-frame-pointer -g1)
+  -fno-omit-frame-pointer $<IF:$<CONFIG:Debug>,-g,-g1>)
 if(LC_SANITIZE)
   # The checks that a sanitizer puts in make GCC 12 see sizes that don't occur.
   target_compile_options(lc_options INTERFACE -fsanitize=${LC_SANITIZE} -fno-sanitize-recover=all

@@ -102,7 +102,7 @@ private:
 
     void send(SimulatedApplication& player) {
         constexpr ContextID kWindows[] = {ContextID{7}, ContextID{8}, ContextID{0}};
-        const std::uint16_t message = static_cast<std::uint16_t>(in_.below(20));
+        const std::uint16_t message = static_cast<std::uint16_t>(in_.below(static_cast<unsigned>(daemonProtocol().messages.size())));
         const MessageDeclaration& declaration = daemonProtocol().messages[message];
         Array arguments = argumentsFor(declaration, kWindows, in_);
         require(matches(arguments, declaration.arguments), "arguments are what the table declares");

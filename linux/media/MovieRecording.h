@@ -29,7 +29,7 @@ struct ClosedMovie {
     std::uint64_t bytes = 0;     ///< in the file when it was told to end
 };
 
-/// One movie being written: its state, the bounded queues of its tracks, its encoder thread and its disk thread. Every
+/// One movie being written: its state, the bounded queues of its tracks, its encoder thread and its file thread. Every
 /// operation may come from any lane and returns at once; none waits for the encoder or the disk, but where it says so.
 /// Once the movie is over, finished or failed, the file is closed and the threads end, whoever keeps the object.
 class MovieRecording final {

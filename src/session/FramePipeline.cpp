@@ -110,7 +110,7 @@ void LCRecordingSession::deliver(const SampleRef& sample, std::uint32_t transfor
         log_.line("LCRecordingSession: failed to start writer when appending video sample");
         stopRecordingWithNotification(true, services_.errors._lcUserErrorForCode(RecordingErrorCode::FailedToSave));
     }
-    // A failed append has stopped the session, and the agent is gone by then.
+    // A session without a writer has stopped itself, and the agent is gone by then.
     if (const auto agent = reportingAgent()) agent->update([](UsageMetrics& metrics) { ++metrics.videoFrameCount; });
 }
 
