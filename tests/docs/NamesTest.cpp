@@ -33,7 +33,7 @@ bool isPathThere(const Page& page, std::string path) {
 
 bool isPath(const std::string& text) {
     static const std::regex kPath(
-        "(src|linux|client|extensions|examples|tests|scripts|docs|packaging|fuzz|bench|resources|cmake|base|platform|"
+        "(src|linux|headless|debian|client|extensions|examples|tests|scripts|docs|packaging|fuzz|bench|resources|cmake|base|platform|"
         "support|broadcast|writer|capture|session|daemon|\\.ci)/[\\w./@-]*");
     return std::regex_match(text, kPath);
 }
@@ -176,7 +176,7 @@ TEST(Names, OfWhateverMakesAThreadOrAQueueStandInTheLanes) {
     const std::set<std::string> kTools{"Threads", "QuietThread", "ThreadScheduler", "ThreadSchedulerQueue"};
     const Page& lanes = docs::page("docs/lanes.md");
     std::set<std::string> makers;
-    for (const char* folder : {"src", "linux"})
+    for (const char* folder : {"src", "linux", "headless"})
         for (const auto& file : architecture::sourcesBelow(folder))
             if (makesLane(architecture::codeOf(file.text))) makers.insert(fs::path(file.path).stem().string());
     EXPECT_GT(makers.size(), 25u);

@@ -81,7 +81,7 @@ std::string textBelow(std::string_view folder, const std::vector<std::string>& e
 }
 
 bool isNameInCode(std::string_view name) {
-    for (const char* folder : {"src", "linux", "client", "extensions", "examples", "tests"})
+    for (const char* folder : {"src", "linux", "headless", "client", "extensions", "examples", "tests"})
         if (isNameIn(folder, name)) return true;
     return false;
 }

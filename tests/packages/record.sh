@@ -27,7 +27,7 @@ session_is_there() {
     wait_for 60 test -S "$root$socket"
 }
 wakes_it() { ! grep -q Starting "$root/tmp/daemon.log" && as_ann lumacastctl status && grep -q 'lumacastd Starting!' "$root/tmp/daemon.log"; }
-all_is_well() { as_ann lumacastctl doctor | tee "$root/tmp/doctor.txt" && ! grep -v '^ok' "$root/tmp/doctor.txt"; }
+all_is_well() { as_ann lumacastctl doctor | tee "$root/tmp/doctor.txt" && [ -s "$root/tmp/doctor.txt" ] && ! grep -v '^ok' "$root/tmp/doctor.txt"; }
 builds_with_cmake() {
   as_ann sh -c 'cp -r /usr/share/doc/liblumacast-dev/examples ~/project && cd ~/project &&
     cmake -B build/cmake -DCMAKE_INSTALL_PREFIX=$HOME/.local && cmake --build build/cmake && cmake --install build/cmake'
@@ -37,7 +37,8 @@ headers_stand_alone() {
   as_ann sh -c 'cd /usr/include/lumacast && for header in $(find . -name "*.h" | cut -c 3-); do
     echo "#include \"$header\"" | g++ -std=c++20 -Wall -Wextra -Werror -fsyntax-only -x c++ $(pkg-config --cflags lumacast) - || exit; done'
 }
-answer_yes() { DISPLAY=:7 "$click_button" default --wait 60 >"$root/tmp/click.log" 2>&1 & }
+answer_yes() { DISPLAY=:7 "$click_button" default --wait 60 >"$root/tmp/click.log" 2>&1 & clicker=$!; }
+was_asked() { wait "$clicker" || { cat "$root/tmp/click.log"; return 1; }; }  # and the answer was given
 has_colours() { # movies… : red, then green, then blue, in this order, each for a while
   for movie in "$@"; do
     ffmpeg -v error -i "$movie" -an -vf 'fps=10,scale=1:1' -pix_fmt rgb24 -f rawvideo - || return
@@ -53,7 +54,7 @@ sys.exit([name for name, length in runs] != ["r", "g", "b"] or min(length for na
 records() { # program, movie
   answer_yes
   as_ann "$1" "$2" || { cat "$root/tmp/click.log" "$root/tmp/daemon.log"; return 1; }
-  has_colours "$root$2"
+  was_asked && has_colours "$root$2"
 }
 records_again() { as_ann "$1" "$2" && has_colours "$root$2"; }
 broadcasts() { # extension, directory below its own
@@ -63,7 +64,7 @@ broadcasts() { # extension, directory below its own
 }
 keeps_clips() {
   answer_yes
-  broadcasts org.example.clip-keeper clips &&
+  broadcasts org.example.clip-keeper clips && was_asked &&
     has_colours $(ls -v "$root"/home/ann/.local/state/lumacast/extension-data/org.example.clip-keeper/clips/clip-*.mp4)
 }
 makes_a_stream() {
@@ -73,7 +74,7 @@ makes_a_stream() {
 records_the_display() {
   answer_yes
   as_ann lumacastctl record --display --duration 2 || { cat "$root/tmp/click.log"; tail -n 20 "$root/tmp/daemon.log"; return 1; }
-  [ "$(ls "$movies"/*.mp4 | wc -l)" -eq 1 ] && ffprobe -v error "$movies"/*.mp4
+  was_asked && [ "$(ls "$movies"/*.mp4 | wc -l)" -eq 1 ] && ffprobe -v error "$movies"/*.mp4
 }
 saves() { as_ann lumacastctl save /home/ann/again.mp4 && [ "$(ls "$movies"/*.mp4 | wc -l)" -eq 2 ]; }
 

@@ -127,6 +127,8 @@ TEST_F(DisplayEndings, AScreenThatIsLockedEndsItAndTheToolSaysWhy) {
     EXPECT_EQ(recorder->wait(), 6) << world_.daemonLog();
     EXPECT_THAT(complaints(), HasSubstr("the recording was ended by the daemon: "));
     EXPECT_THAT(complaints(), HasSubstr(movie)) << "where it is";
+    EXPECT_TRUE(waitUntil([&] { return world_.daemonLog().find("clientDidResignActive") != std::string::npos; }))
+        << "some time later the user is to be asked again";
     expectOneEvent(-5806);
     EXPECT_TRUE(fs::exists(movie));
 }

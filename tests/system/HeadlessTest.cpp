@@ -133,6 +133,7 @@ TEST_F(Headless, LinksNoDisplayAndNoSoundServer) {
 }
 
 TEST_F(Headless, ConsentByConfigurationIsNothingTheOtherDaemonKnowsOf) {
+    ASSERT_THAT(bytesOf(LC_DAEMON), HasSubstr("lumacastd Starting!")) << "so that it is what is looked through";
     for (const char* text : {"LUMACAST_HEADLESS_CONSENT", "allowed by configuration"}) {
         EXPECT_THAT(bytesOf(LC_HEADLESS_DAEMON), HasSubstr(text));
         EXPECT_EQ(bytesOf(LC_DAEMON).find(text), std::string::npos);

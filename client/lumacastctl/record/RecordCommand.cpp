@@ -233,6 +233,12 @@ int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& requ
                                                 : ""));
     }
 
+    // However it ends, the tool is in front no longer then, and some time later the user is asked again.
+    struct InFront {
+        client::Recorder& recorder;
+        ~InFront() { recorder.didResignActive(); }
+    };
+    const InFront inFront{recorder};
     const auto begun = Clock::now();
     auto nextLine = begun;
     bool isWished = false;
@@ -285,18 +291,13 @@ int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& requ
            Clock::now() - stopped < kStopPatience)
         stopWished(milliseconds(10));
     printView(known.viewURL);
-    if (request.broadcast && known.stop && !known.stop->error) {
-        recorder.didResignActive();
-        return kGood;
-    }
+    if (request.broadcast && known.stop && !known.stop->error) return kGood;
     if (!known.stop || !known.stop->movie) {
         const std::string reason = known.stop && known.stop->error ? client::textOf(*known.stop->error)
                                    : known.stopError               ? client::textOf(*known.stopError)
                                                                    : "the daemon does not answer.";
         return notRecorded(complaints, reason);
     }
-    // The tool is in front no longer: the next time the user may be asked again.
-    recorder.didResignActive();
     const std::string movie = known.stop->movie->path();
     if (request.output.empty()) return save(movie);
     if (const auto reason = moveMovie(movie, request.output)) {
