@@ -14,8 +14,7 @@ for path in sorted(pathlib.Path(sys.argv[1]).glob("*.json")):
                 print(f"FAILED   {name}")
             elif test.get("result") == "SKIPPED":
                 skipped += 1
-                reasons = " ".join(s.get("message", "").strip() for s in test.get("skipped", []))
-                print(f"skipped  {name}: {reasons or 'no reason given'}")
+                print(f"skipped  {name}: {test.get('why_skipped', 'no reason given')}")
             elif test.get("result") == "COMPLETED":
                 passed += 1
 for path in sorted(pathlib.Path(sys.argv[1]).glob("*.crashed")):

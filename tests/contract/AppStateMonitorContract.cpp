@@ -9,6 +9,7 @@
 #include "linux/display/X11AppStateMonitor.h"
 #include "support/ThreadScheduler.h"
 #include "tests/contract/PrivateDisplay.h"
+#include "tests/contract/Skip.h"
 #include "tests/contract/TestWindow.h"
 #include "tests/contract/XClientProcess.h"
 #include "tests/fakes/FakeAppStateMonitor.h"
@@ -232,7 +233,7 @@ TEST_P(AppStateMonitorContract, TellsThatAnApplicationIsInFrontAndWhichProcessIt
 }
 
 TEST_P(AppStateMonitorContract, TellsWhichApplicationIsInFront) {
-    if (!whyAllAreInFront().empty()) GTEST_SKIP() << whyAllAreInFront();
+    if (!whyAllAreInFront().empty()) LC_SKIP(whyAllAreInFront());
     world_->openTwoApplications();
     EXPECT_TRUE(becomes([&] { return isInFront(monitor_, kFirst); }));
     EXPECT_TRUE(becomes([&] { return isBehind(monitor_, kSecond); }));
@@ -242,7 +243,7 @@ TEST_P(AppStateMonitorContract, TellsWhichApplicationIsInFront) {
 }
 
 TEST_P(AppStateMonitorContract, NamesTheApplicationInFrontAndTheProcessesOfBoth) {
-    if (!whyAllAreInFront().empty()) GTEST_SKIP() << whyAllAreInFront();
+    if (!whyAllAreInFront().empty()) LC_SKIP(whyAllAreInFront());
     world_->openTwoApplications();
     EXPECT_TRUE(becomes([&] { return monitor_.frontmostApplication() == kFirst; }));
     EXPECT_EQ(monitor_.applicationProcess(kFirst), world_->process(kFirst));
@@ -253,7 +254,7 @@ TEST_P(AppStateMonitorContract, NamesTheApplicationInFrontAndTheProcessesOfBoth)
 }
 
 TEST_P(AppStateMonitorContract, TellsTheHandlerOnTheMainQueueWhenAnotherApplicationComesToFront) {
-    if (!whyAllAreInFront().empty()) GTEST_SKIP() << whyAllAreInFront();
+    if (!whyAllAreInFront().empty()) LC_SKIP(whyAllAreInFront());
     world_->openTwoApplications();
     const auto updates = listen();
     ASSERT_TRUE(becomes([&] { return isInFront(monitor_, kFirst); }));
@@ -266,7 +267,7 @@ TEST_P(AppStateMonitorContract, TellsTheHandlerOnTheMainQueueWhenAnotherApplicat
 }
 
 TEST_P(AppStateMonitorContract, TellsNobodyAfterAnEmptyHandler) {
-    if (!whyAllAreInFront().empty()) GTEST_SKIP() << whyAllAreInFront();
+    if (!whyAllAreInFront().empty()) LC_SKIP(whyAllAreInFront());
     world_->openTwoApplications();
     const auto updates = listen();
     ASSERT_TRUE(becomes([&] { return isInFront(monitor_, kFirst); }));
@@ -278,7 +279,7 @@ TEST_P(AppStateMonitorContract, TellsNobodyAfterAnEmptyHandler) {
 }
 
 TEST_P(AppStateMonitorContract, AnswersZeroInTimeWhenTheDesktopHangs) {
-    if (!whyAllAreInFront().empty()) GTEST_SKIP() << whyAllAreInFront();
+    if (!whyAllAreInFront().empty()) LC_SKIP(whyAllAreInFront());
     world_->openTwoApplications();
     ASSERT_TRUE(becomes([&] { return isInFront(monitor_, kFirst); }));
     world_->stopAnswering();

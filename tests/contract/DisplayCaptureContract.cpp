@@ -10,6 +10,7 @@
 #include "support/ThreadScheduler.h"
 #include "tests/contract/CapturedFrames.h"
 #include "tests/contract/PrivateDisplay.h"
+#include "tests/contract/Skip.h"
 #include "tests/contract/TestWindow.h"
 #include "tests/fakes/FakeDisplayCapture.h"
 #include "tests/fakes/ThreadLoop.h"
@@ -208,7 +209,7 @@ TEST_P(DisplayCaptureContract, DeliversChangesWithGrowingStampsOneAtATime) {
 }
 
 TEST_P(DisplayCaptureContract, RepeatsAStillPictureEachSecond) {
-    if (const std::string why = world_->whyNothingStandsStill(); !why.empty()) GTEST_SKIP() << why;
+    if (const std::string why = world_->whyNothingStandsStill(); !why.empty()) LC_SKIP(why);
     world_->clock().startCaptureClock();
     const Watched watched = started();
     ASSERT_TRUE(watched.frames->waitForCount(3));

@@ -7,6 +7,7 @@
 #include "headless/display/SyntheticWindows.h"
 #include "linux/display/X11RenderServer.h"
 #include "tests/contract/PrivateDisplay.h"
+#include "tests/contract/Skip.h"
 #include "tests/contract/TestWindow.h"
 #include "tests/contract/XClientProcess.h"
 #include "tests/fakes/FakeRenderServer.h"
@@ -139,7 +140,7 @@ TEST_P(RenderServerContract, APortAnswersNoneOnceItsProcessHasEnded) {
 }
 
 TEST_P(RenderServerContract, AnswersNothingInTimeWhenTheServerHangs) {
-    if (const std::string why = world_->whyItAlwaysAnswers(); !why.empty()) GTEST_SKIP() << why;
+    if (const std::string why = world_->whyItAlwaysAnswers(); !why.empty()) LC_SKIP(why);
     const ContextID window = world_->openApplication();
     ASSERT_TRUE(becomes([&] { return ownerOf(window).has_value(); }));
     world_->stopAnswering();

@@ -3,6 +3,7 @@
 #include "headless/user/SyntheticUserAlerts.h"
 #include "support/ThreadScheduler.h"
 #include "tests/contract/DialogWorld.h"
+#include "tests/contract/Skip.h"
 #include "tests/fakes/FakeUserAlerts.h"
 #include "tests/fakes/ThreadLoop.h"
 
@@ -207,7 +208,7 @@ TEST_P(UserAlertContract, TwoAlertsAreTwo) {
 }
 
 TEST_P(UserAlertContract, WithoutAScreenThereIsNoAlert) {
-    if (const std::string why = world_->whyTheScreenStays(); !why.empty()) GTEST_SKIP() << why;
+    if (const std::string why = world_->whyTheScreenStays(); !why.empty()) LC_SKIP(why);
     world_->loseTheScreen();
     EXPECT_EQ(world_->alerts().show(twoButtons()), nullptr);
 }

@@ -10,6 +10,7 @@
 #include <regex>
 #include <set>
 
+#include "tests/contract/Skip.h"
 #include "tests/reliability/Scenario.h"
 
 namespace lumacast::test {
@@ -97,7 +98,7 @@ class Count : public ::testing::TestWithParam<std::unique_ptr<Scenario> (*)()> {
 
 TEST_P(Count, OfTheNotesIsThatOfTheSystem) {
     if (std::system("strace -f --seccomp-bpf -o /dev/null true 2>/dev/null") != 0)
-        GTEST_SKIP() << "this machine lets no process be traced";
+        LC_SKIP("this machine lets no process be traced");
     const auto scenario = GetParam()();
     auto& world = scenario->world();
     const std::string trace = world.path("trace.txt");

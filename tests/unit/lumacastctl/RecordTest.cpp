@@ -10,6 +10,7 @@
 #include "client/lumacastctl/ExitStatus.h"
 #include "client/lumacastctl/record/RecordCommand.h"
 #include "tests/contract/ScratchDirectory.h"
+#include "tests/contract/Skip.h"
 #include "tests/unit/lumacastctl/ToolFixture.h"
 
 namespace lumacast::ctl {
@@ -80,7 +81,7 @@ TEST_F(MoveMovie, OnAnotherFileSystemItIsCopiedAndTheFirstOneGoes) {
 
 // Without its name a copy is gone after a power cut, and the first one may be gone by then, too. The system tells the order.
 TEST_F(MoveMovie, ACopyHasItsNameOnTheDiskBeforeTheFirstOneGoes) {
-    if (std::system("strace -f -o /dev/null true 2>/dev/null") != 0) GTEST_SKIP() << "this machine lets no process be traced";
+    if (std::system("strace -f -o /dev/null true 2>/dev/null") != 0) LC_SKIP("this machine lets no process be traced");
     const std::string trace = scratch_.path("trace.txt"), self = fs::read_symlink("/proc/self/exe").string();
     const std::string command = "ASAN_OPTIONS=detect_leaks=0 strace -f -y -o '" + trace + "' -e trace=fsync,unlink,unlinkat '" + self +
                                 "' --gtest_filter=MoveMovie.OnAnotherFileSystemItIsCopiedAndTheFirstOneGoes > '" +
