@@ -18,7 +18,10 @@ class ClipKeeper final : public extension::Handler {
         if (!path) return clip.answer.fail(Error("org.example.clip-keeper", 1));
         const std::string name = *path + "/clip-" + std::to_string(clip.number) + ".mp4";
         const Fd copy(::open(name.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600));
-        while (::sendfile(copy.get(), clip.movie.get(), nullptr, 1 << 20) > 0) {}
+        ssize_t sent = 0;
+        do sent = ::sendfile(copy.get(), clip.movie.get(), nullptr, 1 << 20);
+        while (sent > 0);
+        if (sent < 0) return clip.answer.fail(Error("org.example.clip-keeper", 2));
         if (clip.number > 1) return;
         // Shorter clips from now on, and a word to the application.
         extension::BroadcastConfiguration configuration;
