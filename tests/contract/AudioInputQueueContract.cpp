@@ -66,7 +66,7 @@ public:
     ~Recorded() {
         if (queue) queue->dispose();
         // One that is in progress uses this, and what the test has on its stack.
-        EXPECT_TRUE(test::eventually([this] { return isCallbackLetGo(); }));
+        EXPECT_TRUE(eventually([this] { return isCallbackLetGo(); }));
     }
     Recorded(const Recorded&) = delete;
     Recorded& operator=(const Recorded&) = delete;

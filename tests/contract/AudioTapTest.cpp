@@ -19,7 +19,6 @@
 namespace lumacast {
 namespace {
 
-using test::eventually;
 using test::HeardSound;
 using test::TonePlayer;
 

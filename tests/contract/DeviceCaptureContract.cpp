@@ -11,7 +11,6 @@
 namespace lumacast {
 namespace {
 
-using testing::eventually;
 using testing::Interruptions;
 using testing::ListenedSession;
 using testing::SampleListener;

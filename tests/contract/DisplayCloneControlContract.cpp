@@ -11,6 +11,7 @@
 #include "linux/system/LinuxClock.h"
 #include "support/ThreadScheduler.h"
 #include "tests/contract/CapturedFrames.h"
+#include "tests/contract/Colours.h"
 #include "tests/contract/PrivateDisplay.h"
 #include "tests/contract/TestScreen.h"
 #include "tests/contract/TestWindow.h"
@@ -20,7 +21,8 @@
 namespace lumacast {
 namespace {
 
-constexpr std::uint32_t kRed = 0xC01020, kGreen = 0x10B030;
+using test::kGreen;
+using test::kRed;
 
 class CloneWorld {
 public:

@@ -13,21 +13,11 @@
 #include <utility>
 #include <vector>
 
+#include "tests/contract/Eventually.h"
 #include "tests/contract/ExtensionsWorld.h"
 #include "tests/contract/IpcWorld.h"
 
 namespace lumacast {
-
-/// Polls a condition, for at most twenty seconds.
-template <class Condition>
-[[nodiscard]] bool eventually(Condition condition) {
-    const auto limit = std::chrono::steady_clock::now() + std::chrono::seconds(20);
-    while (!condition()) {
-        if (std::chrono::steady_clock::now() > limit) return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(2));
-    }
-    return true;
-}
 
 /// Processes that were started with a path of this test's.
 inline std::size_t processesWith(const std::string& path) {

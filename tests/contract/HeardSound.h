@@ -12,6 +12,7 @@
 
 #include "platform/AudioInputQueue.h"
 #include "tests/checkers/ToneChecker.h"
+#include "tests/contract/Eventually.h"
 
 namespace lumacast::test {
 
@@ -25,16 +26,6 @@ inline AudioFormat recorderFormat() {
     format.framesPerPacket = format.channelsPerFrame = 1;
     format.bitsPerChannel = 16;
     return format;
-}
-
-template <class Condition>
-bool eventually(const Condition& condition, std::chrono::milliseconds limit = std::chrono::seconds(20)) {
-    const auto end = std::chrono::steady_clock::now() + limit;
-    while (!condition()) {
-        if (std::chrono::steady_clock::now() > end) return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
-    return true;
 }
 
 /// A queue for one process in the recorder's format, with the recorder's ten buffers, each of which goes back at once;

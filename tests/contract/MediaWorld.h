@@ -17,6 +17,7 @@
 #include "platform/Clock.h"
 #include "platform/ContainerWriter.h"
 #include "writer/media/SampleBuffer.h"
+#include "tests/contract/Eventually.h"
 
 namespace lumacast::testing {
 
@@ -126,17 +127,6 @@ private:
     int count_ = 0;
     std::thread::id thread_;
 };
-
-/// Polls until `condition` holds; whether it did before the bound.
-template <class Condition>
-bool eventually(Condition condition) {
-    const auto bound = std::chrono::steady_clock::now() + Happening::kBound;
-    while (!condition()) {
-        if (std::chrono::steady_clock::now() > bound) return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(1));
-    }
-    return true;
-}
 
 inline MediaTime atNanoseconds(std::int64_t value) { return MediaTime::make(value, CaptureClock::kTimescale); }
 inline MediaTime atSeconds(double seconds) { return MediaTime::fromSeconds(seconds, CaptureClock::kTimescale); }

@@ -10,7 +10,6 @@
 namespace lumacast {
 namespace {
 
-using testing::eventually;
 using testing::Interruptions;
 using testing::ListenedSession;
 using testing::SoundServerWorld;

@@ -133,7 +133,7 @@ TEST(LinuxNetworkReachability, NothingIsSentToTheHost) {
         target.sin_port = htons(9);
         std::memcpy(&target.sin_addr, host.bytes.data(), 4);
         ASSERT_EQ(::sendto(socket.get(), "x", 1, 0, reinterpret_cast<const sockaddr*>(&target), sizeof target), 1);
-        EXPECT_TRUE(test::eventually([&] { return ear.heardOf(host) > 0; }));
+        EXPECT_TRUE(eventually([&] { return ear.heardOf(host) > 0; }));
     }));
 }
 
@@ -164,12 +164,12 @@ TEST(LinuxNetworkReachability, ADeviceThatWaitsForItsConnectionNeedsOne) {
     ASSERT_TRUE(withOwnNetwork([] {
         ASSERT_TRUE(makeDevice() && ip("route add default via 10.77.0.2") && makeDormant());
         // The kernel takes its time over it, and would take back what was said meanwhile.
-        ASSERT_TRUE(test::eventually([] { return ip("link show near | grep -q 'state DORMANT'"); }));
+        ASSERT_TRUE(eventually([] { return ip("link show near | grep -q 'state DORMANT'"); }));
         EXPECT_EQ(flagsTo({hostAddress()}), kLater);
         // A name can be resolved only over that connection.
         EXPECT_EQ(flagsTo({}), kLater);
         ASSERT_TRUE(ip("link set near state up"));
-        EXPECT_TRUE(test::eventually([] { return flagsTo({hostAddress()}) == kReachable; }));
+        EXPECT_TRUE(eventually([] { return flagsTo({hostAddress()}) == kReachable; }));
         EXPECT_EQ(flagsTo({}), 0u);
         ASSERT_TRUE(ip("link set near down"));
         EXPECT_EQ(flagsTo({hostAddress()}), 0u);

@@ -73,7 +73,7 @@ public:
         how_ = how;
         running_ = running;
         // Told by its own thread.
-        eventually([&] { return told_ == running || ending_; });
+        static_cast<void>(eventually([&] { return told_ == running || ending_; }));
     }
     /// Answers are kept back, each with what was true when it was asked for; false sends them.
     void holdAnswers(bool holding) { holding_ = holding; }

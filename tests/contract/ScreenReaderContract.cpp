@@ -11,7 +11,6 @@ namespace lumacast {
 namespace {
 
 using test::AccessibilityService;
-using test::eventually;
 using test::PrivateBus;
 
 class ScreenReaderWorld {

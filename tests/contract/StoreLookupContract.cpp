@@ -161,7 +161,7 @@ TEST_P(StoreLookupContract, TheHandlerIsCalledOnceAndNeverInline) {
             ++*calls;
             if (std::this_thread::get_id() == caller) ++*inlineCalls;
         });
-    EXPECT_TRUE(test::eventually([&] { return *calls == 3; }));
+    EXPECT_TRUE(eventually([&] { return *calls == 3; }));
     find({"com.example.Clock"});
     EXPECT_EQ(*calls, 3);
     EXPECT_EQ(*inlineCalls, 0);
@@ -313,7 +313,7 @@ TEST_F(LinuxStoreLookupTest, ItsEndEndsTheLookupAndCallsEveryHandler) {
             });
     }
     EXPECT_LT(std::chrono::steady_clock::now() - before, std::chrono::seconds(5));
-    EXPECT_TRUE(test::eventually([&] { return *calls == 40; }));
+    EXPECT_TRUE(eventually([&] { return *calls == 40; }));
 }
 
 TEST_F(LinuxStoreLookupTest, NoMoreThanThirtyTwoWait) {
@@ -325,7 +325,7 @@ TEST_F(LinuxStoreLookupTest, NoMoreThanThirtyTwoWait) {
     const auto calls = std::make_shared<std::atomic<int>>(0);
     for (int i = 0; i < 40; ++i) store.start(requestFor({"a"}), [calls](const Products&) { ++*calls; });
     std::ofstream(go) << "go\n";
-    EXPECT_TRUE(test::eventually([&] { return *calls == 40; }));
+    EXPECT_TRUE(eventually([&] { return *calls == 40; }));
     const std::string all = ScratchDirectory::read(runs);
     EXPECT_EQ(std::count(all.begin(), all.end(), '\n'), 32);
 }

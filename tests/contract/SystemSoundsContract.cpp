@@ -18,7 +18,6 @@
 namespace lumacast {
 namespace {
 
-using test::eventually;
 using test::MonitorSound;
 using test::PrivateSoundServer;
 

@@ -11,6 +11,7 @@
 
 #include "linux/display/CaptureStatus.h"
 #include "base/Limits.h"
+#include "tests/contract/Colours.h"
 #include "tests/contract/TestScreen.h"
 #include "tests/contract/X11CaptureFixture.h"
 
@@ -20,7 +21,7 @@ namespace {
 using Frames = CapturedFrames::Frames;
 using Look = TestWindow::Look;
 
-constexpr std::uint32_t kRed = 0xC01020, kGreen = 0x10B030, kBlue = 0x2030D0, kWhite = 0xF0E0F0, kBlack = 0;
+constexpr std::uint32_t kWhite = 0xF0E0F0, kBlack = 0;
 
 struct Dot {
     int x, y;

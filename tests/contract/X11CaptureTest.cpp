@@ -16,6 +16,7 @@
 #include "linux/system/LinuxClock.h"
 #include "support/ThreadScheduler.h"
 #include "tests/contract/CapturedFrames.h"
+#include "tests/contract/Colours.h"
 #include "tests/contract/PrivateDisplay.h"
 #include "tests/contract/TestWindow.h"
 #include "tests/contract/X11CaptureFixture.h"
@@ -26,8 +27,6 @@ namespace {
 
 using Frames = CapturedFrames::Frames;
 using Look = TestWindow::Look;
-
-constexpr std::uint32_t kRed = 0xC01020, kGreen = 0x10B030, kBlue = 0x2030D0;
 
 class TemporaryFile final {
 public:

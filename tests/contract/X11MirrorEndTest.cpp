@@ -3,13 +3,12 @@
 #include <gtest/gtest.h>
 
 #include "linux/display/CaptureStatus.h"
+#include "tests/contract/Colours.h"
 #include "tests/contract/MirrorWorld.h"
 #include "tests/contract/PoweredDisplay.h"
 
 namespace lumacast::test {
 namespace {
-
-constexpr std::uint32_t kGreen = 0x10B030;
 
 TEST_F(LandscapeMirror, IsPreemptedOnceWhenTheScreenIsBlankedAndGoesOnAfterIt) {
     const auto made = start(400, 300);

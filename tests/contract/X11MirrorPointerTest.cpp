@@ -4,6 +4,7 @@
 
 #include <utility>
 
+#include "tests/contract/Colours.h"
 #include "tests/contract/MirrorWorld.h"
 
 namespace lumacast::test {
@@ -11,8 +12,6 @@ namespace {
 
 using Frames = CapturedFrames::Frames;
 using PointerLook = TestScreen::PointerLook;
-
-constexpr std::uint32_t kRed = 0xC01020;
 
 TEST_F(LandscapeMirror, DrawsThePointerWithWhatShinesThrough) {
     const auto made = start(400, 300);

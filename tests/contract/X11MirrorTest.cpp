@@ -6,6 +6,7 @@
 #include <random>
 #include <utility>
 
+#include "tests/contract/Colours.h"
 #include "tests/contract/MirrorWorld.h"
 
 namespace lumacast::test {
@@ -14,8 +15,6 @@ namespace {
 using namespace std::chrono_literals;
 using Frames = CapturedFrames::Frames;
 using PointerLook = TestScreen::PointerLook;
-
-constexpr std::uint32_t kRed = 0xC01020, kGreen = 0x10B030, kBlue = 0x2030D0;
 
 TEST_F(LandscapeMirror, IsTurnedIntoAPortraitFrameWhateverTheCaptureSize) {
     TestWindow corner(display.name(), {.place = {0, 0, 40, 20}, .colour = kGreen});

@@ -7,6 +7,8 @@
 #include <random>
 #include <thread>
 
+#include "tests/contract/Colours.h"
+#include "tests/contract/Eventually.h"
 #include "tests/contract/TestWindow.h"
 #include "tests/contract/X11CaptureFixture.h"
 
@@ -14,18 +16,6 @@ namespace lumacast::test {
 namespace {
 
 using Frames = CapturedFrames::Frames;
-
-constexpr std::uint32_t kRed = 0xC01020, kGreen = 0x10B030, kBlue = 0x2030D0;
-
-template <class Condition>
-bool eventually(const Condition& condition) {
-    const auto end = std::chrono::steady_clock::now() + kGenerous;
-    while (!condition()) {
-        if (std::chrono::steady_clock::now() > end) return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
-    return true;
-}
 
 /// Whether the server keeps a picture of the window in memory.
 bool isRedirected(const TestWindow& window) {

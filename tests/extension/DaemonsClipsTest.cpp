@@ -76,7 +76,7 @@ private:
         now_ = wanted;
     }
     static void append(TrackInput& input, const SampleRef& sample) {
-        EXPECT_TRUE(testing::eventually([&] { return input.isReadyForMoreMediaData(); }));
+        EXPECT_TRUE(eventually([&] { return input.isReadyForMoreMediaData(); }));
         EXPECT_TRUE(input.append(sample));
     }
     SampleRef picture(double seconds) {

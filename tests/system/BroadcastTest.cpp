@@ -20,7 +20,6 @@ namespace fs = std::filesystem;
 using ::testing::HasSubstr;
 using ::testing::StartsWith;
 
-constexpr char kKeeper[] = "org.lumacast.ClipKeeper";
 
 std::vector<std::string> moviesIn(const fs::path& folder) {
     std::vector<std::string> movies;
@@ -32,12 +31,12 @@ std::vector<std::string> moviesIn(const fs::path& folder) {
 
 TEST(Broadcast, ClipsReachTheirExtensionWithEveryFrameInOrderAndLeaveNothingBehind) {
     World world;
-    const std::string folder = world.installExtension(kKeeper, LC_MINIMAL_EXTENSION, false);
+    const std::string folder = world.installExtension(World::kKeeper, LC_MINIMAL_EXTENSION, false);
     world.startDaemon();
     const auto app = world.application({"--size", "640x360", "--fps", "30", "--beep-every", "15"});
     ASSERT_TRUE(app->waitForFrame(1));  // until then the window is black
     const std::string answer =
-        app->ask("broadcast org.lumacast.SelfRecorder " + std::string(kKeeper) + " directory=" + folder);
+        app->ask("broadcast org.lumacast.SelfRecorder " + std::string(World::kKeeper) + " directory=" + folder);
     ASSERT_THAT(answer, StartsWith("started frame")) << world.daemonLog();
     ASSERT_TRUE(waitUntil([&] { return moviesIn(folder).size() >= 2; })) << world.daemonLog();
     ASSERT_TRUE(app->waitForFrame(app->askForFrame("frame") + 10));

@@ -25,7 +25,6 @@ namespace fs = std::filesystem;
 using ::testing::StartsWith;
 
 constexpr double kFrame = 1 / 30.0;
-constexpr char kKeeper[] = "org.lumacast.ClipKeeper";
 /// Where it is sought, as parts of the movie, in no order.
 constexpr double kSought[]{0.7, 0.1, 0.95, 0.4, 0.0};
 
@@ -172,7 +171,7 @@ class Browser : public ::testing::Test {
 protected:
     Browser() {
         world_.addVariable("PULSE_SERVER=" + sound_.address());
-        keeperFolder_ = world_.installExtension(kKeeper, LC_MINIMAL_EXTENSION, false);
+        keeperFolder_ = world_.installExtension(World::kKeeper, LC_MINIMAL_EXTENSION, false);
         world_.startDaemon();
         app_ = world_.application({"--size", "640x360", "--fps", "30", "--tone", "700"});
         EXPECT_TRUE(app_->waitForFrame(30));  // its tone is on its way too
@@ -207,7 +206,7 @@ protected:
 
     std::vector<std::string> recordClips() {
         const std::string started =
-            app_->ask("broadcast org.lumacast.SelfRecorder " + std::string(kKeeper) + " directory=" + keeperFolder_);
+            app_->ask("broadcast org.lumacast.SelfRecorder " + std::string(World::kKeeper) + " directory=" + keeperFolder_);
         EXPECT_THAT(started, StartsWith("started")) << world_.daemonLog();
         std::vector<std::string> clips{keeperFolder_ + "/clip-1.mp4", keeperFolder_ + "/clip-2.mp4"};
         // The third is there when the second is whole.

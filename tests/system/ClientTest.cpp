@@ -13,6 +13,7 @@
 #include "tests/client/Heard.h"
 #include "tests/contract/TestWindow.h"
 #include "tests/dialog/DialogUser.h"
+#include "tests/system/MovingWindow.h"
 #include "tests/system/World.h"
 
 namespace lumacast::test {
@@ -24,8 +25,6 @@ using client::StateAnswer;
 using client::StopAnswer;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
-
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "30"};
 
 /// This process as an application with a window, and its recorder.
 class Client : public ::testing::Test {

@@ -5,12 +5,11 @@
 #include <algorithm>
 #include <filesystem>
 
+#include "tests/system/MovingWindow.h"
 #include "tests/system/World.h"
 
 namespace lumacast::test {
 namespace {
-
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "30"};
 
 /// What a client hears of a recording that another start has ended; its movie is not handed out.
 constexpr char kTakenOver[] = "event stopped -5806";

@@ -14,11 +14,11 @@ namespace {
 namespace fs = std::filesystem;
 
 #ifdef LC_SANITIZED
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "6"};
+const std::vector<std::string> kShown{"--size", "320x180", "--fps", "6"};
 constexpr int kApplications = 40, kAtATime = 10;
 constexpr std::size_t kFramesMeanwhile = 3;
 #else
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "20"};
+const std::vector<std::string> kShown{"--size", "320x180", "--fps", "20"};
 constexpr int kApplications = 200, kAtATime = 50;
 constexpr std::size_t kFramesMeanwhile = 15;
 #endif
@@ -42,7 +42,7 @@ TEST(Crowd, OfApplicationsThatComeAskAndLeaveCostsARecordingNoFrameAndLeavesNoth
     World world;
     const auto programs = installVisitors(world);
     world.startDaemon();
-    const auto application = world.application(kMoving);
+    const auto application = world.application(kShown);
     ASSERT_TRUE(application->waitForFrame(3));
     const std::uint32_t first = application->askForFrame("start");
     ASSERT_TRUE(world.waitForElapsed(1));
@@ -82,13 +82,13 @@ TEST(Crowd, OfApplicationsThatComeAskAndLeaveCostsARecordingNoFrameAndLeavesNoth
 TEST(Crowd, ANewConnectionOfAnApplicationReplacesTheOldOneAndItsRecordingGoesOn) {
     World world;
     world.startDaemon();
-    const auto application = world.application(kMoving);
+    const auto application = world.application(kShown);
     ASSERT_TRUE(application->waitForFrame(3));
     (void)application->askForFrame("start");
     ASSERT_TRUE(world.waitForElapsed(0.5));
     const std::size_t descriptors = world.daemonDescriptors();
     // The same program again: the same application, from another process.
-    const auto newer = world.application(kMoving);
+    const auto newer = world.application(kShown);
     ASSERT_TRUE(newer->waitForFrame(1));
     const std::string state = newer->ask("state");
     EXPECT_NE(state.find("\"isRecording\" = 1"), std::string::npos) << state;

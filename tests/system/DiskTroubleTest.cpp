@@ -9,6 +9,7 @@
 #include <map>
 #include <sstream>
 
+#include "tests/system/MovingWindow.h"
 #include "tests/system/RawClient.h"
 #include "tests/system/World.h"
 
@@ -17,10 +18,7 @@ namespace {
 
 using std::chrono::milliseconds;
 
-#ifdef LC_SANITIZED
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "6"};
-#else
-const std::vector<std::string> kMoving{"--size", "640x360", "--fps", "30"};
+#ifndef LC_SANITIZED
 /// How long a request of another client may take, whatever the disk does.
 constexpr milliseconds kAnswerWithin{50};
 #endif
@@ -51,7 +49,7 @@ TEST(DiskTrouble, AStallOfTenSecondsHoldsNobodyUpAndTheRecordingGoesOn) {
     World world;
     installThisProcess(world);
     world.startDaemon(world.troubledDisk());
-    const auto application = world.application(kMoving);
+    const auto application = world.application(kJudged);
     ASSERT_TRUE(application->waitForFrame(3));
     const std::uint32_t first = application->askForFrame("start");
     ASSERT_TRUE(world.waitForElapsed(1));
@@ -108,7 +106,7 @@ TEST(DiskTrouble, AStallOfTenSecondsHoldsNobodyUpAndTheRecordingGoesOn) {
 TEST(DiskTrouble, AQuotaThatIsUsedUpLeavesAMovieThatPlaysAndTheNextOneWorks) {
     World world;
     world.startDaemon(world.troubledDisk());
-    const auto application = world.application(kMoving);
+    const auto application = world.application(kJudged);
     ASSERT_TRUE(application->waitForFrame(3));
     (void)application->askForFrame("start");
     ASSERT_TRUE(world.waitForElapsed(1));
@@ -155,7 +153,7 @@ TEST(DiskTrouble, AQuotaThatIsUsedUpLeavesAMovieThatPlaysAndTheNextOneWorks) {
 TEST(DiskTrouble, AFullDiskStopsTheRecordingAndTheNextOneWorksOnceThereIsRoom) {
     World world;
     world.startDaemon(world.troubledDisk());
-    const auto application = world.application(kMoving);
+    const auto application = world.application(kJudged);
     ASSERT_TRUE(application->waitForFrame(3));
     (void)application->askForFrame("start");
     ASSERT_TRUE(world.waitForElapsed(0.5));

@@ -12,13 +12,13 @@
 #include <sstream>
 
 #include "base/Limits.h"
+#include "tests/system/MovingWindow.h"
 #include "tests/system/RawClient.h"
 #include "tests/system/World.h"
 
 namespace lumacast::test {
 namespace {
 
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "30"};
 constexpr char kDropped[] = "IPC: connection of process ";
 
 std::vector<std::string> linesWith(const std::string& text, const std::string& part) {

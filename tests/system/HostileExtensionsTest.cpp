@@ -22,9 +22,9 @@ using ::testing::StartsWith;
 
 constexpr char kSamples[] = "org.lumacast.HostileSamples", kClips[] = "org.lumacast.HostileClips",
                kGood[] = "org.lumacast.SampleTaker";
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "30", "--beep-every", "15"};
+const std::vector<std::string> kBeeping{"--size", "320x180", "--fps", "30", "--beep-every", "15"};
 
-std::size_t linesWith(const std::string& file, const std::string& part) {
+std::size_t countOfLines(const std::string& file, const std::string& part) {
     std::ifstream text(file);
     std::size_t count = 0;
     for (std::string line; std::getline(text, line);)
@@ -39,7 +39,7 @@ protected:
           clips_(world_.installExtension(kClips, LC_EXTENSION_HOSTILE, false)),
           good_(world_.installExtension(kGood, LC_SAMPLE_TAKER, true)) {
         world_.startDaemon();
-        app_ = world_.application(kMoving);
+        app_ = world_.application(kBeeping);
         EXPECT_TRUE(app_->waitForFrame(1));
     }
     void choose(const std::string& home, const std::string& turn) {
@@ -63,7 +63,7 @@ protected:
     /// A broadcast through a good extension gets its frames, and then nothing is left of these extensions.
     void expectTheNextOneWorks(const std::string& after,
                                const std::vector<const char*>& gone = {kSamples, kClips, kGood}) {
-        const auto frames = [&] { return linesWith(good_ + "/samples.log", "frame "); };
+        const auto frames = [&] { return countOfLines(good_ + "/samples.log", "frame "); };
         const std::size_t before = frames();
         ASSERT_THAT(begin(kGood), StartsWith("started")) << "after " << after;
         EXPECT_TRUE(waitUntil([&] { return frames() >= before + 10; })) << "after " << after;
@@ -144,11 +144,11 @@ TEST_F(HostileExtensions, WhatDoesNoHarmIsPassedOver) {
     for (const char* turn : {"keeps-endpoint", "completes-others", "floods-info", "floods-pings", "writes", "forks"}) {
         choose(samples_, turn);
         ASSERT_THAT(begin(kSamples), StartsWith("started")) << turn;
-        ASSERT_TRUE(waitUntil([&] { return linesWith(samples_ + "/report", "frame") > 20; }))
+        ASSERT_TRUE(waitUntil([&] { return countOfLines(samples_ + "/report", "frame") > 20; }))
             << turn << report(samples_);
-        EXPECT_EQ(linesWith(samples_ + "/report", "GOT AWAY"), 0u) << report(samples_);
+        EXPECT_EQ(countOfLines(samples_ + "/report", "GOT AWAY"), 0u) << report(samples_);
         if (turn == std::string("writes")) {
-            EXPECT_GT(linesWith(samples_ + "/report", "tried to write"), 20u);
+            EXPECT_GT(countOfLines(samples_ + "/report", "tried to write"), 20u);
         }
         EXPECT_THAT(app_->ask("stop"), HasSubstr("without movie")) << turn;
         expectTheNextOneWorks(turn);
@@ -164,8 +164,8 @@ TEST_F(HostileExtensions, WhoKeepsItsFramesGetsNoMoreThanThreeAndGoesOnWithSound
     ASSERT_THAT(begin(kSamples), StartsWith("started"));
     // Three seconds of pictures were drawn and of sound handed over meanwhile.
     EXPECT_TRUE(app_->waitForFrame(first + 90));
-    EXPECT_TRUE(waitUntil([&] { return linesWith(samples_ + "/report", "payload") > 40; })) << report(samples_);
-    EXPECT_EQ(linesWith(samples_ + "/report", "frame"), 3u);
+    EXPECT_TRUE(waitUntil([&] { return countOfLines(samples_ + "/report", "payload") > 40; })) << report(samples_);
+    EXPECT_EQ(countOfLines(samples_ + "/report", "frame"), 3u);
     EXPECT_THAT(app_->ask("stop"), HasSubstr("without movie"));
     expectTheNextOneWorks("keeps-frames");
     expectNoMoreThan(before);
@@ -181,7 +181,7 @@ TEST_F(HostileExtensions, WhoNeverPingsHoldsUpItsOwnStartAlone) {
         ASSERT_TRUE(waitUntil([&] {
             return report(samples_).find(turn == std::string("no-ping") ? "connected" : "here") != std::string::npos;
         })) << turn;
-        auto other = world_.otherApplication("Other" + std::to_string(++number), kMoving);
+        auto other = world_.otherApplication("Other" + std::to_string(++number), kBeeping);
         const double loss = lossOf(*other);
         std::printf("    %s: another one's recording lost %.1f %% meanwhile\n", turn, loss);
         EXPECT_LT(loss, 15) << turn;
@@ -208,7 +208,7 @@ TEST_F(HostileExtensions, WhoNeverPingsHoldsUpItsOwnStartAlone) {
 TEST_F(HostileExtensions, WhatIsWrongWithAClipsAnswerIsPassedOverAndOthersLoseNothing) {
     expectTheNextOneWorks("nothing");
     const auto before = possessions();
-    auto other = world_.otherApplication("Other", kMoving);
+    auto other = world_.otherApplication("Other", kBeeping);
     std::printf("    another one's recording lost %.1f %% before\n", lossOf(*other));
     other.reset();
     int number = 0;
@@ -218,9 +218,9 @@ TEST_F(HostileExtensions, WhatIsWrongWithAClipsAnswerIsPassedOverAndOthersLoseNo
         EXPECT_THAT(begin(kClips), StartsWith("started")) << turn;
         EXPECT_TRUE(app_->waitForFrame(app_->askForFrame("frame") + 15));
         EXPECT_THAT(app_->ask("stop"), HasSubstr("without movie")) << turn;
-        EXPECT_TRUE(waitUntil([&] { return linesWith(clips_ + "/report", "clip") > 0; })) << turn << world_.daemonLog();
+        EXPECT_TRUE(waitUntil([&] { return countOfLines(clips_ + "/report", "clip") > 0; })) << turn << world_.daemonLog();
         if (turn == std::string("floods") || turn == std::string("never-completes")) {
-            other = world_.otherApplication("Other" + std::to_string(++number), kMoving);
+            other = world_.otherApplication("Other" + std::to_string(++number), kBeeping);
             const double loss = lossOf(*other);
             std::printf("    %s: another one's recording lost %.1f %%\n", turn, loss);
             EXPECT_LT(loss, 25) << turn;

@@ -6,6 +6,7 @@
 #include <filesystem>
 #include <fstream>
 
+#include "tests/system/MovingWindow.h"
 #include "tests/system/World.h"
 
 namespace lumacast::test {
@@ -14,8 +15,6 @@ namespace {
 namespace fs = std::filesystem;
 using ::testing::HasSubstr;
 using ::testing::StartsWith;
-
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "30"};
 
 fs::path temporaryDirectory(const World& world) { return fs::path(world.moviePath()).parent_path(); }
 

@@ -25,11 +25,11 @@ constexpr double kTone = 440, kNoTone = 3100;
 
 // A sanitizer's daemon is many times slower.
 #ifdef LC_SANITIZED
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "10", "--tone", "440"};
+const std::vector<std::string> kPushed{"--size", "320x180", "--fps", "10", "--tone", "440"};
 constexpr std::uint32_t kFrames = 60;
 constexpr double kMostMissing = 0.7;
 #else
-const std::vector<std::string> kMoving{"--size", "1280x720", "--fps", "30", "--tone", "440"};
+const std::vector<std::string> kPushed{"--size", "1280x720", "--fps", "30", "--tone", "440"};
 constexpr std::uint32_t kFrames = 180;
 constexpr double kMostMissing = 0.4;
 #endif
@@ -98,7 +98,7 @@ public:
     PushedBroadcast() {
         world.addVariable("PULSE_SERVER=" + sounds_.address());
         world.startDaemon();
-        app_ = world.application(kMoving);
+        app_ = world.application(kPushed);
     }
 
     void run(const std::string& url) {

@@ -6,6 +6,7 @@
 #include <filesystem>
 
 #include "tests/checkers/check_movie/MovieCheck.h"
+#include "tests/system/MovingWindow.h"
 #include "tests/system/World.h"
 
 namespace lumacast::test {
@@ -17,12 +18,10 @@ using std::chrono::milliseconds;
 
 // A sanitizer's daemon is many times slower: a small, slow picture there, and the content is judged, not the rate.
 #ifdef LC_SANITIZED
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "6"};
 constexpr std::uint32_t kStretch = 12;
 constexpr milliseconds kLargestHole{1500};
 constexpr milliseconds kEndsApart{2000};
 #else
-const std::vector<std::string> kMoving{"--size", "640x360", "--fps", "30"};
 constexpr std::uint32_t kStretch = 60;
 constexpr milliseconds kLargestHole{67};  // two frame times
 constexpr milliseconds kEndsApart{250};   // sound against picture
@@ -61,7 +60,7 @@ checkers::FrameReport judge(const std::string& movie, const FrameExpectation& ex
 TEST(Recording, ShowsEveryFrameThatWasDrawnInOrderAndOnTime) {
     World world;
     world.startDaemon();
-    const auto application = world.application(kMoving);
+    const auto application = world.application(kJudged);
     ASSERT_TRUE(application->waitForFrame(3));
     const std::uint32_t first = application->askForFrame("start");
     ASSERT_TRUE(application->waitForFrame(first + kStretch));
@@ -99,7 +98,7 @@ TEST(Recording, ShowsEveryFrameThatWasDrawnInOrderAndOnTime) {
 TEST(Recording, HasNoFrameOfAPauseAndNoHoleWhereItWas) {
     World world;
     world.startDaemon();
-    const auto application = world.application(kMoving);
+    const auto application = world.application(kJudged);
     ASSERT_TRUE(application->waitForFrame(3));
     FrameExpectation expectation;
     std::uint32_t from = application->askForFrame("start");
@@ -128,7 +127,7 @@ TEST(Recording, StillGoesOnAfterVeryManyPauses) {
     World world;
     world.startDaemon();
 #ifdef LC_SANITIZED
-    const auto application = world.application(kMoving);
+    const auto application = world.application(kJudged);
 #else
     const auto application = world.application({"--size", "320x180", "--fps", "60"});
 #endif
@@ -150,7 +149,7 @@ TEST(Recording, StillGoesOnAfterVeryManyPauses) {
 TEST(Recording, TrimmedToAClipBeginsOnThePictureOfThatMoment) {
     World world;
     world.startDaemon();
-    const auto application = world.application(kMoving);
+    const auto application = world.application(kJudged);
     ASSERT_TRUE(application->waitForFrame(3));
     const std::uint32_t first = application->askForFrame("start");
     ASSERT_TRUE(world.waitForElapsed(4.2));
@@ -189,7 +188,7 @@ TEST(Recording, OfAStillWindowIsAsLongAsItLasted) {
 TEST(Recording, GoesOnWhileItsWindowIsHiddenMovedAndResized) {
     World world;
     world.startDaemon();
-    const auto application = world.application(kMoving);
+    const auto application = world.application(kJudged);
     ASSERT_TRUE(application->waitForFrame(3));
     const std::uint32_t first = application->askForFrame("start");
     ASSERT_TRUE(application->waitForFrame(first + 5));
@@ -212,7 +211,7 @@ TEST(Recording, GoesOnWhileItsWindowIsHiddenMovedAndResized) {
 TEST(Recording, EndsWithAnErrorWhenItsWindowIsGone) {
     World world;
     world.startDaemon();
-    const auto recorded = world.application(kMoving);
+    const auto recorded = world.application(kJudged);
     ASSERT_TRUE(recorded->waitForFrame(3));
     (void)recorded->askForFrame("start");
     // Stopped, so that the application does not go with its display: the end of the connection would come first.

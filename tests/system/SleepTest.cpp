@@ -3,13 +3,12 @@
 
 #include <gtest/gtest.h>
 
+#include "tests/system/MovingWindow.h"
 #include "tests/system/World.h"
 #include "tests/unit/linux_services/StandInLoginManager.h"
 
 namespace lumacast::test {
 namespace {
-
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "30"};
 
 bool bothAreHeld(const StandInLoginManager& manager) {
     return manager.held("sleep", "delay") == 1 && manager.held("idle", "block") == 1;

@@ -20,11 +20,11 @@ using std::chrono::seconds;
 
 // A sanitizer's daemon is many times slower: a small, slow picture and a short run there.
 #ifdef LC_SANITIZED
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "10"};
+const std::vector<std::string> kHeard{"--size", "320x180", "--fps", "10"};
 constexpr milliseconds kInSync{250};
 constexpr int kFramesPerSecond = 10;
 #else
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "30"};
+const std::vector<std::string> kHeard{"--size", "320x180", "--fps", "30"};
 constexpr milliseconds kInSync{40};
 constexpr int kFramesPerSecond = 30;
 #endif
@@ -118,7 +118,7 @@ TEST_P(SoundOnServer, EachRecordingHoldsItsOwnApplicationsToneAndNoOther) {
     std::vector<std::unique_ptr<Application>> applications;
     for (const double own : tones) {
         const std::string tone = std::to_string(static_cast<int>(own));
-        applications.push_back(world_.otherApplication("Plays" + tone, with(kMoving, {"--tone", tone})));
+        applications.push_back(world_.otherApplication("Plays" + tone, with(kHeard, {"--tone", tone})));
         Application& front = *applications.back();
         ASSERT_TRUE(front.waitForFrame(2 * kFramesPerSecond));  // it plays by then
         const auto sound = soundOf(record(front, 3));
@@ -136,7 +136,7 @@ TEST_P(SoundOnServer, EachRecordingHoldsItsOwnApplicationsToneAndNoOther) {
             EXPECT_GE(separation, 60);
         }
     }
-    const auto silent = world_.otherApplication("Silent", kMoving);
+    const auto silent = world_.otherApplication("Silent", kHeard);
     ASSERT_TRUE(silent->waitForFrame(2));
     const auto nothing = soundOf(record(*silent, 2));
     EXPECT_GT(lengthOf(nothing), 1.5);
@@ -151,7 +151,7 @@ TEST_P(SoundOnServer, IsInSyncFromEndToEndHoweverOftenTheRecordingIsPaused) {
 #endif
     constexpr int kPauses = 5;
     const auto application =
-        world_.application(with(kMoving, {"--beep-every", std::to_string(kFramesPerSecond / 2 + 5)}));
+        world_.application(with(kHeard, {"--beep-every", std::to_string(kFramesPerSecond / 2 + 5)}));
     ASSERT_TRUE(application->waitForFrame(2 * kFramesPerSecond));
     (void)application->askForFrame("start");
     checkers::SyncExpectation expectation;
@@ -202,7 +202,7 @@ TEST_P(SoundOnServer, IsInSyncFromEndToEndHoweverOftenTheRecordingIsPaused) {
 }
 
 TEST_P(SoundOnServer, OfAServerThatIsKilledAndComesBackHasSilenceForTheHole) {
-    const auto application = world_.application(with(kMoving, {"--beep-every", std::to_string(kFramesPerSecond / 2)}));
+    const auto application = world_.application(with(kHeard, {"--beep-every", std::to_string(kFramesPerSecond / 2)}));
     ASSERT_TRUE(application->waitForFrame(2 * kFramesPerSecond));
     (void)application->askForFrame("start");
     ASSERT_TRUE(world_.waitForElapsed(3));
@@ -251,7 +251,7 @@ TEST_P(SoundOnServer, OfAServerThatIsKilledAndComesBackHasSilenceForTheHole) {
 }
 
 TEST_P(SoundOnServer, BeginsAndEndsWithThePictureForAnApplicationThatPlaysAllTheTime) {
-    const auto application = world_.application(with(kMoving, {"--tone", "700"}));
+    const auto application = world_.application(with(kHeard, {"--tone", "700"}));
     ASSERT_TRUE(application->waitForFrame(2 * kFramesPerSecond));
     const std::string movie = record(*application, 3);
     const auto sound = soundOf(movie);

@@ -21,10 +21,10 @@ namespace {
 namespace fs = std::filesystem;
 
 #ifdef LC_SANITIZED
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "6"};
+const std::vector<std::string> kEnding{"--size", "320x180", "--fps", "6"};
 constexpr std::uint32_t kLate = 12;
 #else
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "30"};
+const std::vector<std::string> kEnding{"--size", "320x180", "--fps", "30"};
 /// Pictures that were shown and had not got to the daemon when it was told to end.
 constexpr std::uint32_t kLate = 6;
 #endif
@@ -52,7 +52,7 @@ class Termination : public ::testing::Test {
 protected:
     void start(const std::vector<std::string>& variables = {}) {
         world_.startDaemon(variables);
-        application_ = world_.application(kMoving);
+        application_ = world_.application(kEnding);
         ASSERT_TRUE(application_->waitForFrame(1));
         first_ = application_->askForFrame("start");
         ASSERT_TRUE(world_.waitForElapsed(1.2));

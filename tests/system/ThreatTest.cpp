@@ -17,6 +17,7 @@
 #include "tests/checkers/ToneChecker.h"
 #include "tests/contract/TestWindow.h"
 #include "tests/sound/PrivateSoundServer.h"
+#include "tests/system/MovingWindow.h"
 #include "tests/system/RawClient.h"
 #include "tests/system/Unit.h"
 #include "tests/system/World.h"
@@ -28,7 +29,6 @@ namespace fs = std::filesystem;
 using checkers::Child;
 using ::testing::HasSubstr;
 
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "30"};
 /// Nobody's number.
 constexpr uid_t kStranger = 61'001;
 

@@ -8,6 +8,7 @@
 #include <fstream>
 
 #include "tests/contract/TestWindow.h"
+#include "tests/system/MovingWindow.h"
 #include "tests/system/World.h"
 
 namespace lumacast::test {
@@ -17,7 +18,6 @@ using ::testing::AnyOf;
 using ::testing::HasSubstr;
 using ::testing::Not;
 
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "30"};
 constexpr int kSummary = 1, kClosedAtEnd = 2;
 
 struct Outcome {

@@ -23,9 +23,9 @@ using ::testing::StartsWith;
 
 // The judge listens for 500 Hz among others.
 #ifdef LC_SANITIZED
-const std::vector<std::string> kMoving{"--size", "320x180", "--fps", "10", "--tone", "500"};
+const std::vector<std::string> kWatched{"--size", "320x180", "--fps", "10", "--tone", "500"};
 #else
-const std::vector<std::string> kMoving{"--size", "640x360", "--fps", "30", "--tone", "500"};
+const std::vector<std::string> kWatched{"--size", "640x360", "--fps", "30", "--tone", "500"};
 #endif
 
 nlohmann::json told(const PrivateNginx& server, const std::string& name, const PrivateBrowser& browser) {
@@ -56,7 +56,7 @@ TEST(HlsBroadcast, ABrowserPlaysItWhileItIsLive) {
     world.addVariable("PULSE_SERVER=" + sounds.address());
     world.installExtensionFolder(LC_EXTENSIONS "/hls-clips");
     world.startDaemon();
-    const auto app = world.application(kMoving);
+    const auto app = world.application(kWatched);
     const std::string answer =
         app->ask("broadcast org.lumacast.SelfRecorder org.lumacast.hls-clips clipDuration=2,url=" + server.url());
     ASSERT_THAT(answer, StartsWith("started frame")) << world.daemonLog();

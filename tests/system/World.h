@@ -112,6 +112,8 @@ public:
     const PrivateDisplay& display() const { return display_; }
     /// Installs a program as an application.
     void install(const std::string& identifier, const std::string& name, const std::string& executable);
+    /// Whom the shortest extension is installed as, where it takes clips.
+    static constexpr char kKeeper[] = "org.lumacast.ClipKeeper";
     /// Installs a program as an upload extension that takes clips, or samples. Answers the folder where it may write.
     std::string installExtension(const std::string& identifier, const std::string& program, bool takesSamples);
     /// Installs an upload extension as it is built, a folder with its manifest. Answers where its program is then.
