@@ -190,5 +190,29 @@ TEST(Names, OfWhateverMakesAThreadOrAQueueStandInTheLanes) {
     EXPECT_FALSE(makesLane("std::thread::id id; int thread = 1;"));
 }
 
+/// Rows of the lanes' table that name a file.
+std::ptrdiff_t rowsWith(const Page& lanes, const std::string& stem) {
+    std::istringstream lines(lanes.text);
+    std::ptrdiff_t rows = 0;
+    for (std::string line; std::getline(lines, line);)
+        if (line.starts_with("| ") && line.find("`" + stem + "`") != std::string::npos) ++rows;
+    return rows;
+}
+
+TEST(Names, OfFilesThatMakeSeveralQueuesStandInTheLanesOnceForEach) {
+    static const std::regex kQueue("serialQueue\\(\\s*\"");
+    const Page& lanes = docs::page("docs/lanes.md");
+    std::ptrdiff_t queues = 0;
+    for (const char* folder : {"src", "linux", "headless"})
+        for (const auto& file : architecture::sourcesBelow(folder)) {
+            const std::string code = architecture::codeOf(file.text);
+            const auto made = std::distance(std::sregex_iterator(code.begin(), code.end(), kQueue), std::sregex_iterator());
+            const std::string stem = fs::path(file.path).stem().string();
+            EXPECT_GE(rowsWith(lanes, stem), made) << stem << " makes queues that docs/lanes.md doesn't have";
+            queues += made;
+        }
+    EXPECT_GT(queues, 12);
+}
+
 }  // namespace
 }  // namespace lumacast::docs
