@@ -10,7 +10,7 @@ namespace lumacast::fuzz {
 
 namespace {
 
-std::string quoted(std::string_view text) {
+std::string inQuotes(std::string_view text) {
     std::string result = "\"";
     for (const char c : text) {
         switch (c) {
@@ -27,7 +27,7 @@ std::string quoted(std::string_view text) {
 
 std::string printed(const StringsTable& table) {
     std::string result = "/* printed */\n";
-    for (const auto& [key, text] : table.texts()) result += quoted(key) + " = " + quoted(text) + ";  // one\n";
+    for (const auto& [key, text] : table.texts()) result += inQuotes(key) + " = " + inQuotes(text) + ";  // one\n";
     return result;
 }
 
