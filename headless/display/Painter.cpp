@@ -6,7 +6,6 @@
 
 #include "examples/scene/FramePattern.h"
 #include "headless/Show.h"
-#include "linux/display/Turn.h"
 
 namespace lumacast::headless {
 
@@ -34,16 +33,16 @@ std::uint32_t colourOf(ContextID window) {
     return (mixed >> 8 & 0x7F7F7F) + 0x404040;
 }
 
-Painter::Painter(std::int32_t width, std::int32_t height, Lies lies)
-    : width_(lies == Lies::Upright ? width : height), height_(lies == Lies::Upright ? height : width), lies_(lies) {
+Painter::Painter(std::int32_t width, std::int32_t height, x11::Turn turn)
+    : width_(turn == x11::Turn::None ? width : height), height_(turn == x11::Turn::None ? height : width), turn_(turn) {
     if (width_ >= scene::kMinimumWidth && height_ >= scene::kMinimumHeight)
         scene_.emplace(width_, height_, scene::Motion::Everywhere);
-    if (lies_ == Lies::TurnedCounterclockwise)
+    if (turn_ == x11::Turn::Counterclockwise)
         upright_.resize(static_cast<std::size_t>(width_) * static_cast<std::size_t>(height_));
 }
 
 void Painter::paint(PlaneMemory& memory, std::int64_t number, const std::vector<std::uint32_t>& colours) {
-    if (lies_ == Lies::Upright)
+    if (turn_ == x11::Turn::None)
         return paintUpright({memory.pixels(), width_, height_, memory.stride()}, number, colours);
     const std::size_t stride = static_cast<std::size_t>(width_) * sizeof(std::uint32_t);
     auto* const pixels = reinterpret_cast<std::uint8_t*>(upright_.data());

@@ -8,6 +8,7 @@
 #include "base/Identifiers.h"
 #include "examples/scene/Scene.h"
 #include "headless/display/PlaneMemory.h"
+#include "linux/display/Turn.h"
 
 namespace lumacast::headless {
 
@@ -21,10 +22,8 @@ inline constexpr std::uint32_t kScreenColour = 0xF0F0F0;
 /// all over. Serves one lane.
 class Painter final {
 public:
-    enum class Lies : bool { Upright, TurnedCounterclockwise };
-
     /// Of frames of this size, in memory.
-    Painter(std::int32_t width, std::int32_t height, Lies lies);
+    Painter(std::int32_t width, std::int32_t height, x11::Turn turn);
 
     void paint(PlaneMemory& memory, std::int64_t number, const std::vector<std::uint32_t>& colours);
 
@@ -32,7 +31,7 @@ private:
     void paintUpright(const scene::Picture& picture, std::int64_t number, const std::vector<std::uint32_t>& colours);
 
     const std::int32_t width_, height_;  ///< upright
-    const Lies lies_;
+    const x11::Turn turn_;
     std::optional<scene::Scene> scene_;
     std::vector<std::uint32_t> upright_;  ///< where the picture is drawn before it is turned
 };

@@ -8,14 +8,11 @@
 namespace lumacast::headless {
 
 std::shared_ptr<DisplayCaptureSource> SyntheticDisplay::makeSource(Size captureSize, MediaTime minimumInterval) {
-    auto makeLane = [show = show_, captureSize, minimumInterval, selection = selection_, scheduler = &scheduler_](
-                        std::weak_ptr<DisplayCaptureSource> source, std::shared_ptr<x11::CaptureControl> control) {
-        return std::make_shared<SyntheticLane>(SyntheticLaneSetup{
-            show, static_cast<std::int32_t>(captureSize.width), static_cast<std::int32_t>(captureSize.height),
-            minimumInterval, std::move(control), selection, std::move(source), scheduler});
+    auto makeLane = [show = show_](x11::CaptureLaneSetup setup) {
+        return std::make_shared<SyntheticLane>(show, std::move(setup));
     };
-    return std::make_shared<LaneCaptureSource>(
-        LaneCaptureSource::Setup{captureSize, clock_, scheduler_, keeper_, std::move(makeLane)});
+    return std::make_shared<LaneCaptureSource>(LaneCaptureSource::Setup{
+        captureSize, minimumInterval, clock_, scheduler_, selection_, keeper_, std::move(makeLane)});
 }
 
 }  // namespace lumacast::headless

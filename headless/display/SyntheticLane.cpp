@@ -18,17 +18,11 @@ namespace {
 constexpr std::int64_t kNever = x11::FramePacer::kNever;
 /// What a late lane makes up for.
 constexpr std::int64_t kMostLate = Show::kPicturesPerSecond;
-// Of the transform flags.
-constexpr std::uint32_t kRotateClockwise = 4;
-
-std::int64_t intervalOf(const MediaTime& interval) {
-    return static_cast<std::int64_t>(std::clamp(interval.seconds(), 0.001, 3600.0) * 1e9);
-}
 
 }  // namespace
 
-SyntheticLane::SyntheticLane(SyntheticLaneSetup setup)
-    : setup_(std::move(setup)), pacer_(intervalOf(setup_.minimumInterval)) {
+SyntheticLane::SyntheticLane(const Show& show, x11::CaptureLaneSetup setup)
+    : show_(show), setup_(std::move(setup)), pacer_(setup_.minimumInterval), outlet_(setup_) {
     setup_.selection->watch(wake_);
 }
 
@@ -77,7 +71,7 @@ bool SyntheticLane::beginRun(const Order& order) {
         last_ = {};
     }
     pacer_.restart();
-    next_ = setup_.show.pictureAt(LinuxClock::currentHostTime());
+    next_ = show_.pictureAt(LinuxClock::currentHostTime());
     return followSelection(order);
 }
 
@@ -97,7 +91,7 @@ bool SyntheticLane::followSelection(const Order& order) {
             owners_.push_back(std::move(*process));
             colours_.push_back(colourOf(window));
         }
-        if (colours_.empty()) return windowsAreGone(order), false;
+        if (colours_.empty()) return outlet_.end(order, x11::failure(CaptureStatus::kWindowGone)), false;
     }
     makePainter();
     return true;
@@ -106,33 +100,32 @@ bool SyntheticLane::followSelection(const Order& order) {
 /// Frames of the screen are portrait, of windows as they were asked for.
 void SyntheticLane::makePainter() {
     const bool isScreen = wanted_.mode == DisplayCloneControl::kMirrorDisplay;
-    const auto lies = isScreen ? Painter::Lies::TurnedCounterclockwise : Painter::Lies::Upright;
-    if (painter_ && lies == lies_) return;
-    auto [width, height] = std::pair(setup_.width, setup_.height);
-    if (isScreen && width > height) std::swap(width, height);
-    lies_ = lies;
+    const auto turn = isScreen ? x11::Turn::Counterclockwise : x11::Turn::None;
+    if (painter_ && turn == turn_) return;
+    const auto [width, height] = setup_.frameSize(isScreen);
+    turn_ = turn;
     planes_ = std::make_unique<PlaneStore>(width, height);
-    painter_.emplace(width, height, lies);
+    painter_.emplace(width, height, turn);
 }
 
 std::int64_t SyntheticLane::takePictures(const Order& order) {
-    const std::int64_t current = setup_.show.pictureAt(LinuxClock::currentHostTime());
+    const std::int64_t current = show_.pictureAt(LinuxClock::currentHostTime());
     if (current - next_ > kMostLate) {
         setup_.control->countDropped(static_cast<std::uint64_t>(current - next_ - kMostLate));
         next_ = current - kMostLate;
     }
     for (; next_ <= current; ++next_) {
-        const std::int64_t begin = setup_.show.beginOf(next_).nanoseconds;
+        const std::int64_t begin = show_.beginOf(next_).nanoseconds;
         if (begin < pacer_.nextChange()) continue;
         if (!takePicture(order, next_)) break;
         pacer_.taken(begin);
     }
-    return setup_.show.beginOf(next_).nanoseconds;
+    return show_.beginOf(next_).nanoseconds;
 }
 
 /// The moment at which the picture began, but of the first one of a run, which was there before the run.
 MediaTime SyntheticLane::stampOf(const Order& order, std::int64_t picture) const {
-    const auto begin = isFirst_ ? std::nullopt : order.clock->at(setup_.show.beginOf(picture));
+    const auto begin = isFirst_ ? std::nullopt : order.clock->at(show_.beginOf(picture));
     const bool isLater = begin && last_.picture && compare(*begin, last_.stamp) > 0;
     return isLater ? *begin : order.clock->now();
 }
@@ -146,37 +139,18 @@ bool SyntheticLane::takePicture(const Order& order, std::int64_t picture) {
         return true;
     }
     painter_->paint(*memory, picture, colours_);
-    const std::uint32_t flags = lies_ == Painter::Lies::Upright ? 0 : kRotateClockwise;
     auto shown =
         std::make_shared<SyntheticPicture>(std::move(memory), SyntheticPicture::Differs::Everywhere, ++pictures_);
-    if (!deliver(order, {std::move(shown), stamp, order.clock, flags}, Stamp::Fresh)) return false;
+    if (!deliver(order, {std::move(shown), stamp, order.clock, transformFlagsOf(turn_)}, Stamp::Fresh)) return false;
     isFirst_ = false;
     return true;
 }
 
 bool SyntheticLane::deliver(const Order& order, Delivered what, Stamp kind) {
-    const auto source = setup_.source.lock();
-    const auto delegate = setup_.control->delegate();
-    if (!source || !delegate) return true;  // to nobody
-    const auto given = setup_.control->beginDelivery(order, what.stamp, kind);
-    if (!given) return false;
-    what.stamp = *given;
-    last_ = what;
-    delegate->screenCaptureControllerDidReceiveSampleBuffer(
-        *source, samples_.video(PixelBuffer(std::move(what.picture)), *given, setup_.minimumInterval),
-        what.transformFlags);
-    setup_.control->countDelivered();
-    setup_.control->endDelivery();
+    const auto outcome = outlet_.deliver(order, what.picture, what.stamp, kind, what.transformFlags);
+    if (outcome != x11::FrameOutlet::Outcome::Delivered) return outcome == x11::FrameOutlet::Outcome::ToNobody;
+    last_ = std::move(what);
     return true;
-}
-
-void SyntheticLane::windowsAreGone(const Order& order) {
-    if (!setup_.control->endRun(order)) return;
-    setup_.scheduler->mainQueue().async([source = setup_.source, control = setup_.control, run = order.run] {
-        const auto ended = source.lock();
-        const auto delegate = control->delegateOfEnded(run);
-        if (ended && delegate) delegate->screenCaptureControllerDidFailWithStatus(*ended, CaptureStatus::kWindowGone);
-    });
 }
 
 }  // namespace lumacast::headless

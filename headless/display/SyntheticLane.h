@@ -3,7 +3,6 @@
 
 #include <atomic>
 #include <cstdint>
-#include <functional>
 #include <memory>
 #include <optional>
 #include <vector>
@@ -11,34 +10,22 @@
 #include "headless/Show.h"
 #include "headless/display/Painter.h"
 #include "headless/display/PlaneMemory.h"
-#include "linux/display/CaptureControl.h"
 #include "linux/display/CaptureLane.h"
 #include "linux/display/CloneSelection.h"
+#include "linux/display/FrameOutlet.h"
 #include "linux/display/FramePacer.h"
 #include "linux/display/Processes.h"
+#include "linux/display/Turn.h"
 #include "linux/display/Wake.h"
-#include "platform/Scheduler.h"
-#include "writer/media/SampleMaker.h"
 
 namespace lumacast::headless {
-
-/// What a lane captures, and for whom.
-struct SyntheticLaneSetup {
-    Show show;
-    std::int32_t width = 0, height = 0;
-    MediaTime minimumInterval;
-    std::shared_ptr<x11::CaptureControl> control;
-    std::shared_ptr<x11::CloneSelection> selection;
-    std::weak_ptr<DisplayCaptureSource> source;
-    Scheduler* scheduler = nullptr;  ///< borrowed; for failures, which go to the main queue
-};
 
 /// Draws and delivers the show's pictures while the control says so. Each is stamped with the moment at which it began,
 /// so that a machine that is late by less than a second delivers all of them, with the stamps they should have; what is
 /// later than that is dropped and counted.
 class SyntheticLane final : public x11::CaptureLane {
 public:
-    explicit SyntheticLane(SyntheticLaneSetup setup);
+    SyntheticLane(const Show& show, x11::CaptureLaneSetup setup);
 
     void run() override;
     bool finished() const override { return finished_.load(std::memory_order_acquire); }
@@ -63,10 +50,10 @@ private:
     MediaTime stampOf(const Order& order, std::int64_t picture) const;
     bool takePicture(const Order& order, std::int64_t picture);
     bool deliver(const Order& order, Delivered what, Stamp kind);
-    void windowsAreGone(const Order& order);
     void sleep(std::int64_t deadline);
 
-    const SyntheticLaneSetup setup_;
+    const Show show_;
+    const x11::CaptureLaneSetup setup_;
     const std::shared_ptr<x11::Wake> wake_ = std::make_shared<x11::Wake>();
     std::atomic<bool> finished_{false};
 
@@ -76,13 +63,13 @@ private:
     std::vector<x11::HeldProcess> owners_;  ///< of the windows that are shown
     std::vector<std::uint32_t> colours_;    ///< of what is shown; empty: nothing is
     std::optional<Painter> painter_;
-    Painter::Lies lies_ = Painter::Lies::Upright;
+    x11::Turn turn_ = x11::Turn::None;
     std::unique_ptr<PlaneStore> planes_;
     x11::FramePacer pacer_;
     std::int64_t next_ = 0;       ///< the show's picture that is due next
     bool isFirst_ = true;         ///< of the run
     std::uint64_t pictures_ = 0;  ///< numbered so far
-    SampleMaker samples_;
+    x11::FrameOutlet outlet_;
     Delivered last_;
 };
 

@@ -16,22 +16,16 @@ namespace {
 constexpr int kReadings = 3;
 // A source that stands longer gives the window and its planes back.
 constexpr std::int64_t kReleaseAfter = 10'000'000'000;
-// Of the transform flags.
-constexpr std::uint32_t kRotateClockwise = 4;
 
 std::int64_t steadyNow() {
     return std::chrono::duration_cast<std::chrono::nanoseconds>(std::chrono::steady_clock::now().time_since_epoch())
         .count();
 }
 
-std::int64_t intervalOf(const MediaTime& interval) {
-    const double seconds = interval.seconds();
-    return static_cast<std::int64_t>(std::clamp(seconds, 0.001, 3600.0) * 1e9);
-}
-
 }  // namespace
 
-FrameLane::FrameLane(FrameLaneSetup setup) : setup_(std::move(setup)), pacer_(intervalOf(setup_.minimumInterval)) {
+FrameLane::FrameLane(std::string display, CaptureLaneSetup setup)
+    : display_(std::move(display)), setup_(std::move(setup)), pacer_(setup_.minimumInterval), outlet_(setup_) {
     setup_.selection->watch(wake_);
 }
 
@@ -156,7 +150,7 @@ bool FrameLane::beginRun(const Order& order) {
 }
 
 bool FrameLane::connect(const Order& order) {
-    connection_ = X11Connection::open(setup_.display, interrupt_);
+    connection_ = X11Connection::open(display_, interrupt_);
     if (!connection_) return fail(order, CaptureStatus::kNoDisplay), false;
     if (!connection_->canCapture()) return fail(order, CaptureStatus::kNotSupported), false;
     scene_ = std::make_unique<CaptureScene>(*connection_, pacer_.interval());
@@ -166,8 +160,7 @@ bool FrameLane::connect(const Order& order) {
 
 // Frames of the screen and of windows may have different sizes.
 void FrameLane::makeMaker() {
-    auto [width, height] = std::pair(setup_.width, setup_.height);
-    if (mirrors_ && width > height) std::swap(width, height);
+    const auto [width, height] = setup_.frameSize(mirrors_);
     if (maker_ && maker_->makes(width, height)) return;
     maker_ = std::make_unique<PictureMaker>(*connection_, width, height);
     last_.source = 0;
@@ -255,8 +248,8 @@ void FrameLane::takePicture(const Order& order) {
     }
     // What a locked screen shows is nobody's business; the next look ends the run.
     if (scene_->screenIsBlank()) return;
-    const std::uint32_t flags = maker_->turn() == Turn::Counterclockwise ? kRotateClockwise : 0;
-    Delivered taken{maker_->picture(*plane, ++pictures_), stamp, order.clock, flags, shown_->id(), shown_->layout()};
+    Delivered taken{maker_->picture(*plane, ++pictures_), stamp, order.clock, transformFlagsOf(maker_->turn()),
+                    shown_->id(), shown_->layout()};
     if (!deliver(order, std::move(taken), CaptureControl::Stamp::Fresh)) return;
     maker_->delivered();
     maker_->tidy(steadyNow());
@@ -282,18 +275,9 @@ void FrameLane::repeatPicture(const Order& order, MediaTime stamp, CaptureContro
 bool FrameLane::deliver(const Order& order, Delivered what, CaptureControl::Stamp kind) {
     const std::int64_t began = steadyNow();
     pacer_.taken(began);
-    const auto source = setup_.source.lock();
-    const auto delegate = setup_.control->delegate();
-    if (!source || !delegate) return true;  // to nobody
-    const auto given = setup_.control->beginDelivery(order, what.stamp, kind);
-    if (!given) return false;
-    what.stamp = *given;
-    last_ = what;
-    delegate->screenCaptureControllerDidReceiveSampleBuffer(
-        *source, samples_.video(PixelBuffer(std::move(what.picture)), *given, setup_.minimumInterval),
-        what.transformFlags);
-    setup_.control->countDelivered();
-    setup_.control->endDelivery();
+    const auto outcome = outlet_.deliver(order, what.picture, what.stamp, kind, what.transformFlags);
+    if (outcome != FrameOutlet::Outcome::Delivered) return outcome == FrameOutlet::Outcome::ToNobody;
+    last_ = std::move(what);
 
     drainEvents(false);
     const std::int64_t took = steadyNow() - began;
@@ -303,8 +287,7 @@ bool FrameLane::deliver(const Order& order, Delivered what, CaptureControl::Stam
 }
 
 void FrameLane::fail(const Order& order, std::int32_t status) {
-    end(order,
-        [status](auto& delegate, auto& source) { delegate.screenCaptureControllerDidFailWithStatus(source, status); });
+    end(order, failure(status));
 }
 
 void FrameLane::displayIsLost(const Order& order) {
@@ -316,12 +299,7 @@ void FrameLane::displayIsLost(const Order& order) {
 // The run is over, and its delegate is told why.
 void FrameLane::end(const Order& order, Telling telling) {
     release();
-    if (!setup_.control->endRun(order)) return;
-    setup_.scheduler->mainQueue().async([source = setup_.source, control = setup_.control, run = order.run, telling] {
-        const auto ended = source.lock();
-        const auto delegate = control->delegateOfEnded(run);
-        if (ended && delegate) telling(*delegate, *ended);
-    });
+    outlet_.end(order, std::move(telling));
 }
 
 }  // namespace lumacast::x11

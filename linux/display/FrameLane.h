@@ -5,39 +5,25 @@
 
 #include <atomic>
 #include <cstdint>
-#include <functional>
 #include <memory>
 #include <string>
 
 #include "linux/display/CaptureControl.h"
 #include "linux/display/CaptureLane.h"
 #include "linux/display/CaptureScene.h"
-#include "linux/display/CloneSelection.h"
+#include "linux/display/FrameOutlet.h"
 #include "linux/display/FramePacer.h"
 #include "linux/display/PictureMaker.h"
 #include "linux/display/Wake.h"
 #include "linux/display/X11Connection.h"
-#include "platform/Scheduler.h"
-#include "writer/media/SampleMaker.h"
 
 namespace lumacast::x11 {
-
-/// What a frame lane captures, and for whom. Of the screen frames are always portrait: the shorter side is their width.
-struct FrameLaneSetup {
-    std::string display;
-    std::int32_t width = 0, height = 0;
-    MediaTime minimumInterval;
-    std::shared_ptr<CaptureControl> control;
-    std::shared_ptr<CloneSelection> selection;
-    std::weak_ptr<DisplayCaptureSource> source;
-    Scheduler* scheduler = nullptr;  ///< borrowed; for failures, which go to the main queue
-};
 
 /// Captures and delivers while the control says so; sleeps otherwise. It waits for the display server on its own
 /// connection, so nobody else ever waits for a server that hangs.
 class FrameLane final : public CaptureLane {
 public:
-    explicit FrameLane(FrameLaneSetup setup);
+    FrameLane(std::string display, CaptureLaneSetup setup);
 
     void run() override;
     bool finished() const override { return finished_.load(std::memory_order_acquire); }
@@ -54,7 +40,6 @@ private:
         std::uint32_t source = 0;  ///< which it was read from, and how that was laid out; 0 when it is not known any more
         std::uint64_t layout = 0;
     };
-    using Telling = std::function<void(DisplayCaptureDelegate&, DisplayCaptureSource&)>;
 
     void work(const Order& order);
     bool beginRun(const Order& order);
@@ -81,7 +66,8 @@ private:
     void sleep(std::int64_t deadline);
     void release();
 
-    const FrameLaneSetup setup_;
+    const std::string display_;
+    const CaptureLaneSetup setup_;
     const std::shared_ptr<Wake> wake_ = std::make_shared<Wake>();
     Interrupt interrupt_;
     std::atomic<bool> finished_{false};
@@ -101,7 +87,7 @@ private:
     bool pictureWanted_ = false;  ///< the current picture is due though nothing may have changed
     std::int64_t stoppedSince_ = 0;
     std::uint64_t pictures_ = 0;  ///< numbered so far
-    SampleMaker samples_;
+    FrameOutlet outlet_;
     Delivered last_;
 };
 

@@ -5,6 +5,8 @@
 #include <cstdint>
 #include <limits>
 
+#include "writer/media/MediaTime.h"
+
 namespace lumacast::x11 {
 
 /// Keeps frames the minimum interval apart without losing one of a steady stream. Each frame has a slot; the next slot
@@ -18,6 +20,9 @@ public:
     static constexpr std::int64_t kRepeatAfter = 900'000'000;
 
     explicit FramePacer(std::int64_t interval) : interval_(std::max<std::int64_t>(interval, 1)) {}
+    /// Intervals as a source may be asked for, within what makes sense: a millisecond to an hour.
+    explicit FramePacer(const MediaTime& interval)
+        : FramePacer(static_cast<std::int64_t>(std::clamp(interval.seconds(), 0.001, 3600.0) * 1e9)) {}
 
     /// The next frame is due at once.
     void restart() {

@@ -3,6 +3,7 @@
 #include <utility>
 
 #include "linux/display/CaptureStatus.h"
+#include "linux/display/FrameOutlet.h"
 
 namespace lumacast {
 namespace {
@@ -55,19 +56,16 @@ std::shared_ptr<x11::CaptureLane> LaneCaptureSource::lane() {
     const std::lock_guard lock(mutex_);
     if (lane_) return lane_;
     const auto keeper = setup_.keeper.lock();
-    auto lane = setup_.makeLane(weak_from_this(), control_);
+    auto lane = setup_.makeLane({static_cast<std::int32_t>(setup_.captureSize.width),
+                                 static_cast<std::int32_t>(setup_.captureSize.height), setup_.minimumInterval, control_,
+                                 setup_.selection, weak_from_this(), &setup_.scheduler});
     if (keeper && keeper->launch(lane)) lane_ = std::move(lane);
     return lane_;
 }
 
 void LaneCaptureSource::fail(std::int32_t status) {
     control_->stop();
-    setup_.scheduler.mainQueue().async(
-        [source = weak_from_this(), control = control_, run = control_->order().run, status] {
-            const auto failed = source.lock();
-            const auto delegate = control->delegateOfEnded(run);
-            if (failed && delegate) delegate->screenCaptureControllerDidFailWithStatus(*failed, status);
-        });
+    x11::tellOfEnd(control_->order().run, control_, weak_from_this(), setup_.scheduler, x11::failure(status));
 }
 
 }  // namespace lumacast

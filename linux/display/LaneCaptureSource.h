@@ -5,6 +5,7 @@
 
 #include "linux/display/CaptureControl.h"
 #include "linux/display/CaptureLane.h"
+#include "linux/display/CloneSelection.h"
 #include "linux/display/LaneKeeper.h"
 #include "platform/Clock.h"
 #include "platform/DisplayCapture.h"
@@ -15,13 +16,13 @@ namespace lumacast {
 /// One capture source, whatever it captures: its lane, a thread, comes with the first start and goes with the source.
 class LaneCaptureSource final : public DisplayCaptureSource, public std::enable_shared_from_this<LaneCaptureSource> {
 public:
-    /// Makes the lane. It delivers by the control's leave, in the source's name.
-    using MakeLane = std::function<std::shared_ptr<x11::CaptureLane>(std::weak_ptr<DisplayCaptureSource> source,
-                                                                     std::shared_ptr<x11::CaptureControl> control)>;
+    using MakeLane = std::function<std::shared_ptr<x11::CaptureLane>(x11::CaptureLaneSetup setup)>;
     struct Setup {
         Size captureSize;
+        MediaTime minimumInterval;
         Clock& clock;
         Scheduler& scheduler;
+        std::shared_ptr<x11::CloneSelection> selection;
         std::weak_ptr<x11::LaneKeeper> keeper;
         MakeLane makeLane;
     };

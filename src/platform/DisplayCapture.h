@@ -13,14 +13,18 @@ namespace lumacast {
 
 class DisplayCaptureSource;
 
+/// The bits of a frame's transform flags: how it is to be turned and mirrored to be upright. Higher bits carry no
+/// meaning.
+enum FrameTransformFlag : std::uint32_t { kFlipY = 1, kFlipX = 2, kRotateClockwise = 4 };
+
 /// Told of frames and failures by a capture source. Frames come on the source's own delivery thread (the frame lane),
 /// one at a time; failures on the main queue. Nothing is called inline from an operation of the source. What happened to
 /// capture before the source was last started is not told any more.
 class DisplayCaptureDelegate {
 public:
     virtual ~DisplayCaptureDelegate() = default;
-    /// One frame, stamped with the recording's capture clock, its duration the minimum interval. `transformFlags`: bit
-    /// 0 flip y, bit 1 flip x, bit 2 rotate clockwise.
+    /// One frame, stamped with the recording's capture clock, its duration the minimum interval. `transformFlags` is
+    /// made of FrameTransformFlag.
     virtual void screenCaptureControllerDidReceiveSampleBuffer(DisplayCaptureSource& source, const SampleRef& sample,
                                                                std::uint32_t transformFlags) = 0;
     /// Capture failed with this status and has ended.

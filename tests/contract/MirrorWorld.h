@@ -18,8 +18,6 @@
 
 namespace lumacast::test {
 
-inline constexpr std::uint32_t kRotateClockwise = 4;
-
 /// A small screen of any shape, with a pointer in the top left corner that can't be seen.
 class MirrorWorld {
 public:

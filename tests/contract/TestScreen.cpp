@@ -8,13 +8,14 @@
 #include <cstring>
 
 #include "linux/display/X11Connection.h"
+#include "platform/DisplayCapture.h"
 
 namespace lumacast::test {
 
 using x11::Owned;
 
 Pixels uprightPixels(const SharedPlane& plane, std::uint32_t transformFlags) {
-    const bool turned = (transformFlags & 4) != 0;
+    const bool turned = (transformFlags & kRotateClockwise) != 0;
     const std::int32_t width = plane.width(), height = plane.height();
     Pixels upright{turned ? height : width, turned ? width : height, {}};
     upright.colours.resize(static_cast<std::size_t>(width) * static_cast<std::size_t>(height));
