@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <chrono>
 
-#include "linux/display/Processes.h"
+#include "linux/system/UserProcesses.h"
 
 namespace lumacast::headless {
 
@@ -15,7 +15,7 @@ constexpr std::chrono::milliseconds kPatience{90};
 
 std::optional<ProcessID> SyntheticAppStateMonitor::applicationProcess(const BundleIdentifier& identifier) {
     const auto end = std::chrono::steady_clock::now() + kPatience;
-    auto processes = x11::processesOfThisUser();
+    auto processes = processesOfThisUser();
     std::sort(processes.begin(), processes.end(),
               [](ProcessID one, ProcessID other) { return number(one) > number(other); });
     for (const ProcessID pid : processes) {

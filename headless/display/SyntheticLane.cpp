@@ -53,7 +53,7 @@ void SyntheticLane::sleep(std::int64_t deadline) {
 std::int64_t SyntheticLane::work(const Order& order) {
     if (order.run != run_ && !beginRun(order)) return kNever;
     if (wanted_.version != setup_.selection->version() && !followSelection(order)) return kNever;
-    if (std::any_of(owners_.begin(), owners_.end(), [](const auto& owner) { return owner.ended(); }) &&
+    if (std::any_of(owners_.begin(), owners_.end(), [](const auto& owner) { return owner.hasEnded(); }) &&
         !followSelection(order))
         return kNever;
     return colours_.empty() ? kNever : takePictures(order);
@@ -83,7 +83,7 @@ bool SyntheticLane::followSelection(const Order& order) {
     if (wanted_.mode == DisplayCloneControl::kCloneContexts) {
         for (const ContextID window : wanted_.contexts) {
             const auto owner = ownerOf(window);
-            auto process = owner ? x11::HeldProcess::hold(*owner) : std::nullopt;
+            auto process = owner ? HeldProcess::hold(*owner) : std::nullopt;
             if (!process) {
                 setup_.selection->forget(window);
                 continue;

@@ -14,9 +14,9 @@
 #include "linux/display/CloneSelection.h"
 #include "linux/display/FrameOutlet.h"
 #include "linux/display/FramePacer.h"
-#include "linux/display/Processes.h"
 #include "linux/display/Turn.h"
 #include "linux/display/Wake.h"
+#include "linux/system/HeldProcess.h"
 
 namespace lumacast::headless {
 
@@ -60,7 +60,7 @@ private:
     // Of the lane alone.
     std::uint64_t run_ = 0;
     x11::CloneSelection::Wanted wanted_;
-    std::vector<x11::HeldProcess> owners_;  ///< of the windows that are shown
+    std::vector<HeldProcess> owners_;  ///< of the windows that are shown
     std::vector<std::uint32_t> colours_;    ///< of what is shown; empty: nothing is
     std::optional<Painter> painter_;
     x11::Turn turn_ = x11::Turn::None;

@@ -3,7 +3,7 @@
 #include <utility>
 
 #include "headless/display/SyntheticWindows.h"
-#include "linux/display/Processes.h"
+#include "linux/system/HeldProcess.h"
 
 namespace lumacast::headless {
 
@@ -11,20 +11,20 @@ namespace {
 
 class SyntheticClientPort final : public ClientPort {
 public:
-    explicit SyntheticClientPort(x11::HeldProcess owner) : owner_(std::move(owner)) {}
+    explicit SyntheticClientPort(HeldProcess owner) : owner_(std::move(owner)) {}
     std::optional<ProcessID> processIdentifier() override {
-        return owner_.ended() ? std::nullopt : std::optional(owner_.pid());
+        return owner_.hasEnded() ? std::nullopt : std::optional(owner_.pid());
     }
 
 private:
-    const x11::HeldProcess owner_;
+    const HeldProcess owner_;
 };
 
 }  // namespace
 
 std::unique_ptr<ClientPort> SyntheticRenderServer::clientPort(ContextID context) {
     const auto owner = ownerOf(context);
-    auto process = owner ? x11::HeldProcess::hold(*owner) : std::nullopt;
+    auto process = owner ? HeldProcess::hold(*owner) : std::nullopt;
     return process ? std::make_unique<SyntheticClientPort>(std::move(*process)) : nullptr;
 }
 

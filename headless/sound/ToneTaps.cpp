@@ -1,6 +1,6 @@
 #include "headless/sound/ToneTaps.h"
 
-#include "linux/display/Processes.h"
+#include "linux/system/HeldProcess.h"
 
 namespace lumacast::headless {
 
@@ -43,7 +43,7 @@ private:
 }  // namespace
 
 std::shared_ptr<sound::TappedProcess> ToneTaps::hold(ProcessID pid) {
-    if (!x11::HeldProcess::hold(pid)) return nullptr;
+    if (!HeldProcess::hold(pid)) return nullptr;
     return std::make_shared<ToneProcess>(show_, applicationOf_(pid).has_value());
 }
 

@@ -1,39 +1,19 @@
 #include "linux/audio/TapOwner.h"
 
 #include <fcntl.h>
-#include <poll.h>
-#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <array>
-#include <charconv>
 #include <string_view>
 
-#include "linux/system/ParentProcess.h"
+#include "linux/system/Ancestors.h"
+#include "linux/system/FileDescriptor.h"
 
 namespace lumacast::sound {
 
 namespace {
 
-constexpr int kMostAncestors = 64;
 constexpr std::size_t kMostFamily = 256;
-
-FileDescriptor openProcess(ProcessID pid) {
-    return FileDescriptor(number(pid) > 0 ? static_cast<int>(::syscall(SYS_pidfd_open, number(pid), 0)) : -1);
-}
-
-bool hasProcessEnded(const FileDescriptor& process) {
-    pollfd polled{process.get(), POLLIN, 0};
-    return ::poll(&polled, 1, 0) != 0;
-}
-
-bool descendsFrom(ProcessID pid, ProcessID ancestor) {
-    for (int step = 0; step < kMostAncestors && number(pid) > 0; ++step) {
-        pid = parentOf(pid);
-        if (pid == ancestor) return true;
-    }
-    return false;
-}
 
 /// The file name of the program that the process runs; empty when that can't be told.
 std::string binaryOf(ProcessID pid) {
@@ -69,18 +49,16 @@ bool fits(const ClientIdentity& claim) {
 }  // namespace
 
 std::shared_ptr<TapOwner> TapOwner::hold(ProcessID pid, ApplicationOf applicationOf) {
-    FileDescriptor process = openProcess(pid);
-    if (!process || hasProcessEnded(process)) return nullptr;
-    return std::shared_ptr<TapOwner>(new TapOwner(pid, std::move(process), std::move(applicationOf)));
+    auto process = HeldProcess::hold(pid);
+    if (!process) return nullptr;
+    return std::shared_ptr<TapOwner>(new TapOwner(std::move(*process), std::move(applicationOf)));
 }
-
-bool TapOwner::hasEnded() const { return hasProcessEnded(process_); }
 
 bool TapOwner::owns(const ListedClient& client, const ClientIdentity& identity) {
     if (hasEnded() || (!identity.isKernelChecked && !fits(identity))) return false;
-    if (identity.pid == pid_) return true;
-    const FileDescriptor held = openProcess(identity.pid);
-    if (!held || !descendsFrom(identity.pid, pid_)) return false;
+    if (identity.pid == process_.pid()) return true;
+    const auto held = HeldProcess::hold(identity.pid);
+    if (!held || !descendsFrom(identity.pid, process_.pid())) return false;
     const std::pair key(client.index, identity.pid);
     if (family_.count(key) == 0) {
         if (!isSameApplication(identity.pid)) return false;
@@ -88,12 +66,12 @@ bool TapOwner::owns(const ListedClient& client, const ClientIdentity& identity) 
         family_.insert(key);
     }
     // Still the one that was looked at.
-    return !hasProcessEnded(held) && !hasEnded();
+    return !held->hasEnded() && !hasEnded();
 }
 
 bool TapOwner::isSameApplication(ProcessID pid) {
     if (!applicationOf_) return false;
-    const auto own = applicationOf_(pid_);
+    const auto own = applicationOf_(process_.pid());
     return own && applicationOf_(pid) == own;
 }
 

@@ -10,7 +10,7 @@
 
 #include "base/Identifiers.h"
 #include "linux/audio/TapSelection.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/system/HeldProcess.h"
 
 namespace lumacast::sound {
 
@@ -28,15 +28,14 @@ public:
     /// of the program (the number may come from inside a container, where it is another process's).
     bool owns(const ListedClient& client, const ClientIdentity& identity);
 
-    bool hasEnded() const;
+    bool hasEnded() const { return process_.hasEnded(); }
 
 private:
-    TapOwner(ProcessID pid, FileDescriptor process, ApplicationOf applicationOf)
-        : pid_(pid), process_(std::move(process)), applicationOf_(std::move(applicationOf)) {}
+    TapOwner(HeldProcess process, ApplicationOf applicationOf)
+        : process_(std::move(process)), applicationOf_(std::move(applicationOf)) {}
     bool isSameApplication(ProcessID pid);
 
-    const ProcessID pid_;
-    const FileDescriptor process_;
+    const HeldProcess process_;
     const ApplicationOf applicationOf_;
     /// Clients whose process was found to be of the same application: a disk that is slow later changes nothing.
     std::set<std::pair<std::uint32_t, ProcessID>> family_;

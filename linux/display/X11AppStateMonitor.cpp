@@ -4,6 +4,8 @@
 #include <utility>
 
 #include "linux/display/WindowOwner.h"
+#include "linux/system/Ancestors.h"
+#include "linux/system/UserProcesses.h"
 
 namespace lumacast {
 namespace {
@@ -19,7 +21,7 @@ bool contains(const std::vector<ProcessID>& processes, ProcessID pid) {
 
 X11AppStateMonitor::ProcessesOf askingAll(const X11AppStateMonitor::IdentifierOf& identifierOf) {
     return [identifierOf](const BundleIdentifier& identifier) {
-        std::vector<ProcessID> found = x11::processesOfThisUser();
+        std::vector<ProcessID> found = processesOfThisUser();
         std::erase_if(found, [&](ProcessID process) { return identifierOf(process) != identifier; });
         return found;
     };
@@ -88,7 +90,7 @@ bool X11AppStateMonitor::isToolInFront(X11Connection& connection, const std::vec
         if (contains(processes, owner)) return false;
     if (!active) return true;
     return std::any_of(processes.begin(), processes.end(),
-                       [&](ProcessID process) { return contains(x11::ancestorsOf(process), *active); });
+                       [&](ProcessID process) { return descendsFrom(process, *active); });
 }
 
 void X11AppStateMonitor::setHandler(Handler handler) {
@@ -131,7 +133,7 @@ std::optional<ProcessID> X11AppStateMonitor::frontProcess(X11Connection& connect
     return window == XCB_NONE ? std::nullopt : x11::ownerOf(connection, window);
 }
 
-x11::HeldProcess* X11AppStateMonitor::remembered(ProcessID pid) {
+HeldProcess* X11AppStateMonitor::remembered(ProcessID pid) {
     const auto found =
         std::find_if(seen_.begin(), seen_.end(), [&](const auto& process) { return process.pid() == pid; });
     return found == seen_.end() ? nullptr : &*found;
@@ -139,8 +141,8 @@ x11::HeldProcess* X11AppStateMonitor::remembered(ProcessID pid) {
 
 /// False for one that has ended.
 bool X11AppStateMonitor::remember(ProcessID pid) {
-    if (const x11::HeldProcess* const known = remembered(pid)) return !known->ended();
-    auto process = x11::HeldProcess::hold(pid);
+    if (const HeldProcess* const known = remembered(pid)) return !known->hasEnded();
+    auto process = HeldProcess::hold(pid);
     if (!process) return false;
     if (seen_.size() >= kMostSeen) {
         // The one that has been there for the longest time, but never the one in front.
@@ -182,15 +184,15 @@ void X11AppStateMonitor::lookForChange(X11Connection& connection) {
     if (now == front_) return;
     const auto before = std::exchange(front_, now);
     // One that has ended is told of when its end is seen.
-    const x11::HeldProcess* const left = before ? remembered(*before) : nullptr;
-    if (left != nullptr && !left->ended() && !(now && areOneApplication(*before, *now)))
+    const HeldProcess* const left = before ? remembered(*before) : nullptr;
+    if (left != nullptr && !left->hasEnded() && !(now && areOneApplication(*before, *now)))
         tell(kRunningBackground, false, *before);
     if (now) tell(kRunningForeground, true, *now);
 }
 
 std::vector<int> X11AppStateMonitor::descriptors() {
     std::vector<int> all;
-    for (const x11::HeldProcess& process : seen_) all.push_back(process.descriptor());
+    for (const HeldProcess& process : seen_) all.push_back(process.descriptor());
     return all;
 }
 

@@ -10,8 +10,8 @@
 #include <vector>
 
 #include "linux/display/ActiveWindow.h"
-#include "linux/display/Processes.h"
 #include "linux/display/QuestionLane.h"
+#include "linux/system/HeldProcess.h"
 #include "platform/AppStateMonitor.h"
 #include "platform/Scheduler.h"
 
@@ -58,7 +58,7 @@ private:
 
     void watch(x11::X11Connection* connection, bool wanted);
     std::optional<ProcessID> frontProcess(x11::X11Connection& connection);
-    x11::HeldProcess* remembered(ProcessID pid);
+    HeldProcess* remembered(ProcessID pid);
     bool remember(ProcessID pid);
     void rememberOwnersOfWindows(x11::X11Connection& connection);
     bool areOneApplication(ProcessID one, ProcessID other) const;
@@ -80,7 +80,7 @@ private:
     std::unique_ptr<x11::ActiveWindow> activeWindow_;
     bool watching_ = false;
     std::optional<ProcessID> front_;
-    std::vector<x11::HeldProcess> seen_;  ///< those with windows that have not ended
+    std::vector<HeldProcess> seen_;  ///< those with windows that have not ended
 
     std::unique_ptr<x11::QuestionLane> lane_;  // last: its thread uses what stands above
 };

@@ -2,20 +2,19 @@
 
 #include <optional>
 
-#include "linux/display/Processes.h"
 #include "linux/display/WindowOwner.h"
+#include "linux/system/HeldProcess.h"
 
 namespace lumacast {
 namespace {
 
-using x11::HeldProcess;
 using x11::X11Connection;
 
 class X11ClientPort final : public ClientPort {
 public:
     explicit X11ClientPort(std::shared_ptr<const HeldProcess> owner) : owner_(std::move(owner)) {}
     std::optional<ProcessID> processIdentifier() override {
-        if (owner_->ended()) return std::nullopt;
+        if (owner_->hasEnded()) return std::nullopt;
         return owner_->pid();
     }
 

@@ -1,4 +1,4 @@
-#include "linux/system/ParentProcess.h"
+#include "linux/system/Ancestors.h"
 
 #include <fcntl.h>
 #include <unistd.h>
@@ -12,6 +12,12 @@
 
 namespace lumacast {
 
+namespace {
+
+constexpr int kMostAncestors = 64;
+
+}  // namespace
+
 // The fourth field of /proc/<pid>/stat; the second one is a name in parentheses that may contain anything.
 ProcessID parentOf(ProcessID pid) {
     const FileDescriptor file(::open(("/proc/" + std::to_string(number(pid)) + "/stat").c_str(), O_RDONLY | O_CLOEXEC));
@@ -24,6 +30,14 @@ ProcessID parentOf(ProcessID pid) {
     std::int32_t parent = 0;
     std::from_chars(text.data() + name + 4, text.data() + text.size(), parent);
     return ProcessID{parent};
+}
+
+bool descendsFrom(ProcessID pid, ProcessID ancestor) {
+    for (int step = 0; step < kMostAncestors && number(pid) > 0; ++step) {
+        pid = parentOf(pid);
+        if (pid == ancestor) return true;
+    }
+    return false;
 }
 
 }  // namespace lumacast

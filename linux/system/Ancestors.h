@@ -7,4 +7,7 @@ namespace lumacast {
 /// thread; waits for nobody.
 ProcessID parentOf(ProcessID pid);
 
+/// Whether `ancestor` is the process's parent, its parent or so on, 64 of them at most. The same.
+bool descendsFrom(ProcessID pid, ProcessID ancestor);
+
 }  // namespace lumacast
