@@ -36,13 +36,22 @@ TapCore::TapCore(TapServices services, const AudioFormat& format, AudioInputQueu
       callback_(std::make_shared<const AudioInputQueue::InputCallback>(std::move(callback))) {}
 
 std::int32_t TapCore::setProcessTap(ProcessID pid) {
-    const std::lock_guard lock(mutex_);
-    if (disposed_) return AudioStatus::kDisposed;
-    if (running_) return AudioStatus::kBadState;
+    {
+        const std::lock_guard lock(mutex_);
+        if (const std::int32_t refused = whyNoNewTapLocked(); refused != AudioStatus::kSuccess) return refused;
+    }
+    // Without the lock: the source may have to look for what the process is. Meanwhile everything may have changed.
     auto process = services_.source->hold(pid);
     if (!process) return AudioStatus::kNoSuchProcess;
-    process_ = std::move(process);
+    const std::lock_guard lock(mutex_);
+    if (const std::int32_t refused = whyNoNewTapLocked(); refused != AudioStatus::kSuccess) return refused;
+    std::swap(process_, process);
     return AudioStatus::kSuccess;
+}
+
+std::int32_t TapCore::whyNoNewTapLocked() const {
+    if (disposed_) return AudioStatus::kDisposed;
+    return running_ ? AudioStatus::kBadState : AudioStatus::kSuccess;
 }
 
 std::int32_t TapCore::streamFormat(AudioFormat& format) const {

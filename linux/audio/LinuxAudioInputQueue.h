@@ -52,6 +52,7 @@ private:
     using Lock = std::unique_lock<std::mutex>;
 
     Allocated* findLocked(const AudioQueueBufferRef& buffer);
+    std::int32_t whyNoNewTapLocked() const;
     void stopLocked();
     bool openTapLocked();
     void closeTapLocked();

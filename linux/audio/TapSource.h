@@ -25,11 +25,11 @@ public:
     virtual std::unique_ptr<Listening> listen(std::shared_ptr<TapMix> mix) = 0;
 };
 
-/// What the processes of this machine play. Callable from any thread; waits for nobody.
+/// What the processes of this machine play. Callable from any thread.
 class TapSource {
 public:
     virtual ~TapSource() = default;
-    /// Null for a process that does not run.
+    /// Null for a process that does not run. May take a moment, where it has to be found out what the process is.
     virtual std::shared_ptr<TappedProcess> hold(ProcessID pid) = 0;
     /// From now on nothing is heard any more, and nobody is asked anything.
     virtual void end() {}
