@@ -8,6 +8,7 @@
 #include <string_view>
 
 #include "platform/Scheduler.h"
+#include "platform/StandingAlerts.h"
 #include "platform/UserAlert.h"
 
 namespace lumacast::headless {
@@ -34,16 +35,14 @@ public:
     std::shared_ptr<UserAlert> show(const AlertContent& content) override;
 
     /// How many stand there.
-    std::size_t standing() const;
+    std::size_t standing() const { return alerts_.count(); }
     /// Answers the oldest alert that stands; false when there is none.
-    bool answer(Response response);
+    bool answer(Response response) { return alerts_.answer(response); }
 
 private:
-    class Alert;
-    struct Standing;
     const Consent consent_;
     const Note note_;
-    const std::shared_ptr<Standing> standing_;
+    StandingAlerts alerts_;
 };
 
 }  // namespace lumacast::headless
