@@ -126,11 +126,14 @@ private:
 /// A started daemon with the question to the user suppressed.
 class DaemonWorld : public ::testing::Test {
 protected:
+    /// Movies in memory keep their pictures.
+    static constexpr int kManyPlanes = 1 << 20;
+
     /// `prepare` installs what the daemon reads when it starts.
     explicit DaemonWorld(void (*prepare)(FakePlatform&) = nullptr) {
         if (prepare) prepare(fakes_);
         fakes_.preferences.set(kPreferenceDomain, "LCSuppressAlert", true);
-        fakes_.displayCapture.setPlanes(1 << 20);  // movies in memory keep their pictures
+        fakes_.displayCapture.setPlanes(kManyPlanes);
         process_ = std::make_unique<Process>(fakes_.platform());
         world_.scheduler.mainQueue().sync([this] { process_->start(); });
     }

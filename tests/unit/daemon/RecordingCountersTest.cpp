@@ -29,9 +29,14 @@ TEST_F(RecordingCounters, AreThatRecordingsThoughItsSourceIsOlder) {
     const auto client = makeRecording();
     const auto source = fakes_.displayCapture.lastSource();
     advance(seconds(2));
+    fakes_.displayCapture.setPlanes(0);
+    advance(seconds(1));
+    fakes_.displayCapture.setPlanes(kManyPlanes);
     const auto first = source->counters();
     EXPECT_GT(first.delivered, 10u);
+    EXPECT_GT(first.dropped, 10u);
     EXPECT_EQ(figure("framesDelivered"), first.delivered);
+    EXPECT_EQ(figure("framesDropped"), first.dropped);
     client->ask(DaemonMessage::StopRecording);
     settle();
     client->start();
@@ -39,6 +44,11 @@ TEST_F(RecordingCounters, AreThatRecordingsThoughItsSourceIsOlder) {
     ASSERT_EQ(fakes_.displayCapture.lastSource(), source);
     EXPECT_LT(figure("framesDelivered"), first.delivered / 2);
     EXPECT_EQ(figure("framesDelivered"), source->counters().delivered - first.delivered);
+    EXPECT_EQ(figure("framesDropped"), 0u);
+    fakes_.displayCapture.setPlanes(0);
+    advance(seconds(1));
+    fakes_.displayCapture.setPlanes(kManyPlanes);
+    EXPECT_GT(figure("framesDropped"), 10u);
     EXPECT_EQ(figure("framesDropped"), source->counters().dropped - first.dropped);
 }
 
