@@ -90,6 +90,7 @@ std::optional<Error> FileRemovals::perform(const std::string& key, const Removal
     auto error =
         removal.user ? fileSystem_.removeForUser(*removal.user, removal.path) : fileSystem_.remove(removal.path);
     if (error && saysNothingIsThere(*error)) return std::nullopt;
+    // Deliberately another prefix than the operation's.
     if (error) log_.line("_lxRemoveFile error: %i", error->code());
     return error;
 }

@@ -127,6 +127,7 @@ void TempStore::_srMoveFileFromURL(const URL& from, const URL& to, Completion co
     default_.async([&log = log_, &fileSystem = fileSystem_, from, to, completion = std::move(completion)] {
         (void)fileSystem.remove(to.path());  // deliberately ignored: the move tells
         auto error = fileSystem.move(from.path(), to.path());
+        // Deliberately another prefix than the operation's.
         if (error) log.error("_lxMoveFileFromURL error: %i", error->code());
         if (completion) completion(std::move(error));
     });
@@ -138,6 +139,7 @@ void TempStore::_srDeleteFilesWithPrefix(const std::string& prefix) {
         const auto* names = std::get_if<std::vector<std::string>>(&listed);
         for (const std::string& name : names ? *names : std::vector<std::string>()) {
             if (!beginsWithCaseAndDiacriticInsensitive(name, prefix)) continue;
+            // Deliberately another prefix than the operation's.
             if (const auto error = fileSystem.remove(directory + "/" + name))
                 log.line("_lxDeleteFilesWithPrefix error: %i", error->code());
         }

@@ -57,10 +57,11 @@ public:
     bool isClaimedAfter(const std::string& path, std::uint64_t claim) const {
         return removals_->isClaimedAfter(path, claim);
     }
-    /// `_srMoveFileFromURL:toURL:completion:` — moves a file on the default queue, over one that is there.
+    /// `_srMoveFileFromURL:toURL:completion:` — moves a file on the default queue, over one that is there. Nothing
+    /// uses it.
     void _srMoveFileFromURL(const URL& from, const URL& to, Completion completion);
     /// `_srDeleteFilesWithPrefix:` — deletes, on the default queue, all files whose names begin with it, case and
-    /// diacritics aside.
+    /// diacritics aside. Nothing uses it.
     void _srDeleteFilesWithPrefix(const std::string& prefix);
     /// `_srGetCreationDateForFile:` — none when it can't be read.
     std::optional<Date> _srGetCreationDateForFile(const URL& url) const;
