@@ -1,12 +1,10 @@
 #include "client/Link.h"
 
-#include <pthread.h>
-#include <signal.h>
-
 #include <algorithm>
 #include <cerrno>
 
 #include "base/Limits.h"
+#include "linux/ipc/QuietThread.h"
 
 namespace lumacast::client {
 
@@ -54,14 +52,7 @@ Link::Link(Events events, const std::string& runtimeDirectory)
 void Link::open() {
     reactor_.async([this] { connect(); });
     // Signals are the application's: its handlers don't run here.
-    sigset_t all, before;
-    sigfillset(&all);
-    pthread_sigmask(SIG_SETMASK, &all, &before);
-    struct Restore {
-        const sigset_t& mask;
-        ~Restore() { pthread_sigmask(SIG_SETMASK, &mask, nullptr); }
-    } restore{before};
-    thread_ = std::thread([self = shared_from_this()] { self->reactor_.run(); });
+    thread_ = quietThread([self = shared_from_this()] { self->reactor_.run(); });
 }
 
 void Link::close() {

@@ -1,7 +1,6 @@
 #include "client/extension/Extension.h"
 
 #include <fcntl.h>
-#include <pthread.h>
 #include <signal.h>
 #include <sys/socket.h>
 
@@ -14,6 +13,7 @@
 #include "client/extension/DaemonLink.h"
 #include "client/extension/HostLink.h"
 #include "client/extension/World.h"
+#include "linux/ipc/QuietThread.h"
 
 namespace lumacast::extension {
 
@@ -28,18 +28,6 @@ Fd socketOf(int descriptor) {
     if (::getsockopt(descriptor, SOL_SOCKET, SO_TYPE, &type, &size) != 0 || type != SOCK_STREAM) return Fd();
     ::fcntl(descriptor, F_SETFD, FD_CLOEXEC);
     return Fd(descriptor);
-}
-
-/// The thread of the sockets. Signals are the extension's own.
-std::thread reactorThread(Reactor& reactor) {
-    sigset_t all, before;
-    sigfillset(&all);
-    pthread_sigmask(SIG_SETMASK, &all, &before);
-    struct Restore {
-        const sigset_t& mask;
-        ~Restore() { pthread_sigmask(SIG_SETMASK, &mask, nullptr); }
-    } restore{before};
-    return std::thread([&reactor] { reactor.run(); });
 }
 
 }  // namespace
@@ -72,7 +60,8 @@ int run(Handler& handler, Options options) {
         host->open(std::move(requests), gone);
         daemon->open(std::move(auxiliary), gone);
     });
-    std::thread thread = reactorThread(world->reactor);
+    // The thread of the sockets. Signals are the extension's own.
+    std::thread thread = quietThread([&reactor = world->reactor] { reactor.run(); });
     world->lane.run();
     handler.ended();
     world->reactor.async([&] {

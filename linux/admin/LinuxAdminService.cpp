@@ -1,8 +1,6 @@
 #include "linux/admin/LinuxAdminService.h"
 
 #include <poll.h>
-#include <pthread.h>
-#include <signal.h>
 #include <sys/eventfd.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
@@ -15,10 +13,10 @@
 #include <mutex>
 #include <set>
 #include <sstream>
-#include <system_error>
 #include <vector>
 
 #include "linux/admin/UnixSocket.h"
+#include "linux/ipc/QuietThread.h"
 #include "linux/system/Json.h"
 
 namespace lumacast {
@@ -308,23 +306,11 @@ void LinuxAdminService::resume(std::function<Dictionary()> snapshot) {
     FileDescriptor listener = listenAt(socketPath_, reason);
     if (listener) {
         server_ = std::make_unique<Server>(scheduler_, limits_, commands_, std::move(snapshot), std::move(listener));
-        if (server_->isComplete()) startThread();
+        // isAnswering() tells whether there was a thread to be had.
+        if (server_->isComplete()) thread_ = quietThreadIfAny([server = server_.get()] { server->run(); });
         if (!thread_.joinable()) reason = "no thread or no descriptor is left";
     }
     if (!thread_.joinable() && unavailable_) unavailable_(reason);
-}
-
-void LinuxAdminService::startThread() {
-    sigset_t all;
-    sigset_t before;
-    sigfillset(&all);
-    pthread_sigmask(SIG_SETMASK, &all, &before);  // signals belong to the termination thread
-    try {
-        thread_ = std::thread([server = server_.get()] { server->run(); });
-    } catch (const std::system_error&) {
-        // isAnswering() tells.
-    }
-    pthread_sigmask(SIG_SETMASK, &before, nullptr);
 }
 
 std::optional<std::string> askAdminService(const std::string& socketPath, std::string_view request,

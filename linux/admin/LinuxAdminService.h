@@ -46,8 +46,6 @@ public:
 private:
     class Server;
 
-    void startThread();
-
     Scheduler& scheduler_;
     const std::string socketPath_;
     const Limits limits_;

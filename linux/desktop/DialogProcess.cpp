@@ -11,6 +11,9 @@
 #include <cerrno>
 #include <initializer_list>
 
+#include "linux/ipc/QuietThread.h"
+#include "linux/system/WordPointers.h"
+
 namespace lumacast {
 namespace {
 
@@ -33,13 +36,6 @@ Pipe makePipe() {
     pipe.read = moved(ends[0]);
     pipe.write = moved(ends[1]);
     return pipe;
-}
-
-std::vector<char*> pointersTo(const std::vector<std::string>& words) {
-    std::vector<char*> pointers;
-    for (const std::string& word : words) pointers.push_back(const_cast<char*>(word.c_str()));
-    pointers.push_back(nullptr);
-    return pointers;
 }
 
 /// Everything the new process needs, made before the fork: behind it only what is safe in a signal handler may run.
@@ -93,13 +89,12 @@ std::unique_ptr<DialogProcess> DialogProcess::start(const Command& command) {
     std::vector<char*> arguments = pointersTo(command.arguments), environment = pointersTo(command.environment);
     const Start start{command.path.c_str(), arguments.data(),    environment.data(), null.get(),
                       output.write.get(),   failure.write.get(), ::getpid()};
-    // No handler of this process may run in the other one.
-    sigset_t all, before;
-    ::sigfillset(&all);
-    ::pthread_sigmask(SIG_SETMASK, &all, &before);
-    const pid_t pid = ::fork();
-    if (pid == 0) becomeProgram(start);
-    ::pthread_sigmask(SIG_SETMASK, &before, nullptr);
+    pid_t pid = -1;
+    {
+        const SignalsBlocked blocked;  // no handler of this process may run in the other one
+        pid = ::fork();
+        if (pid == 0) becomeProgram(start);
+    }
     if (pid < 0) return nullptr;
     output.write.reset();
     failure.write.reset();

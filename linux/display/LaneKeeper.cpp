@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <system_error>
 
-#include "linux/display/QuietThread.h"
+#include "linux/ipc/QuietThread.h"
 
 namespace lumacast::x11 {
 

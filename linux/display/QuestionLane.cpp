@@ -5,7 +5,7 @@
 
 #include <chrono>
 
-#include "linux/display/QuietThread.h"
+#include "linux/ipc/QuietThread.h"
 
 namespace lumacast::x11 {
 namespace {

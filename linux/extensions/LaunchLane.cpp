@@ -1,7 +1,6 @@
 #include "linux/extensions/LaunchLane.h"
 
 #include <fcntl.h>
-#include <pthread.h>
 #include <signal.h>
 #include <spawn.h>
 #include <sys/syscall.h>
@@ -11,19 +10,15 @@
 #include <cerrno>
 #include <utility>
 
+#include "linux/ipc/QuietThread.h"
+#include "linux/system/WordPointers.h"
+
 namespace lumacast {
 
 namespace {
 
 constexpr int kFirst = 3;
 constexpr int kLowestOwn = 32;  // above what the program is given: moving one there can't hit another
-
-std::vector<char*> pointersTo(const std::vector<std::string>& words) {
-    std::vector<char*> pointers;
-    for (const std::string& word : words) pointers.push_back(const_cast<char*>(word.c_str()));
-    pointers.push_back(nullptr);
-    return pointers;
-}
 
 FileDescriptor moved(int descriptor) {
     return FileDescriptor(::fcntl(descriptor, F_DUPFD_CLOEXEC, kLowestOwn));
@@ -79,14 +74,7 @@ Started perform(const Start& start) {
 
 }  // namespace
 
-LaunchLane::LaunchLane() {
-    // The signals belong to the thread that waits for them.
-    sigset_t all, before;
-    ::sigfillset(&all);
-    ::pthread_sigmask(SIG_SETMASK, &all, &before);
-    thread_ = std::thread([this] { run(); });
-    ::pthread_sigmask(SIG_SETMASK, &before, nullptr);
-}
+LaunchLane::LaunchLane() : thread_(quietThread([this] { run(); })) {}
 
 LaunchLane::~LaunchLane() {
     {

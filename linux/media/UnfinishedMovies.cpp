@@ -1,11 +1,8 @@
 #include "linux/media/UnfinishedMovies.h"
 
-#include <pthread.h>
-#include <signal.h>
-
 #include <cerrno>
-#include <system_error>
 
+#include "linux/ipc/QuietThread.h"
 #include "linux/media/mp4/MovieRecovery.h"
 #include "linux/system/LowPriority.h"
 #include "linux/system/SystemError.h"
@@ -28,20 +25,12 @@ void UnfinishedMovies::remember() {
 }
 
 void UnfinishedMovies::begin(std::function<void()> afterwards) {
-    sigset_t all;
-    sigset_t before;
-    sigfillset(&all);
-    pthread_sigmask(SIG_SETMASK, &all, &before);  // signals belong to the termination thread
-    try {
-        thread_ = std::thread([this, afterwards = std::move(afterwards)] {
-            runAtLowPriority();
-            run();
-            if (afterwards && !cancelled_.load(std::memory_order_relaxed)) afterwards();
-        });
-    } catch (const std::system_error&) {
-        // The next start has another try.
-    }
-    pthread_sigmask(SIG_SETMASK, &before, nullptr);
+    // Without a thread the next start has another try.
+    thread_ = quietThreadIfAny([this, afterwards = std::move(afterwards)] {
+        runAtLowPriority();
+        run();
+        if (afterwards && !cancelled_.load(std::memory_order_relaxed)) afterwards();
+    });
 }
 
 void UnfinishedMovies::wait() {

@@ -13,19 +13,13 @@
 #include <cerrno>
 
 #include "linux/system/FileDescriptor.h"
+#include "linux/system/WordPointers.h"
 
 namespace lumacast {
 
 namespace {
 
 using Clock = std::chrono::steady_clock;
-
-std::vector<char*> pointersTo(std::vector<std::string>& words) {
-    std::vector<char*> pointers;
-    for (std::string& word : words) pointers.push_back(word.data());
-    pointers.push_back(nullptr);
-    return pointers;
-}
 
 /// A child process in a group of its own, killed and reaped with this object.
 class Child final {

@@ -2,17 +2,16 @@
 
 #include <poll.h>
 #include <pthread.h>
-#include <signal.h>
 #include <sys/eventfd.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cstdint>
 #include <mutex>
-#include <system_error>
 #include <thread>
 #include <utility>
 
+#include "linux/ipc/QuietThread.h"
 #include "linux/system/LoginLocks.h"
 
 namespace lumacast {
@@ -49,16 +48,7 @@ private:
     }
 
     /// Where the system has no thread left the device is simply not kept awake; the next busy moment tries again.
-    void start() {
-        sigset_t all, before;
-        sigfillset(&all);
-        pthread_sigmask(SIG_SETMASK, &all, &before);  // signals belong to the termination thread
-        try {
-            thread_ = std::thread([this] { run(); });
-        } catch (const std::system_error&) {
-        }
-        pthread_sigmask(SIG_SETMASK, &before, nullptr);
-    }
+    void start() { thread_ = quietThreadIfAny([this] { run(); }); }
 
     void run() {
         pthread_setname_np(pthread_self(), "lc-inhibit");

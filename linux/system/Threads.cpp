@@ -1,35 +1,15 @@
 #include "linux/system/Threads.h"
 
-#include <pthread.h>
-#include <signal.h>
-
 #include <cerrno>
-#include <system_error>
 #include <thread>
+#include <utility>
+
+#include "linux/ipc/QuietThread.h"
 
 namespace lumacast {
 
-namespace {
-
-/// A thread without signals; one that is not joinable when there was none to be had.
-std::thread startThread(std::function<void()> body) {
-    sigset_t all;
-    sigset_t before;
-    sigfillset(&all);
-    pthread_sigmask(SIG_SETMASK, &all, &before);
-    std::thread thread;
-    try {
-        thread = std::thread(std::move(body));
-    } catch (const std::system_error&) {
-    }
-    pthread_sigmask(SIG_SETMASK, &before, nullptr);
-    return thread;
-}
-
-}  // namespace
-
 bool startDetachedThread(std::function<void()> body) {
-    std::thread thread = startThread(std::move(body));
+    std::thread thread = quietThreadIfAny(std::move(body));
     if (!thread.joinable()) return false;
     thread.detach();
     return true;
@@ -37,7 +17,7 @@ bool startDetachedThread(std::function<void()> body) {
 
 int performOnOwnThread(const std::function<int()>& action) {
     int result = 0;
-    std::thread thread = startThread([&] { result = action(); });
+    std::thread thread = quietThreadIfAny([&] { result = action(); });
     if (!thread.joinable()) return EAGAIN;
     thread.join();
     return result;
