@@ -7,8 +7,8 @@
 #include <cstdlib>
 #include <string_view>
 
-#include "linux/system/IniFile.h"
 #include "linux/system/SmallFile.h"
+#include "linux/system/ThemeFiles.h"
 
 namespace lumacast {
 
@@ -17,7 +17,6 @@ namespace {
 constexpr const char* kDefaultTheme = "hicolor";
 constexpr std::size_t kMaximumThemes = 16;
 constexpr std::size_t kMaximumFolders = 1024;
-constexpr std::size_t kMaximumSettingsBytes = 256 * 1024;
 constexpr std::size_t kMaximumIconBytes = 1024 * 1024;
 constexpr std::string_view kPng("\x89PNG\r\n\x1a\n", 8);
 constexpr std::string_view kEnding = ".png";
@@ -30,39 +29,6 @@ struct Setting {
 constexpr std::array kThemeSettings{Setting{"kdeglobals", "Icons", "Theme"},
                                     Setting{"gtk-4.0/settings.ini", "Settings", "gtk-icon-theme-name"},
                                     Setting{"gtk-3.0/settings.ini", "Settings", "gtk-icon-theme-name"}};
-
-/// Whether it names something in a folder, and nothing outside.
-bool isPlainName(std::string_view name) {
-    return !name.empty() && name.size() <= 255 && name.front() != '.' && name.find('/') == std::string_view::npos &&
-           name.find('\0') == std::string_view::npos;
-}
-
-bool isPlainPath(std::string_view path) {
-    while (true) {
-        const std::size_t slash = path.find('/');
-        if (!isPlainName(path.substr(0, slash))) return false;
-        if (slash == std::string_view::npos) return true;
-        path.remove_prefix(slash + 1);
-    }
-}
-
-std::vector<std::string> listed(std::string_view text) {
-    std::vector<std::string> items;
-    while (!text.empty() && items.size() < kMaximumFolders) {
-        const std::size_t end = text.find_first_of(",;");
-        std::string_view item = text.substr(0, end);
-        while (item.starts_with(' ')) item.remove_prefix(1);
-        while (item.ends_with(' ')) item.remove_suffix(1);
-        if (!item.empty()) items.emplace_back(item);
-        text.remove_prefix(end == std::string_view::npos ? text.size() : end + 1);
-    }
-    return items;
-}
-
-std::optional<IniFile> settingsOf(const std::string& path) {
-    const auto file = readSmallFile(path, kMaximumSettingsBytes);
-    return file ? std::optional(IniFile::parse(file->text)) : std::nullopt;
-}
 
 int numberIn(const IniFile& index, const std::string& section, const char* key, int otherwise) {
     const std::string* text = index.find(section, key);
@@ -88,7 +54,7 @@ struct IconThemes::Theme {
 std::string IconThemes::currentTheme() const {
     for (const Setting& setting : kThemeSettings)
         for (const std::string& directory : configDirectories) {
-            const auto settings = settingsOf(directory + "/" + setting.file);
+            const auto settings = settingsAt(directory + "/" + setting.file);
             const std::string* const theme = settings ? settings->find(setting.section, setting.key) : nullptr;
             if (theme && isPlainName(*theme)) return *theme;
         }
@@ -105,12 +71,13 @@ std::vector<std::string> IconThemes::places() const {
 IconThemes::Theme IconThemes::read(const std::string& name) const {
     Theme theme{name, {}, {}};
     for (const std::string& place : places()) {
-        const auto index = settingsOf(place + "/" + name + "/index.theme");
+        const auto index = settingsAt(place + "/" + name + "/index.theme");
         if (!index) continue;
         // The first description counts; the icons themselves may lie in any of the places.
-        if (const std::string* parents = index->find("Icon Theme", "Inherits")) theme.parents = listed(*parents);
+        if (const std::string* parents = index->find("Icon Theme", "Inherits"))
+            theme.parents = listedIn(*parents, kMaximumFolders);
         const std::string* const folders = index->find("Icon Theme", "Directories");
-        for (const std::string& path : folders ? listed(*folders) : std::vector<std::string>{}) {
+        for (const std::string& path : folders ? listedIn(*folders, kMaximumFolders) : std::vector<std::string>{}) {
             const int size = numberIn(*index, path, "Size", 0);
             if (!isPlainPath(path) || size == 0 || numberIn(*index, path, "Scale", 1) != 1) continue;
             const std::string* const type = index->find(path, "Type");

@@ -5,10 +5,8 @@
 #include <algorithm>
 #include <array>
 #include <optional>
-#include <string_view>
 
-#include "linux/system/IniFile.h"
-#include "linux/system/SmallFile.h"
+#include "linux/system/ThemeFiles.h"
 
 namespace lumacast::sound {
 
@@ -18,7 +16,6 @@ constexpr const char* kDefaultTheme = "freedesktop";
 constexpr std::size_t kMaximumThemes = 16;
 constexpr std::size_t kMaximumFolders = 64;
 constexpr std::size_t kMaximumFiles = 16;
-constexpr std::size_t kMaximumSettingsBytes = 256 * 1024;
 constexpr std::array kExtensions{".oga", ".ogg", ".wav"};
 
 struct Setting {
@@ -29,41 +26,6 @@ struct Setting {
 constexpr std::array kThemeSettings{Setting{"kdeglobals", "Sounds", "Theme"},
                                     Setting{"gtk-4.0/settings.ini", "Settings", "gtk-sound-theme-name"},
                                     Setting{"gtk-3.0/settings.ini", "Settings", "gtk-sound-theme-name"}};
-
-/// Whether it names something in a folder, and nothing outside.
-bool isPlainName(std::string_view name) {
-    return !name.empty() && name.size() <= 128 && name.front() != '.' && name.find('/') == std::string_view::npos &&
-           name.find('\0') == std::string_view::npos;
-}
-
-/// The same for a folder of a theme, which may have folders above it.
-bool isPlainPath(std::string_view path) {
-    if (path.size() > 256) return false;
-    while (true) {
-        const std::size_t slash = path.find('/');
-        if (!isPlainName(path.substr(0, slash))) return false;
-        if (slash == std::string_view::npos) return true;
-        path.remove_prefix(slash + 1);
-    }
-}
-
-std::vector<std::string> listed(std::string_view text) {
-    std::vector<std::string> items;
-    while (!text.empty() && items.size() < kMaximumFolders) {
-        const std::size_t end = text.find_first_of(",;");
-        std::string_view item = text.substr(0, end);
-        while (item.starts_with(' ')) item.remove_prefix(1);
-        while (item.ends_with(' ')) item.remove_suffix(1);
-        if (!item.empty()) items.emplace_back(item);
-        text.remove_prefix(end == std::string_view::npos ? text.size() : end + 1);
-    }
-    return items;
-}
-
-std::optional<IniFile> settingsOf(const std::string& path) {
-    const auto file = readSmallFile(path, kMaximumSettingsBytes);
-    return file ? std::optional(IniFile::parse(file->text)) : std::nullopt;
-}
 
 bool isFile(const std::string& path) {
     struct stat status {};
@@ -80,7 +42,7 @@ struct SoundThemes::Theme {
 std::string SoundThemes::currentTheme() const {
     for (const Setting& setting : kThemeSettings)
         for (const std::string& directory : configDirectories) {
-            const auto settings = settingsOf(directory + "/" + setting.file);
+            const auto settings = settingsAt(directory + "/" + setting.file);
             const std::string* const theme = settings ? settings->find(setting.section, setting.key) : nullptr;
             if (theme && isPlainName(*theme)) return *theme;
         }
@@ -90,12 +52,13 @@ std::string SoundThemes::currentTheme() const {
 SoundThemes::Theme SoundThemes::read(const std::string& name) const {
     Theme theme{name, {}, {}};
     for (const std::string& directory : dataDirectories) {
-        const auto index = settingsOf(directory + "/sounds/" + name + "/index.theme");
+        const auto index = settingsAt(directory + "/sounds/" + name + "/index.theme");
         if (!index) continue;
         // The first description counts; the sounds themselves may lie in any of the data directories.
-        if (const std::string* parents = index->find("Sound Theme", "Inherits")) theme.parents = listed(*parents);
+        if (const std::string* parents = index->find("Sound Theme", "Inherits"))
+            theme.parents = listedIn(*parents, kMaximumFolders);
         const std::string* const folders = index->find("Sound Theme", "Directories");
-        for (const std::string& folder : folders ? listed(*folders) : std::vector<std::string>{}) {
+        for (const std::string& folder : folders ? listedIn(*folders, kMaximumFolders) : std::vector<std::string>{}) {
             const std::string* const profile = index->find(folder, "OutputProfile");
             if (isPlainPath(folder) && (!profile || *profile == "stereo")) theme.folders.push_back(folder);
         }
