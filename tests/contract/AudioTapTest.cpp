@@ -1,83 +1,24 @@
-// The tap against real sound servers, each private to its test.
-
-#include <gtest/gtest.h>
-#include <sys/resource.h>
+// Who is heard by a tap, and who is not.
 
 #include <algorithm>
+#include <cmath>
 #include <cstdio>
-#include <filesystem>
-#include <functional>
-#include <map>
-#include <utility>
+#include <mutex>
+#include <string>
 
-#include "linux/audio/LinuxAudioInputQueues.h"
-#include "linux/audio/PulseTaps.h"
-#include "linux/system/LinuxClock.h"
-#include "tests/contract/HeardSound.h"
-#include "tests/sound/PrivateSoundServer.h"
+#include "tests/contract/AudioTapFixture.h"
 
 namespace lumacast {
 namespace {
 
+using test::AudioTapTest;
+using test::expectNever;
 using test::HeardSound;
+using test::kHalf;
+using test::kOther;
+using test::kOwn;
+using test::kThird;
 using test::TonePlayer;
-
-using Begin = test::PrivateSoundServer::Begin;
-using Maker = std::function<std::unique_ptr<test::SoundServer>(Begin)>;
-
-class AudioTapTest : public ::testing::TestWithParam<Maker> {
-protected:
-    AudioTapTest() : AudioTapTest(Begin::Now) {}
-    explicit AudioTapTest(Begin begin) : server_(GetParam()(begin)) {
-        clock_.startCaptureClock();
-        clock_.captureClock()->run();
-    }
-
-    void SetUp() override { ASSERT_TRUE(server_->isThere()); }
-
-    std::unique_ptr<TonePlayer> play(double frequency, const std::vector<std::string>& options = {}) {
-        auto player = std::make_unique<TonePlayer>(server_->address(), options);
-        EXPECT_TRUE(player->isReady());
-        EXPECT_TRUE(player->tell("play a " + std::to_string(frequency) + " 0.5 2"));
-        return player;
-    }
-    std::unique_ptr<HeardSound> hear(ProcessID pid) { return std::make_unique<HeardSound>(queues_, pid); }
-
-    static std::shared_ptr<sound::PulseConnection> connectTo(const std::string& address) {
-        sound::PulseConnection::Options options;
-        options.server = address;
-        return std::make_shared<sound::PulseConnection>(options);
-    }
-
-    std::unique_ptr<test::SoundServer> server_;
-    LinuxClock clock_;
-    std::mutex familyMutex_;
-    std::map<ProcessID, std::string> family_;  ///< bundle identifiers by process
-    std::shared_ptr<sound::PulseConnection> connection_ = connectTo(server_->address());
-    LinuxAudioInputQueues queues_{
-        std::make_shared<sound::PulseTaps>(connection_, [this](ProcessID pid) -> std::optional<BundleIdentifier> {
-            const std::lock_guard lock(familyMutex_);
-            const auto found = family_.find(pid);
-            if (found == family_.end()) return std::nullopt;
-            return BundleIdentifier(found->second);
-        }), clock_};
-};
-
-class LateAudioTapTest : public AudioTapTest {
-protected:
-    LateAudioTapTest() : AudioTapTest(Begin::Later) {}
-    void SetUp() override { ASSERT_FALSE(server_->isThere()); }
-};
-
-constexpr double kOwn = 997, kOther = 1703, kThird = 2503;
-/// What they are played at.
-const double kHalf = 20 * std::log10(0.5);
-
-/// That of a tone not even 10 ms were heard, which would be above -30 dB. Another tone, cut off anywhere, reaches -50.
-void expectNever(const HeardSound& heard, double frequency) {
-    const auto sound = heard.sound();
-    EXPECT_EQ(checkers::checkToneAbsent(sound, frequency, -40, checkers::wholeOf(sound)), checkers::Findings{});
-}
 
 TEST_P(AudioTapTest, TwoApplicationsAreHeardApart) {
     const auto one = play(kOwn), other = play(kOther);
@@ -262,189 +203,6 @@ TEST_P(AudioTapTest, SeveralStreamsAreMixed) {
     EXPECT_TRUE(eventually([&] { return heard->level(kOther) < -70 && std::abs(heard->level(kOwn) - kHalf) < 0.5; }));
 }
 
-TEST_P(AudioTapTest, AServerThatDiesLeavesSilenceAndIsFollowedWhenItComesBack) {
-    const auto one = play(kOwn);
-    const auto heard = hear(one->pid());
-    ASSERT_TRUE(heard->waitForTone(kOwn));
-    server_->kill();
-    ASSERT_TRUE(heard->waitForSilence());
-    const std::size_t from = heard->waitFor(0.3);
-    ASSERT_NE(from, SIZE_MAX);
-    EXPECT_TRUE(heard->isSilent(from));
-    ASSERT_TRUE(server_->start());
-    // As applications do: it connects again. So does another one, which may have got any number of the first one's.
-    const auto other = play(kOther);
-    ASSERT_TRUE(one->tell("connect"));
-    ASSERT_TRUE(one->tell("play a 997 0.5 2"));
-    ASSERT_TRUE(heard->waitForTone(kOwn));
-    expectNever(*heard, kOther);
-    EXPECT_TRUE(test::holesIn(heard->pieces()).empty());
-}
-
-TEST_P(AudioTapTest, AServerThatHangsLeavesSilenceAndIsHeardAgain) {
-    const auto one = play(kOwn);
-    const auto heard = hear(one->pid());
-    ASSERT_TRUE(heard->waitForTone(kOwn));
-    server_->hang();
-    ASSERT_TRUE(heard->waitForSilence());
-    server_->goOn();
-    EXPECT_TRUE(heard->waitForTone(kOwn));
-    EXPECT_TRUE(test::holesIn(heard->pieces()).empty());
-}
-
-TEST_P(LateAudioTapTest, AServerThatComesLaterIsJoinedWithoutLookingForIt) {
-    sound::PulseConnection::Options options;
-    options.server = server_->address();
-    options.firstRetry = options.slowestRetry = options.slowestWithoutSocket = std::chrono::hours(1);
-    LinuxAudioInputQueues queues(std::make_shared<sound::PulseTaps>(std::make_shared<sound::PulseConnection>(options), nullptr),
-                                 clock_);
-    TonePlayer one(server_->address(), {"--later"});
-    ASSERT_TRUE(one.isReady());
-    const HeardSound heard(queues, one.pid());
-    ASSERT_NE(heard.waitFor(0.3), SIZE_MAX);
-    ASSERT_TRUE(server_->start());
-    ASSERT_TRUE(one.tell("connect"));
-    ASSERT_TRUE(one.tell("play a 997 0.5 2"));
-    EXPECT_TRUE(heard.waitForTone(kOwn));
-}
-
-TEST_P(LateAudioTapTest, AServerThatComesLaterIsJoined) {
-    TonePlayer one(server_->address(), {"--later"});
-    ASSERT_TRUE(one.isReady());
-    const auto heard = hear(one.pid());
-    ASSERT_NE(heard->waitFor(0.3), SIZE_MAX) << "silence comes without a server";
-    EXPECT_TRUE(heard->isSilent(0));
-    ASSERT_TRUE(server_->start());
-    ASSERT_TRUE(one.tell("connect"));
-    ASSERT_TRUE(one.tell("play a 997 0.5 2"));
-    EXPECT_TRUE(heard->waitForTone(kOwn));
-    EXPECT_TRUE(test::holesIn(heard->pieces()).empty());
-}
-
-TEST_P(AudioTapTest, ABeepIsStampedWithTheTimeAtWhichItWasHeard) {
-    TonePlayer one(server_->address());
-    ASSERT_TRUE(one.tell("play a 997 0.05 2"));
-    const auto heard = hear(one.pid());
-    ASSERT_TRUE(heard->waitForTone(kOwn, -40));
-    std::vector<double> errors;
-    std::string text;
-    for (int beep = 0; beep < 5; ++beep) {
-        heard->waitFor(0.1);
-        const std::int64_t played = one.beep("a");
-        ASSERT_NE(played, 0);
-        const auto onsets = [&] { return checkers::beepOnsets(heard->sound(), kOwn, -6); };
-        ASSERT_TRUE(eventually([&] { return onsets().size() == static_cast<std::size_t>(beep + 1); }))
-            << beep << ": " << onsets().size() << " beeps heard";
-        // The capture clock has run all the time: what it says now gives its zero.
-        const std::int64_t zero = LinuxClock::currentHostTime().nanoseconds - clock_.captureClock()->now().value;
-        const auto begin = static_cast<std::int64_t>(heard->pieces().front().start.hostTime);
-        errors.push_back(static_cast<double>(zero + begin + onsets().back().count() - played) / 1e6);
-        text += " " + std::to_string(errors.back()).substr(0, 5);
-    }
-    std::printf("%s: beeps stamped%s ms after the player's account\n", server_->name().c_str(), text.c_str());
-    for (const double error : errors) EXPECT_LT(std::abs(error), 25) << "a picture at 40 a second";
-    // On a busy machine single accounts come late.
-    std::sort(errors.begin(), errors.end());
-    EXPECT_LT(std::abs(errors[errors.size() / 2]), 5);
-}
-
-TEST_P(AudioTapTest, ATapCostsLittle) {
-    const auto one = play(kOwn);
-    const auto heard = hear(one->pid());
-    ASSERT_TRUE(heard->waitForTone(kOwn));
-    heard->waitFor(0.3);
-    rusage before{}, after{};
-    ::getrusage(RUSAGE_SELF, &before);
-    heard->waitFor(1);
-    ::getrusage(RUSAGE_SELF, &after);
-    const auto seconds = [](const rusage& usage) {
-        return static_cast<double>(usage.ru_utime.tv_sec + usage.ru_stime.tv_sec) +
-               static_cast<double>(usage.ru_utime.tv_usec + usage.ru_stime.tv_usec) / 1e6;
-    };
-    // The test's own polling (200 times a second) is in it.
-    const double share = (seconds(after) - seconds(before)) * 100;
-    const double switches = static_cast<double>(after.ru_nvcsw - before.ru_nvcsw);
-    std::printf("%s: %.2f %% of a core, %.0f wake-ups a second, of which the test's own about 200\n",
-                server_->name().c_str(), share, switches);
-    EXPECT_LT(share, 10);
-}
-
-TEST_P(AudioTapTest, WithoutAQueueThereIsNoThread) {
-    EXPECT_FALSE(connection_->hasThread());
-    {
-        const auto one = play(kOwn);
-        const auto heard = hear(one->pid());
-        ASSERT_TRUE(heard->waitForTone(kOwn));
-        EXPECT_TRUE(connection_->hasThread());
-    }
-    EXPECT_TRUE(eventually([this] { return !connection_->hasThread(); }));
-}
-
-TEST_P(AudioTapTest, ACallbackThatOwnsItsQueueEndsItWithoutATrace) {
-    const auto threads = [] {
-        const std::filesystem::directory_iterator tasks("/proc/self/task");
-        return std::distance(begin(tasks), end(tasks));
-    };
-    const auto before = threads();
-    struct Owner {
-        std::shared_ptr<AudioInputQueue> queue;
-    };
-    auto owner = std::make_shared<Owner>();
-    owner->queue = queues_
-                       .makeInputQueue(
-                           test::recorderFormat(),
-                           [owner](const AudioQueueBufferRef&, const AudioTimeStamp&, std::uint32_t, auto) {
-                               owner->queue->dispose();
-                           },
-                           AudioInputQueues::kCaptureProcessOutput)
-                       .queue;
-    AudioQueueBufferRef buffer;
-    ASSERT_EQ(owner->queue->allocateBuffer(882 * 2, buffer), AudioStatus::kSuccess);
-    ASSERT_EQ(owner->queue->enqueueBuffer(buffer), AudioStatus::kSuccess);
-    ASSERT_EQ(owner->queue->start(), AudioStatus::kSuccess);
-    const std::weak_ptr<Owner> weak = owner;
-    owner.reset();
-    EXPECT_TRUE(eventually([&] { return weak.expired() && threads() <= before; })) << threads() << " threads, " << before;
-}
-
-TEST_P(AudioTapTest, AQueueWithoutABufferForASecondGivesItsStreamBackAndTheNextBufferBringsItBack) {
-    const auto one = play(kOwn);
-    struct Heard {
-        std::mutex mutex;
-        std::vector<AudioQueueBufferRef> buffers;
-        bool isLoud = false;
-    };
-    const auto heard = std::make_shared<Heard>();
-    const auto made = queues_.makeInputQueue(
-        test::recorderFormat(),
-        [heard](const AudioQueueBufferRef& buffer, const AudioTimeStamp&, std::uint32_t, auto) {
-            const std::lock_guard lock(heard->mutex);
-            for (std::uint32_t byte = 0; byte < buffer->byteSize; ++byte)
-                if (buffer->bytes[byte] != 0) heard->isLoud = true;
-            heard->buffers.push_back(buffer);
-        },
-        AudioInputQueues::kCaptureProcessOutput);
-    AudioInputQueue& queue = *made.queue;
-    ASSERT_EQ(queue.setProcessTap(one->pid()), AudioStatus::kSuccess);
-    AudioQueueBufferRef buffer;
-    ASSERT_EQ(queue.allocateBuffer(8820, buffer), AudioStatus::kSuccess);
-    ASSERT_EQ(queue.enqueueBuffer(buffer), AudioStatus::kSuccess);
-    ASSERT_EQ(queue.start(), AudioStatus::kSuccess);
-    EXPECT_TRUE(connection_->hasThread());
-    EXPECT_TRUE(eventually([&] { return !connection_->hasThread(); })) << "nobody is tapped";
-    {
-        const std::lock_guard lock(heard->mutex);
-        heard->isLoud = false;
-    }
-    // Whoever gives it back each time hears the process again.
-    EXPECT_TRUE(eventually([&] {
-        const std::lock_guard lock(heard->mutex);
-        for (const auto& each : std::exchange(heard->buffers, {})) queue.enqueueBuffer(each);
-        return heard->isLoud;
-    }));
-    queue.dispose();
-}
-
 TEST_P(AudioTapTest, AProcessThatHasEndedIsNone) {
     ProcessID gone{0};
     {
@@ -454,15 +212,6 @@ TEST_P(AudioTapTest, AProcessThatHasEndedIsNone) {
     const auto made = queues_.makeInputQueue(test::recorderFormat(), {}, AudioInputQueues::kCaptureProcessOutput);
     EXPECT_EQ(made.queue->setProcessTap(gone), AudioStatus::kNoSuchProcess);
 }
-
-std::string nameOfServer(const ::testing::TestParamInfo<Maker>& info) { return info.index == 0 ? "PulseAudio" : "PipeWire"; }
-
-const auto kServers = ::testing::Values(
-    Maker([](Begin begin) { return std::make_unique<test::PrivateSoundServer>(begin); }),
-    Maker([](Begin begin) { return std::make_unique<test::PrivatePipeWire>(begin); }));
-
-INSTANTIATE_TEST_SUITE_P(Real, AudioTapTest, kServers, nameOfServer);
-INSTANTIATE_TEST_SUITE_P(Real, LateAudioTapTest, kServers, nameOfServer);
 
 }  // namespace
 }  // namespace lumacast
