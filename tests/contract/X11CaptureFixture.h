@@ -52,4 +52,7 @@ protected:
     const std::shared_ptr<CapturedFrames> frames = std::make_shared<CapturedFrames>();
 };
 
+/// What is special about capturing on X11.
+class X11Capture : public X11CaptureFixture {};
+
 }  // namespace lumacast::test
