@@ -26,21 +26,12 @@ def wait_for(what, condition):
         time.sleep(0.02)
 
 
-class Machine:
-    """`options` are more of examples/self_recorder's; {folder} in them is the machine's folder."""
+class Household:
+    """A folder of its own, and children that are ended with it."""
 
-    def __init__(self, binaries, size, kind="moving", fps=60, options=()):
-        self.binaries, self.size, self.fps = pathlib.Path(binaries).resolve(), size, fps
-        self.options = [*MOTION[kind], *options]
-        self.folder = pathlib.Path(tempfile.mkdtemp(prefix="lumacast-bench-"))
+    def __init__(self, prefix):
+        self.folder = pathlib.Path(tempfile.mkdtemp(prefix=prefix))
         self.children = []
-        try:
-            self._make_folders()
-            self._start_display()
-            self.start_application()
-        except BaseException:
-            self.close()
-            raise
 
     def __enter__(self):
         return self
@@ -53,15 +44,33 @@ class Machine:
             end(child)
         shutil.rmtree(self.folder, ignore_errors=True)
 
+    def spawn(self, command, **options):
+        child = subprocess.Popen([str(word) for word in command], **options)
+        self.children.append(child)
+        return child
+
+
+class Machine(Household):
+    """`options` are more of examples/self_recorder's; {folder} in them is the machine's folder."""
+
+    def __init__(self, binaries, size, kind="moving", fps=60, options=()):
+        self.binaries, self.size, self.fps = pathlib.Path(binaries).resolve(), size, fps
+        self.options = [*MOTION[kind], *options]
+        super().__init__("lumacast-bench-")
+        try:
+            self._make_folders()
+            self._start_display()
+            self.start_application()
+        except BaseException:
+            self.close()
+            raise
+
     def start(self, command, log, variables=None, **options):
         """`variables` are this process's own. The log goes on where one of that name is."""
         with open(self.folder / log, "ab") as errors:
             options.setdefault("stdout", errors)
             options.setdefault("stdin", subprocess.DEVNULL)
-            child = subprocess.Popen([str(word) for word in command], env=self.environment | (variables or {}),
-                                     stderr=errors, **options)
-        self.children.append(child)
-        return child
+            return self.spawn(command, env=self.environment | (variables or {}), stderr=errors, **options)
 
     def install(self, identifier, name, program):
         """Makes a program an application."""

@@ -4,12 +4,9 @@ import os
 import pathlib
 import re
 import selectors
-import shutil
-import signal
 import socket
 import struct
 import subprocess
-import tempfile
 import time
 
 from . import machine, meters
@@ -25,12 +22,11 @@ def free_port():
         return probe.getsockname()[1]
 
 
-class Server:
+class Server(machine.Household):
     """nginx on one core, as the documentation has it; `sendfile` or not."""
 
     def __init__(self, core, sendfile):
-        self.folder = pathlib.Path(tempfile.mkdtemp(prefix="lumacast-viewers-"))
-        self.children = []
+        super().__init__("lumacast-viewers-")
         for name in ("live/hls", "live/rtmp", "cache", "temp"):
             (self.folder / name).mkdir(parents=True)
         self.rtmp, self.origin, self.edge = (free_port() for _ in range(3))
@@ -62,21 +58,7 @@ class Server:
             raise RuntimeError("nginx: " + (self.folder / "error.log").read_text())
 
     def start(self, command):
-        child = subprocess.Popen([str(word) for word in command], stdin=subprocess.DEVNULL, stdout=subprocess.DEVNULL,
-                                 stderr=subprocess.DEVNULL)
-        self.children.append(child)
-        return child
-
-    def __enter__(self):
-        return self
-
-    def __exit__(self, *_):
-        self.close()
-
-    def close(self):
-        for child in reversed(self.children):
-            machine.end(child, signal.SIGTERM)
-        shutil.rmtree(self.folder, ignore_errors=True)
+        return self.spawn(command, stdin=subprocess.DEVNULL, stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
 
     def put_segments(self, size):
         for number in range(SEGMENTS):
