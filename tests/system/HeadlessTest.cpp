@@ -2,16 +2,14 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <stdlib.h>
 
 #include <cstdio>
 #include <filesystem>
-#include <fstream>
-#include <iterator>
+#include <string>
+#include <vector>
 
-#include "linux/admin/LinuxAdminService.h"
 #include "tests/checkers/check_movie/MovieCheck.h"
-#include "tests/system/World.h"
+#include "tests/system/DaemonUser.h"
 
 namespace lumacast::test {
 namespace {
@@ -31,70 +29,34 @@ std::string outputOf(const std::string& command) {
     return output;
 }
 
-std::string bytesOf(const std::string& path) {
-    std::ifstream file(path, std::ios::binary);
-    return {std::istreambuf_iterator<char>(file), {}};
-}
+std::string bytesOf(const std::string& path) { return ScratchDirectory::read(path); }
 
 /// A user of a machine with nothing on it but one application.
 class Headless : public ::testing::Test {
 protected:
-    Headless() {
-        std::string pattern = (fs::temp_directory_path() / "lumacast-XXXXXX").string();
-        EXPECT_TRUE(::mkdtemp(pattern.data()));
-        folder_ = pattern;
-        for (const auto& [variable, name] : {std::pair{"XDG_RUNTIME_DIR", "run"},
-                                             {"XDG_CONFIG_HOME", "config"},
-                                             {"XDG_DATA_HOME", "data"},
-                                             {"XDG_STATE_HOME", "state"},
-                                             {"XDG_CACHE_HOME", "cache"}}) {
-            fs::create_directory(path(name));
-            fs::permissions(path(name), fs::perms::owner_all);
-            environment_.push_back(std::string(variable) + "=" + path(name));
-        }
-        fs::create_directories(path("data/applications"));
-        fs::create_directories(path("data/lumacast"));
-        fs::copy(fs::path(LC_SOURCE_DIR) / "resources/Lumacast.bundle", path("data/lumacast/Lumacast.bundle"),
-                 fs::copy_options::recursive);
-        std::ofstream(path("data/applications/org.lumacast.Minimal.desktop"))
-            << "[Desktop Entry]\nType=Application\nName=Minimal\nExec=\"" << LC_MINIMAL_HEADLESS << "\"\n";
-    }
-    ~Headless() override {
-        if (HasFailure()) std::fprintf(stderr, "%s\n", bytesOf(path("daemon.log")).c_str());
-        daemon_.reset();
-        std::error_code ignored;
-        fs::remove_all(folder_, ignored);
-    }
+    Headless() { user_.install("org.lumacast.Minimal", "Minimal", LC_MINIMAL_HEADLESS); }
 
     /// `consent` is the variable that answers every question; without it, as the port has it.
     void startDaemon(const std::string& consent = {}) {
-        daemon_ = run({LC_HEADLESS_DAEMON},
-                      consent.empty() ? "HEADLESS_TEST=1" : "LUMACAST_HEADLESS_CONSENT=" + consent, "daemon.log");
-        EXPECT_TRUE(waitUntil(
-            [this] {
-                return askAdminService(path("run/lumacast/admin.sock"), "status", std::chrono::milliseconds(5000))
-                    .has_value();
-            },
-            std::chrono::seconds(60)));
+        std::vector<std::string> variables;
+        if (!consent.empty()) variables.push_back("LUMACAST_HEADLESS_CONSENT=" + consent);
+        user_.startDaemon(withoutADesktop(LC_HEADLESS_DAEMON), variables);
     }
     /// The application's exit status.
-    int record() { return run({LC_MINIMAL_HEADLESS, movie()}, "HEADLESS_TEST=1", "application.log")->wait(); }
+    int record() {
+        std::vector<std::string> command = withoutADesktop(LC_MINIMAL_HEADLESS);
+        command.push_back(movie());
+        return checkers::Child(command, user_.environment(), path("application.log")).wait();
+    }
     std::string movie() const { return path("movie.mp4"); }
-    std::string path(const std::string& name) const { return folder_ + "/" + name; }
+    std::string path(const std::string& name) const { return user_.path(name); }
 
 private:
-    std::unique_ptr<checkers::Child> run(std::vector<std::string> command, const std::string& variable,
-                                         const std::string& log) {
-        std::vector<std::string> whole{
-            "env",   "-u", "DISPLAY", "-u", "WAYLAND_DISPLAY", "-u", "PULSE_SERVER", "-u", "DBUS_SESSION_BUS_ADDRESS",
-            variable};
-        whole.insert(whole.end(), command.begin(), command.end());
-        return std::make_unique<checkers::Child>(whole, environment_, path(log));
+    static std::vector<std::string> withoutADesktop(const char* program) {
+        return {"env", "-u", "DISPLAY", "-u", "WAYLAND_DISPLAY", "-u", "PULSE_SERVER", "-u", "DBUS_SESSION_BUS_ADDRESS", program};
     }
 
-    std::string folder_;
-    std::vector<std::string> environment_{"LANG=C", "LANGUAGE=en"};
-    std::unique_ptr<checkers::Child> daemon_;
+    DaemonUser user_;
 };
 
 TEST_F(Headless, RecordsTheSceneWithItsTonesInTimeWithItsBorders) {

@@ -1,7 +1,6 @@
 #include "tests/system/World.h"
 
 #include <gtest/gtest.h>
-#include <poll.h>
 #include <signal.h>
 #include <stdlib.h>
 
@@ -11,20 +10,9 @@
 #include <fstream>
 #include <iterator>
 
-#include "linux/admin/LinuxAdminService.h"
-
 namespace lumacast::test {
 
 namespace fs = std::filesystem;
-
-bool waitUntil(const std::function<bool()>& condition, std::chrono::seconds limit) {
-    const auto until = std::chrono::steady_clock::now() + limit;
-    while (!condition()) {
-        if (std::chrono::steady_clock::now() > until) return false;
-        ::poll(nullptr, 0, 5);
-    }
-    return true;
-}
 
 pid_t processRunning(const std::string& program) {
     for (const auto& entry : fs::directory_iterator("/proc")) {
@@ -117,40 +105,12 @@ checkers::FramesLog Application::framesLog() const {
 }
 
 World::World(Consent consent, const std::string& screen) : display_(screen) {
-    std::string pattern = (fs::temp_directory_path() / "lumacast-XXXXXX").string();
-    EXPECT_TRUE(::mkdtemp(pattern.data()));
-    folder_ = pattern;
     EXPECT_FALSE(display_.name().empty()) << "no display";
-    environment_ = {"DISPLAY=" + display_.name(), "WAYLAND_DISPLAY=", "LANG=C", "LANGUAGE=en"};
-    for (const auto& [variable, name] : {std::pair{"XDG_RUNTIME_DIR", "run"},
-                                         {"XDG_CONFIG_HOME", "config"},
-                                         {"XDG_DATA_HOME", "data"},
-                                         {"XDG_STATE_HOME", "state"},
-                                         {"XDG_CACHE_HOME", "cache"}}) {
-        fs::create_directory(path(name));
-        fs::permissions(path(name), fs::perms::owner_all);
-        environment_.push_back(std::string(variable) + "=" + path(name));
-    }
-    fs::create_directories(path("config/lumacast"));
-    fs::create_directories(path("data/applications"));
-    fs::create_directories(path("data/lumacast"));
-    fs::copy(fs::path(LC_SOURCE_DIR) / "resources/Lumacast.bundle", path("data/lumacast/Lumacast.bundle"),
-             fs::copy_options::recursive);
+    addVariable("DISPLAY=" + display_.name());
+    addVariable("WAYLAND_DISPLAY=");
     if (consent == Consent::Suppressed)
         std::ofstream(path("config/lumacast/com.orvane.lumacastd.conf")) << "LCSuppressAlert=true\n";
     install("org.lumacast.SelfRecorder", "Self Recorder", LC_SELF_RECORDER);
-}
-
-World::~World() {
-    if (::testing::Test::HasFailure()) std::fprintf(stderr, "%s\n", daemonLog().c_str());
-    daemon_.reset();
-    std::error_code ignored;
-    fs::remove_all(folder_, ignored);
-}
-
-void World::install(const std::string& identifier, const std::string& name, const std::string& executable) {
-    std::ofstream(path("data/applications/" + identifier + ".desktop"))
-        << "[Desktop Entry]\nType=Application\nName=" << name << "\nExec=\"" << executable << "\"\n";
 }
 
 std::string World::installExtension(const std::string& identifier, const std::string& program, bool takesSamples) {
@@ -179,20 +139,11 @@ pid_t World::extensionProcess(const std::string& identifier) const {
     return processRunning(path("data/lumacast/extensions/" + identifier + "/program"));
 }
 
-void World::startDaemon(const std::vector<std::string>& variables) { startDaemonBy({LC_DAEMON}, variables); }
-
-void World::startDaemonBy(const std::vector<std::string>& command, const std::vector<std::string>& variables) {
-    std::vector<std::string> environment = environment_;
-    environment.insert(environment.end(), variables.begin(), variables.end());
-    daemon_ = std::make_unique<checkers::Child>(command, environment, path("daemon.log"));
-    EXPECT_TRUE(waitUntil([this] { return !status().is_null(); })) << daemonLog();
-}
-
 int World::endDaemon(int signal) {
-    EXPECT_GT(daemon_->pid(), 1);
-    if (daemon_->pid() <= 1) return -1;  // would be everybody
-    ::kill(daemon_->pid(), signal);
-    return daemon_->wait();
+    EXPECT_GT(daemon().pid(), 1);
+    if (daemon().pid() <= 1) return -1;  // would be everybody
+    ::kill(daemon().pid(), signal);
+    return daemon().wait();
 }
 
 std::unique_ptr<Application> World::application(std::vector<std::string> options) {
@@ -204,11 +155,6 @@ std::unique_ptr<Application> World::otherApplication(const std::string& name, st
     fs::copy_file(LC_SELF_RECORDER, program);
     install("org.lumacast." + name, name, program);
     return std::make_unique<Application>(*this, program, name, options);
-}
-
-nlohmann::json World::status() {
-    const auto answer = askAdminService(path("run/lumacast/admin.sock"), "status", std::chrono::milliseconds(5000));
-    return answer ? nlohmann::json::parse(*answer, nullptr, false) : nlohmann::json();
 }
 
 nlohmann::json World::recording() {
@@ -226,12 +172,12 @@ bool World::waitForElapsed(double seconds) {
 }
 
 std::size_t World::daemonDescriptors() {
-    const fs::directory_iterator open("/proc/" + std::to_string(daemon_->pid()) + "/fd");
+    const fs::directory_iterator open("/proc/" + std::to_string(user_.daemon().pid()) + "/fd");
     return static_cast<std::size_t>(std::distance(fs::begin(open), fs::end(open)));
 }
 
 std::size_t World::daemonNumber(const std::string& name) {
-    std::ifstream file("/proc/" + std::to_string(daemon_->pid()) + "/status");
+    std::ifstream file("/proc/" + std::to_string(user_.daemon().pid()) + "/status");
     for (std::string line; std::getline(file, line);)
         if (line.starts_with(name + ":")) return std::stoul(line.substr(name.size() + 1));
     ADD_FAILURE() << "no " << name;
@@ -257,11 +203,6 @@ void World::setFlag(const std::string& name, bool on) const {
 
 std::string World::moviePath(const std::string& name) const {
     return path("state/lumacast/root/private/var/mobile/Library/Lumacast/" + name + ".mp4");
-}
-
-std::string World::daemonLog() const {
-    std::ifstream file(path("daemon.log"));
-    return {std::istreambuf_iterator<char>(file), {}};
 }
 
 std::vector<checkers::NumberedPicture> picturesOf(const std::string& movie, bool mayEndEarly) {

@@ -16,11 +16,9 @@
 #include "tests/checkers/tests/Child.h"
 #include "tests/client/WaitUntil.h"
 #include "tests/contract/PrivateDisplay.h"
+#include "tests/system/DaemonUser.h"
 
 namespace lumacast::test {
-
-/// Asks again and again until `condition` holds; false when it did not within `limit`.
-bool waitUntil(const std::function<bool()>& condition, std::chrono::seconds limit);
 
 /// The innermost process that runs a program; 0 when there is none.
 pid_t processRunning(const std::string& program);
@@ -70,17 +68,18 @@ public:
 
     /// `screen` is the display's size, as "1280x800x24".
     explicit World(Consent consent = Consent::Suppressed, const std::string& screen = "1280x800x24");
-    ~World();
     World(const World&) = delete;
     World& operator=(const World&) = delete;
 
     /// One more variable for every process that is started from now on, "NAME=value".
-    void addVariable(const std::string& variable) { environment_.push_back(variable); }
+    void addVariable(const std::string& variable) { user_.addVariable(variable); }
     /// Starts the daemon and waits for its sockets. `variables` are its alone.
-    void startDaemon(const std::vector<std::string>& variables = {});
+    void startDaemon(const std::vector<std::string>& variables = {}) { startDaemonBy({LC_DAEMON}, variables); }
     /// The same by another command, which becomes the daemon.
-    void startDaemonBy(const std::vector<std::string>& command, const std::vector<std::string>& variables = {});
-    checkers::Child& daemon() { return *daemon_; }
+    void startDaemonBy(const std::vector<std::string>& command, const std::vector<std::string>& variables = {}) {
+        user_.startDaemon(command, variables);
+    }
+    checkers::Child& daemon() { return user_.daemon(); }
     /// Ends it with a signal and waits; its exit status, -1 when the signal ended it.
     int endDaemon(int signal);
 
@@ -89,7 +88,7 @@ public:
     std::unique_ptr<Application> otherApplication(const std::string& name, std::vector<std::string> options);
 
     /// What `status` of the administrator's socket answers.
-    nlohmann::json status();
+    nlohmann::json status() const { return user_.status(); }
     /// The one session's running recording; null when there is none.
     nlohmann::json recording();
     /// Waits until the running recording is at least so old.
@@ -99,10 +98,10 @@ public:
     std::size_t daemonNumber(const std::string& name);
     /// The movie that the recordings of an application are written to.
     std::string moviePath(const std::string& name = "Self Recorder") const;
-    std::string daemonLog() const;
+    std::string daemonLog() const { return user_.daemonLog(); }
 
-    std::string path(const std::string& name) const { return folder_ + "/" + name; }
-    const std::vector<std::string>& environment() const { return environment_; }
+    std::string path(const std::string& name) const { return user_.path(name); }
+    const std::vector<std::string>& environment() const { return user_.environment(); }
     /// The variables that make a daemon's disk one that can stop answering or be full (tests/system/slow_disk).
     std::vector<std::string> troubledDisk() const;
     void setDiskStalled(bool stalled) const { setFlag("disk stalled", stalled); }
@@ -111,7 +110,9 @@ public:
     void setDiskQuotaUsedUp(bool used) const { setFlag("disk quota", used); }
     const PrivateDisplay& display() const { return display_; }
     /// Installs a program as an application.
-    void install(const std::string& identifier, const std::string& name, const std::string& executable);
+    void install(const std::string& identifier, const std::string& name, const std::string& executable) {
+        user_.install(identifier, name, executable);
+    }
     /// Whom the shortest extension is installed as, where it takes clips.
     static constexpr char kKeeper[] = "org.lumacast.ClipKeeper";
     /// Installs a program as an upload extension that takes clips, or samples. Answers the folder where it may write.
@@ -124,10 +125,8 @@ public:
 private:
     void setFlag(const std::string& name, bool on) const;
 
-    std::string folder_;
     PrivateDisplay display_;
-    std::vector<std::string> environment_;
-    std::unique_ptr<checkers::Child> daemon_;
+    DaemonUser user_;
     int applications_ = 0;
 };
 
