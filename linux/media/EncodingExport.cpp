@@ -81,6 +81,8 @@ public:
         if (span_.end - span_.start > kLongest) return systemError(EFBIG);
         if (const auto error = open()) return error;
         if (const auto error = movieError(movie_.start())) return error;
+        // What lies before the movie's zero leads: with a fragment written, a track can't begin there any more.
+        if (const auto error = soundUpTo(1)) return error;
         if (const auto error = encodePictures()) return error;
         if (const auto error = soundUpTo(span_.end - span_.start)) return error;
         if (const auto error = finishSound()) return error;
