@@ -39,8 +39,9 @@ struct EncodedPicture {
     bool isKeyFrame = false;
 };
 
-/// H.264, High profile, level as needed, no B-pictures and no delay: a picture that goes in comes out. Belongs to one
-/// thread; opening takes tens of milliseconds. BT.601 limited range, tagged so.
+/// H.264, High profile, level as needed, no B-pictures and no delay: a picture that goes in comes out, or
+/// is left out for good to keep to the bit rate (openh264 alone; never a key frame that is forced). Belongs to one thread;
+/// opening takes tens of milliseconds. BT.601 limited range, tagged so.
 class VideoEncoder {
 public:
     static constexpr int kTimescale = 1'000'000;  ///< ticks a second of the stamps

@@ -20,11 +20,13 @@ void describe(SEncParamExt& parameters, const VideoTrackSettings& settings) {
     parameters.fMaxFrameRate = static_cast<float>(settings.frameRate);
     parameters.iTargetBitrate = static_cast<int>(settings.bitRate);
     parameters.iMaxBitrate = UNSPECIFIED_BIT_RATE;
-    parameters.iRCMode = RC_BITRATE_MODE;
+    // By the stamps: pictures come at irregular times, and each gets what the time since the last one allows.
+    parameters.iRCMode = RC_TIMESTAMP_MODE;
     parameters.iMinQp = kFinest;
     parameters.iMaxQp = kCoarsest;
-    // A picture that goes in comes out, and key frames stand where they are asked for, all with the same parameter sets.
+    // The library's own skipping leaves out most of a page that scrolls; RateCeiling decides instead.
     parameters.bEnableFrameSkip = false;
+    // Key frames stand where they are asked for, all with the same parameter sets.
     parameters.bEnableSceneChangeDetect = false;
     parameters.uiIntraPeriod = static_cast<unsigned>(settings.maxKeyFrameInterval);
     parameters.eSpsPpsIdStrategy = CONSTANT_ID;
@@ -79,11 +81,13 @@ VideoEncoder::Opened OpenH264Encoder::open(const VideoTrackSettings& settings) {
     std::vector<std::uint8_t> header;
     if (encoder->EncodeParameterSets(&info) != cmResultSuccess) return systemError(EIO);
     collect(info, Layers::All, header);
-    return std::unique_ptr<VideoEncoder>(new OpenH264Encoder(std::move(encoder), std::move(header)));
+    return std::unique_ptr<VideoEncoder>(
+        new OpenH264Encoder(std::move(encoder), std::move(header), settings.bitRate));
 }
 
 std::optional<Error> OpenH264Encoder::encode(const std::shared_ptr<I420Picture>& picture, std::int64_t stamp, KeyFrame key,
                                              const Output& output) {
+    if (!ceiling_.hasRoom(stamp) && key != KeyFrame::Forced) return std::nullopt;
     if (key == KeyFrame::Forced) encoder_->ForceIntraFrame(true);
     SSourcePicture source{};
     source.iColorFormat = videoFormatI420;
@@ -99,6 +103,7 @@ std::optional<Error> OpenH264Encoder::encode(const std::shared_ptr<I420Picture>&
     if (encoder_->EncodeFrame(&source, &info) != cmResultSuccess) return systemError(EIO);
     if (info.eFrameType == videoFrameTypeSkip || info.eFrameType == videoFrameTypeInvalid) return systemError(EIO);
     collect(info, Layers::PicturesOnly, bytes_);
+    ceiling_.spend(bytes_.size());
     output({bytes_, stamp, info.eFrameType == videoFrameTypeIDR});
     return std::nullopt;
 }
