@@ -24,6 +24,11 @@ struct Unload {
 
 EncoderFacts probeEncoders() {
     EncoderFacts facts;
+#ifdef LC_CTL_OPENH264
+    // A daemon without it doesn't even start: it is linked to it.
+    facts.ownLibrary = LC_CTL_OPENH264;
+    facts.ownIsLoaded = std::unique_ptr<void, Unload>(::dlopen(LC_CTL_OPENH264, RTLD_LAZY | RTLD_LOCAL)) != nullptr;
+#endif
     facts.library = "libavcodec.so." + std::to_string(LIBAVCODEC_VERSION_MAJOR);
     // It stays loaded: what it keeps for itself is not ours to free.
     const std::unique_ptr<void, Unload> library(
@@ -39,26 +44,46 @@ EncoderFacts probeEncoders() {
     return facts;
 }
 
-Findings checkEncoders(const EncoderFacts& facts) {
-    constexpr char kSubject[] = "encoder";
-    if (!facts.isLoaded)
-        return {problem(kSubject, facts.library + " can't be loaded, so nothing can be encoded; install it.")};
-    const std::string software = kEncoders.back();
+namespace {
+
+constexpr char kSubject[] = "encoder";
+
+bool has(const std::vector<std::string>& names, const std::string& name) {
+    return std::find(names.begin(), names.end(), name) != names.end();
+}
+
+/// What pictures are encoded with while they are recorded.
+Finding checkRecording(const EncoderFacts& facts) {
     std::vector<std::string> hardware = facts.present;
-    std::erase(hardware, software);
-    const bool hasSoftware = hardware.size() != facts.present.size();
+    std::erase(hardware, kSavingSoftware);
     const bool mayHaveHardware = !hardware.empty() && !facts.devices.empty();
     const std::string tried = listText(hardware) + " (there is " + listText(facts.devices) + ")";
-    if (!hasSoftware)
-        return {mayHaveHardware ? warning(kSubject, facts.library + " has no " + software + ": recording depends on " +
-                                                        tried + ", which only a recording can try; install a " +
-                                                        facts.library + " with " + software + ".")
-                                : problem(kSubject, facts.library + " has no " + software +
-                                                        ", and there is no hardware to encode with; install a " +
-                                                        facts.library + " with " + software + ".")};
+    const bool isItsOwn = !facts.ownLibrary.empty();
+    if (isItsOwn ? !facts.ownIsLoaded : !has(facts.present, facts.software)) {
+        const std::string lacking = isItsOwn ? facts.ownLibrary + " can't be loaded"
+                                             : facts.library + " has no " + facts.software;
+        const std::string remedy = isItsOwn ? "install it." : "install a " + facts.library + " with " + facts.software + ".";
+        if (!mayHaveHardware)
+            return problem(kSubject, lacking + ", and there is no hardware to encode with; " + remedy);
+        return warning(kSubject, lacking + ": recording depends on " + tried + ", which only a recording can try; " + remedy);
+    }
     if (mayHaveHardware)
-        return {ok(kSubject, "a recording tries " + tried + ", then " + software + ", which is there.")};
-    return {ok(kSubject, software + " is there; no hardware was found, so pictures are encoded by the processor.")};
+        return ok(kSubject, "a recording tries " + tried + ", then " + facts.software + ", which is there.");
+    return ok(kSubject, facts.software + " is there; no hardware was found, so pictures are encoded by the processor.");
+}
+
+}  // namespace
+
+Findings checkEncoders(const EncoderFacts& facts) {
+    if (!facts.isLoaded)
+        return {problem(kSubject, facts.library + " can't be loaded, so nothing can be encoded; install it.")};
+    Findings findings{checkRecording(facts)};
+    if (facts.software != kSavingSoftware && !has(facts.present, kSavingSoftware))
+        findings.push_back(warning(kSubject, facts.library + " has no " + kSavingSoftware +
+                                                 ", which saving with the sound mixed encodes with: movies are saved as "
+                                                 "they are; install a " +
+                                                 facts.library + " with " + kSavingSoftware + "."));
+    return findings;
 }
 
 }  // namespace lumacast::ctl

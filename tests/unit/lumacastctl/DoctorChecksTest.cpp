@@ -123,26 +123,61 @@ TEST(SoundCheck, SaysWhereSoundIsRecordedFromOrWhyMoviesAreSilent) {
 
 // --- encoders ---
 
+/// Of a build with x264, where the library is there.
+EncoderFacts encoderFacts(std::vector<std::string> present, std::vector<std::string> devices = {}) {
+    EncoderFacts facts;
+    facts.library = "libavcodec.so.59";
+    facts.isLoaded = true;
+    facts.present = std::move(present);
+    facts.devices = std::move(devices);
+    facts.software = "libx264";
+    return facts;
+}
+
+/// Of a build with a library of its own for recordings.
+EncoderFacts ownEncoderFacts(std::vector<std::string> present, bool ownIsLoaded) {
+    EncoderFacts facts = encoderFacts(std::move(present));
+    facts.software = "libopenh264";
+    facts.ownLibrary = "libopenh264.so.7";
+    facts.ownIsLoaded = ownIsLoaded;
+    return facts;
+}
+
 TEST(EncoderCheck, IsWellWithSoftwareAlone) {
-    const EncoderFacts facts{"libavcodec.so.59", true, {"h264_vaapi", "libx264"}, {}};
+    const EncoderFacts facts = encoderFacts({"h264_vaapi", "libx264"});
     EXPECT_THAT(checkEncoders(facts), ElementsAre(Finds(kOk, "encoded by the processor")));
 }
 
 TEST(EncoderCheck, SaysWhatHardwareIsTried) {
-    const EncoderFacts facts{"libavcodec.so.59", true, {"h264_vaapi", "libx264"}, {"/dev/dri/renderD128"}};
+    const EncoderFacts facts = encoderFacts({"h264_vaapi", "libx264"}, {"/dev/dri/renderD128"});
     EXPECT_THAT(checkEncoders(facts),
                 ElementsAre(Finds(kOk, "tries h264_vaapi (there is /dev/dri/renderD128), then libx264")));
 }
 
 TEST(EncoderCheck, IsAProblemWithoutAnyAndAWarningWithHardwareAlone) {
-    EncoderFacts facts{"libavcodec.so.59", true, {"h264_vaapi"}, {}};
+    EncoderFacts facts = encoderFacts({"h264_vaapi"});
     EXPECT_THAT(checkEncoders(facts), ElementsAre(Finds(kProblem, "no hardware to encode with")));
     facts.devices = {"/dev/dri/renderD128"};
     EXPECT_THAT(checkEncoders(facts), ElementsAre(Finds(kWarning, "depends on h264_vaapi")));
 }
 
+TEST(EncoderCheck, WarnsOnlyOfSavingWhereRecordingHasALibraryOfItsOwn) {
+    EXPECT_THAT(checkEncoders(ownEncoderFacts({"libx264"}, true)), ElementsAre(Finds(kOk, "libopenh264 is there")));
+    EXPECT_THAT(checkEncoders(ownEncoderFacts({}, true)),
+                ElementsAre(Finds(kOk, "libopenh264 is there"), Finds(kWarning, "movies are saved as they are")));
+}
+
+TEST(EncoderCheck, IsAProblemWithoutTheLibraryOfRecordingsThatSavingDoesNotReplace) {
+    EncoderFacts facts = ownEncoderFacts({"libx264", "h264_vaapi"}, false);
+    EXPECT_THAT(checkEncoders(facts), ElementsAre(Finds(kProblem, "libopenh264.so.7 can't be loaded, and")));
+    facts.devices = {"/dev/dri/renderD128"};
+    EXPECT_THAT(checkEncoders(facts), ElementsAre(Finds(kWarning, "recording depends on h264_vaapi")));
+}
+
 TEST(EncoderCheck, IsAProblemWithoutTheLibrary) {
-    EXPECT_THAT(checkEncoders({"libavcodec.so.59", false, {}, {}}), ElementsAre(Finds(kProblem, "can't be loaded")));
+    EncoderFacts facts = encoderFacts({});
+    facts.isLoaded = false;
+    EXPECT_THAT(checkEncoders(facts), ElementsAre(Finds(kProblem, "can't be loaded")));
 }
 
 // --- temporary directory ---

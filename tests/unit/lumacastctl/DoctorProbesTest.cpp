@@ -109,7 +109,18 @@ TEST(SoundProbe, FollowsTheServersOwnVariables) {
 TEST(EncoderProbe, FindsTheSoftwareThatTheDaemonEncodesWith) {
     const EncoderFacts facts = probeEncoders();
     EXPECT_TRUE(facts.isLoaded) << facts.library;
-    EXPECT_THAT(facts.present, Contains("libx264"));
+    EXPECT_THAT(facts.present, Contains(kSavingSoftware));
+    EXPECT_EQ(facts.software, kLiveSoftware);
+    if (facts.ownLibrary.empty()) {
+        EXPECT_THAT(facts.present, Contains(facts.software));
+    } else {
+        EXPECT_TRUE(facts.ownIsLoaded) << facts.ownLibrary;
+    }
+}
+
+TEST(EncoderProbe, LooksForTheSoftwareThatTheDaemonOfThisBuildIsMadeWith) {
+    EXPECT_EQ(kLiveSoftware, std::string("lib") + LC_H264);
+    EXPECT_EQ(probeEncoders().ownLibrary.empty(), std::string(LC_H264) == "x264");
 }
 
 TEST(EncoderProbe, LooksForTheEncodersThatARecordingTries) {
