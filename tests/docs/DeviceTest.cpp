@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <regex>
+#include <set>
 
 #include "base/Limits.h"
 #include "linux/storage/LinuxFileSystem.h"
@@ -86,25 +87,36 @@ TEST(OnADevice, NamesTheFoldersThatTheDaemonUses) {
     EXPECT_TRUE(hasSpan(std::string(kDeviceTemporaryDirectory)));
 }
 
-/// The last name of a path of the administrator's, where the code, the unit or the packages have it.
-bool isPathOfTheSystem(const std::string& path) {
-    static const std::string all = textBelow("linux", {".cpp", ".h", ".txt"}) + textBelow("src", {".cpp", ".h"}) +
-                                   textBelow("packaging", {".service", ".conf", ".txt", ".md", ".desktop"});
-    const auto slash = path.rfind('/');
-    return all.find(path.substr(slash + 1)) != std::string::npos;
+constexpr std::string_view kAdministratorsFolder = "/etc/lumacast";
+
+/// Whether one of these texts has `name` as a path below a folder: in the code the whole literal, in a unit the path.
+bool isReadBelow(const std::string& name) {
+    static const std::string code = textBelow("linux", {".cpp"});
+    static const std::string unit = fileText("packaging/systemd/lumacastd@.service");
+    return code.find("directory + \"/" + name + "\"") != std::string::npos ||
+           code.find("below(environment.systemDirectories, \"" + name + "\")") != std::string::npos ||
+           unit.find("EnvironmentFile=-" + std::string(kAdministratorsFolder) + "/" + name + "\n") != std::string::npos;
 }
 
 TEST(OnADevice, NamesPathsOfTheAdministratorThatAreRead) {
-    std::size_t paths = 0;
+    const auto nothing = [](std::string_view) -> std::optional<std::string> { return std::nullopt; };
+    EXPECT_EQ(LinuxEnvironment::from(nothing, 1000, "/usr/bin/lumacastd").systemDirectories.front(), kAdministratorsFolder);
+    const std::string below = std::string(kAdministratorsFolder) + "/";
+    std::set<std::string> named;
     for (const Span& span : devicePage().spans) {
-        if (!span.text.starts_with("/etc/")) continue;
-        ++paths;
-        std::string path = span.text;
-        if (path.ends_with("/*.conf")) path.resize(path.size() - 7);
-        EXPECT_TRUE(isPathOfTheSystem(path)) << at(devicePage(), span.line) << span.text;
+        if (!span.text.starts_with("/etc/") || span.text == kAdministratorsFolder) continue;
+        std::string name = span.text;
+        if (name.ends_with("/*.conf")) name.resize(name.size() - 7);
+        ASSERT_TRUE(name.starts_with(below)) << at(devicePage(), span.line) << span.text;
+        name.erase(0, below.size());
+        named.insert(name);
+        EXPECT_TRUE(isReadBelow(name)) << at(devicePage(), span.line) << span.text << " is read nowhere";
     }
-    EXPECT_GT(paths, 4u);
-    EXPECT_FALSE(isPathOfTheSystem("/etc/lumacast/no-such-file.conf"));
+    EXPECT_EQ(named, (std::set<std::string>{"daemon.conf", "device.conf", "entitlements.d", "environment"}))
+        << "what the administrator may write";
+    // Names that stand in the code, but are read from no folder of the administrator's.
+    for (const char* name : {"conf", "device", "machine-id", "resolv.conf", "entitlements"})
+        EXPECT_FALSE(isReadBelow(name)) << name;
 }
 
 TEST(OnADevice, NamesTheCommandsOfTheAdministratorsSocket) {
