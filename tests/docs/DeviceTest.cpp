@@ -100,7 +100,8 @@ bool isReadBelow(const std::string& name) {
 
 TEST(OnADevice, NamesPathsOfTheAdministratorThatAreRead) {
     const auto nothing = [](std::string_view) -> std::optional<std::string> { return std::nullopt; };
-    EXPECT_EQ(LinuxEnvironment::from(nothing, 1000, "/usr/bin/lumacastd").systemDirectories.front(), kAdministratorsFolder);
+    EXPECT_EQ(LinuxEnvironment::from(nothing, 1000, "/usr/bin/lumacastd").systemDirectories.front(),
+              kAdministratorsFolder);
     const std::string below = std::string(kAdministratorsFolder) + "/";
     std::set<std::string> named;
     for (const Span& span : devicePage().spans) {

@@ -60,12 +60,14 @@ Finding checkRecording(const EncoderFacts& facts) {
     const std::string tried = listText(hardware) + " (there is " + listText(facts.devices) + ")";
     const bool isItsOwn = !facts.ownLibrary.empty();
     if (isItsOwn ? !facts.ownIsLoaded : !has(facts.present, facts.software)) {
-        const std::string lacking = isItsOwn ? facts.ownLibrary + " can't be loaded"
-                                             : facts.library + " has no " + facts.software;
-        const std::string remedy = isItsOwn ? "install it." : "install a " + facts.library + " with " + facts.software + ".";
+        const std::string lacking =
+            isItsOwn ? facts.ownLibrary + " can't be loaded" : facts.library + " has no " + facts.software;
+        const std::string remedy =
+            isItsOwn ? "install it." : "install a " + facts.library + " with " + facts.software + ".";
         if (!mayHaveHardware)
             return problem(kSubject, lacking + ", and there is no hardware to encode with; " + remedy);
-        return warning(kSubject, lacking + ": recording depends on " + tried + ", which only a recording can try; " + remedy);
+        return warning(kSubject,
+                       lacking + ": recording depends on " + tried + ", which only a recording can try; " + remedy);
     }
     if (mayHaveHardware)
         return ok(kSubject, "a recording tries " + tried + ", then " + facts.software + ", which is there.");
@@ -79,10 +81,11 @@ Findings checkEncoders(const EncoderFacts& facts) {
         return {problem(kSubject, facts.library + " can't be loaded, so nothing can be encoded; install it.")};
     Findings findings{checkRecording(facts)};
     if (facts.software != kSavingSoftware && !has(facts.present, kSavingSoftware))
-        findings.push_back(warning(kSubject, facts.library + " has no " + kSavingSoftware +
-                                                 ", which saving with the sound mixed encodes with: movies are saved as "
-                                                 "they are; install a " +
-                                                 facts.library + " with " + kSavingSoftware + "."));
+        findings.push_back(
+            warning(kSubject, facts.library + " has no " + kSavingSoftware +
+                                  ", which saving with the sound mixed encodes with: movies are saved as "
+                                  "they are; install a " +
+                                  facts.library + " with " + kSavingSoftware + "."));
     return findings;
 }
 

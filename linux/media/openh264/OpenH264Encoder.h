@@ -12,8 +12,8 @@
 
 namespace lumacast::media {
 
-/// The library openh264, by its own interface. It encodes what is recorded; what is saved is encoded anew by x264 all the same
-/// (PictureReencoder). Its coarsest pictures can still be too large for the bit rate: then some are left out.
+/// The library openh264, by its own interface. It encodes what is recorded; what is saved is encoded anew by x264 all
+/// the same (PictureReencoder). Its coarsest pictures can still be too large for the bit rate: then some are left out.
 class OpenH264Encoder final : public VideoEncoder {
 public:
     static Opened open(const VideoTrackSettings& settings);

@@ -87,7 +87,8 @@ std::vector<double> bySeconds(const std::vector<Coded>& coded, std::size_t secon
 
 TEST(Rate, OfNoiseIsACeilingAfterTheFirstSecond) {
     int appended = 0;
-    const auto coded = code(6, paintRandomly, [] { return kTicks / 60; }, appended);
+    const auto coded = code(
+        6, paintRandomly, [] { return kTicks / 60; }, appended);
     auto seconds = bySeconds(coded, 6);
     EXPECT_LT(seconds[0], 3.5) << "what may be spent ahead, and the picture that goes beyond it";
     seconds.erase(seconds.begin());
@@ -100,7 +101,8 @@ TEST(Rate, OfNoiseIsACeilingAfterTheFirstSecond) {
 TEST(Rate, OfAPageThatScrollsAtIrregularTimesIsUsedAndNotExceeded) {
     std::mt19937 random(5);
     int appended = 0;
-    const auto coded = code(6, paintScrolledPage, [&] { return static_cast<std::int64_t>(1000 + random() % 90'000); }, appended);
+    const auto coded = code(
+        6, paintScrolledPage, [&] { return static_cast<std::int64_t>(1000 + random() % 90'000); }, appended);
     EXPECT_EQ(coded.size(), static_cast<std::size_t>(appended)) << "no picture of a page is left out";
     auto seconds = bySeconds(coded, 6);
     std::string text;
@@ -108,7 +110,8 @@ TEST(Rate, OfAPageThatScrollsAtIrregularTimesIsUsedAndNotExceeded) {
     EXPECT_LT(seconds[0], 2.2);
     seconds.erase(seconds.begin());
     EXPECT_THAT(seconds, Each(Le(1.2)));
-    EXPECT_GT(std::accumulate(seconds.begin(), seconds.end(), 0.0) / 5, 0.6) << "rare pictures get the bits of the time that they stand for: " << text;
+    EXPECT_GT(std::accumulate(seconds.begin(), seconds.end(), 0.0) / 5, 0.6)
+        << "rare pictures get the bits of the time that they stand for: " << text;
 }
 
 TEST(Ceiling, LetsASecondsWorthBeSpentAhead) {
