@@ -137,7 +137,7 @@ TEST(Saving, TwoMoviesInTheSameSecondAreBothSaved) {
         };
         ASSERT_TRUE(waitUntil(bothMixed, kPatience)) << world.daemonLog();
         EXPECT_EQ(answers.total(), 0);
-        // The log is written by a thread of its own.
+        // What failed is logged a moment after the state has changed.
         EXPECT_TRUE(waitUntil([&] {
             hasMet = world.countInLog(kNotMixed) > failedBefore;
             return world.temporaryFiles().size() == (hasMet ? 1u : 2u);
