@@ -9,4 +9,7 @@ enum class Form { Text, Json };
 /// other, without escape codes.
 enum class Screen { Terminal, Plain };
 
+/// Takes back the line that a terminal shows.
+inline constexpr char kClearLine[] = "\r\033[K";
+
 }  // namespace lumacast::ctl

@@ -15,6 +15,7 @@
 #include "client/Recorder.h"
 #include "client/lumacastctl/AskDaemon.h"
 #include "client/lumacastctl/ExitStatus.h"
+#include "client/lumacastctl/Form.h"
 #include "client/lumacastctl/Text.h"
 #include "linux/admin/LinuxAdminService.h"
 #include "linux/calls/FolderSync.h"
@@ -32,7 +33,6 @@ constexpr milliseconds kLine{500};
 constexpr milliseconds kStopPatience{60'000};
 constexpr milliseconds kFarewell{300};
 constexpr milliseconds kInsistence{3000};
-constexpr char kClearLine[] = "\r\033[K";
 
 /// What the daemon answers and tells, from the recorder's thread.
 class Answers {
@@ -165,16 +165,20 @@ std::optional<std::string> moveMovie(const std::string& from, const std::string&
     return std::nullopt;
 }
 
-int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& request, Screen progress, std::FILE* out,
-                  std::FILE* complaints, const std::function<bool(milliseconds)>& stopWished,
-                  const std::function<int(const std::string&)>& save) {
+namespace {
+
+/// None when a movie can go there; else why it can't, for people.
+std::optional<std::string> whyNoPlace(const std::string& output) {
+    if (output.empty()) return std::nullopt;
     std::error_code failure;
-    if (!request.output.empty() && std::filesystem::exists(std::filesystem::symlink_status(request.output, failure)))
-        return notRecorded(complaints, request.output + " is there already.");
-    const auto folder = std::filesystem::path(request.output).parent_path();
-    if (!request.output.empty() && !std::filesystem::is_directory(folder, failure))
-        return notRecorded(complaints, folder.string() + " is no folder.");
-    const auto answers = std::make_shared<Answers>();
+    if (std::filesystem::exists(std::filesystem::symlink_status(output, failure))) return output + " is there already.";
+    const auto folder = std::filesystem::path(output).parent_path();
+    if (!std::filesystem::is_directory(folder, failure)) return folder.string() + " is no folder.";
+    return std::nullopt;
+}
+
+/// What the daemon tells by itself, put down in `answers`.
+client::Events eventsTo(const std::shared_ptr<Answers>& answers) {
     client::Events events;
     events.stopped = [answers](std::optional<Error> error, std::optional<URL> movie) {
         answers->change([&](Answers::Known& known) {
@@ -189,124 +193,202 @@ int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& requ
     };
     events.broadcastURL = [tellView](std::optional<URL> url) { tellView(url ? url->text() : std::string()); };
     events.broadcastServiceInfo = [tellView](const Value& info) { tellView(viewURLIn(info)); };
-    client::Recorder recorder(std::move(events), runtimeDirectory);
+    return events;
+}
 
-    if (request.broadcast)
-        if (const auto error = recorder.setUpBroadcastAndWait(*request.broadcast))
-            return notRecorded(complaints, client::textOf(*error) +
-                                               "\n`lumacastctl extensions` shows the upload extensions.");
-    client::StartOptions options;
-    options.broadcast = request.broadcast.has_value();
-    options.size = request.size;
-    options.microphone = request.microphone;
-    options.systemRecording = true;
-    const auto ask = [&] {
-        answers->change([](Answers::Known& known) { known.start.reset(); });
-        recorder.start(options, [answers](client::StartAnswer answer) {
-            answers->change([&](Answers::Known& known) { known.start = std::move(answer); });
-        });
-    };
-    ask();
-    LiveLine line(progress, complaints);
-    line.show("The user may be asked first…");
+/// One recording of the display: begin, then follow, then end. Each of the first two answers none when it goes on, else
+/// the process's exit status, and has said why.
+class DisplayRecording final {
+public:
+    DisplayRecording(const std::string& runtimeDirectory, const RecordRequest& request, Screen progress, std::FILE* out,
+                     std::FILE* complaints, const std::function<bool(milliseconds)>& stopWished)
+        : runtimeDirectory_(runtimeDirectory),
+          request_(request),
+          out_(out),
+          complaints_(complaints),
+          stopWished_(stopWished),
+          recorder_(eventsTo(answers_), runtimeDirectory),
+          line_(progress, complaints) {}
+    /// However it ends, the tool is in front no longer then, and some time later the user is asked again.
+    ~DisplayRecording() {
+        if (hasBegun_) recorder_.didResignActive();
+    }
+    DisplayRecording(const DisplayRecording&) = delete;
+    DisplayRecording& operator=(const DisplayRecording&) = delete;
+
+    /// Has the daemon record; waits for its answer, or for the wish to stop.
+    std::optional<int> begin();
+    /// Shows how far it is until it is to end, or has ended.
+    std::optional<int> follow();
+    /// Stops it and brings the movie where it is to be.
+    int end(const std::function<int(const std::string&)>& save);
+
+private:
+    void askToStart();
+    void askToStop();
+    bool isToBeAskedAgain(const client::StartAnswer& answer, Clock::time_point asked) const;
+    int refused(const Error& error) const;
+    void showProgress();
+    void printView(const std::string& url);
+    int endedByDaemon(const Answers::Known& known) const;
+    int deliver(const std::string& movie, const std::function<int(const std::string&)>& save) const;
+
+    const std::string& runtimeDirectory_;
+    const RecordRequest& request_;
+    std::FILE* const out_;
+    std::FILE* const complaints_;
+    const std::function<bool(milliseconds)>& stopWished_;
+    const std::shared_ptr<Answers> answers_ = std::make_shared<Answers>();
+    client::Recorder recorder_;
+    LiveLine line_;
+    bool hasBegun_ = false;
+    std::string path_;     ///< where the daemon writes it
+    std::string viewURL_;  ///< the one printed last
+};
+
+std::optional<int> DisplayRecording::begin() {
+    if (request_.broadcast)
+        if (const auto error = recorder_.setUpBroadcastAndWait(*request_.broadcast))
+            return notRecorded(complaints_, client::textOf(*error) +
+                                                "\n`lumacastctl extensions` shows the upload extensions.");
+    askToStart();
+    line_.show("The user may be asked first…");
     const auto asked = Clock::now();
-    // A busy display does not say in time who is in front: then one asks again.
-    const auto isToBeAskedAgain = [&](const client::StartAnswer& answer) {
-        return answer.error && client::recordingCodeOf(*answer.error) == RecordingErrorCode::FailedToStart &&
-               Clock::now() - asked < kInsistence;
-    };
     while (true) {
-        const auto answer = answers->known().start;
-        if (answer && !isToBeAskedAgain(*answer)) break;
-        if (stopWished(kLook)) {
-            takeBack(recorder, answers);
-            return notRecorded(complaints, "it was stopped before it began.");
+        const auto answer = answers_->known().start;
+        if (answer && !isToBeAskedAgain(*answer, asked)) break;
+        if (stopWished_(kLook)) {
+            takeBack(recorder_, answers_);
+            return notRecorded(complaints_, "it was stopped before it began.");
         }
-        if (answer) ask();
+        if (answer) askToStart();
     }
-    line.clear();
-    if (const auto error = answers->known().start.value_or(client::StartAnswer{}).error) {
-        const auto code = client::recordingCodeOf(*error);
-        return notRecorded(complaints, client::textOf(*error) +
-                                           (code == RecordingErrorCode::Entitlements
-                                                ? "\n`lumacastctl doctor` says who is, and how to change that."
-                                                : ""));
-    }
+    line_.clear();
+    if (const auto error = answers_->known().start.value_or(client::StartAnswer{}).error) return refused(*error);
+    hasBegun_ = true;
+    return std::nullopt;
+}
 
-    // However it ends, the tool is in front no longer then, and some time later the user is asked again.
-    struct InFront {
-        client::Recorder& recorder;
-        ~InFront() { recorder.didResignActive(); }
-    };
-    const InFront inFront{recorder};
+void DisplayRecording::askToStart() {
+    client::StartOptions options;
+    options.broadcast = request_.broadcast.has_value();
+    options.size = request_.size;
+    options.microphone = request_.microphone;
+    options.systemRecording = true;
+    answers_->change([](Answers::Known& known) { known.start.reset(); });
+    recorder_.start(options, [answers = answers_](client::StartAnswer answer) {
+        answers->change([&](Answers::Known& known) { known.start = std::move(answer); });
+    });
+}
+
+/// A busy display does not say in time who is in front: then one asks again.
+bool DisplayRecording::isToBeAskedAgain(const client::StartAnswer& answer, Clock::time_point asked) const {
+    return answer.error && client::recordingCodeOf(*answer.error) == RecordingErrorCode::FailedToStart &&
+           Clock::now() - asked < kInsistence;
+}
+
+int DisplayRecording::refused(const Error& error) const {
+    const bool mayNot = client::recordingCodeOf(error) == RecordingErrorCode::Entitlements;
+    return notRecorded(complaints_, client::textOf(error) +
+                                        (mayNot ? "\n`lumacastctl doctor` says who is, and how to change that." : ""));
+}
+
+std::optional<int> DisplayRecording::follow() {
     const auto begun = Clock::now();
     auto nextLine = begun;
     bool isWished = false;
-    std::string path;  ///< where the daemon writes it
-    std::string viewURL;
-    const auto printView = [&](const std::string& url) {
-        if (url.empty() || std::exchange(viewURL, url) == url) return;
-        line.clear();
-        std::fprintf(out, "%s\n", printable(url).c_str());
-        std::fflush(out);
-    };
     while (!isWished) {
-        const auto known = answers->known();
+        const auto known = answers_->known();
         printView(known.viewURL);
         if (known.hasStopped || known.isDisconnected) break;
         const auto now = Clock::now();
-        if (request.duration.count() > 0 && now - begun >= request.duration) break;
+        if (request_.duration.count() > 0 && now - begun >= request_.duration) break;
         if (now >= nextLine) {
             nextLine = now + kLine;
-            const auto answer = askAdminService(runtimeDirectory + "/admin.sock", "status", kLine);
-            const auto status = answer ? readStatus(*answer) : std::variant<DaemonStatus, std::string>("");
-            if (const auto* daemon = std::get_if<DaemonStatus>(&status))
-                if (const auto recording = displayRecording(*daemon)) {
-                    path = recording->path.value_or(path);
-                    line.show(recordLine(*recording) + "   (q or Ctrl-C stops)");
-                }
+            showProgress();
         }
         auto wait = kLook;
-        if (request.duration.count() > 0)
-            wait = std::min(wait, std::chrono::ceil<milliseconds>(request.duration - (now - begun)));
-        isWished = stopWished(std::max(wait, milliseconds(0)));
+        if (request_.duration.count() > 0)
+            wait = std::min(wait, std::chrono::ceil<milliseconds>(request_.duration - (now - begun)));
+        isWished = stopWished_(std::max(wait, milliseconds(0)));
     }
-    line.clear();
-
-    auto known = answers->known();
+    line_.clear();
+    const auto known = answers_->known();
     if (known.isDisconnected)
-        return complain(complaints, "the connection to the daemon was lost; the recording may go on. " + whereItIs(path));
-    if (known.hasStopped) {
-        complain(complaints, "the recording was ended by the daemon: " +
-                                 printable(known.stopError ? client::textOf(*known.stopError) : "no reason given") +
-                                 "\n" + whereItIs(path));
-        if (known.stopMovie) std::fprintf(out, "%s\n", known.stopMovie->path().c_str());
-        return kNotRecorded;
-    }
-    recorder.stop([answers](client::StopAnswer answer) {
+        return complain(complaints_,
+                        "the connection to the daemon was lost; the recording may go on. " + whereItIs(path_));
+    if (known.hasStopped) return endedByDaemon(known);
+    return std::nullopt;
+}
+
+void DisplayRecording::showProgress() {
+    const auto answer = askAdminService(runtimeDirectory_ + "/admin.sock", "status", kLine);
+    const auto status = answer ? readStatus(*answer) : std::variant<DaemonStatus, std::string>("");
+    const auto* daemon = std::get_if<DaemonStatus>(&status);
+    const auto recording = daemon ? displayRecording(*daemon) : std::nullopt;
+    if (!recording) return;
+    path_ = recording->path.value_or(path_);
+    line_.show(recordLine(*recording) + "   (q or Ctrl-C stops)");
+}
+
+void DisplayRecording::printView(const std::string& url) {
+    if (url.empty() || std::exchange(viewURL_, url) == url) return;
+    line_.clear();
+    std::fprintf(out_, "%s\n", printable(url).c_str());
+    std::fflush(out_);
+}
+
+int DisplayRecording::endedByDaemon(const Answers::Known& known) const {
+    complain(complaints_, "the recording was ended by the daemon: " +
+                              printable(known.stopError ? client::textOf(*known.stopError) : "no reason given") + "\n" +
+                              whereItIs(path_));
+    if (known.stopMovie) std::fprintf(out_, "%s\n", known.stopMovie->path().c_str());
+    return kNotRecorded;
+}
+
+void DisplayRecording::askToStop() {
+    recorder_.stop([answers = answers_](client::StopAnswer answer) {
         answers->change([&](Answers::Known& changed) { changed.stop = std::move(answer); });
     });
-    const auto stopped = Clock::now();
-    while (!(known = answers->known()).stop && !known.hasStopped && !known.isDisconnected &&
-           Clock::now() - stopped < kStopPatience)
-        stopWished(milliseconds(10));
+}
+
+int DisplayRecording::end(const std::function<int(const std::string&)>& save) {
+    askToStop();
+    const auto asked = Clock::now();
+    Answers::Known known;
+    while (!(known = answers_->known()).stop && !known.hasStopped && !known.isDisconnected &&
+           Clock::now() - asked < kStopPatience)
+        stopWished_(milliseconds(10));
     printView(known.viewURL);
-    if (request.broadcast && known.stop && !known.stop->error) return kGood;
-    if (!known.stop || !known.stop->movie) {
-        const std::string reason = known.stop && known.stop->error ? client::textOf(*known.stop->error)
-                                   : known.stopError               ? client::textOf(*known.stopError)
-                                                                   : "the daemon does not answer.";
-        return notRecorded(complaints, reason);
-    }
-    const std::string movie = known.stop->movie->path();
-    if (request.output.empty()) return save(movie);
-    if (const auto reason = moveMovie(movie, request.output)) {
-        complain(complaints, "the movie can't be moved to " + printable(request.output) + ": " + *reason + "\nIt is " +
-                                 printable(movie));
+    if (request_.broadcast && known.stop && !known.stop->error) return kGood;
+    if (known.stop && known.stop->movie) return deliver(known.stop->movie->path(), save);
+    const std::string reason = known.stop && known.stop->error ? client::textOf(*known.stop->error)
+                               : known.stopError               ? client::textOf(*known.stopError)
+                                                               : "the daemon does not answer.";
+    return notRecorded(complaints_, reason);
+}
+
+int DisplayRecording::deliver(const std::string& movie, const std::function<int(const std::string&)>& save) const {
+    if (request_.output.empty()) return save(movie);
+    if (const auto reason = moveMovie(movie, request_.output)) {
+        complain(complaints_, "the movie can't be moved to " + printable(request_.output) + ": " + *reason +
+                                  "\nIt is " + printable(movie));
         return kNotSaved;
     }
-    std::fprintf(out, "%s\n", request.output.c_str());
+    std::fprintf(out_, "%s\n", request_.output.c_str());
     return kGood;
+}
+
+}  // namespace
+
+int recordDisplay(const std::string& runtimeDirectory, const RecordRequest& request, Screen progress, std::FILE* out,
+                  std::FILE* complaints, const std::function<bool(milliseconds)>& stopWished,
+                  const std::function<int(const std::string&)>& save) {
+    if (const auto reason = whyNoPlace(request.output)) return notRecorded(complaints, *reason);
+    DisplayRecording recording(runtimeDirectory, request, progress, out, complaints, stopWished);
+    if (const auto status = recording.begin()) return *status;
+    if (const auto status = recording.follow()) return *status;
+    return recording.end(save);
 }
 
 }  // namespace lumacast::ctl

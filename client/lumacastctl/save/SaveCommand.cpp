@@ -14,7 +14,6 @@ namespace lumacast::ctl {
 namespace {
 
 /// Back to the line's beginning, and clear to its end (ECMA-48 EL).
-constexpr char kClearLine[] = "\r\033[K";
 
 /// Shows how far a save is, and never the same twice. On a terminal the cursor stays at the beginning of its line: a
 /// complaint takes its place.
