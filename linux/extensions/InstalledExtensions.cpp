@@ -12,6 +12,7 @@
 #include <cerrno>
 #include <cstring>
 #include <memory>
+#include <set>
 
 #include "base/Limits.h"
 #include "linux/system/FileDescriptor.h"
@@ -172,7 +173,7 @@ InstalledExtensions::Known& InstalledExtensions::known(const std::string& folder
 std::variant<std::vector<std::shared_ptr<const InstalledExtension>>, int> InstalledExtensions::look() {
     const std::lock_guard lock(mutex_);
     std::vector<std::shared_ptr<const InstalledExtension>> found;
-    std::set<std::string> identifiers, present, complaints;
+    std::set<std::string> identifiers, present;
     for (const std::string& directory : directories_) {
         const std::string place = directory + std::string(kPlace);
         auto names = foldersIn(place);
@@ -188,14 +189,14 @@ std::variant<std::vector<std::shared_ptr<const InstalledExtension>>, int> Instal
         for (auto& extension : here)
             if (identifiers.insert(extension->manifest.identifier).second) found.push_back(std::move(extension));
     }
-    if (found.size() > limitOf(Limit::ExtensionsInstalled)) {
+    const bool tooMany = found.size() > limitOf(Limit::ExtensionsInstalled);
+    if (tooMany) {
         found.resize(limitOf(Limit::ExtensionsInstalled));
-        complaints.insert("many");
-        if (!complained_.contains("many"))
+        if (!saidTooMany_)
             log_.error("more than %d extensions are installed: the others are passed over",
                        static_cast<std::int64_t>(limitOf(Limit::ExtensionsInstalled)));
     }
-    complained_ = std::move(complaints);
+    saidTooMany_ = tooMany;
     std::erase_if(known_, [&](const auto& entry) { return !present.contains(entry.first); });
     return found;
 }

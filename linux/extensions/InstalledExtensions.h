@@ -3,7 +3,6 @@
 #include <memory>
 #include <mutex>
 #include <optional>
-#include <set>
 #include <string>
 #include <variant>
 #include <vector>
@@ -55,7 +54,7 @@ private:
     const std::vector<Locale> locales_;
     std::mutex mutex_;
     std::map<std::string, Known> known_;  ///< by folder
-    std::set<std::string> complained_;    ///< of what else a line was written
+    bool saidTooMany_ = false;            ///< in the look before
 };
 
 /// Its icons as PNG files, best first: those that are regular files of at most 1 MiB and begin as PNG files do. Blocks

@@ -58,20 +58,22 @@ std::shared_ptr<ExtensionServices> servicesWith(Reactor& reactor, Scheduler& sch
                                                 LinuxAppExtensions::Options options) {
     auto installed = std::make_shared<InstalledExtensions>(log, options.dataDirectories, options.locales);
     auto sandbox = std::make_shared<Sandbox>(log, options.sandbox);
-    return std::shared_ptr<ExtensionServices>(new ExtensionServices{reactor,
-                                                                    scheduler,
-                                                                    ipc,
-                                                                    log,
-                                                                    std::move(options),
-                                                                    std::move(installed),
-                                                                    std::move(sandbox),
-                                                                    scheduler.serialQueue("extension lookups"),
-                                                                    std::make_shared<DiskLane>(),
-                                                                    {},
-                                                                    {},
-                                                                    {},
-                                                                    {},
-                                                                    std::make_unique<LaunchLane>()});
+    return std::shared_ptr<ExtensionServices>(new ExtensionServices{
+        .reactor = reactor,
+        .scheduler = scheduler,
+        .ipc = ipc,
+        .log = log,
+        .options = std::move(options),
+        .installed = std::move(installed),
+        .sandbox = std::move(sandbox),
+        .lookups = scheduler.serialQueue("extension lookups"),
+        .disk = std::make_shared<DiskLane>(),
+        .isOver = false,
+        .mutex = {},
+        .contextClass = {},
+        .processes = {},
+        .launches = std::make_unique<LaunchLane>(),
+    });
 }
 
 std::optional<std::string> variable(const std::string& name) {
