@@ -4,11 +4,14 @@
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
+#include <array>
 #include <chrono>
 #include <cmath>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
+#include <functional>
+#include <memory>
 #include <optional>
 #include <string>
 #include <thread>
@@ -45,7 +48,9 @@ std::string whyNoPid(const std::string& text) {
 }
 
 /// For a watch: each block was written whole before, so there is nothing to end but the process.
-extern "C" void endWatch(int) { ::_exit(kGood); }
+extern "C" void endWatch(int) {
+    ::_exit(kGood);
+}
 
 void onEndSignals(void (*handler)(int)) {
     struct sigaction action {};
@@ -96,7 +101,8 @@ int runRecord(const std::string& directory, RecordRequest request) {
     if (request.size.width < 1) {
         const DisplayFacts display = probeDisplay(variable, std::chrono::seconds(5));
         if (display.width == 0) {
-            std::fprintf(stderr, "lumacastctl: the display can't be asked for its size; `lumacastctl doctor` says why.\n");
+            std::fprintf(stderr,
+                         "lumacastctl: the display can't be asked for its size; `lumacastctl doctor` says why.\n");
             return kNotRecorded;
         }
         request.size = {static_cast<double>(display.width), static_cast<double>(display.height)};
@@ -104,8 +110,7 @@ int runRecord(const std::string& directory, RecordRequest request) {
     const Screen screen = ::isatty(STDERR_FILENO) == 1 ? Screen::Terminal : Screen::Plain;
     std::optional<StopWish> wish(std::in_place);
     return recordDisplay(
-        directory, request, screen, stdout, stderr,
-        [&](std::chrono::milliseconds limit) { return wish->came(limit); },
+        directory, request, screen, stdout, stderr, [&](std::chrono::milliseconds limit) { return wish->came(limit); },
         [&](const std::string& movie) {
             wish.reset();
             return runSave(directory, movie, Form::Text);
@@ -146,95 +151,205 @@ int runDoctor(const IdentityQuestion& question) {
     return hasProblem(findings) ? kProblemsFound : kGood;
 }
 
+/// One of the tool's commands, and what it does once the command line was read.
+struct Command {
+    CLI::App* app;  ///< the whole command line's
+    std::function<int()> run;
+};
+
+Form formOf(bool json) {
+    return json ? Form::Json : Form::Text;
+}
+
+std::string runtimeDirectory() {
+    return LinuxEnvironment::ofThisProcess().runtimeDirectory;
+}
+
+CLI::App* addCommand(CLI::App& to, const char* name, const char* description) {
+    CLI::App* const command = to.add_subcommand(name, description);
+    command->footer(exitStatusText());
+    return command;
+}
+
+Command statusCommand(CLI::App& app) {
+    struct Options {
+        bool json = false, watch = false;
+    };
+    const auto options = std::make_shared<Options>();
+    CLI::App* const command =
+        addCommand(app, "status", "Show the applications that the daemon knows and the running recording");
+    command->add_flag("--json", options->json, "Answer one line of JSON");
+    command->add_flag("--watch", options->watch,
+                      "Show the running recordings, anew each second, until Ctrl-C or the daemon's end");
+    return {command, [options] {
+                const Form form = formOf(options->json);
+                return options->watch ? runWatch(runtimeDirectory(), form)
+                                      : showStatus(runtimeDirectory(), form, stdout, stderr);
+            }};
+}
+
+Command doctorCommand(CLI::App& app) {
+    struct Options {
+        std::int32_t pid = 0;
+        std::string executable;
+    };
+    const auto options = std::make_shared<Options>();
+    CLI::App* const command = addCommand(
+        app, "doctor", "Look at all that recording takes; a line each: ok, warning or problem, and what to do");
+    CLI::Option* const byPid =
+        command->add_option("--pid", options->pid, "Tell which application this process counts as")
+            ->type_name("N")
+            ->check(CLI::Validator(whyNoPid, ""));
+    CLI::Option* const byProgram =
+        command->add_option("--exe", options->executable, "Tell which application this program counts as")
+            ->type_name("PATH")
+            ->excludes(byPid);
+    return {command, [options, byPid, byProgram] {
+                IdentityQuestion question;
+                if (byProgram->count() > 0)
+                    question.executable = options->executable;
+                else
+                    question.pid = ProcessID{byPid->count() > 0 ? options->pid : ::getppid()};
+                question.isExample = byProgram->count() == 0 && byPid->count() == 0;
+                return runDoctor(question);
+            }};
+}
+
+Command storageCommand(CLI::App& app) {
+    struct Options {
+        bool json = false;
+        std::int32_t urgency = 0;
+    };
+    const auto options = std::make_shared<Options>();
+    CLI::App* const command = addCommand(app, "storage", "Show the temporary movies, or have old ones deleted");
+    command->require_subcommand(0, 1);
+    CLI::App* const list = addCommand(*command, "list", "Show the movies: size, date, age, length and state");
+    CLI::App* const purgeable = addCommand(*command, "purgeable", "Show what a purge could give back");
+    CLI::App* const purge =
+        addCommand(*command, "purge",
+                   "Delete as if space were so short: from urgency 3 on a running recording is stopped and every movie "
+                   "deleted; below 3 nothing goes but where a recording has just ended");
+    for (CLI::App* const one : {command, list, purgeable, purge})
+        one->add_flag("--json", options->json, "Answer one line of JSON");
+    purge->add_option("URGENCY", options->urgency, "How short space is: 1, 2 or 3")
+        ->required()
+        ->check(CLI::Range(1, 1000));
+    return {command, [options, list, purgeable, purge] {
+                const Form form = formOf(options->json);
+                if (purge->parsed()) return purgeStorage(runtimeDirectory(), options->urgency, form, stdout, stderr);
+                const StoragePart part = list->parsed()        ? StoragePart::List
+                                         : purgeable->parsed() ? StoragePart::Purgeable
+                                                               : StoragePart::All;
+                return showStorage(runtimeDirectory(), part, form, stdout, stderr);
+            }};
+}
+
+Command saveCommand(CLI::App& app) {
+    struct Options {
+        std::string movie;
+        bool json = false;
+    };
+    const auto options = std::make_shared<Options>();
+    CLI::App* const command = addCommand(
+        app, "save", "Save a movie to the Videos folder, its sounds mixed into one; the file that is given is removed");
+    command->add_option("FILE", options->movie, "The movie")->required();
+    command->add_flag("--json", options->json, "Answer lines of JSON");
+    return {command, [options] { return runSave(runtimeDirectory(), options->movie, formOf(options->json)); }};
+}
+
+Command usageCommand(CLI::App& app) {
+    const auto json = std::make_shared<bool>(false);
+    CLI::App* const command =
+        addCommand(app, "usage", "Show the recordings that have ended, and why each did; newest last");
+    command->add_flag("--json", *json, "Answer one line of JSON");
+    return {command, [json] { return showUsage(runtimeDirectory(), formOf(*json), stdout, stderr); }};
+}
+
+/// What recording and broadcasting the display have in common.
+struct DisplayOptions {
+    bool display = false;  ///< named, as something else may be recorded one day
+    double duration = 0;   ///< seconds; 0: until the user ends it
+    RecordRequest wanted;
+
+    /// With what was read.
+    RecordRequest request() const {
+        RecordRequest result = wanted;
+        result.duration = std::chrono::milliseconds(std::llround(duration * 1000));
+        return result;
+    }
+};
+
+void addDuration(CLI::App& command, DisplayOptions& options) {
+    command.add_option("--duration", options.duration, "End after so many seconds")
+        ->type_name("SECONDS")
+        ->check(CLI::Range(0.1, 86'400.0));
+}
+
+void addMicrophone(CLI::App& command, DisplayOptions& options) {
+    command.add_flag("--microphone", options.wanted.microphone, "Ask for the microphone too");
+}
+
+Command recordCommand(CLI::App& app) {
+    const auto options = std::make_shared<DisplayOptions>();
+    CLI::App* const command = addCommand(
+        app, "record",
+        "Record the whole display, with the sound of what is in front, until q, Enter, the space bar or Ctrl-C");
+    command->add_flag("--display", options->display, "What to record: the whole display")->required();
+    addDuration(*command, *options);
+    command
+        ->add_option("--output", options->wanted.output,
+                     "Where the movie goes; by default the Videos folder, sounds mixed")
+        ->type_name("FILE");
+    addMicrophone(*command, *options);
+    return {command, [options] { return runRecord(runtimeDirectory(), options->request()); }};
+}
+
+Command extensionsCommand(CLI::App& app) {
+    const auto json = std::make_shared<bool>(false);
+    CLI::App* const command =
+        addCommand(app, "extensions", "Show the upload extensions that a broadcast can go through");
+    command->add_flag("--json", *json, "Answer one line of JSON");
+    return {command, [json] { return showExtensions(runtimeDirectory(), formOf(*json), stdout, stderr); }};
+}
+
+Command broadcastCommand(CLI::App& app) {
+    struct Options : DisplayOptions {
+        std::string extension;
+        std::vector<std::string> entries;
+        double clipSeconds = 0;
+    };
+    const auto options = std::make_shared<Options>();
+    CLI::App* const command =
+        addCommand(app, "broadcast",
+                   "Broadcast the whole display through an upload extension, until q, Enter, the space bar or Ctrl-C");
+    command->add_flag("--display", options->display, "What to broadcast: the whole display")->required();
+    command->add_option("--extension", options->extension, "The extension, as `extensions` shows it")
+        ->type_name("IDENTIFIER")
+        ->required();
+    command
+        ->add_option("--set", options->entries,
+                     "What the extension is to know, once for each; its documentation says what")
+        ->type_name("KEY=VALUE");
+    command->add_option("--clip", options->clipSeconds, "How long a clip is, where the extension takes clips")
+        ->type_name("SECONDS")
+        ->check(CLI::Range(0.5, 600.0));
+    addDuration(*command, *options);
+    addMicrophone(*command, *options);
+    return {command, [options] {
+                return runBroadcast(options->request(), options->extension, options->entries, options->clipSeconds);
+            }};
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
     CLI::App app("Asks the screen recording daemon how it is, and looks for what keeps it from recording.",
                  "lumacastctl");
-    const std::string exitStatuses = exitStatusText();
-    app.footer(exitStatuses);
+    app.footer(exitStatusText());
     app.require_subcommand(1);
-    CLI::App* status =
-        app.add_subcommand("status", "Show the applications that the daemon knows and the running recording");
-    status->footer(exitStatuses);
-    bool json = false, watch = false;
-    status->add_flag("--json", json, "Answer one line of JSON");
-    status->add_flag("--watch", watch,
-                     "Show the running recordings, anew each second, until Ctrl-C or the daemon's end");
-    CLI::App* doctor = app.add_subcommand(
-        "doctor", "Look at all that recording takes; a line each: ok, warning or problem, and what to do");
-    doctor->footer(exitStatuses);
-    std::int32_t pid = 0;
-    std::string executable;
-    CLI::Option* byPid = doctor->add_option("--pid", pid, "Tell which application this process counts as")
-                            ->type_name("N")
-                            ->check(CLI::Validator(whyNoPid, ""));
-    CLI::Option* byProgram = doctor->add_option("--exe", executable, "Tell which application this program counts as")
-                                 ->type_name("PATH")
-                                 ->excludes(byPid);
-
-    CLI::App* storage = app.add_subcommand("storage", "Show the temporary movies, or have old ones deleted");
-    storage->footer(exitStatuses);
-    storage->require_subcommand(0, 1);
-    storage->add_flag("--json", json, "Answer one line of JSON");
-    CLI::App* list = storage->add_subcommand("list", "Show the movies: size, date, age, length and state");
-    CLI::App* purgeable = storage->add_subcommand("purgeable", "Show what a purge could give back");
-    CLI::App* purge = storage->add_subcommand(
-        "purge", "Delete as if space were so short: from urgency 3 on a running recording is stopped and every movie "
-                 "deleted; below 3 nothing goes but where a recording has just ended");
-    for (CLI::App* command : {list, purgeable, purge}) {
-        command->footer(exitStatuses);
-        command->add_flag("--json", json, "Answer one line of JSON");
-    }
-    std::int32_t urgency = 0;
-    purge->add_option("URGENCY", urgency, "How short space is: 1, 2 or 3")->required()->check(CLI::Range(1, 1000));
-
-    CLI::App* save = app.add_subcommand(
-        "save", "Save a movie to the Videos folder, its sounds mixed into one; the file that is given is removed");
-    save->footer(exitStatuses);
-    std::string movie;
-    save->add_option("FILE", movie, "The movie")->required();
-    save->add_flag("--json", json, "Answer lines of JSON");
-
-    CLI::App* usage = app.add_subcommand("usage", "Show the recordings that have ended, and why each did; newest last");
-    usage->footer(exitStatuses);
-    usage->add_flag("--json", json, "Answer one line of JSON");
-    CLI::App* record = app.add_subcommand(
-        "record", "Record the whole display, with the sound of what is in front, until q, Enter, the space bar or Ctrl-C");
-    record->footer(exitStatuses);
-    bool display = false;
-    RecordRequest wanted;
-    double duration = 0;
-    record->add_flag("--display", display, "What to record: the whole display")->required();
-    record->add_option("--duration", duration, "End after so many seconds")
-        ->type_name("SECONDS")
-        ->check(CLI::Range(0.1, 86'400.0));
-    record->add_option("--output", wanted.output, "Where the movie goes; by default the Videos folder, sounds mixed")
-        ->type_name("FILE");
-    record->add_flag("--microphone", wanted.microphone, "Ask for the microphone too");
-
-    CLI::App* extensions = app.add_subcommand("extensions", "Show the upload extensions that a broadcast can go through");
-    extensions->footer(exitStatuses);
-    extensions->add_flag("--json", json, "Answer one line of JSON");
-    CLI::App* broadcast = app.add_subcommand(
-        "broadcast", "Broadcast the whole display through an upload extension, until q, Enter, the space bar or Ctrl-C");
-    broadcast->footer(exitStatuses);
-    std::string extension;
-    std::vector<std::string> entries;
-    double clipSeconds = 0;
-    broadcast->add_flag("--display", display, "What to broadcast: the whole display")->required();
-    broadcast->add_option("--extension", extension, "The extension, as `extensions` shows it")
-        ->type_name("IDENTIFIER")
-        ->required();
-    broadcast->add_option("--set", entries, "What the extension is to know, once for each; its documentation says what")
-        ->type_name("KEY=VALUE");
-    broadcast->add_option("--clip", clipSeconds, "How long a clip is, where the extension takes clips")
-        ->type_name("SECONDS")
-        ->check(CLI::Range(0.5, 600.0));
-    broadcast->add_option("--duration", duration, "End after so many seconds")
-        ->type_name("SECONDS")
-        ->check(CLI::Range(0.1, 86'400.0));
-    broadcast->add_flag("--microphone", wanted.microphone, "Ask for the microphone too");
+    // In the order of the help.
+    const std::array commands{statusCommand(app), doctorCommand(app), storageCommand(app),    saveCommand(app),
+                              usageCommand(app),  recordCommand(app), extensionsCommand(app), broadcastCommand(app)};
 
     try {
         app.parse(argc, argv);
@@ -242,40 +357,9 @@ int main(int argc, char** argv) {
         return app.exit(error) == 0 ? kGood : kWrongUsage;  // --help comes this way too
     }
 
-    int result = kGood;
-    if (status->parsed()) {
-        const std::string directory = LinuxEnvironment::ofThisProcess().runtimeDirectory;
-        const Form form = json ? Form::Json : Form::Text;
-        result = watch ? runWatch(directory, form) : showStatus(directory, form, stdout, stderr);
-    } else if (storage->parsed()) {
-        const std::string directory = LinuxEnvironment::ofThisProcess().runtimeDirectory;
-        const Form form = json ? Form::Json : Form::Text;
-        const StoragePart part = list->parsed()        ? StoragePart::List
-                                 : purgeable->parsed() ? StoragePart::Purgeable
-                                                       : StoragePart::All;
-        result = purge->parsed() ? purgeStorage(directory, urgency, form, stdout, stderr)
-                                 : showStorage(directory, part, form, stdout, stderr);
-    } else if (usage->parsed()) {
-        const std::string directory = LinuxEnvironment::ofThisProcess().runtimeDirectory;
-        result = showUsage(directory, json ? Form::Json : Form::Text, stdout, stderr);
-    } else if (save->parsed()) {
-        result = runSave(LinuxEnvironment::ofThisProcess().runtimeDirectory, movie, json ? Form::Json : Form::Text);
-    } else if (extensions->parsed()) {
-        result = showExtensions(LinuxEnvironment::ofThisProcess().runtimeDirectory, json ? Form::Json : Form::Text,
-                                stdout, stderr);
-    } else if (broadcast->parsed()) {
-        wanted.duration = std::chrono::milliseconds(std::llround(duration * 1000));
-        result = runBroadcast(wanted, extension, entries, clipSeconds);
-    } else if (record->parsed()) {
-        wanted.duration = std::chrono::milliseconds(std::llround(duration * 1000));
-        result = runRecord(LinuxEnvironment::ofThisProcess().runtimeDirectory, wanted);
-    } else {
-        IdentityQuestion question;
-        if (byProgram->count() > 0) question.executable = executable;
-        else question.pid = ProcessID{byPid->count() > 0 ? pid : ::getppid()};
-        question.isExample = byProgram->count() == 0 && byPid->count() == 0;
-        result = runDoctor(question);
-    }
+    int result = kWrongUsage;
+    for (const Command& command : commands)
+        if (command.app->parsed()) result = command.run();
     if (std::fflush(stdout) != 0 || std::ferror(stdout) != 0) {
         std::fprintf(stderr, "lumacastctl: the output could not be written.\n");
         return kNoAnswer;
