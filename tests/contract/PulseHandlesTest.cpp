@@ -15,6 +15,7 @@ namespace lumacast {
 namespace {
 
 /// How many streams record from the server, and play to it, asked once all that was sent before has been answered.
+/// A server may take a moment longer to let go of one.
 struct Counts {
     int recording = 0, playing = 0;
 };
@@ -59,7 +60,10 @@ private:
         const auto playing = [](pa_context*, const pa_sink_input_info* info, int end, void* self) {
             auto& hasty = *static_cast<Hasty*>(self);
             if (info) ++hasty.counts_.playing;
-            if (end != 0) hasty.counted_.set_value(hasty.counts_);
+            if (end == 0) return;
+            const bool isLate = std::chrono::steady_clock::now() > hasty.bound_;
+            if (!isLate && hasty.counts_.recording + hasty.counts_.playing > 0) return hasty.countAgain();
+            hasty.counted_.set_value(hasty.counts_);
         };
         if (auto* const question = pa_context_get_source_output_info_list(context_, recording, this))
             pa_operation_unref(question);
@@ -67,6 +71,12 @@ private:
             pa_operation_unref(question);
     }
 
+    void countAgain() {
+        counts_ = {};
+        ask([this] { count(); });
+    }
+
+    const std::chrono::steady_clock::time_point bound_ = std::chrono::steady_clock::now() + std::chrono::seconds(20);
     pa_context* context_ = nullptr;
     std::function<void()> then_;
     Counts counts_;

@@ -111,9 +111,14 @@ TEST_P(Count, OfTheNotesIsThatOfTheSystem) {
     for (int i = 0; i < 40 && heard.stop != "ok"; ++i) heard = scenario->record();
     EXPECT_EQ(heard.stop, "ok") << heard.start;
     const pid_t daemon = world.daemon().pid();
-    // What follows the answer (a clip is removed) is not to be under way when the daemon ends: begun, and not noted yet.
-    (void)waitUntil([&] { return countOfNotes(scenario->calls()) == countOfSystem(trace, world.path(""), daemon); },
-                    std::chrono::seconds(10));
+    // What follows the answer (a clip or a saved movie is removed) is not to be under way when the daemon ends: begun, and not
+    // noted yet.
+    (void)waitUntil(
+        [&] {
+            return scenario->isSettled() &&
+                   countOfNotes(scenario->calls()) == countOfSystem(trace, world.path(""), daemon);
+        },
+        std::chrono::seconds(30));
     EXPECT_EQ(world.endDaemon(SIGTERM), 0);
     const std::regex end("^" + std::to_string(daemon) + R"( +\+\+\+ exited.*$)");  // padded to the width of larger numbers
     EXPECT_TRUE(waitUntil([&] {

@@ -297,9 +297,10 @@ private:
     }
     /// A clip that its extension has been given and has not kept is gone for good: a broadcast is live.
     bool isKept(std::uint32_t, const checkers::FramesLog&) const override { return false; }
+    bool isSettled() const override { return moviesIn(world_.temporaryDirectory()).empty(); }
     /// The last clip is handed over after the answer.
     void settle(const Heard& heard) override {
-        if (heard.stop == "ok") waitUntil([&] { return moviesIn(world_.temporaryDirectory()).empty() || !daemonLives(); }, std::chrono::seconds(5));
+        if (heard.stop == "ok") waitUntil([&] { return isSettled() || !daemonLives(); }, std::chrono::seconds(5));
     }
     const std::string folder_;
 };
@@ -370,6 +371,7 @@ private:
 class Mixed final : public Scenario {
 public:
     std::string name() const override { return "mixed"; }
+    bool isSettled() const override { return !fs::exists(movie_); }
     Heard record() override {
         movie_ = world_.makeMovie("two.mp4", {440, 880});
         client::Recorder recorder(client::Events{}, world_.path("run/lumacast"));

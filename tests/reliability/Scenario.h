@@ -40,6 +40,8 @@ public:
 
     /// Has one movie made, start to end. Everything that answers may fail, and the daemon may die on the way.
     virtual Heard record() = 0;
+    /// Whether what follows the answer of a recording without fault has happened: what was handed on is removed.
+    virtual bool isSettled() const { return true; }
     /// What is wrong with what is there after a recording that had a fault: each movie plays, or there is none, and nothing
     /// is lost that was safe before. `ended` is when the daemon was killed.
     virtual std::vector<std::string> judgeAfterFault(const Heard& heard, std::optional<std::chrono::nanoseconds> ended) = 0;
