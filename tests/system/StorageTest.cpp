@@ -8,26 +8,13 @@
 #include <fstream>
 
 #include "tests/contract/SmallDisk.h"
+#include "tests/system/Tool.h"
 #include "tests/system/World.h"
 
 namespace lumacast::test {
 namespace {
 
 using ::testing::HasSubstr;
-
-struct Outcome {
-    int status = -1;
-    std::string out;
-};
-
-Outcome tool(const World& world, std::vector<std::string> arguments) {
-    arguments.insert(arguments.begin(), LC_CTL);
-    checkers::Child child(arguments, world.environment(), world.path("tool.log"));
-    Outcome outcome;
-    outcome.out = child.readAll();
-    outcome.status = child.wait();
-    return outcome;
-}
 
 nlohmann::json answer(const World& world, std::vector<std::string> arguments) {
     arguments.push_back("--json");

@@ -9,6 +9,7 @@
 
 #include "tests/contract/TestWindow.h"
 #include "tests/system/MovingWindow.h"
+#include "tests/system/Tool.h"
 #include "tests/system/World.h"
 
 namespace lumacast::test {
@@ -19,20 +20,6 @@ using ::testing::HasSubstr;
 using ::testing::Not;
 
 constexpr int kSummary = 1, kClosedAtEnd = 2;
-
-struct Outcome {
-    int status = -1;
-    std::string out;
-};
-
-Outcome tool(const World& world, std::vector<std::string> arguments) {
-    arguments.insert(arguments.begin(), LC_CTL);
-    checkers::Child child(arguments, world.environment(), world.path("tool.log"));
-    Outcome outcome;
-    outcome.out = child.readAll();
-    outcome.status = child.wait();
-    return outcome;
-}
 
 nlohmann::json usage(const World& world) {
     const Outcome outcome = tool(world, {"usage", "--json"});
