@@ -43,10 +43,10 @@ class PortWriterWorld final : public WriterWorld {
 public:
     ContainerWriters& writers() override { return writers_; }
     bool fileExists(const URL& url) override { return std::filesystem::exists(url.path()); }
-    URL url(const std::string& name) const override { return URL::file(directory_.file(name)); }
+    URL url(const std::string& name) const override { return URL::file(directory_.path(name)); }
 
 private:
-    OwnDirectory directory_;
+    ScratchDirectory directory_;
     LinuxContainerWriters writers_{clock};
 };
 

@@ -176,7 +176,7 @@ public:
     /// failed. After a restart of the server it can be added again.
     PipedMicrophone* addMicrophone(const std::string& name) {
         auto& room = rooms_[name];
-        const std::string pipe = directory_.file(name);
+        const std::string pipe = directory_.path(name);
         if (!room) room = std::make_unique<PipedMicrophone>();
         std::filesystem::remove(pipe);
         const bool isThere = does("load-module module-pipe-source source_name=" + name + " file=" + pipe +
@@ -218,7 +218,7 @@ private:
     }
 
     const std::unique_ptr<test::SoundServer> server_;
-    const OwnDirectory directory_;
+    const ScratchDirectory directory_;
     std::map<std::string, std::unique_ptr<PipedMicrophone>> rooms_;
     LinuxClock clock_;
     ThreadScheduler scheduler_{std::make_shared<ThreadLoop>()};

@@ -115,7 +115,7 @@ protected:
     /// Waits for the service's answer to the hello, which shows that the connection works.
     static void expectHello(RawPeer& peer) { EXPECT_EQ(peer.read(kHelloBytes), makeHello()); }
 
-    TemporaryDirectory directory;
+    ScratchDirectory directory;
     std::size_t descriptorsBefore = 0;
     std::unique_ptr<IpcPort> daemon;
     std::unique_ptr<IpcPort> client;

@@ -16,27 +16,9 @@
 #include "linux/ipc/LinuxIpc.h"
 #include "linux/ipc/Reactor.h"
 #include "tests/contract/IpcWorld.h"
+#include "tests/contract/ScratchDirectory.h"
 
 namespace lumacast {
-
-/// A private directory, removed at the end.
-class TemporaryDirectory {
-public:
-    TemporaryDirectory() {
-        std::string pattern = (std::filesystem::temp_directory_path() / "lc-ipc-XXXXXX").string();
-        path_ = mkdtemp(pattern.data()) ? pattern : std::string();
-    }
-    TemporaryDirectory(const TemporaryDirectory&) = delete;
-    TemporaryDirectory& operator=(const TemporaryDirectory&) = delete;
-    ~TemporaryDirectory() {
-        std::error_code ignored;
-        if (!path_.empty()) std::filesystem::remove_all(path_, ignored);
-    }
-    const std::string& path() const { return path_; }
-
-private:
-    std::string path_;
-};
 
 /// One end: a reactor on its own thread, a log and an Ipc.
 class IpcPort {
@@ -92,7 +74,7 @@ public:
     const std::string& directory() const { return directory_.path(); }
 
 private:
-    TemporaryDirectory directory_;
+    ScratchDirectory directory_;
     std::array<IpcPort, 3> ports_{IpcPort(directory_.path()), IpcPort(directory_.path()), IpcPort(directory_.path())};
 };
 

@@ -18,6 +18,7 @@
 #include "platform/ContainerWriter.h"
 #include "writer/media/SampleBuffer.h"
 #include "tests/contract/Eventually.h"
+#include "tests/contract/ScratchDirectory.h"
 
 namespace lumacast::testing {
 
@@ -75,25 +76,6 @@ private:
     std::uint64_t number_;
     std::vector<std::uint8_t> pixels_;
     std::vector<PixelRect> damage_;
-};
-
-/// A directory that goes with the test.
-class OwnDirectory final {
-public:
-    OwnDirectory() {
-        std::string pattern = (std::filesystem::temp_directory_path() / "movies.XXXXXX").string();
-        if (::mkdtemp(pattern.data())) path_ = pattern;
-    }
-    OwnDirectory(const OwnDirectory&) = delete;
-    OwnDirectory& operator=(const OwnDirectory&) = delete;
-    ~OwnDirectory() {
-        std::error_code ignored;
-        if (!path_.empty()) std::filesystem::remove_all(path_, ignored);
-    }
-    std::string file(const std::string& name) const { return path_ + "/" + name; }
-
-private:
-    std::string path_;
 };
 
 /// Something that happens on another thread, counted.

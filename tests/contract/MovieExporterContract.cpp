@@ -50,10 +50,10 @@ public:
     ContainerWriters& writers() override { return writers_; }
     MovieExporters& exporters() override { return exporters_; }
     bool fileExists(const URL& url) override { return std::filesystem::exists(url.path()); }
-    URL url(const std::string& name) const override { return URL::file(directory_.file(name)); }
+    URL url(const std::string& name) const override { return URL::file(directory_.path(name)); }
 
 private:
-    OwnDirectory directory_;
+    ScratchDirectory directory_;
     LinuxContainerWriters writers_{clock};
     LinuxMovieExporters exporters_{std::make_shared<media::PosixMovieFiles>(), media::EncodingPriority::AsUsual};
 };

@@ -41,7 +41,7 @@ protected:
         return foreign;
     }
 
-    TemporaryDirectory directory;
+    ScratchDirectory directory;
     ActivatedSockets activated;
     Log log;
 };

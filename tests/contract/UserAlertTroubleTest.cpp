@@ -113,7 +113,7 @@ public:
 
 private:
     const ScratchDirectory scratch_;
-    const FileDescriptor socket_{::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)};
+    const Fd socket_{::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)};
 };
 
 /// Has the accessibility service's name, and never reads what it is asked.

@@ -43,8 +43,8 @@ TEST_P(X11MirrorMovie, IsUprightForAPlayer) {
     made->stop();
     const CapturedFrame frame = world.frames->frames().back();
 
-    const lumacast::testing::OwnDirectory directory;
-    const std::string file = directory.file("mirror.mp4");
+    const ScratchDirectory directory;
+    const std::string file = directory.path("mirror.mp4");
     LinuxContainerWriters writers(world.clock);
     auto writer = std::get<0>(writers.make(URL::file(file), ContainerType::Mpeg4));
     const auto input = writer->addVideoInput(

@@ -14,7 +14,7 @@
 
 #include "tests/checkers/ToneChecker.h"
 #include "tests/checkers/check_movie/MovieCheck.h"
-#include "tests/checkers/tests/TestFolder.h"
+#include "tests/checkers/tests/FileBytes.h"
 #include "tests/client/Heard.h"
 #include "tests/contract/SmallDisk.h"
 #include "tests/system/SavingWorld.h"

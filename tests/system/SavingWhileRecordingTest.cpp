@@ -8,7 +8,7 @@
 #include <mutex>
 #include <set>
 
-#include "tests/checkers/tests/TestFolder.h"
+#include "tests/checkers/tests/FileBytes.h"
 #include "tests/client/Heard.h"
 #include "tests/system/SavingWorld.h"
 

@@ -4,7 +4,8 @@
 
 #include "tests/checkers/tests/BoxDoctor.h"
 #include "tests/checkers/tests/MovieMaker.h"
-#include "tests/checkers/tests/TestFolder.h"
+#include "tests/checkers/tests/FileBytes.h"
+#include "tests/contract/ScratchDirectory.h"
 
 namespace lumacast::checkers {
 namespace {
@@ -43,8 +44,8 @@ protected:
         }
     }
 
-    TestFolder folder_;
-    std::string path_ = folder_.file("movie.mp4");
+    ScratchDirectory folder_;
+    std::string path_ = folder_.path("movie.mp4");
     Bytes good_;
 };
 
@@ -315,7 +316,7 @@ TEST_F(BoxCheckerTest, RejectsAFileThatIsNoMovie) {
             writeBytes(path_, bytes);
             EXPECT_FALSE(checkBoxes(path_, shape).findings.empty());
         }
-        EXPECT_FALSE(checkBoxes(folder_.file("none.mp4"), shape).findings.empty());
+        EXPECT_FALSE(checkBoxes(folder_.path("none.mp4"), shape).findings.empty());
     }
 }
 

@@ -2,7 +2,8 @@
 
 #include "tests/checkers/BoxChecker.h"
 #include "tests/checkers/tests/BoxDoctor.h"
-#include "tests/checkers/tests/TestFolder.h"
+#include "tests/checkers/tests/FileBytes.h"
+#include "tests/contract/ScratchDirectory.h"
 #include "tests/unit/linux_mp4/Media.h"
 
 namespace lumacast::checkers {
@@ -39,8 +40,8 @@ protected:
         }
     }
 
-    TestFolder folder_;
-    std::string path_ = folder_.file("movie.mp4");
+    ScratchDirectory folder_;
+    std::string path_ = folder_.path("movie.mp4");
     Bytes good_;
 };
 

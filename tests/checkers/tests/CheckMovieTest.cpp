@@ -7,7 +7,8 @@
 
 #include "tests/checkers/tests/Child.h"
 #include "tests/checkers/tests/MovieMaker.h"
-#include "tests/checkers/tests/TestFolder.h"
+#include "tests/checkers/tests/FileBytes.h"
+#include "tests/contract/ScratchDirectory.h"
 
 namespace lumacast::checkers {
 namespace {
@@ -33,18 +34,18 @@ protected:
         }
         std::vector<std::string> command{LC_CHECK_MOVIE, movie_};
         command.insert(command.end(), options.begin(), options.end());
-        Child tool(command, {}, folder_.file("errors"));
+        Child tool(command, {}, folder_.path("errors"));
         const std::string output = tool.readAll();
         report_ = json::parse(output, nullptr, false);
         const int status = tool.wait();
-        const auto bytes = bytesOf(folder_.file("errors"));
+        const auto bytes = bytesOf(folder_.path("errors"));
         errors_.assign(bytes.begin(), bytes.end());
         return status;
     }
 
-    TestFolder folder_;
-    std::string movie_ = folder_.file("movie.mp4");
-    std::string log_ = folder_.file("frames.txt");
+    ScratchDirectory folder_;
+    std::string movie_ = folder_.path("movie.mp4");
+    std::string log_ = folder_.path("frames.txt");
     MoviePlan plan_;
     bool made_ = false;
     json report_;
@@ -52,7 +53,7 @@ protected:
 };
 
 TEST_F(CheckMovie, PassesAGoodMovieAndReportsIt) {
-    const std::string sheet = folder_.file("sheet.png");
+    const std::string sheet = folder_.path("sheet.png");
     EXPECT_EQ(run({"--frames-log", log_, "--expect-all", "--expect", "100-129", "--max-hole-ms", "34", "--tone", "440",
                    "--no-tone", "880", "--video-tracks", "1", "--audio-tracks", "1", "--min-seconds", "0.9",
                    "--max-seconds", "1.1", "--contact-sheet", sheet}),
@@ -102,7 +103,7 @@ TEST_F(CheckMovie, FailsOnAFileThatIsCutOffOrMissing) {
     writeBytes(movie_, bytes);
     EXPECT_EQ(run({}), 1);
     EXPECT_NE(errors_, "");
-    movie_ = folder_.file("none.mp4");
+    movie_ = folder_.path("none.mp4");
     EXPECT_EQ(run({}), 1);
     EXPECT_EQ(report_["ok"], false);
 }
@@ -111,7 +112,7 @@ TEST_F(CheckMovie, RefusesOptionsItDoesNotUnderstand) {
     EXPECT_EQ(run({"--forbid", "7"}), 2);
     EXPECT_EQ(run({"--forbid", "9-7"}), 2);
     EXPECT_EQ(run({"--bogus"}), 2);
-    EXPECT_EQ(run({"--frames-log", folder_.file("none")}), 2);
+    EXPECT_EQ(run({"--frames-log", folder_.path("none")}), 2);
 }
 
 }  // namespace

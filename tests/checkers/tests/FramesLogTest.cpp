@@ -2,7 +2,8 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/checkers/tests/TestFolder.h"
+#include "tests/checkers/tests/FileBytes.h"
+#include "tests/contract/ScratchDirectory.h"
 
 namespace lumacast::checkers {
 namespace {
@@ -12,12 +13,12 @@ using namespace std::chrono_literals;
 class FramesLogTest : public ::testing::Test {
 protected:
     std::optional<FramesLog> read(const std::string& text) {
-        const std::string path = folder_.file("frames.txt");
+        const std::string path = folder_.path("frames.txt");
         writeBytes(path, {text.begin(), text.end()});
         error_.clear();
         return readFramesLog(path, error_);
     }
-    TestFolder folder_;
+    ScratchDirectory folder_;
     std::string error_;
 };
 
@@ -42,7 +43,7 @@ TEST_F(FramesLogTest, RefusesLinesOfAnotherForm) {
         EXPECT_FALSE(read(text)) << text;
         EXPECT_NE(error_, "");
     }
-    EXPECT_FALSE(readFramesLog(folder_.file("none"), error_));
+    EXPECT_FALSE(readFramesLog(folder_.path("none"), error_));
 }
 
 }  // namespace

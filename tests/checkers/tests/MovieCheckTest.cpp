@@ -5,8 +5,9 @@
 #include "tests/checkers/BoxChecker.h"
 #include "tests/checkers/FrameNumberChecker.h"
 #include "tests/checkers/MovieReader.h"
+#include "tests/checkers/tests/FileBytes.h"
 #include "tests/checkers/tests/MovieMaker.h"
-#include "tests/checkers/tests/TestFolder.h"
+#include "tests/contract/ScratchDirectory.h"
 
 namespace lumacast::checkers {
 namespace {
@@ -33,7 +34,7 @@ protected:
     }
 
     FrameReport judge() {
-        const std::string path = folder_.file("movie.mp4");
+        const std::string path = folder_.path("movie.mp4");
         EXPECT_EQ(makeMovie(plan_, path), "");
         MovieReader reader(path);
         EXPECT_EQ(reader.error(), "");
@@ -51,7 +52,7 @@ protected:
         EXPECT_EQ(found, kinds) << texts;
     }
 
-    TestFolder folder_;
+    ScratchDirectory folder_;
     MoviePlan plan_;
     FrameExpectation expectation_;
 };
@@ -189,7 +190,7 @@ TEST_F(MovieCheck, RejectsAMovieWithoutPicturesAndTimesThatStandStill) {
 TEST_F(MovieCheck, ReportsWhatAMovieIs) {
     plan_.soundSeconds = 2;
     plan_.sound = [](double) { return 0.0F; };
-    const std::string path = folder_.file("movie.mp4");
+    const std::string path = folder_.path("movie.mp4");
     ASSERT_EQ(makeMovie(plan_, path), "");
     const MovieReader reader(path);
     ASSERT_EQ(reader.videoTracks().size(), 1U);
@@ -206,17 +207,17 @@ TEST_F(MovieCheck, ReportsWhatAMovieIs) {
 }
 
 TEST_F(MovieCheck, SaysThatATruncatedOrMissingFileCantBeRead) {
-    const std::string path = folder_.file("movie.mp4");
+    const std::string path = folder_.path("movie.mp4");
     ASSERT_EQ(makeMovie(plan_, path), "");
     auto bytes = bytesOf(path);
     bytes.resize(bytes.size() / 2);
     writeBytes(path, bytes);
     EXPECT_NE(MovieReader(path).error(), "");
-    EXPECT_NE(MovieReader(folder_.file("none.mp4")).error(), "");
+    EXPECT_NE(MovieReader(folder_.path("none.mp4")).error(), "");
 }
 
 TEST_F(MovieCheck, SaysThatDamagedMediaCantBeDecoded) {
-    const std::string path = folder_.file("movie.mp4");
+    const std::string path = folder_.path("movie.mp4");
     ASSERT_EQ(makeMovie(plan_, path), "");
     auto bytes = bytesOf(path);
     // Junk in the middle of the media; the index stays whole.

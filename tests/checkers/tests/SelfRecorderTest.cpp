@@ -14,7 +14,8 @@
 #include "tests/checkers/FramesLog.h"
 #include "tests/checkers/Luma.h"
 #include "tests/checkers/tests/Child.h"
-#include "tests/checkers/tests/TestFolder.h"
+#include "tests/checkers/tests/FileBytes.h"
+#include "tests/contract/ScratchDirectory.h"
 
 namespace lumacast::checkers {
 namespace {
@@ -42,7 +43,7 @@ protected:
     void SetUp() override {
         server_ = std::make_unique<Child>(std::vector<std::string>{"Xvfb", "-displayfd", "1", "-noreset", "-nolisten",
                                                                    "tcp", "-screen", "0", "800x600x24"},
-                                          std::vector<std::string>{}, folder_.file("server"));
+                                          std::vector<std::string>{}, folder_.path("server"));
         const std::string number = server_->readLine();
         ASSERT_NE(number, "") << "Xvfb doesn't start";
         display_ = ":" + number;
@@ -54,7 +55,7 @@ protected:
         options.insert(options.begin(), LC_SELF_RECORDER);
         options.insert(options.end(), {"--frames-log", log_});
         environment.push_back("DISPLAY=" + display_);
-        application_ = std::make_unique<Child>(options, environment, folder_.file("errors"));
+        application_ = std::make_unique<Child>(options, environment, folder_.path("errors"));
         const std::string line = application_->readLine();
         ASSERT_EQ(line.substr(0, 9), "window 0x") << line;
         window_ = static_cast<xcb_window_t>(std::stoul(line.substr(7), nullptr, 16));
@@ -131,8 +132,8 @@ protected:
         void operator()(xcb_connection_t* connection) const { xcb_disconnect(connection); }
     };
 
-    TestFolder folder_;
-    std::string log_ = folder_.file("frames.txt");
+    ScratchDirectory folder_;
+    std::string log_ = folder_.path("frames.txt");
     std::string display_;
     std::unique_ptr<Child> server_;
     std::unique_ptr<xcb_connection_t, Disconnect> connection_;
@@ -244,17 +245,17 @@ TEST_F(SelfRecorder, SaysWhatIsWrongWithItsOptions) {
          {std::vector<std::string>{"--size", "10x10"}, {"--size", "x"}, {"--fps", "0"}}) {
         std::vector<std::string> command{LC_SELF_RECORDER};
         command.insert(command.end(), options.begin(), options.end());
-        Child child(command, {"DISPLAY=" + display_}, folder_.file("errors"));
+        Child child(command, {"DISPLAY=" + display_}, folder_.path("errors"));
         EXPECT_NE(child.wait(), 0);
-        EXPECT_FALSE(bytesOf(folder_.file("errors")).empty());
+        EXPECT_FALSE(bytesOf(folder_.path("errors")).empty());
     }
-    Child lost({LC_SELF_RECORDER}, {"DISPLAY=:nowhere"}, folder_.file("errors"));
+    Child lost({LC_SELF_RECORDER}, {"DISPLAY=:nowhere"}, folder_.path("errors"));
     EXPECT_EQ(lost.wait(), 1);
 }
 
 TEST_F(SelfRecorder, MarksFramesAndSaysOnceThatThereIsNobodyToBeepFor) {
     // Nobody serves sound there.
-    start({"--size", "320x180", "--fps", "60", "--beep-every", "30"}, {"PULSE_SERVER=unix:" + folder_.file("nobody")});
+    start({"--size", "320x180", "--fps", "60", "--beep-every", "30"}, {"PULSE_SERVER=unix:" + folder_.path("nobody")});
     EXPECT_TRUE(eventually([&] { return isMarked(content().view()); }));
     EXPECT_TRUE(eventually([&] { return !isMarked(content().view()); })) << "for a moment only";
     EXPECT_TRUE(reachesFrame(100));
@@ -266,7 +267,7 @@ TEST_F(SelfRecorder, MarksFramesAndSaysOnceThatThereIsNobodyToBeepFor) {
     for (const auto& [number, stamp] : *log) marked += stamp.isMarked ? 1 : 0;
     EXPECT_GE(marked, 2);
     EXPECT_LE(marked, 3);
-    const auto bytes = bytesOf(folder_.file("errors"));
+    const auto bytes = bytesOf(folder_.path("errors"));
     const std::string said(bytes.begin(), bytes.end());
     EXPECT_EQ(said.find("no beeps"), said.rfind("no beeps")) << said;
     EXPECT_NE(said.find("no beeps"), std::string::npos) << said;

@@ -6,7 +6,8 @@
 
 #include "tests/checkers/BoxChecker.h"
 #include "tests/checkers/tests/BoxDoctor.h"
-#include "tests/checkers/tests/TestFolder.h"
+#include "tests/checkers/tests/FileBytes.h"
+#include "tests/contract/ScratchDirectory.h"
 #include "tests/unit/linux_mp4/Descriptions.h"
 
 namespace lumacast::checkers {
@@ -58,8 +59,8 @@ TEST(SequenceParameterSet, AgreesWithTheBoxesAroundItOrTheyAreNamed) {
     ASSERT_EQ(writer.addSample(*track, {0, 1'000'000, true}, slice), mp4::MovieError::none);
     ASSERT_EQ(writer.finish(1'000'000), mp4::MovieError::none);
     const BoxDoctor::Bytes good(sink.file().begin(), sink.file().end());
-    const TestFolder folder;
-    const std::string path = folder.file("movie.mp4");
+    const ScratchDirectory folder;
+    const std::string path = folder.path("movie.mp4");
     writeBytes(path, good);
     EXPECT_EQ(checkBoxes(path).findings, Findings{});
 

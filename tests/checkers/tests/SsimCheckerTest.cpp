@@ -8,7 +8,7 @@
 
 #include "tests/checkers/MovieReader.h"
 #include "tests/checkers/tests/MovieMaker.h"
-#include "tests/checkers/tests/TestFolder.h"
+#include "tests/contract/ScratchDirectory.h"
 
 namespace lumacast::checkers {
 namespace {
@@ -54,12 +54,12 @@ TEST(Ssim, OfOtherSizesIsNone) {
 }
 
 TEST(Ssim, TellsTheRightFrameOfAMovieFromItsNeighbour) {
-    const TestFolder folder;
+    const ScratchDirectory folder;
     MoviePlan plan;
     plan.pictures = steadyPictures(100, 10, 30);
     plan.halfSize = false;
     plan.bitRate = 3'000'000;
-    const std::string path = folder.file("movie.mp4");
+    const std::string path = folder.path("movie.mp4");
     ASSERT_EQ(makeMovie(plan, path), "");
     MovieReader reader(path);
     std::uint32_t number = 100;

@@ -11,7 +11,7 @@
 #include "tests/checkers/Luma.h"
 #include "tests/checkers/tests/Child.h"
 #include "tests/checkers/tests/MovieMaker.h"
-#include "tests/checkers/tests/TestFolder.h"
+#include "tests/contract/ScratchDirectory.h"
 
 namespace lumacast::checkers {
 namespace {
@@ -141,14 +141,14 @@ protected:
     }
     // Runs the tool on the plan's movie, as scripts do; its exit status.
     int check(std::vector<std::string> options = {}) {
-        const std::string path = folder_.file("movie.mp4");
+        const std::string path = folder_.path("movie.mp4");
         EXPECT_EQ(makeMovie(plan_, path), "");
         options.insert(options.begin(), {LC_CHECK_MOVIE, path, "--beeps-at-marked-frames", "1000"});
-        Child tool(options, {}, folder_.file("errors"));
+        Child tool(options, {}, folder_.path("errors"));
         report_ = nlohmann::json::parse(tool.readAll(), nullptr, false);
         return tool.wait();
     }
-    TestFolder folder_;
+    ScratchDirectory folder_;
     MoviePlan plan_;
     double lateness_ = 0;
     nlohmann::json report_;

@@ -7,7 +7,7 @@
 
 #include "tests/checkers/MovieReader.h"
 #include "tests/checkers/tests/MovieMaker.h"
-#include "tests/checkers/tests/TestFolder.h"
+#include "tests/contract/ScratchDirectory.h"
 
 namespace lumacast::checkers {
 namespace {
@@ -35,7 +35,7 @@ protected:
         plan.pictures = steadyPictures(1, 90, 30);
         plan.soundSeconds = 3;
         plan.sound = sound;
-        const std::string path = folder_.file("movie.mp4");
+        const std::string path = folder_.path("movie.mp4");
         EXPECT_EQ(makeMovie(plan, path), "");
         MovieReader reader(path);
         const auto read = reader.readSound();
@@ -43,7 +43,7 @@ protected:
         return read.value_or(Sound{});
     }
 
-    TestFolder folder_;
+    ScratchDirectory folder_;
 };
 
 TEST(ToneLevel, IsTheAmplitudeOfTheToneAndNothingElse) {
@@ -121,7 +121,7 @@ TEST_F(ToneInAMovie, DoesNotTakeAnotherToneOrAClickForABeep) {
 TEST_F(ToneInAMovie, AMissingAudioTrackIsAnError) {
     MoviePlan plan;
     plan.pictures = steadyPictures(1, 5, 30);
-    const std::string path = folder_.file("movie.mp4");
+    const std::string path = folder_.path("movie.mp4");
     ASSERT_EQ(makeMovie(plan, path), "");
     MovieReader reader(path);
     EXPECT_FALSE(reader.readSound());

@@ -37,17 +37,17 @@ TEST(Disk, HasTheFileForThisUserAlone) {
 
 TEST(Disk, PathsThatClimbAreRefused) {
     HandClock clock;
-    OwnDirectory directory;
+    ScratchDirectory directory;
     LinuxContainerWriters writers(clock);
-    const auto made = writers.make(URL::file(directory.file("../climbed.mp4")), ContainerType::Mpeg4);
+    const auto made = writers.make(URL::file(directory.path("../climbed.mp4")), ContainerType::Mpeg4);
     ASSERT_TRUE(std::holds_alternative<Error>(made));
-    EXPECT_FALSE(std::filesystem::exists(directory.file("../climbed.mp4")));
+    EXPECT_FALSE(std::filesystem::exists(directory.path("../climbed.mp4")));
 }
 
 TEST(Disk, NothingIsMadeButInTheDirectoryItself) {
     namespace fs = std::filesystem;
-    OwnDirectory own;
-    const fs::path directory = own.file("movies"), outside = own.file("outside");
+    ScratchDirectory own;
+    const fs::path directory = own.path("movies"), outside = own.path("outside");
     fs::create_directory(directory);
     fs::create_directory(outside);
     fs::create_directory_symlink(outside, directory / "App");
@@ -150,13 +150,13 @@ TEST(Disk, ThatDoesNotAnswerIsNotWaitedFor) {
 TEST(Disk, ThatCreatesLateIsWaitedForFortyMilliseconds) {
     HandClock clock;
     clock.startCaptureClock();
-    OwnDirectory directory;
+    ScratchDirectory directory;
     const auto disk = std::make_shared<FaultyFiles>();
     LinuxContainerWriters writers(clock, disk);
     disk->freeze();
     std::unique_ptr<ContainerWriter> writer;
     const double seconds = secondsTaken([&] {
-        auto made = writers.make(URL::file(directory.file("late.mp4")), ContainerType::Mpeg4);
+        auto made = writers.make(URL::file(directory.path("late.mp4")), ContainerType::Mpeg4);
         ASSERT_TRUE(std::get_if<0>(&made)) << "a silent disk is no error yet";
         writer = std::move(std::get<0>(made));
     });
@@ -171,17 +171,17 @@ TEST(Disk, ThatCreatesLateIsWaitedForFortyMilliseconds) {
     writer->finishWriting([&] { done.happen(); });
     ASSERT_TRUE(done.waitFor());
     EXPECT_EQ(writer->status(), ContainerStatus::Completed);
-    EXPECT_EQ(shownPictures(directory.file("late.mp4")).size(), 1u);
+    EXPECT_EQ(shownPictures(directory.path("late.mp4")).size(), 1u);
 }
 
 TEST(Disk, ThatRefusesLateFailsTheWriter) {
     HandClock clock;
-    OwnDirectory directory;
+    ScratchDirectory directory;
     const auto disk = std::make_shared<FaultyFiles>();
     LinuxContainerWriters writers(clock, disk);
     disk->freeze();
     disk->failCreation(EACCES);
-    auto made = writers.make(URL::file(directory.file("late.mp4")), ContainerType::Mpeg4);
+    auto made = writers.make(URL::file(directory.path("late.mp4")), ContainerType::Mpeg4);
     auto* const writer = std::get_if<0>(&made);
     ASSERT_TRUE(writer);
     disk->thaw();
@@ -232,11 +232,11 @@ TEST(Disk, HasAPictureWithinASecondEvenWhenNoOtherComes) {
 TEST(Daemon, ClosesItsOpenMoviesAtTheEnd) {
     HandClock clock;
     clock.startCaptureClock();
-    OwnDirectory directory;
+    ScratchDirectory directory;
     LinuxContainerWriters writers(clock);
     std::vector<std::unique_ptr<ContainerWriter>> open;
     for (const char* name : {"a.mp4", "b.mp4", "unused.mp4"}) {
-        auto made = writers.make(URL::file(directory.file(name)), ContainerType::Mpeg4);
+        auto made = writers.make(URL::file(directory.path(name)), ContainerType::Mpeg4);
         ASSERT_TRUE(std::get_if<0>(&made));
         open.push_back(std::move(std::get<0>(made)));
     }
@@ -251,9 +251,9 @@ TEST(Daemon, ClosesItsOpenMoviesAtTheEnd) {
     const auto closed = writers.closeOpenMovies();
     EXPECT_EQ(open[0]->status(), ContainerStatus::Completed);
     EXPECT_EQ(open[2]->status(), ContainerStatus::Unknown);
-    for (const char* name : {"a.mp4", "b.mp4"}) EXPECT_EQ(movieNanoseconds(directory.file(name)), 3 * kSecond);
+    for (const char* name : {"a.mp4", "b.mp4"}) EXPECT_EQ(movieNanoseconds(directory.path(name)), 3 * kSecond);
     ASSERT_EQ(closed.size(), 2u) << "what was never begun is no recording";
-    EXPECT_EQ(closed[1].path, directory.file("b.mp4"));
+    EXPECT_EQ(closed[1].path, directory.path("b.mp4"));
     EXPECT_EQ(closed[1].seconds, 3.0);
     EXPECT_EQ(closed[1].width, 128);
     EXPECT_EQ(closed[1].height, 96);
@@ -364,8 +364,8 @@ TEST_P(Killed, AMoviePlaysUpToItsLastSecond) {
     const int rate = GetParam();
     std::mt19937 random(static_cast<unsigned>(rate));
     for (int round = 0; round < 10; ++round) {
-        OwnDirectory directory;
-        const std::string path = directory.file("movie.mp4");
+        ScratchDirectory directory;
+        const std::string path = directory.path("movie.mp4");
         int ends[2];
         ASSERT_EQ(::pipe(ends), 0);
         const pid_t child = ::fork();

@@ -71,10 +71,10 @@ protected:
         exporter->exportAsynchronously([this](ExportStatus, std::optional<Error>) { ++told_; });
         running_.push_back(std::move(exporter));
     }
-    std::string path(const std::string& name) const { return directory_.file(name); }
+    std::string path(const std::string& name) const { return directory_.path(name); }
     bool exists(const std::string& name) const { return std::filesystem::exists(path(name)); }
 
-    OwnDirectory directory_;
+    ScratchDirectory directory_;
     RecordedMovie movie_;
     std::atomic<int> told_{0};
     std::vector<std::shared_ptr<MovieExporter>> running_;

@@ -36,7 +36,7 @@ protected:
 
     static int greyOf(int picture) { return 40 + picture * 7 % 200; }
 
-    std::string copyPath(const std::string& name = "copy.mp4") const { return directory_.file(name); }
+    std::string copyPath(const std::string& name = "copy.mp4") const { return directory_.path(name); }
 
     ExportStatus exportRange(double start, double duration, LinuxMovieExporters& exporters,
                              const std::string& name = "copy.mp4", const std::string& from = "") {
@@ -70,7 +70,7 @@ protected:
         }
     }
 
-    OwnDirectory directory_;
+    ScratchDirectory directory_;
     std::unique_ptr<RecordedMovie> movie_;
     LinuxMovieExporters exporters_;
     std::optional<Error> error_;

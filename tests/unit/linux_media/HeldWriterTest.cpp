@@ -63,8 +63,8 @@ struct Held {
         EXPECT_TRUE(eventually([&] { return !writers.bytesBeingWritten(path); }));
     }
 
-    OwnDirectory directory;
-    const std::string path = directory.file("movie.mp4");
+    ScratchDirectory directory;
+    const std::string path = directory.path("movie.mp4");
     HandClock clock;
     LinuxContainerWriters writers;
     const std::size_t threadsBefore;

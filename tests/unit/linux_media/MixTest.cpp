@@ -103,10 +103,10 @@ protected:
             EXPECT_NEAR(shown[static_cast<std::size_t>(i)].luma, lumaOfGrey(greyOf(i)), 2) << i;
         }
     }
-    std::string path(const std::string& name = "mixed.mp4") const { return directory_.file(name); }
+    std::string path(const std::string& name = "mixed.mp4") const { return directory_.path(name); }
     bool exists(const std::string& name = "mixed.mp4") const { return std::filesystem::exists(path(name)); }
 
-    OwnDirectory directory_;
+    ScratchDirectory directory_;
     AffineTransform transform_;
     std::unique_ptr<RecordedMovie> movie_;
     LinuxMovieExporters exporters_{std::make_shared<media::PosixMovieFiles>(), media::EncodingPriority::AsUsual};

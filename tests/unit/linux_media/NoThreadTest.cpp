@@ -96,8 +96,8 @@ std::string toldBy(Happening& happening) {
 
 class NoThread : public ::testing::Test {
 protected:
-    void SetUp() override { ASSERT_EQ(::chmod(directory_.file("").c_str(), 0777), 0); }  // for the child
-    OwnDirectory directory_;
+    void SetUp() override { ASSERT_EQ(::chmod(directory_.path("").c_str(), 0777), 0); }  // for the child
+    ScratchDirectory directory_;
 };
 
 TEST_F(NoThread, AWriterCannotBeMade) {
@@ -106,7 +106,7 @@ TEST_F(NoThread, AWriterCannotBeMade) {
                   LinuxContainerWriters writers(clock);
                   const NoThreadsLeft none;
                   if (!none.holds()) return std::string("threads are left");
-                  const auto made = writers.make(URL::file(directory_.file("movie.mp4")), ContainerType::Mpeg4);
+                  const auto made = writers.make(URL::file(directory_.path("movie.mp4")), ContainerType::Mpeg4);
                   const auto* const error = std::get_if<Error>(&made);
                   return error ? nameOf(*error) : std::string("made");
               }),
@@ -154,7 +154,7 @@ TEST_F(NoThread, AnExportFails) {
                   LinuxMovieExporters exporters;
                   const NoThreadsLeft none;
                   if (!none.holds()) return std::string("threads are left");
-                  const std::string copy = directory_.file("copy.mp4");
+                  const std::string copy = directory_.path("copy.mp4");
                   const auto exporter = exporters.makeExporter(exporters.openMovie(URL::file(movie.path())),
                                                                ExportPreset::PassThrough, URL::file(copy));
                   Happening done;

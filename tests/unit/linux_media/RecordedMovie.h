@@ -56,7 +56,7 @@ public:
         microphone = writer->addAudioInput(audioSettings());
     }
 
-    std::string path() const { return directory_.file("movie.mp4"); }
+    std::string path() const { return directory_.path("movie.mp4"); }
     LinuxContainerWriters& writers() { return writers_; }
 
     void start(std::int64_t nanoseconds = 0) {
@@ -85,7 +85,7 @@ public:
     std::shared_ptr<TrackInput> video, sound, microphone;
 
 private:
-    OwnDirectory directory_;
+    ScratchDirectory directory_;
     int width_, height_;
     std::uint64_t number_ = 0;
     LinuxContainerWriters writers_;

@@ -29,7 +29,7 @@ protected:
     }
 
     const ScratchDirectory scratch_;
-    const FileDescriptor file_{::open(scratch_.path("log").c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600)};
+    const Fd file_{::open(scratch_.path("log").c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600)};
     std::chrono::steady_clock::time_point now_{1h};
     int number_ = 0;
     LinuxLogSink sink_{{.standardError = file_.get(),

@@ -28,7 +28,7 @@ struct Manager {
         return count > 0 ? std::string(buffer.data(), static_cast<std::size_t>(count)) : "(nothing)";
     }
     ScratchDirectory scratch;
-    FileDescriptor socket;
+    Fd socket;
     std::string name;
 };
 

@@ -32,7 +32,7 @@ struct Pipe {
             text.append(buffer.data(), static_cast<std::size_t>(count));
         return text;
     }
-    FileDescriptor reading, writing;
+    Fd reading, writing;
 };
 
 LogSinkTargets targets(int error, int output = -1) { return {error, output, "", ""}; }
@@ -92,10 +92,10 @@ TEST(LinuxLogSink, AReaderThatWentDoesNotEndTheProcess) {
 
 TEST(LinuxLogSink, AFileAndASocketAreWrittenToToo) {
     ScratchDirectory scratch;
-    const FileDescriptor file(::open(scratch.path("log").c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600));
+    const Fd file(::open(scratch.path("log").c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600));
     std::array<int, 2> ends{};
     ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends.data()), 0);
-    const FileDescriptor near(ends[0]), far(ends[1]);
+    const Fd near(ends[0]), far(ends[1]);
     LinuxLogSink sink(targets(file.get(), near.get()));
     sink.write(LogLevel::Default, "to the file");
     sink.write(LogLevel::Print, "to the socket");
@@ -127,7 +127,7 @@ struct Journal {
         return count > 0 ? std::string(buffer.data(), static_cast<std::size_t>(count)) : "(nothing)";
     }
     ScratchDirectory scratch;
-    FileDescriptor socket;
+    Fd socket;
 };
 
 std::string streamName(int number) {

@@ -231,8 +231,8 @@ TEST(LinuxPhotoLibrary, AnotherFileSystemIsCopiedTo) {
 TEST(CopyBytes, AMovieThatBecameShorterIsNotCopied) {
     const ScratchDirectory scratch;
     for (const CopyBy copyBy : {CopyBy::Kernel, CopyBy::Hand}) {
-        const FileDescriptor from(::open(scratch.write("movie", "12345").c_str(), O_RDONLY | O_CLOEXEC));
-        const FileDescriptor to(::open(scratch.path("copy").c_str(), O_RDWR | O_CREAT | O_TRUNC | O_CLOEXEC, 0600));
+        const Fd from(::open(scratch.write("movie", "12345").c_str(), O_RDONLY | O_CLOEXEC));
+        const Fd to(::open(scratch.path("copy").c_str(), O_RDWR | O_CREAT | O_TRUNC | O_CLOEXEC, 0600));
         EXPECT_EQ(copyBytes(from.get(), to.get(), 6, copyBy), EIO);
     }
 }
@@ -240,8 +240,8 @@ TEST(CopyBytes, AMovieThatBecameShorterIsNotCopied) {
 TEST(CopyBytes, AMovieThatGrewIsCopiedWhole) {
     const ScratchDirectory scratch;
     for (const CopyBy copyBy : {CopyBy::Kernel, CopyBy::Hand}) {
-        const FileDescriptor from(::open(scratch.write("movie", "12345").c_str(), O_RDONLY | O_CLOEXEC));
-        const FileDescriptor to(::open(scratch.path("copy").c_str(), O_RDWR | O_CREAT | O_TRUNC | O_CLOEXEC, 0600));
+        const Fd from(::open(scratch.write("movie", "12345").c_str(), O_RDONLY | O_CLOEXEC));
+        const Fd to(::open(scratch.path("copy").c_str(), O_RDWR | O_CREAT | O_TRUNC | O_CLOEXEC, 0600));
         EXPECT_EQ(copyBytes(from.get(), to.get(), 3, copyBy), 0);
         EXPECT_EQ(ScratchDirectory::read(scratch.path("copy")), "12345");
     }
@@ -253,8 +253,8 @@ TEST(CopyBytes, ADiskThatBecomesFullMeanwhileIsAnError) {
     const std::string small = scratch.makeDirectory("small");
     // As if the movie had been short when the room was asked for.
     const auto copy = [&](CopyBy copyBy) {
-        const FileDescriptor from(::open(movie.c_str(), O_RDONLY | O_CLOEXEC));
-        const FileDescriptor to(::open((small + "/copy").c_str(), O_RDWR | O_CREAT | O_TRUNC | O_CLOEXEC, 0600));
+        const Fd from(::open(movie.c_str(), O_RDONLY | O_CLOEXEC));
+        const Fd to(::open((small + "/copy").c_str(), O_RDWR | O_CREAT | O_TRUNC | O_CLOEXEC, 0600));
         return copyBytes(from.get(), to.get(), 1, copyBy);
     };
     for (const CopyBy copyBy : {CopyBy::Kernel, CopyBy::Hand}) {
@@ -266,15 +266,15 @@ TEST(CopyBytes, ADiskThatBecomesFullMeanwhileIsAnError) {
 
 TEST(CopyBytes, AFileWhoseSizeIsNotKnownBeforehandIsReadToItsEnd) {
     const ScratchDirectory scratch;
-    const FileDescriptor from(::open("/proc/self/status", O_RDONLY | O_CLOEXEC));
-    const FileDescriptor to(::open(scratch.path("copy").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
+    const Fd from(::open("/proc/self/status", O_RDONLY | O_CLOEXEC));
+    const Fd to(::open(scratch.path("copy").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
     EXPECT_EQ(copyBytes(from.get(), to.get(), 0, CopyBy::Clone), 0);
     EXPECT_TRUE(ScratchDirectory::read(scratch.path("copy")).starts_with("Name:"));
 }
 
 TEST(NewFile, WhatIsNotGivenANameLeavesNothing) {
     const ScratchDirectory scratch;
-    const FileDescriptor folder(::open(scratch.path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    const Fd folder(::open(scratch.path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     const auto entries = [&] { return std::distance(std::filesystem::directory_iterator(scratch.path()), {}); };
     for (const Unseen unseen : {Unseen::WithoutName, Unseen::HiddenName}) {
         {
@@ -288,7 +288,7 @@ TEST(NewFile, WhatIsNotGivenANameLeavesNothing) {
 
 TEST(NewFile, ATakenNameIsRefusedAndAnotherOneWillDo) {
     const ScratchDirectory scratch;
-    const FileDescriptor folder(::open(scratch.path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    const Fd folder(::open(scratch.path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     scratch.write("taken", "mine");
     for (const Unseen unseen : {Unseen::WithoutName, Unseen::HiddenName}) {
         const std::string name = unseen == Unseen::HiddenName ? "hidden" : "unnamed";

@@ -10,7 +10,7 @@
 #include <thread>
 #include <vector>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 #include "tests/contract/PrivateDisplay.h"
 #include "tests/contract/ScratchDirectory.h"
 
@@ -56,7 +56,7 @@ public:
 private:
     struct Given {
         Lock lock;
-        FileDescriptor end;  ///< ours: at its end when nobody holds the other
+        Fd end;  ///< ours: at its end when nobody holds the other
     };
     static int inhibit(sd_bus_message* message, void* self, sd_bus_error* error);
     void run();
@@ -67,7 +67,7 @@ private:
     std::vector<bool> announcements_;
     std::atomic<std::size_t> announced_ = 0;
     bool quit_ = false;
-    const FileDescriptor wake_;
+    const Fd wake_;
     std::thread thread_;
 };
 

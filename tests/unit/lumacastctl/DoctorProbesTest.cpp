@@ -84,7 +84,7 @@ TEST(DisplayProbe, KnowsAWaylandSessionByEitherVariable) {
 TEST(SoundProbe, LooksWhereTheServersListen) {
     const ScratchDirectory scratch;
     scratch.makeDirectory("pulse");
-    const FileDescriptor pulse = listenAt(scratch.path("pulse/native"));
+    const Fd pulse = listenAt(scratch.path("pulse/native"));
     ASSERT_TRUE(pulse);
     const SoundFacts facts = probeSound(variables({{"XDG_RUNTIME_DIR", scratch.path()}}));
     ASSERT_EQ(facts.sockets.size(), 2u);
@@ -219,8 +219,8 @@ TEST(DaemonProbe, TellsADaemonThatHangs) {
 
 TEST(DaemonProbe, TellsSocketsThatSomebodyElseListensAt) {
     const ScratchDirectory scratch;
-    const FileDescriptor admin = listenAt(scratch.path("admin.sock"));
-    const FileDescriptor service = listenAt(scratch.path("com.orvane.lumacastd.sock"));
+    const Fd admin = listenAt(scratch.path("admin.sock"));
+    const Fd service = listenAt(scratch.path("com.orvane.lumacastd.sock"));
     ASSERT_TRUE(admin && service);
     const DaemonFacts facts = probeDaemon(scratch.path(), true, kShort);
     EXPECT_EQ(facts.admin, DaemonFacts::Socket::Silent);
@@ -229,7 +229,7 @@ TEST(DaemonProbe, TellsSocketsThatSomebodyElseListensAt) {
 
 TEST(DaemonProbe, TellsADaemonThatHasNoPlaceToWaitLeft) {
     const ScratchDirectory scratch;
-    const FileDescriptor service = listenAt(scratch.path("com.orvane.lumacastd.sock"));
+    const Fd service = listenAt(scratch.path("com.orvane.lumacastd.sock"));
     ASSERT_EQ(::listen(service.get(), 0), 0);
     const Fd waiting = connectToServiceSocket(scratch.path(), "com.orvane.lumacastd");
     ASSERT_TRUE(waiting);
