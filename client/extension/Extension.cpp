@@ -45,7 +45,7 @@ void sayLogged(LogLevel level, std::string_view text) {
 int run(Handler& handler, Options options) {
     Fd requests = socketOf(options.requestsDescriptor), auxiliary = socketOf(options.auxiliaryDescriptor);
     if (!requests || !auxiliary) {
-        requests.release(), auxiliary.release();  // not ours, then
+        (void)requests.release(), (void)auxiliary.release();  // not ours, then
         std::fputs("This is an upload extension of lumacastd, which launches it when there is something to broadcast.\n",
                    stderr);
         return kWrongUse;

@@ -9,7 +9,7 @@
 #include <future>
 
 #include "linux/accessibility/ScreenReaderBus.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 #include "linux/system/Threads.h"
 
 namespace lumacast {
@@ -42,7 +42,7 @@ struct LinuxScreenReader::State {
     }
 
     const Options options;
-    const FileDescriptor wake{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};
+    const Fd wake{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};
     std::atomic<bool> running{false}, stopping{false};
     std::promise<void> ended;
     std::future<void> end;  ///< of the thread, if there is one

@@ -41,12 +41,12 @@ struct Mailbox {
     std::size_t asked = 0;  ///< questions the main queue has not answered
     std::map<std::uint64_t, Dictionary> answers;   ///< of commands, by their question
     std::set<std::uint64_t> commandsUnderWay;     ///< whose answer has not come
-    FileDescriptor arrived{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};
+    Fd arrived{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};
 };
 
 struct Peer {
     enum class State { Asking, Waiting, Reading };
-    FileDescriptor socket;
+    Fd socket;
     State state = State::Asking;
     Moment deadline;
     std::string request;
@@ -71,12 +71,12 @@ std::vector<std::string> wordsOf(const std::string& request) {
     return words;
 }
 
-void raise(const FileDescriptor& event) {
+void raise(const Fd& event) {
     const std::uint64_t one = 1;
     (void)!::write(event.get(), &one, sizeof one);  // fails only when it is raised already
 }
 
-void lower(const FileDescriptor& event) {
+void lower(const Fd& event) {
     std::uint64_t count = 0;
     (void)!::read(event.get(), &count, sizeof count);
 }
@@ -86,7 +86,7 @@ void lower(const FileDescriptor& event) {
 class LinuxAdminService::Server {
 public:
     Server(Scheduler& scheduler, const Limits& limits, Commands commands, std::function<Dictionary()> snapshot,
-           FileDescriptor listener)
+           Fd listener)
         : scheduler_(scheduler),
           limits_(limits),
           commands_(std::move(commands)),
@@ -133,7 +133,7 @@ private:
     static Moment in(std::chrono::milliseconds limit) { return std::chrono::steady_clock::now() + limit; }
 
     void accept() {
-        FileDescriptor socket(::accept4(listener_.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+        Fd socket(::accept4(listener_.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
         if (!socket) return;
         const auto user = peerUser(socket.get());
         if (!user || (*user != ::geteuid() && *user != 0)) return;
@@ -275,8 +275,8 @@ private:
     const Limits limits_;
     const Commands commands_;
     const std::function<Dictionary()> snapshot_;
-    const FileDescriptor listener_;
-    const FileDescriptor end_{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};
+    const Fd listener_;
+    const Fd end_{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};
     const std::shared_ptr<Mailbox> mailbox_ = std::make_shared<Mailbox>();
     std::list<Peer> peers_;
     std::uint64_t questions_ = 0;
@@ -303,7 +303,7 @@ void LinuxAdminService::addCommand(std::string name, AdminCommand command) {
 void LinuxAdminService::resume(std::function<Dictionary()> snapshot) {
     if (thread_.joinable()) return;
     std::string reason;
-    FileDescriptor listener = listenAt(socketPath_, reason);
+    Fd listener = listenAt(socketPath_, reason);
     if (listener) {
         server_ = std::make_unique<Server>(scheduler_, limits_, commands_, std::move(snapshot), std::move(listener));
         // isAnswering() tells whether there was a thread to be had.
@@ -316,7 +316,7 @@ void LinuxAdminService::resume(std::function<Dictionary()> snapshot) {
 std::optional<std::string> askAdminService(const std::string& socketPath, std::string_view request,
                                            std::chrono::milliseconds limit) {
     const auto deadline = std::chrono::steady_clock::now() + limit;
-    FileDescriptor socket = connectTo(socketPath);
+    Fd socket = connectTo(socketPath);
     while (!socket && errno == EAGAIN && std::chrono::steady_clock::now() < deadline) {  // others wait to be heard
         ::poll(nullptr, 0, 5);
         socket = connectTo(socketPath);

@@ -9,7 +9,7 @@
 #include <string_view>
 #include <thread>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 #include "platform/AdminService.h"
 #include "platform/Scheduler.h"
 

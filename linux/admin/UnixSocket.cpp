@@ -23,25 +23,25 @@ std::optional<sockaddr_un> addressOf(const std::string& path) {
     return address;
 }
 
-FileDescriptor streamSocket() {
-    return FileDescriptor(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+Fd streamSocket() {
+    return Fd(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
 }
 
 }  // namespace
 
-FileDescriptor listenAt(const std::string& path) {
+Fd listenAt(const std::string& path) {
     std::string reason;
     return listenAt(path, reason);
 }
 
-FileDescriptor listenAt(const std::string& path, std::string& reason) {
+Fd listenAt(const std::string& path, std::string& reason) {
     const auto refuse = [&](std::string why) {
         reason = std::move(why);
-        return FileDescriptor();
+        return Fd();
     };
     const auto address = addressOf(path);
     if (!address) return refuse("its path is too long");
-    FileDescriptor socket = streamSocket();
+    Fd socket = streamSocket();
     if (!socket) return refuse("no socket can be made");
     struct stat status = {};
     if (::lstat(path.c_str(), &status) == 0) {
@@ -56,9 +56,9 @@ FileDescriptor listenAt(const std::string& path, std::string& reason) {
     return socket;
 }
 
-FileDescriptor connectTo(const std::string& path) {
+Fd connectTo(const std::string& path) {
     const auto address = addressOf(path);
-    FileDescriptor socket = streamSocket();
+    Fd socket = streamSocket();
     if (!address || !socket) return {};
     if (::connect(socket.get(), reinterpret_cast<const sockaddr*>(&*address), sizeof *address) == 0) return socket;
     const int error = errno;

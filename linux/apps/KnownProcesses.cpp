@@ -31,7 +31,7 @@ std::optional<std::string> KnownProcesses::path(ProcessID pid, std::chrono::stea
     return std::nullopt;
 }
 
-void KnownProcesses::keep(ProcessID pid, const FileDescriptor& process, const ProcessImage& image) {
+void KnownProcesses::keep(ProcessID pid, const Fd& process, const ProcessImage& image) {
     struct stat folder = {};
     if (::fstat(process.get(), &folder) != 0) return;
     const std::lock_guard lock(mutex_);

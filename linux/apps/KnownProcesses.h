@@ -7,7 +7,7 @@
 
 #include "base/Identifiers.h"
 #include "linux/apps/ProcessImage.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 
@@ -20,7 +20,7 @@ public:
     /// Where the program was started from, if it was looked up no longer ago than `freshness`.
     std::optional<std::string> path(ProcessID pid, std::chrono::steady_clock::duration freshness);
     /// Takes note of what was found through `process`, a handle on the process's folder.
-    void keep(ProcessID pid, const FileDescriptor& process, const ProcessImage& image);
+    void keep(ProcessID pid, const Fd& process, const ProcessImage& image);
 
 private:
     static constexpr std::size_t kMost = 1024;

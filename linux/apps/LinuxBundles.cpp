@@ -62,7 +62,7 @@ std::optional<std::string> LinuxBundles::executablePath(ProcessID pid) {
     if (auto path = processes_->path(pid, options_.freshness)) return path;
     const auto answer = ask<std::optional<std::string>>(
         [pid, processes = processes_](BundleLibrary&) -> std::optional<std::string> {
-            const FileDescriptor process = openProcess(pid);
+            const Fd process = openProcess(pid);
             const auto image = processImage(process);
             if (!image) return std::nullopt;
             processes->keep(pid, process, *image);

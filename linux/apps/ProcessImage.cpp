@@ -27,14 +27,14 @@ bool isSameFile(const struct stat& a, const struct stat& b) { return a.st_dev ==
 
 }  // namespace
 
-FileDescriptor openProcess(ProcessID pid) {
+Fd openProcess(ProcessID pid) {
     if (number(pid) <= 0) return {};
-    return FileDescriptor(::open(("/proc/" + std::to_string(number(pid))).c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    return Fd(::open(("/proc/" + std::to_string(number(pid))).c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
 }
 
 std::optional<ProcessImage> processImage(ProcessID pid) { return processImage(openProcess(pid)); }
 
-std::optional<ProcessImage> processImage(const FileDescriptor& process) {
+std::optional<ProcessImage> processImage(const Fd& process) {
     if (!process) return std::nullopt;
     std::array<char, kMaximumPath + kDeletedMark.size() + 1> buffer;
     const ssize_t length = ::readlinkat(process.get(), "exe", buffer.data(), buffer.size());

@@ -5,7 +5,7 @@
 #include <string>
 
 #include "base/Identifiers.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 
@@ -23,7 +23,7 @@ struct ProcessImage {
 std::optional<ProcessImage> processImage(ProcessID pid);
 
 /// The same in two steps: a handle on the process's folder in /proc, good for that process alone; and its image.
-FileDescriptor openProcess(ProcessID pid);
-std::optional<ProcessImage> processImage(const FileDescriptor& process);
+Fd openProcess(ProcessID pid);
+std::optional<ProcessImage> processImage(const Fd& process);
 
 }  // namespace lumacast

@@ -12,7 +12,7 @@
 #include <vector>
 
 #include "linux/audio/ServerWatch.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 #include "linux/system/Threads.h"
 
 namespace lumacast::sound {
@@ -258,7 +258,7 @@ private:
 
     mutable std::mutex mutex_;
     std::condition_variable stopped_;
-    FileDescriptor wake_;
+    Fd wake_;
     std::vector<std::shared_ptr<PulseUser>> attached_;
     std::vector<std::function<void()>> tasks_;
     bool running_ = false, ended_ = false;

@@ -3,7 +3,7 @@
 
 #include <string>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast::sound {
 
@@ -26,7 +26,7 @@ private:
     void arm();
 
     std::string socket_;  ///< where it is; empty: nowhere that is known
-    FileDescriptor events_;
+    Fd events_;
     int watched_ = -1;
     std::string wanted_;  ///< the name that is waited for in what is watched
 };

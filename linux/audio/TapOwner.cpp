@@ -6,8 +6,8 @@
 #include <array>
 #include <string_view>
 
+#include "linux/ipc/Fd.h"
 #include "linux/system/Ancestors.h"
-#include "linux/system/FileDescriptor.h"
 
 namespace lumacast::sound {
 
@@ -31,7 +31,7 @@ std::string binaryOf(ProcessID pid) {
 /// The machine's identifier, as the clients of the sound server read it; empty where it has none.
 std::string thisMachine() {
     for (const char* const path : {"/etc/machine-id", "/var/lib/dbus/machine-id"}) {
-        const FileDescriptor file(::open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+        const Fd file(::open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK));
         std::array<char, 64> buffer;
         const ssize_t length = file ? ::read(file.get(), buffer.data(), buffer.size()) : -1;
         if (length < 32) continue;

@@ -21,12 +21,12 @@ constexpr std::size_t kMostOutput = 1024;
 constexpr int kLowestOwn = 10;  // above standard input, output and error: moving one there can't hit another
 
 struct Pipe {
-    FileDescriptor read, write;
+    Fd read, write;
 };
 
-FileDescriptor moved(int descriptor) {
-    FileDescriptor original(descriptor);
-    return FileDescriptor(original ? ::fcntl(original.get(), F_DUPFD_CLOEXEC, kLowestOwn) : -1);
+Fd moved(int descriptor) {
+    Fd original(descriptor);
+    return Fd(original ? ::fcntl(original.get(), F_DUPFD_CLOEXEC, kLowestOwn) : -1);
 }
 
 Pipe makePipe() {
@@ -83,7 +83,7 @@ void killGroup(pid_t leader) {
 
 std::unique_ptr<DialogProcess> DialogProcess::start(const Command& command) {
     Pipe output = makePipe(), failure = makePipe();
-    const FileDescriptor null = moved(::open("/dev/null", O_RDWR | O_CLOEXEC));
+    const Fd null = moved(::open("/dev/null", O_RDWR | O_CLOEXEC));
     if (!output.write || !failure.write || !null) return nullptr;
     if (::fcntl(output.read.get(), F_SETFL, O_NONBLOCK) != 0) return nullptr;
     std::vector<char*> arguments = pointersTo(command.arguments), environment = pointersTo(command.environment);
@@ -99,7 +99,7 @@ std::unique_ptr<DialogProcess> DialogProcess::start(const Command& command) {
     output.write.reset();
     failure.write.reset();
     // A child that nobody has waited for keeps its number.
-    FileDescriptor process(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
+    Fd process(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
     const bool held = static_cast<bool>(process);
     std::unique_ptr<DialogProcess> started(new DialogProcess(pid, std::move(process), std::move(output.read)));
     int error = 0;

@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "linux/desktop/DialogProgram.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 
@@ -41,13 +41,13 @@ public:
     std::optional<DialogEnd> end();
 
 private:
-    DialogProcess(pid_t pid, FileDescriptor process, FileDescriptor output)
+    DialogProcess(pid_t pid, Fd process, Fd output)
         : pid_(pid), process_(std::move(process)), output_(std::move(output)) {}
 
     const pid_t pid_;
     bool reaped_ = false;
-    FileDescriptor process_;
-    FileDescriptor output_;
+    Fd process_;
+    Fd output_;
     std::string printed_;
 };
 

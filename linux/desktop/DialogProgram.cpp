@@ -10,7 +10,7 @@
 #include <string_view>
 
 #include "linux/desktop/AlertText.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 namespace {
@@ -90,7 +90,7 @@ std::string bodyMarkup(const DialogTexts& texts) {
 /// Whole or not at all: another dialog may be reading it.
 bool writeFile(const std::string& path, std::string_view text) {
     std::string beside = path + ".XXXXXX";
-    const FileDescriptor file(::mkostemp(beside.data(), O_CLOEXEC));
+    const Fd file(::mkostemp(beside.data(), O_CLOEXEC));
     if (!file) return false;
     if (::write(file.get(), text.data(), text.size()) == static_cast<ssize_t>(text.size()) &&
         ::rename(beside.c_str(), path.c_str()) == 0)

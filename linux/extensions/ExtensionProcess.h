@@ -66,9 +66,9 @@ private:
     OutputLines lines_;
 
     std::mutex mutex_;
-    pid_t group_ = 0;         ///< of what was started, until it was waited for
-    FileDescriptor process_;  ///< what was started: with bubblewrap what watches over the sandbox
-    Fd program_;              ///< the process that said hello
+    pid_t group_ = 0;  ///< of what was started, until it was waited for
+    Fd process_;       ///< what was started: with bubblewrap what watches over the sandbox
+    Fd program_;       ///< the process that said hello
     bool isKilled_ = false;
     bool isOver_ = false;
 

@@ -15,7 +15,7 @@
 #include <set>
 
 #include "base/Limits.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 #include "platform/AppExtension.h"
 
 namespace lumacast {
@@ -29,11 +29,11 @@ constexpr std::string_view kManifest = "manifest.json";
 constexpr std::string_view kPng("\x89PNG\r\n\x1a\n", 8);
 
 /// Opened without leaving the folder: links within it are followed, others are not.
-FileDescriptor openWithin(int folder, const std::string& path, std::uint64_t flags) {
+Fd openWithin(int folder, const std::string& path, std::uint64_t flags) {
     open_how how{};
     how.flags = flags | O_CLOEXEC;
     how.resolve = RESOLVE_BENEATH | RESOLVE_NO_MAGICLINKS;
-    FileDescriptor opened(static_cast<int>(::syscall(SYS_openat2, folder, path.c_str(), &how, sizeof how)));
+    Fd opened(static_cast<int>(::syscall(SYS_openat2, folder, path.c_str(), &how, sizeof how)));
     if (!opened && (errno == ENOSYS || errno == EPERM))  // without that call: no links at all
         opened.reset(::openat(folder, path.c_str(), static_cast<int>(flags) | O_CLOEXEC | O_NOFOLLOW));
     return opened;
@@ -107,11 +107,11 @@ InstalledExtensions::InstalledExtensions(Log& log, std::vector<std::string> data
 
 std::variant<std::shared_ptr<const InstalledExtension>, std::string> InstalledExtensions::read(
     const std::string& path, std::string& executable) const {
-    const FileDescriptor folder(::open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    const Fd folder(::open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
     struct stat folderStatus = {}, manifestStatus = {}, programStatus = {};
     if (!folder || ::fstat(folder.get(), &folderStatus) != 0) return "its folder can't be opened";
     if (auto reason = whyNotSafe(folderStatus, "its folder")) return *reason;
-    const FileDescriptor file = openWithin(folder.get(), std::string(kManifest), O_RDONLY | O_NONBLOCK | O_NOCTTY);
+    const Fd file = openWithin(folder.get(), std::string(kManifest), O_RDONLY | O_NONBLOCK | O_NOCTTY);
     if (!file || ::fstat(file.get(), &manifestStatus) != 0 || !S_ISREG(manifestStatus.st_mode))
         return "it has no manifest";
     if (auto reason = whyNotSafe(manifestStatus, "its manifest")) return *reason;
@@ -125,7 +125,7 @@ std::variant<std::shared_ptr<const InstalledExtension>, std::string> InstalledEx
     const ExtensionManifest& manifest = extension->manifest;
     executable = manifest.executable;
     extension->folder = realPath(folder.get());
-    const FileDescriptor program = openWithin(folder.get(), manifest.executable, O_PATH);
+    const Fd program = openWithin(folder.get(), manifest.executable, O_PATH);
     if (!program || ::fstat(program.get(), &programStatus) != 0) return "its executable is not in its folder";
     if (!S_ISREG(programStatus.st_mode) || (programStatus.st_mode & 0111) == 0) return "its executable can't be run";
     if (auto reason = whyNotSafe(programStatus, "its executable")) return *reason;
@@ -150,7 +150,7 @@ std::variant<std::shared_ptr<const InstalledExtension>, std::string> InstalledEx
 
 InstalledExtensions::Known& InstalledExtensions::known(const std::string& folder) {
     Known& known = known_[folder];
-    const FileDescriptor opened(::open(folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    const Fd opened(::open(folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
     const auto stamp = [&opened, &known] {
         if (!opened) return std::string("none");
         std::string text = stampOf(opened.get(), std::string(kManifest)) + " " + stampOf(opened.get(), ".");
@@ -203,9 +203,9 @@ std::variant<std::vector<std::shared_ptr<const InstalledExtension>>, int> Instal
 
 std::vector<Data> readIcons(const InstalledExtension& extension) {
     std::vector<Data> icons;
-    const FileDescriptor folder(::open(extension.folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    const Fd folder(::open(extension.folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
     for (const std::string& path : extension.manifest.icons) {
-        const FileDescriptor file = openWithin(folder.get(), path, O_RDONLY | O_NONBLOCK | O_NOCTTY);
+        const Fd file = openWithin(folder.get(), path, O_RDONLY | O_NONBLOCK | O_NOCTTY);
         struct stat status = {};
         if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) continue;
         const auto text = readAll(file.get(), kMaximumIcon);

@@ -20,18 +20,18 @@ namespace {
 constexpr int kFirst = 3;
 constexpr int kLowestOwn = 32;  // above what the program is given: moving one there can't hit another
 
-FileDescriptor moved(int descriptor) {
-    return FileDescriptor(::fcntl(descriptor, F_DUPFD_CLOEXEC, kLowestOwn));
+Fd moved(int descriptor) {
+    return Fd(::fcntl(descriptor, F_DUPFD_CLOEXEC, kLowestOwn));
 }
 
 Started perform(const Start& start) {
     Started started;
-    std::vector<FileDescriptor> given;
-    const FileDescriptor null(::open("/dev/null", O_RDONLY | O_CLOEXEC));
+    std::vector<Fd> given;
+    const Fd null(::open("/dev/null", O_RDONLY | O_CLOEXEC));
     given.push_back(moved(null.get()));
     given.push_back(moved(start.output));
     for (const int descriptor : start.descriptors) given.push_back(moved(descriptor));
-    for (const FileDescriptor& descriptor : given) {
+    for (const Fd& descriptor : given) {
         if (descriptor) continue;
         started.error = EMFILE;
         return started;

@@ -9,7 +9,7 @@
 #include <thread>
 #include <vector>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 
@@ -22,8 +22,8 @@ struct Start {
 };
 
 struct Started {
-    pid_t pid = 0;           ///< 0: it was not started
-    FileDescriptor process;  ///< its pidfd
+    pid_t pid = 0;  ///< 0: it was not started
+    Fd process;     ///< its pidfd
     int error = 0;
 };
 

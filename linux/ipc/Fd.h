@@ -5,8 +5,9 @@
 
 namespace lumacast {
 
-/// Owns one file descriptor, or none (-1); closes it when it goes.
-class Fd {
+/// Owns one file descriptor, or none (-1), and closes it when it goes. A resource: moved, never copied. Not
+/// thread-safe.
+class Fd final {
 public:
     Fd() = default;
     explicit Fd(int descriptor) : descriptor_(descriptor) {}
@@ -19,9 +20,11 @@ public:
     Fd& operator=(const Fd&) = delete;
     ~Fd() { reset(); }
 
+    /// The descriptor, still owned here; -1 when there is none.
     int get() const { return descriptor_; }
     explicit operator bool() const { return descriptor_ >= 0; }
-    int release() { return std::exchange(descriptor_, -1); }
+    /// Gives the descriptor away; the caller closes it.
+    [[nodiscard]] int release() { return std::exchange(descriptor_, -1); }
     void reset(int descriptor = -1) {
         if (descriptor_ >= 0) ::close(descriptor_);
         descriptor_ = descriptor;

@@ -17,8 +17,8 @@ namespace {
 
 constexpr mode_t kMode = 0755;  // less the umask
 
-FileDescriptor readable(int folder) {
-    return FileDescriptor(calls::openAt(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+Fd readable(int folder) {
+    return Fd(calls::openAt(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
 }
 
 }  // namespace
@@ -31,7 +31,7 @@ LibraryFolder::~LibraryFolder() {
         calls::unlinkAt(made->parent.get(), made->name, AT_REMOVEDIR);
 }
 
-std::variant<FileDescriptor, int> LibraryFolder::openOrMake(const std::string& path, uid_t user, bool isOurs) {
+std::variant<Fd, int> LibraryFolder::openOrMake(const std::string& path, uid_t user, bool isOurs) {
     const auto open = [&] { return isOurs ? openTrusted(path, user) : openFolder(path, user); };
     auto opened = open();
     const int* missing = std::get_if<int>(&opened);
@@ -55,7 +55,7 @@ std::variant<LibraryFolder, int> LibraryFolder::open(const std::string& videos, 
     if (const int* error = std::get_if<int>(&around)) return *error;
     const auto inside = result.openOrMake(result.path_, user, true);
     if (const int* error = std::get_if<int>(&inside)) return *error;
-    result.folder_ = readable(std::get<FileDescriptor>(inside).get());
+    result.folder_ = readable(std::get<Fd>(inside).get());
     if (!result.folder_) return errno;
     return result;
 }

@@ -5,7 +5,7 @@
 #include <variant>
 #include <vector>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 
@@ -32,14 +32,14 @@ public:
 
 private:
     struct Made {
-        FileDescriptor parent;
+        Fd parent;
         std::string name;
     };
     LibraryFolder() = default;
-    std::variant<FileDescriptor, int> openOrMake(const std::string& path, uid_t user, bool isOurs);
+    std::variant<Fd, int> openOrMake(const std::string& path, uid_t user, bool isOurs);
 
     std::string path_;
-    FileDescriptor folder_;
+    Fd folder_;
     std::vector<Made> made_;  ///< outermost first
 };
 

@@ -9,11 +9,11 @@
 #include <utility>
 #include <variant>
 
+#include "linux/calls/FileCalls.h"
 #include "linux/library/LibraryFolder.h"
 #include "linux/library/StaleParts.h"
 #include "linux/library/VideosFolder.h"
 #include "linux/storage/BeneathDirectory.h"
-#include "linux/calls/FileCalls.h"
 #include "linux/system/LowPriority.h"
 #include "linux/system/SystemError.h"
 #include "linux/system/Threads.h"
@@ -24,12 +24,12 @@ namespace {
 
 constexpr int kMaximumNumber = 10'000;  // of movies of the same second
 
-using OpenedFile = std::variant<FileDescriptor, int>;
+using OpenedFile = std::variant<Fd, int>;
 
 /// Never waits for the writer of a pipe, and answers regular files only.
 OpenedFile openMovie(const ResolvedName& place) {
-    FileDescriptor file(calls::openAt(place.directory.get(), place.name,
-                                 O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+    Fd file(
+        calls::openAt(place.directory.get(), place.name, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
     struct stat status = {};
     if (!file || ::fstat(file.get(), &status) != 0) return errno;
     if (!S_ISREG(status.st_mode)) return S_ISDIR(status.st_mode) ? EISDIR : EACCES;
@@ -48,9 +48,9 @@ OpenedFile openForUser(const std::string& path, uid_t user) {
 OpenedFile openOwn(const std::string& path) {
     auto folder = openTrusted(path.substr(0, path.rfind('/') + 1));
     if (const int* error = std::get_if<int>(&folder)) return *error;
-    ResolvedName place{std::move(std::get<FileDescriptor>(folder)), path.substr(path.rfind('/') + 1)};
+    ResolvedName place{std::move(std::get<Fd>(folder)), path.substr(path.rfind('/') + 1)};
     auto opened = openMovie(place);
-    const auto* file = std::get_if<FileDescriptor>(&opened);
+    const auto* file = std::get_if<Fd>(&opened);
     struct stat status = {};
     if (file && (::fstat(file->get(), &status) != 0 || status.st_uid != ::geteuid())) return EACCES;
     return opened;
@@ -120,7 +120,7 @@ LinuxPhotoLibrary::LinuxPhotoLibrary(Options options) : options_(std::move(optio
 void LinuxPhotoLibrary::removeUnfinished() {
     const std::string videos = videosFolder(options_.home, options_.configHome, options_.videosDirectory);
     const auto folder = openTrusted(withSingleSlashes(videos + "/Lumacast"));
-    if (const auto* found = std::get_if<FileDescriptor>(&folder)) (void)removeStaleParts(found->get(), start_);
+    if (const auto* found = std::get_if<Fd>(&folder)) (void)removeStaleParts(found->get(), start_);
 }
 
 Result<URL> LinuxPhotoLibrary::addVideo(const URL& movie, UserID userID) {
@@ -144,8 +144,8 @@ Result<URL> LinuxPhotoLibrary::addVideo(const URL& movie, UserID userID) {
                                            : videosFolder(options_.home, options_.configHome, options_.videosDirectory);
         auto folder = LibraryFolder::open(videos, user);
         if (const int* failure = std::get_if<int>(&folder)) return *failure;
-        auto copy = addCopy(std::get<FileDescriptor>(source).get(), path, std::get<LibraryFolder>(folder),
-                            options_.unseen, options_.copyBy);
+        auto copy = addCopy(std::get<Fd>(source).get(), path, std::get<LibraryFolder>(folder), options_.unseen,
+                            options_.copyBy);
         if (const int* failure = std::get_if<int>(&copy)) return *failure;
         saved = std::get<std::string>(std::move(copy));
         return 0;

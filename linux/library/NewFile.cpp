@@ -32,7 +32,7 @@ std::string randomName() {
 
 std::variant<NewFile, int> NewFile::in(int folder, Unseen unseen) {
     if (unseen == Unseen::WithoutName) {
-        FileDescriptor file(calls::openAt(folder, ".", O_TMPFILE | O_RDWR | O_CLOEXEC, kMode));
+        Fd file(calls::openAt(folder, ".", O_TMPFILE | O_RDWR | O_CLOEXEC, kMode));
         if (file) return NewFile(folder, std::move(file), {});
         // What a file system, or a kernel, that can't says: the flag is unknown, or "." is a directory and no more.
         if (errno != EOPNOTSUPP && errno != EISDIR && errno != EINVAL && errno != ENOENT) return errno;
@@ -40,7 +40,7 @@ std::variant<NewFile, int> NewFile::in(int folder, Unseen unseen) {
     for (int attempt = 0; attempt < kAttempts; ++attempt) {
         std::string name = randomName();
         if (name.empty()) return EAGAIN;
-        FileDescriptor file(
+        Fd file(
             calls::openAt(folder, name, O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, kMode));
         if (file) {
             (void)markBeingWritten(file.get());  // it is new: nobody else's
@@ -58,7 +58,7 @@ bool isHiddenName(std::string_view name) {
            name.substr(kPrefix.size(), kDigits).find_first_not_of("0123456789abcdef") == std::string_view::npos;
 }
 
-NewFile::NewFile(int folder, FileDescriptor file, std::string hiddenName)
+NewFile::NewFile(int folder, Fd file, std::string hiddenName)
     : folder_(folder), file_(std::move(file)), hiddenName_(std::move(hiddenName)) {}
 
 NewFile::NewFile(NewFile&& other) noexcept
@@ -92,7 +92,7 @@ int NewFile::giveNameToHidden(const std::string& name) {
     if (calls::link(folder_, from, folder_, to, 0) == 0) return 0;  // the hidden name goes at the end
     if (!cannot()) return errno;
     // A file system with neither: an empty file of ours takes the name, and is what is replaced.
-    const FileDescriptor place(calls::openAt(folder_, to, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, kMode));
+    const Fd place(calls::openAt(folder_, to, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, kMode));
     if (!place) return errno;
     if (calls::rename(folder_, from, folder_, to) == 0) {
         hiddenName_.clear();

@@ -3,7 +3,7 @@
 #include <string_view>
 #include <variant>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 
@@ -31,12 +31,12 @@ public:
     [[nodiscard]] int giveName(const std::string& name);
 
 private:
-    NewFile(int folder, FileDescriptor file, std::string hiddenName);
+    NewFile(int folder, Fd file, std::string hiddenName);
     int giveNameToUnnamed(const std::string& name);
     int giveNameToHidden(const std::string& name);
 
     int folder_;
-    FileDescriptor file_;
+    Fd file_;
     std::string hiddenName_;  ///< empty for none
 };
 

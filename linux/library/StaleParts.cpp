@@ -9,8 +9,8 @@
 #include <vector>
 
 #include "linux/calls/FileCalls.h"
+#include "linux/ipc/Fd.h"
 #include "linux/library/NewFile.h"
-#include "linux/system/FileDescriptor.h"
 #include "linux/system/FileLock.h"
 
 namespace lumacast {
@@ -19,7 +19,7 @@ namespace {
 
 std::vector<std::string> partsIn(int folder) {
     std::vector<std::string> names;
-    FileDescriptor list(calls::openAt(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    Fd list(calls::openAt(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     DIR* const entries = list ? ::fdopendir(list.get()) : nullptr;
     if (!entries) return names;
     (void)list.release();  // it is closed with the stream
@@ -34,7 +34,7 @@ bool isEarlier(const timespec& a, const timespec& b) {
     return a.tv_sec != b.tv_sec ? a.tv_sec < b.tv_sec : a.tv_nsec < b.tv_nsec;
 }
 
-bool isStale(const FileDescriptor& file, const timespec& before) {
+bool isStale(const Fd& file, const timespec& before) {
     struct stat status = {};
     return file && ::fstat(file.get(), &status) == 0 && S_ISREG(status.st_mode) && status.st_uid == ::geteuid() &&
            isEarlier(status.st_ctim, before) && !isBeingWritten(file.get());
@@ -45,8 +45,7 @@ bool isStale(const FileDescriptor& file, const timespec& before) {
 std::size_t removeStaleParts(int folder, const timespec& before) {
     std::size_t count = 0;
     for (const std::string& name : partsIn(folder)) {
-        const FileDescriptor file(
-            calls::openAt(folder, name, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+        const Fd file(calls::openAt(folder, name, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
         // Such a name is a number of 64 bits by chance: nobody gives it to another file meanwhile.
         if (isStale(file, before) && calls::unlinkAt(folder, name) == 0) ++count;
     }

@@ -6,11 +6,11 @@
 #include <algorithm>
 #include <utility>
 
+#include "linux/ipc/Fd.h"
 #include "linux/media/EncodingQueue.h"
 #include "linux/media/LinuxMovieExport.h"
 #include "linux/media/MovieSource.h"
 #include "linux/calls/FileCalls.h"
-#include "linux/system/FileDescriptor.h"
 
 namespace lumacast {
 
@@ -21,11 +21,11 @@ namespace {
 constexpr std::size_t kMostLibraryMemory = std::size_t{512} << 20;
 
 /// A regular file, for reading; without waiting for anybody, as the opening of a pipe would.
-std::shared_ptr<const FileDescriptor> openRegular(const std::string& path) {
-    FileDescriptor file(calls::openAt(AT_FDCWD, path, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+std::shared_ptr<const Fd> openRegular(const std::string& path) {
+    Fd file(calls::openAt(AT_FDCWD, path, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
     struct stat status = {};
     if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) return nullptr;
-    return std::make_shared<const FileDescriptor>(std::move(file));
+    return std::make_shared<const Fd>(std::move(file));
 }
 
 /// The movie that stood at its path when it was opened, whatever becomes of the path: it is read through its descriptor.
@@ -51,7 +51,7 @@ private:
         }
     }
 
-    const std::shared_ptr<const FileDescriptor> file_;
+    const std::shared_ptr<const Fd> file_;
     std::string path_;
     std::int64_t nanoseconds_ = 0;
     std::vector<std::int32_t> audioTracks_;

@@ -18,7 +18,7 @@ namespace {
 class PosixMovieFile final : public MovieFile {
 public:
     /// `folder` holds the file.
-    PosixMovieFile(int descriptor, FileDescriptor folder) : descriptor_(descriptor), folder_(std::move(folder)) {}
+    PosixMovieFile(int descriptor, Fd folder) : descriptor_(descriptor), folder_(std::move(folder)) {}
     PosixMovieFile(const PosixMovieFile&) = delete;
     PosixMovieFile& operator=(const PosixMovieFile&) = delete;
     ~PosixMovieFile() override { ::close(descriptor_); }
@@ -39,7 +39,7 @@ public:
             return errno == EINVAL || errno == EROFS ? 0 : errno;  // not a file that can be synced
         if (!folder_) return 0;
         // Once: a file whose name is not on the disk is gone after a power cut, however much of it is there.
-        const FileDescriptor folder = std::move(folder_);
+        const Fd folder = std::move(folder_);
         return syncFolder(folder.get());
     }
 
@@ -51,10 +51,10 @@ public:
 
 private:
     const int descriptor_;
-    FileDescriptor folder_;  ///< until its names have been synced
+    Fd folder_;  ///< until its names have been synced
 };
 
-std::variant<std::unique_ptr<MovieFile>, int> createIn(FileDescriptor folder, const std::string& name) {
+std::variant<std::unique_ptr<MovieFile>, int> createIn(Fd folder, const std::string& name) {
     // The mode is what umask 077 would leave, whatever the process's umask is.
     const int descriptor = calls::openAt(folder.get(), name, O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
     if (descriptor < 0) return errno;
@@ -71,7 +71,7 @@ std::variant<std::unique_ptr<MovieFile>, int> PosixMovieFiles::create(const std:
     if (!directory_) {
         const std::size_t slash = path.rfind('/');
         const std::string around = slash == std::string::npos ? "." : path.substr(0, slash + 1);
-        FileDescriptor folder(calls::openAt(AT_FDCWD, around, O_PATH | O_DIRECTORY | O_CLOEXEC));
+        Fd folder(calls::openAt(AT_FDCWD, around, O_PATH | O_DIRECTORY | O_CLOEXEC));
         if (!folder) return errno;
         return createIn(std::move(folder), path.substr(slash + 1));  // from 0 on where there is none
     }
@@ -80,7 +80,7 @@ std::variant<std::unique_ptr<MovieFile>, int> PosixMovieFiles::create(const std:
     if (!whole.starts_with(inside) || whole.find('/', inside.size()) != std::string::npos) return EACCES;
     auto folder = openTrusted(inside);
     if (const int* error = std::get_if<int>(&folder)) return *error;
-    return createIn(std::move(std::get<FileDescriptor>(folder)), whole.substr(inside.size()));
+    return createIn(std::move(std::get<Fd>(folder)), whole.substr(inside.size()));
 }
 
 }  // namespace lumacast::media

@@ -34,15 +34,15 @@ bool isLater(const struct timespec& a, const struct timespec& b) {
 }
 
 /// Follows no link, and waits for nobody, as the opening of a pipe would.
-FileDescriptor openIn(int folder, const std::string& name, int mode, struct stat& status) {
-    FileDescriptor file(calls::openAt(folder, name, mode | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+Fd openIn(int folder, const std::string& name, int mode, struct stat& status) {
+    Fd file(calls::openAt(folder, name, mode | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
     if (file && (::fstat(file.get(), &status) != 0 || !isOwnRegularFile(status))) file.reset();
     return file;
 }
 
 }  // namespace
 
-StoredMovie::StoredMovie(FileDescriptor file, const struct stat& status, const std::atomic<bool>* cancelled)
+StoredMovie::StoredMovie(Fd file, const struct stat& status, const std::atomic<bool>* cancelled)
     : file_(std::move(file)),
       status_(status),
       cancelled_(cancelled),
@@ -107,9 +107,9 @@ void StoredMovie::restoreTimes() {
 
 std::optional<MovieFolder> MovieFolder::open(const std::string& directory) {
     const auto place = openTrusted(withSingleSlashes(directory));
-    const auto* const found = std::get_if<FileDescriptor>(&place);
+    const auto* const found = std::get_if<Fd>(&place);
     if (!found) return std::nullopt;
-    FileDescriptor folder(calls::openAt(found->get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    Fd folder(calls::openAt(found->get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     if (!folder) return std::nullopt;
     return MovieFolder(std::move(folder));
 }
@@ -118,7 +118,7 @@ std::vector<ListedFile> MovieFolder::list(std::size_t most) const {
     const auto isNewer = [](const ListedFile& a, const ListedFile& b) { return isLater(a.changed, b.changed); };
     std::vector<ListedFile> files;  // a heap, the oldest first
     // A description of its own, which begins at the first name.
-    FileDescriptor names(calls::openAt(folder_.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    Fd names(calls::openAt(folder_.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     DIR* const entries = names ? ::fdopendir(names.get()) : nullptr;
     if (!entries) return files;
     (void)names.release();  // it is closed with the stream
@@ -138,7 +138,7 @@ std::vector<ListedFile> MovieFolder::list(std::size_t most) const {
 
 std::unique_ptr<StoredMovie> MovieFolder::openToLook(const std::string& name) const {
     struct stat status = {};
-    FileDescriptor file = openIn(folder_.get(), name, O_RDONLY, status);
+    Fd file = openIn(folder_.get(), name, O_RDONLY, status);
     if (!file) return nullptr;
     return std::unique_ptr<StoredMovie>(new StoredMovie(std::move(file), status, nullptr));
 }
@@ -146,7 +146,7 @@ std::unique_ptr<StoredMovie> MovieFolder::openToLook(const std::string& name) co
 std::unique_ptr<StoredMovie> MovieFolder::openToChange(const ListedFile& listed,
                                                        const std::atomic<bool>& cancelled) const {
     struct stat status = {};
-    FileDescriptor file = openIn(folder_.get(), listed.name, O_RDWR, status);
+    Fd file = openIn(folder_.get(), listed.name, O_RDWR, status);
     // A number is given to another file as soon as the first one is gone; that one's moment is later.
     if (!file || !isSameFile(listed, status) || !isSameMoment(listed.changed, status.st_ctim)) return nullptr;
     if (!markBeingWritten(file.get())) return nullptr;

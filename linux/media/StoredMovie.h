@@ -10,9 +10,9 @@
 #include <string>
 #include <vector>
 
+#include "linux/ipc/Fd.h"
 #include "linux/media/mp4/BoxSink.h"
 #include "linux/media/mp4/BoxSource.h"
-#include "linux/system/FileDescriptor.h"
 
 namespace lumacast::media {
 
@@ -43,11 +43,11 @@ public:
 
 private:
     friend class MovieFolder;
-    StoredMovie(FileDescriptor file, const struct stat& status, const std::atomic<bool>* cancelled);
+    StoredMovie(Fd file, const struct stat& status, const std::atomic<bool>* cancelled);
     bool write(std::uint64_t offset, std::span<const std::uint8_t> bytes);
     void fail(int error);
 
-    const FileDescriptor file_;
+    const Fd file_;
     const struct stat status_;
     const std::atomic<bool>* const cancelled_;
     std::uint64_t size_;
@@ -73,8 +73,8 @@ public:
     int remove(const ListedFile& listed) const;
 
 private:
-    explicit MovieFolder(FileDescriptor folder) : folder_(std::move(folder)) {}
-    FileDescriptor folder_;
+    explicit MovieFolder(Fd folder) : folder_(std::move(folder)) {}
+    Fd folder_;
 };
 
 }  // namespace lumacast::media

@@ -2,8 +2,8 @@
 #include <cstdint>
 #include <optional>
 
+#include "linux/ipc/Fd.h"
 #include "linux/network/NetworkAddress.h"
-#include "linux/system/FileDescriptor.h"
 
 namespace lumacast {
 
@@ -30,7 +30,7 @@ private:
     std::optional<Answer> ask(Request& request);
     std::optional<Way> stateOf(int device);
 
-    FileDescriptor socket_;
+    Fd socket_;
     std::uint32_t sequence_ = 0;
 };
 

@@ -20,14 +20,14 @@ constexpr int kDirectoryFlags = O_PATH | O_DIRECTORY | O_CLOEXEC;
 constexpr int kMaximumDepth = 64;
 constexpr int kMaximumLinks = 40;  // as the kernel follows
 
-FileDescriptor openBeneath(int base, const std::string& path) {
+Fd openBeneath(int base, const std::string& path) {
     open_how how{};
     how.flags = static_cast<std::uint64_t>(kDirectoryFlags | O_NOFOLLOW);
     how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS | RESOLVE_NO_MAGICLINKS;
-    return FileDescriptor(calls::openResolved(base, path, how));
+    return Fd(calls::openResolved(base, path, how));
 }
 
-FileDescriptor walkBeneath(FileDescriptor base, const std::vector<std::string>& components) {
+Fd walkBeneath(Fd base, const std::vector<std::string>& components) {
     for (const std::string& component : components) {
         base.reset(calls::openAt(base.get(), component, kDirectoryFlags | O_NOFOLLOW));
         if (!base) break;
@@ -59,7 +59,7 @@ int removeTree(int directory, const std::string& name, int depth) {
     if (calls::unlinkAt(directory, name) == 0) return 0;
     if (errno != EISDIR && errno != EPERM) return errno;
     const int refusal = errno;
-    FileDescriptor opened(calls::openAt(directory, name, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    Fd opened(calls::openAt(directory, name, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
     if (!opened) return errno == ENOTDIR || errno == ELOOP ? refusal : errno;
 
     const std::unique_ptr<DIR, int (*)(DIR*)> entries(::fdopendir(opened.get()), &::closedir);
@@ -79,7 +79,7 @@ int removeTree(int directory, const std::string& name, int depth) {
 }  // namespace
 
 Resolution availableResolution() {
-    const FileDescriptor root(calls::openAt(AT_FDCWD, "/", kDirectoryFlags));
+    const Fd root(calls::openAt(AT_FDCWD, "/", kDirectoryFlags));
     return openBeneath(root.get(), ".") ? Resolution::Kernel : Resolution::Walk;
 }
 
@@ -91,15 +91,15 @@ std::string withSingleSlashes(std::string_view path) {
     return result;
 }
 
-std::variant<FileDescriptor, int> openFolder(const std::string& directory, uid_t user) {
+std::variant<Fd, int> openFolder(const std::string& directory, uid_t user) {
     if (directory.find('\0') != std::string::npos) return EINVAL;
-    FileDescriptor at(calls::openAt(AT_FDCWD, "/", kDirectoryFlags));
+    Fd at(calls::openAt(AT_FDCWD, "/", kDirectoryFlags));
     std::vector<std::string> rest;  // the next one last
     walkFirst(rest, directory);
     for (int links = 0; at && !rest.empty();) {
         const std::string name = std::move(rest.back());
         rest.pop_back();
-        FileDescriptor next(calls::openAt(at.get(), name, O_PATH | O_CLOEXEC | O_NOFOLLOW));
+        Fd next(calls::openAt(at.get(), name, O_PATH | O_CLOEXEC | O_NOFOLLOW));
         struct stat status = {};
         if (!next || ::fstat(next.get(), &status) != 0) return errno;
         if (!S_ISLNK(status.st_mode)) {
@@ -119,16 +119,16 @@ std::variant<FileDescriptor, int> openFolder(const std::string& directory, uid_t
     return at;
 }
 
-std::variant<FileDescriptor, int> openTrusted(const std::string& directory, uid_t user) {
+std::variant<Fd, int> openTrusted(const std::string& directory, uid_t user) {
     auto opened = openFolder(directory, user);
-    const auto* folder = std::get_if<FileDescriptor>(&opened);
+    const auto* folder = std::get_if<Fd>(&opened);
     struct stat status = {};
     if (folder && ::fstat(folder->get(), &status) != 0) return errno;
     if (folder && !isTrusted(status, user)) return EACCES;
     return opened;
 }
 
-std::variant<FileDescriptor, int> openTrusted(const std::string& directory) {
+std::variant<Fd, int> openTrusted(const std::string& directory) {
     return openTrusted(directory, ::geteuid());
 }
 
@@ -142,7 +142,7 @@ std::variant<ResolvedName, int> resolveForUser(const std::string& path, uid_t us
         return EINVAL;
     auto folder = openFolder(path.substr(0, slash + 1), user);
     if (const int* error = std::get_if<int>(&folder)) return *error;
-    result.directory = std::move(std::get<FileDescriptor>(folder));
+    result.directory = std::move(std::get<Fd>(folder));
     return result;
 }
 
@@ -155,7 +155,7 @@ std::variant<ResolvedName, int> resolveBeneath(const std::string& base, const st
         const std::size_t slash = top.rfind('/');
         auto parent = openTrusted(top.substr(0, slash + 1));
         if (const int* error = std::get_if<int>(&parent)) return *error;
-        return ResolvedName{std::move(std::get<FileDescriptor>(parent)), top.substr(slash + 1)};
+        return ResolvedName{std::move(std::get<Fd>(parent)), top.substr(slash + 1)};
     }
     if (!whole.starts_with(top + "/")) return EACCES;
     std::vector<std::string> components = componentsOf(std::string_view(whole).substr(top.size() + 1));
@@ -167,7 +167,7 @@ std::variant<ResolvedName, int> resolveBeneath(const std::string& base, const st
     components.pop_back();
     auto opened = openTrusted(top);
     if (const int* error = std::get_if<int>(&opened)) return *error;
-    result.directory = std::move(std::get<FileDescriptor>(opened));
+    result.directory = std::move(std::get<Fd>(opened));
     if (components.empty()) return result;
     if (resolution == Resolution::Walk) {
         result.directory = walkBeneath(std::move(result.directory), components);

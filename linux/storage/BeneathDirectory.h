@@ -8,7 +8,7 @@
 #include <string_view>
 #include <variant>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 
@@ -21,7 +21,7 @@ Resolution availableResolution();
 
 /// A name in an open directory. The name is a single component, never "." or "..".
 struct ResolvedName {
-    FileDescriptor directory;  ///< O_PATH
+    Fd directory;  ///< O_PATH
     std::string name;
 };
 
@@ -37,11 +37,11 @@ std::variant<ResolvedName, int> resolveBeneath(const std::string& base, const st
 /// Opens a directory (O_PATH) by its absolute path. Links on the way and at its end are followed if this user or the
 /// administrator made them; one that somebody else planted, and a directory of somebody else's at the end, are EACCES.
 /// Blocks as long as the disk does.
-std::variant<FileDescriptor, int> openTrusted(const std::string& directory);
+std::variant<Fd, int> openTrusted(const std::string& directory);
 /// The same for another user than this process's.
-std::variant<FileDescriptor, int> openTrusted(const std::string& directory, uid_t user);
+std::variant<Fd, int> openTrusted(const std::string& directory, uid_t user);
 /// The same for a directory at the end that may be anybody's: what may be done in it, its rights say.
-std::variant<FileDescriptor, int> openFolder(const std::string& directory, uid_t user);
+std::variant<Fd, int> openFolder(const std::string& directory, uid_t user);
 
 /// Finds the place of any absolute path, its folder reached as openFolder does, with the rights of the calling thread.
 /// The last component is not looked at; what is done with it must not follow links either. EINVAL for a path that names

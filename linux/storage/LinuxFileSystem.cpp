@@ -81,7 +81,7 @@ struct LinuxFileSystem::Place {
     bool isDirectory(const std::string& path) const { return withSingleSlashes(path) == directory; }
 
     /// Opens a directory, following a link only for the temporary directory itself.
-    std::variant<FileDescriptor, int> open(const std::string& path, int flags) const {
+    std::variant<Fd, int> open(const std::string& path, int flags) const {
         const auto place = resolve(path);
         if (const int* error = std::get_if<int>(&place)) return *error;
         const auto& [folder, name] = std::get<ResolvedName>(place);
@@ -90,12 +90,12 @@ struct LinuxFileSystem::Place {
         if (std::holds_alternative<int>(opened)) return opened;
         directoryWasThere = true;
         if ((flags & O_PATH) != 0) return opened;
-        return reopened(std::get<FileDescriptor>(opened).get(), ".", flags);
+        return reopened(std::get<Fd>(opened).get(), ".", flags);
     }
 
     /// As `open`, for the temporary directory: one that was there and is gone is made again, with its parents, so that
     /// whoever cleans up under a running daemon does not end its service.
-    std::variant<FileDescriptor, int> openDirectoryAgain() const {
+    std::variant<Fd, int> openDirectoryAgain() const {
         auto opened = open(directory, O_PATH);
         const int* error = std::get_if<int>(&opened);
         if (!error || *error != ENOENT || !directoryWasThere) return opened;
@@ -104,8 +104,8 @@ struct LinuxFileSystem::Place {
     }
 
 private:
-    static std::variant<FileDescriptor, int> reopened(int folder, const char* name, int flags) {
-        FileDescriptor file(calls::openAt(folder, name, flags | O_CLOEXEC));
+    static std::variant<Fd, int> reopened(int folder, const char* name, int flags) {
+        Fd file(calls::openAt(folder, name, flags | O_CLOEXEC));
         if (!file) return errno;
         return file;
     }
@@ -171,7 +171,7 @@ Result<FileAttributes> LinuxFileSystem::attributes(const std::string& path) {
         if (place.isDirectory(path)) {
             const auto opened = place.open(path, O_PATH);
             if (const int* error = std::get_if<int>(&opened)) return *error;
-            if (::statx(std::get<FileDescriptor>(opened).get(), "", AT_EMPTY_PATH, kWanted, &status) != 0) return errno;
+            if (::statx(std::get<Fd>(opened).get(), "", AT_EMPTY_PATH, kWanted, &status) != 0) return errno;
         } else {
             const auto outcome = place.perform(path, [&](int folder, const std::string& name) {
                 return ::statx(folder, name.c_str(), AT_SYMLINK_NOFOLLOW, kWanted, &status);
@@ -200,7 +200,7 @@ bool LinuxFileSystem::userMayReadAndRemove(UserID user, const std::string& path)
         if (place.beforeEachQuestion) place.beforeEachQuestion();
         const auto own = place.openDirectoryAgain();
         struct stat ours = {};
-        const auto* const folder = std::get_if<FileDescriptor>(&own);
+        const auto* const folder = std::get_if<Fd>(&own);
         if (!folder && std::get<int>(own) != ENOENT) return std::get<int>(own);
         if (folder && ::fstat(folder->get(), &ours) != 0) return errno;
         const int error = performAs(number(user), accounts, [&] {
@@ -222,7 +222,7 @@ Result<std::uint64_t> LinuxFileSystem::freeSize(const std::string& path) {
         const auto opened = place.isDirectory(path) ? place.openDirectoryAgain() : place.open(path, O_PATH);
         if (const int* error = std::get_if<int>(&opened)) return *error;
         struct statvfs status = {};
-        if (calls::statFileSystem(std::get<FileDescriptor>(opened).get(), status) != 0) return errno;
+        if (calls::statFileSystem(std::get<Fd>(opened).get(), status) != 0) return errno;
         return static_cast<std::uint64_t>(status.f_bavail) * status.f_frsize;
     });
     return resultOf(freeSizeNowOrBefore(path, answer));
@@ -244,7 +244,7 @@ std::variant<std::uint64_t, int> LinuxFileSystem::freeSizeNowOrBefore(const std:
 Result<std::vector<std::string>> LinuxFileSystem::list(const std::string& path) {
     auto opened = place_->open(path, O_RDONLY | O_DIRECTORY);
     if (const int* error = std::get_if<int>(&opened)) return systemError(*error);
-    auto& directory = std::get<FileDescriptor>(opened);
+    auto& directory = std::get<Fd>(opened);
     const std::unique_ptr<DIR, int (*)(DIR*)> entries(::fdopendir(directory.get()), &::closedir);
     if (!entries) return systemError(errno);
     (void)directory.release();  // the stream closes it

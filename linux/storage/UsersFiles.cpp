@@ -7,8 +7,8 @@
 
 #include <cerrno>
 
-#include "linux/storage/BeneathDirectory.h"
 #include "linux/calls/FileCalls.h"
+#include "linux/storage/BeneathDirectory.h"
 
 namespace lumacast {
 
@@ -40,8 +40,7 @@ int mayReadAndRemove(const std::string& path, uid_t user, const struct stat* not
     struct stat around = {};
     if (::fstatat(folder.get(), name.c_str(), &file, AT_SYMLINK_NOFOLLOW) != 0) return errno;
     if (!S_ISREG(file.st_mode)) return S_ISDIR(file.st_mode) ? EISDIR : EACCES;
-    const FileDescriptor opened(
-        calls::openAt(folder.get(), name, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+    const Fd opened(calls::openAt(folder.get(), name, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
     struct stat read = {};
     if (!opened || ::fstat(opened.get(), &read) != 0) return errno;
     if (read.st_ino != file.st_ino || read.st_dev != file.st_dev) return EACCES;  // exchanged meanwhile

@@ -9,8 +9,8 @@
 
 #include "base/Value.h"
 #include "linux/apps/Languages.h"
+#include "linux/ipc/Fd.h"
 #include "linux/store/ProgramOutput.h"
-#include "linux/system/FileDescriptor.h"
 #include "linux/system/Json.h"
 #include "linux/system/LinuxEnvironment.h"
 
@@ -95,7 +95,7 @@ struct LinuxStoreLookup::State {
     }
 
     const Options options;
-    const FileDescriptor cancel{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};  ///< can be read from the end on
+    const Fd cancel{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};  ///< can be read from the end on
     std::atomic<std::size_t> waiting{0};
 };
 

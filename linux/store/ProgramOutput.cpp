@@ -12,7 +12,7 @@
 #include <array>
 #include <cerrno>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 #include "linux/system/WordPointers.h"
 
 namespace lumacast {
@@ -69,7 +69,7 @@ public:
 
 private:
     pid_t pid_ = -1;
-    FileDescriptor end_;
+    Fd end_;
 };
 
 /// Waits until `descriptor` can be read; false when the time is over or `cancel` can be read first.
@@ -89,8 +89,8 @@ bool waitFor(int descriptor, int cancel, Clock::time_point deadline) {
 std::optional<std::string> outputOf(const ProgramRun& run, int cancel) {
     int ends[2] = {-1, -1};
     if (run.command.empty() || ::pipe2(ends, O_CLOEXEC) != 0) return std::nullopt;
-    const FileDescriptor output(ends[0]);
-    FileDescriptor theirs(ends[1]);
+    const Fd output(ends[0]);
+    Fd theirs(ends[1]);
     Child child(run, theirs.get());
     theirs.reset();
     if (!child.isThere()) return std::nullopt;

@@ -8,7 +8,7 @@
 #include <string>
 #include <string_view>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 
@@ -20,7 +20,7 @@ constexpr int kMostAncestors = 64;
 
 // The fourth field of /proc/<pid>/stat; the second one is a name in parentheses that may contain anything.
 ProcessID parentOf(ProcessID pid) {
-    const FileDescriptor file(::open(("/proc/" + std::to_string(number(pid)) + "/stat").c_str(), O_RDONLY | O_CLOEXEC));
+    const Fd file(::open(("/proc/" + std::to_string(number(pid)) + "/stat").c_str(), O_RDONLY | O_CLOEXEC));
     std::array<char, 512> buffer;
     const ssize_t length = file ? ::read(file.get(), buffer.data(), buffer.size()) : -1;
     if (length <= 0) return ProcessID{0};

@@ -8,7 +8,7 @@ namespace lumacast {
 
 std::optional<HeldProcess> HeldProcess::hold(ProcessID pid) {
     if (number(pid) <= 0) return std::nullopt;
-    FileDescriptor descriptor(static_cast<int>(::syscall(SYS_pidfd_open, number(pid), 0)));
+    Fd descriptor(static_cast<int>(::syscall(SYS_pidfd_open, number(pid), 0)));
     if (!descriptor) return std::nullopt;
     HeldProcess process(pid, std::move(descriptor));
     if (process.hasEnded()) return std::nullopt;

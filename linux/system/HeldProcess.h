@@ -3,7 +3,7 @@
 #include <utility>
 
 #include "base/Identifiers.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 
@@ -20,10 +20,10 @@ public:
     bool hasEnded() const;
 
 private:
-    HeldProcess(ProcessID pid, FileDescriptor descriptor) : pid_(pid), descriptor_(std::move(descriptor)) {}
+    HeldProcess(ProcessID pid, Fd descriptor) : pid_(pid), descriptor_(std::move(descriptor)) {}
 
     ProcessID pid_;
-    FileDescriptor descriptor_;
+    Fd descriptor_;
 };
 
 }  // namespace lumacast

@@ -10,7 +10,7 @@
 
 #include "linux/calls/FileCalls.h"
 #include "linux/calls/FolderSync.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 #include "linux/system/IniFile.h"
 #include "linux/system/SmallFile.h"
 #include "linux/system/SystemError.h"
@@ -131,7 +131,7 @@ std::optional<Error> LinuxEnvironment::prepareDirectories() const {
     for (const std::string& path : {runtimeDirectory, stateDirectory, cacheDirectory}) {
         if (auto error = makeDirectories(path)) return error;
         // An existing directory of somebody else's, or one that others may write to, is not for our sockets and files.
-        const FileDescriptor directory(::open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC | O_NOFOLLOW));
+        const Fd directory(::open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC | O_NOFOLLOW));
         struct stat status = {};
         if (!directory || ::fstat(directory.get(), &status) != 0) return systemError(errno);
         if (status.st_uid != ::geteuid() || (status.st_mode & (S_IWGRP | S_IWOTH)) != 0) return systemError(EPERM);
@@ -151,7 +151,7 @@ namespace {
 /// Once made, a directory stays there, whatever happens to the power.
 void syncFolderOf(const std::string& path) {
     const std::string parent = path.substr(0, path.rfind('/') + 1);
-    const FileDescriptor folder(calls::openAt(AT_FDCWD, parent, O_PATH | O_DIRECTORY | O_CLOEXEC));
+    const Fd folder(calls::openAt(AT_FDCWD, parent, O_PATH | O_DIRECTORY | O_CLOEXEC));
     if (folder) (void)syncFolder(folder.get());
 }
 

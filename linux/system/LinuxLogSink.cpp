@@ -81,12 +81,12 @@ bool leadsToJournal(const LogSinkTargets& targets) {
     return targets.journalStream == std::to_string(status.st_dev) + ":" + std::to_string(status.st_ino);
 }
 
-FileDescriptor connectToJournal(const std::string& path) {
+Fd connectToJournal(const std::string& path) {
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
     if (path.empty() || path.size() >= sizeof address.sun_path) return {};
     std::copy(path.begin(), path.end(), address.sun_path);
-    FileDescriptor socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+    Fd socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     if (!socket || ::connect(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) return {};
     return socket;
 }

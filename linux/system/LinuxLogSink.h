@@ -6,7 +6,7 @@
 #include <memory>
 #include <string>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 #include "linux/system/LineQuota.h"
 #include "linux/system/RepeatedLines.h"
 #include "platform/LogSink.h"
@@ -52,7 +52,7 @@ private:
         enum class Kind { Ordinary, Pollable, Reopened, Socket };
         int number_;
         Kind kind_ = Kind::Ordinary;
-        FileDescriptor reopened_;
+        Fd reopened_;
     };
 
     bool mayBeWritten(LogLevel level);
@@ -63,7 +63,7 @@ private:
 
     const Stream error_;
     const Stream output_;
-    FileDescriptor journal_;
+    Fd journal_;
     const std::function<std::chrono::steady_clock::time_point()> now_;
     RepeatedLines repeated_;
     LineQuota quota_;

@@ -14,7 +14,7 @@
 #include <thread>
 
 #include "linux/calls/FileCalls.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 #include "linux/system/Json.h"
 #include "linux/system/LinuxClock.h"
 #include "linux/system/LinuxEnvironment.h"
@@ -32,7 +32,7 @@ constexpr std::size_t kMaximumDepth = 8;  // far below what whoever reads an ans
 constexpr std::chrono::seconds kFarewell{2};
 
 /// Whether the file's last line has no end: the power went while it was written.
-bool endsWithinLine(const FileDescriptor& file, const struct stat& status) {
+bool endsWithinLine(const Fd& file, const struct stat& status) {
     char last = '\n';
     return status.st_size > 0 && ::pread(file.get(), &last, 1, status.st_size - 1) == 1 && last != '\n';
 }
@@ -40,10 +40,10 @@ bool endsWithinLine(const FileDescriptor& file, const struct stat& status) {
 /// Appends a line with one write, after making room. Whether all of it is in the file.
 bool append(const std::string& path, std::uint64_t maximumBytes, std::string line) {
     const auto open = [&] {
-        return FileDescriptor(
+        return Fd(
             calls::openAt(AT_FDCWD, path, O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600));
     };
-    FileDescriptor file = open();
+    Fd file = open();
     if (!file && errno == ENOENT) {
         if (makeDirectories(path.substr(0, path.rfind('/')))) return false;
         file = open();

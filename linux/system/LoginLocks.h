@@ -8,7 +8,7 @@
 #include <memory>
 #include <string>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 
@@ -47,7 +47,7 @@ private:
         LoginLocks* owner = nullptr;
         const char* what = nullptr;
         const char* mode = nullptr;
-        FileDescriptor held;
+        Fd held;
     };
 
     void ask(Lock& lock);

@@ -2,7 +2,7 @@
 #include <string>
 #include <string_view>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 
@@ -18,7 +18,7 @@ public:
 
 private:
     const std::string address_;
-    FileDescriptor socket_;
+    Fd socket_;
 };
 
 }  // namespace lumacast

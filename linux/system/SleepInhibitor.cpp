@@ -101,7 +101,7 @@ private:
     }
 
     const Options options_;
-    const FileDescriptor wake_{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};
+    const Fd wake_{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};
     std::mutex mutex_;  // guards the next three
     bool busy_ = false;
     bool quit_ = false;

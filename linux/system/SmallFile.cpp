@@ -5,13 +5,13 @@
 
 #include <cerrno>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 
 std::optional<SmallFile> readSmallFile(const std::string& path, std::size_t maximumBytes) {
     // O_NONBLOCK: opening a pipe that somebody put there must not wait for its writer.
-    const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+    const Fd file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
     SmallFile result;
     if (!file || ::fstat(file.get(), &result.status) != 0 || !S_ISREG(result.status.st_mode)) return std::nullopt;
     if (result.status.st_size < 0 || static_cast<std::size_t>(result.status.st_size) > maximumBytes)

@@ -3,7 +3,7 @@
 #include <functional>
 #include <thread>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast {
 
@@ -39,8 +39,8 @@ public:
 private:
     void wait(const std::function<void()>& onTerminate, std::chrono::milliseconds limit, const Beat& beat) const;
 
-    FileDescriptor signals_;
-    FileDescriptor end_;
+    Fd signals_;
+    Fd end_;
     std::thread thread_;
 };
 

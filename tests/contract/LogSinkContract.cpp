@@ -67,7 +67,7 @@ private:
             EXPECT_EQ(line, "") << "half a line";
             return result;
         }
-        FileDescriptor reading, writing;
+        Fd reading, writing;
     };
 
     Pipe error_, output_;

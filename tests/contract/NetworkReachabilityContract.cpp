@@ -127,7 +127,7 @@ TEST(LinuxNetworkReachability, NothingIsSentToTheHost) {
         EXPECT_EQ(flagsTo({}), 0u);
         EXPECT_EQ(ear.heardOf(host), 0);
         // The ear hears: a packet to the host makes the machine look for its neighbour.
-        const FileDescriptor socket(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+        const Fd socket(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0));
         sockaddr_in target{};
         target.sin_family = AF_INET;
         target.sin_port = htons(9);

@@ -23,8 +23,8 @@
 #include <thread>
 #include <vector>
 
+#include "linux/ipc/Fd.h"
 #include "linux/network/NetworkAddress.h"
-#include "linux/system/FileDescriptor.h"
 #include "tests/sound/SoundProcess.h"
 
 namespace lumacast::test {
@@ -133,7 +133,7 @@ public:
     }
 
 private:
-    FileDescriptor socket_;
+    Fd socket_;
 };
 
 }  // namespace lumacast::test

@@ -15,7 +15,7 @@
 #include <utility>
 #include <vector>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 #include "linux/system/LinuxClock.h"
 
 namespace lumacast::testing {
@@ -41,7 +41,7 @@ public:
     /// Goes on at this pipe, which the server has made.
     void connect(const std::string& path) {
         // For both, so that it neither waits for a reader nor loses its pipe with one.
-        FileDescriptor pipe(::open(path.c_str(), O_RDWR | O_NONBLOCK | O_CLOEXEC));
+        Fd pipe(::open(path.c_str(), O_RDWR | O_NONBLOCK | O_CLOEXEC));
         ::fcntl(pipe.get(), F_SETPIPE_SZ, 16384);
         const std::lock_guard lock(mutex_);
         pipe_ = std::move(pipe);
@@ -92,7 +92,7 @@ private:
         }
     }
 
-    FileDescriptor pipe_;
+    Fd pipe_;
     std::mutex mutex_;
     std::condition_variable changed_;
     bool isOver_ = false, onlyLeft_ = false;

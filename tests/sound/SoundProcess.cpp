@@ -40,7 +40,7 @@ std::vector<char*> pointersTo(std::vector<std::string>& words) {
 SoundProcess::SoundProcess(std::vector<std::string> command, const std::vector<std::string>& environment) {
     int in[2] = {-1, -1}, out[2] = {-1, -1};
     if (::pipe2(in, O_CLOEXEC) != 0 || ::pipe2(out, O_CLOEXEC) != 0) return;
-    const FileDescriptor theirInput(in[0]), theirOutput(out[1]);
+    const Fd theirInput(in[0]), theirOutput(out[1]);
     input_.reset(in[1]);
     output_.reset(out[0]);
     std::vector<std::string> variables = variablesWith(environment);

@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "base/Identifiers.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast::test {
 
@@ -33,7 +33,7 @@ public:
 
 private:
     pid_t pid_ = -1;
-    FileDescriptor input_, output_;
+    Fd input_, output_;
     std::string pending_;
 };
 

@@ -13,7 +13,7 @@
 #include <thread>
 
 #include "client/lumacastctl/doctor/Display.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast::ctl {
 
@@ -74,7 +74,7 @@ void readVersions(xcb_connection_t* connection, DisplayFacts& facts) {
 }
 
 bool takesMemoryByDescriptor(xcb_connection_t* connection) {
-    FileDescriptor memory(::memfd_create("lumacastctl", MFD_CLOEXEC));
+    Fd memory(::memfd_create("lumacastctl", MFD_CLOEXEC));
     if (!memory || ::ftruncate(memory.get(), kMemoryBytes) != 0) return false;
     const xcb_shm_seg_t segment = xcb_generate_id(connection);
     // The library takes the descriptor, and closes it when it is sent.

@@ -19,7 +19,7 @@
 #include "client/lumacastctl/Text.h"
 #include "linux/admin/LinuxAdminService.h"
 #include "linux/calls/FolderSync.h"
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast::ctl {
 
@@ -138,10 +138,10 @@ namespace {
 
 /// Brings the copy onto the disk, its bytes and its name: the other one may go then. 0 or the error number.
 int syncCopy(const std::string& path) {
-    const FileDescriptor copy(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+    const Fd copy(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
     if (!copy || ::fsync(copy.get()) != 0) return errno;
     const std::string around = std::filesystem::path(path).parent_path().string();
-    const FileDescriptor folder(::open(around.empty() ? "." : around.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    const Fd folder(::open(around.empty() ? "." : around.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
     return folder ? syncFolder(folder.get()) : errno;
 }
 

@@ -24,7 +24,7 @@ StopWish::StopWish() {
     sigaddset(&wanted, SIGHUP);  // the terminal has gone
     sigaddset(&wanted, SIGQUIT);
     ::pthread_sigmask(SIG_BLOCK, &wanted, &mask_);
-    signals_ = FileDescriptor(::signalfd(-1, &wanted, SFD_CLOEXEC | SFD_NONBLOCK));
+    signals_ = Fd(::signalfd(-1, &wanted, SFD_CLOEXEC | SFD_NONBLOCK));
     termios now{};
     if (::isatty(STDIN_FILENO) != 1 || ::tcgetattr(STDIN_FILENO, &now) != 0) {
         inputIsOpen_ = false;

@@ -7,7 +7,7 @@
 #include <chrono>
 #include <optional>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast::ctl {
 
@@ -24,7 +24,7 @@ public:
     bool came(std::chrono::milliseconds limit);
 
 private:
-    FileDescriptor signals_;
+    Fd signals_;
     sigset_t mask_{};  ///< as it was
     std::optional<termios> terminal_;  ///< as it was
     bool inputIsOpen_ = true;

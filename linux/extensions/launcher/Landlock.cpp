@@ -9,7 +9,7 @@
 #include <cerrno>
 #include <cstdint>
 
-#include "linux/system/FileDescriptor.h"
+#include "linux/ipc/Fd.h"
 
 namespace lumacast::launcher {
 
@@ -50,7 +50,7 @@ std::size_t sizeFor(int version) {
 }
 
 bool allow(int ruleset, const std::string& path, std::uint64_t rights) {
-    const FileDescriptor place(::open(path.c_str(), O_PATH | O_CLOEXEC));
+    const Fd place(::open(path.c_str(), O_PATH | O_CLOEXEC));
     struct stat status = {};
     if (!place || ::fstat(place.get(), &status) != 0) return errno == ENOENT || errno == EACCES || errno == ENOTDIR;
     if (!S_ISDIR(status.st_mode)) rights &= kOfFiles;
@@ -74,7 +74,7 @@ bool restrictFiles(const FileRules& rules) {
     RulesetAttributes attributes;
     attributes.files = filesOf(version);
     if (version >= 6) attributes.scoped = kScopeAbstractSockets | kScopeSignals;
-    const FileDescriptor ruleset(static_cast<int>(::syscall(kCreateRuleset, &attributes, sizeFor(version), 0)));
+    const Fd ruleset(static_cast<int>(::syscall(kCreateRuleset, &attributes, sizeFor(version), 0)));
     if (!ruleset) return false;
     for (const std::string& path : rules.readable)
         if (!allow(ruleset.get(), path, kExecute | kReadFile | kReadDirectory)) return false;

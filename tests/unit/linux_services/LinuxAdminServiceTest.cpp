@@ -37,11 +37,11 @@ struct Daemon {
     }
     /// Sends raw bytes and answers all that comes until the daemon closes the connection.
     std::string converse(const std::string& bytes) const {
-        const FileDescriptor socket = connectTo(path);
+        const Fd socket = connectTo(path);
         EXPECT_EQ(::send(socket.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL), static_cast<ssize_t>(bytes.size()));
         return readAll(socket);
     }
-    static std::string readAll(const FileDescriptor& socket) {
+    static std::string readAll(const Fd& socket) {
         std::string text;
         std::array<char, 4096> buffer;
         EXPECT_TRUE(until([&] {
@@ -91,7 +91,7 @@ TEST(LinuxAdminService, TheSocketIsThisUsersAloneAndGoesWithTheService) {
 
 TEST(LinuxAdminService, ALineMayComeInPiecesAndWithMoreBehindIt) {
     RunningDaemon daemon;
-    const FileDescriptor socket = connectTo(daemon.path);
+    const Fd socket = connectTo(daemon.path);
     for (const char* piece : {"sta", "tus\r", "\nmore\n"}) ASSERT_GT(::send(socket.get(), piece, strlen(piece), 0), 0);
     EXPECT_EQ(Daemon::readAll(socket), kStatus + "\n");
     EXPECT_EQ(daemon.snapshots, 1);
@@ -106,7 +106,7 @@ TEST(LinuxAdminService, ALineTooLongIsRefused) {
 
 TEST(LinuxAdminService, APeerThatSaysNothingIsSentAway) {
     RunningDaemon daemon({20ms, 30s, 30s});
-    const FileDescriptor socket = connectTo(daemon.path);
+    const Fd socket = connectTo(daemon.path);
     EXPECT_EQ(Daemon::readAll(socket), "");
     EXPECT_EQ(daemon.snapshots, 0);
 }
@@ -114,7 +114,7 @@ TEST(LinuxAdminService, APeerThatSaysNothingIsSentAway) {
 TEST(LinuxAdminService, APeerThatLeavesIsForgotten) {
     RunningDaemon daemon;
     for (int i = 0; i < 50; ++i) {
-        const FileDescriptor socket = connectTo(daemon.path);
+        const Fd socket = connectTo(daemon.path);
         if (i % 2 == 0) (void)::send(socket.get(), "status\n", 7, MSG_NOSIGNAL);
     }
     EXPECT_EQ(daemon.ask("status"), kStatus);
@@ -122,7 +122,7 @@ TEST(LinuxAdminService, APeerThatLeavesIsForgotten) {
 
 TEST(LinuxAdminService, PeersBeyondTheLimitWaitUntilOneLeaves) {
     RunningDaemon daemon;
-    std::vector<FileDescriptor> silent;
+    std::vector<Fd> silent;
     for (int i = 0; i < 8; ++i) silent.push_back(connectTo(daemon.path));
     EXPECT_EQ(daemon.ask("status", 50ms), "(nothing)");
     silent.pop_back();
@@ -143,7 +143,7 @@ TEST(LinuxAdminService, QuestionsOfPeersThatHaveLeftKeepNobodyFromBeingAnswered)
     Daemon daemon({30s, 2s, 30s});  // its main queue does not run yet
     daemon.resume();
     for (int i = 0; i < 8; ++i) EXPECT_EQ(daemon.ask("status", 20ms), "(nothing)");
-    const FileDescriptor socket = connectTo(daemon.path);
+    const Fd socket = connectTo(daemon.path);
     ASSERT_GT(::send(socket.get(), "status\n", 7, MSG_NOSIGNAL), 0);
     EXPECT_EQ(daemon.ask("status", 20ms), "(nothing)") << "whoever came before has been read by then";
     const RunningThreadLoop running(*daemon.loop);
@@ -206,7 +206,7 @@ TEST(LinuxAdminService, ASnapshotUnderWayOutlivesTheService) {
 
 TEST(LinuxAdminService, ASocketLeftBehindIsReplacedAndALivingOneIsNot) {
     Daemon first;
-    { const FileDescriptor dead = listenAt(first.path); }
+    { const Fd dead = listenAt(first.path); }
     ASSERT_TRUE(std::filesystem::exists(first.path));
     first.resume();
     std::string why;
@@ -229,7 +229,7 @@ TEST(LinuxAdminService, WhatIsNoSocketIsLeftAlone) {
 TEST(UnixSocket, ThePeersUserIsKnown) {
     std::array<int, 2> ends{};
     ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends.data()), 0);
-    const FileDescriptor near(ends[0]), far(ends[1]);
+    const Fd near(ends[0]), far(ends[1]);
     EXPECT_EQ(peerUser(near.get()), ::geteuid());
     EXPECT_EQ(peerUser(-1), std::nullopt);
 }

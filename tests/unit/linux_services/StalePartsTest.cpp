@@ -18,7 +18,7 @@ constexpr timespec kNever = {4'000'000'000, 0};
 class StaleParts : public ::testing::Test {
 protected:
     std::size_t remove(const timespec& before = kNever) const {
-        const FileDescriptor folder(::open(scratch.path().c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+        const Fd folder(::open(scratch.path().c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
         return removeStaleParts(folder.get(), before);
     }
     bool isThere(const std::string& name) const { return ::faccessat(AT_FDCWD, scratch.path(name).c_str(), F_OK, AT_SYMLINK_NOFOLLOW) == 0; }
@@ -52,7 +52,7 @@ TEST_F(StaleParts, AreKnownByTheirNameAndTheirKind) {
 }
 
 TEST_F(StaleParts, OfASaveThatGoesOnStay) {
-    const FileDescriptor folder(::open(scratch.path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    const Fd folder(::open(scratch.path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     auto made = NewFile::in(folder.get(), Unseen::HiddenName);
     ASSERT_TRUE(std::holds_alternative<NewFile>(made));
     ASSERT_EQ(::write(std::get<NewFile>(made).get(), "x", 1), 1);

@@ -18,7 +18,7 @@ namespace {
 constexpr char kName[] = "org.freedesktop.login1", kPath[] = "/org/freedesktop/login1",
                kInterface[] = "org.freedesktop.login1.Manager";
 
-bool isOpen(const FileDescriptor& end) {
+bool isOpen(const Fd& end) {
     pollfd polled{end.get(), 0, 0};
     return ::poll(&polled, 1, 0) == 0;  // a hang-up is told without being asked for
 }
@@ -102,10 +102,10 @@ int StandInLoginManager::inhibit(sd_bus_message* message, void* userdata, sd_bus
     int ends[2] = {-1, -1};
     if (sd_bus_message_read(message, "ssss", &what, &who, &why, &mode) < 0) return -EINVAL;
     if (::pipe2(ends, O_CLOEXEC) != 0) return -errno;
-    const FileDescriptor theirs(ends[1]);
+    const Fd theirs(ends[1]);
     {
         const std::lock_guard lock(self.mutex_);
-        self.given_.push_back({{what, who, why, mode, true}, FileDescriptor(ends[0])});
+        self.given_.push_back({{what, who, why, mode, true}, Fd(ends[0])});
     }
     return sd_bus_reply_method_return(message, "h", theirs.get());
 }

@@ -51,7 +51,7 @@ TEST_F(Tool, SaysSoWhenTheDaemonIsBusy) {
 }
 
 TEST_F(Tool, SaysSoWhenTheDaemonDoesNotAnswer) {
-    const FileDescriptor listener = listenAt(runtimeDirectory() + "/admin.sock");
+    const Fd listener = listenAt(runtimeDirectory() + "/admin.sock");
     ASSERT_TRUE(listener);
     const Outcome result = run({"status"});
     EXPECT_EQ(result.status, 1);

@@ -103,7 +103,7 @@ TEST_F(Watch, WritesALineOfJsonASecondWhenAsked) {
 
 TEST_F(Watch, ShowsTheNewestBlockAloneOnATerminal) {
     const StandInDaemon daemon(runtimeDirectory(), snapshotOfARecording);
-    const FileDescriptor terminal(::posix_openpt(O_RDWR | O_NOCTTY | O_CLOEXEC));
+    const Fd terminal(::posix_openpt(O_RDWR | O_NOCTTY | O_CLOEXEC));
     ASSERT_TRUE(terminal);
     ASSERT_EQ(::grantpt(terminal.get()), 0);
     ASSERT_EQ(::unlockpt(terminal.get()), 0);
