@@ -7,6 +7,8 @@
 #include <sys/stat.h>
 #include <sys/un.h>
 
+#include <gtest/gtest.h>
+
 #include <cstring>
 #include <filesystem>
 #include <fstream>
@@ -59,6 +61,10 @@ std::string firstLineOf(std::vector<std::string> command) {
 /// Whether an application can play: a server that accepts clients may still be looking for its outputs.
 bool plays(const std::string& address) {
     return within(std::chrono::seconds(20), [&address] { return TonePlayer(address).tell("play probe 100 0 2"); });
+}
+
+void expectThatItRuns(const SoundProcess& server, const char* name) {
+    EXPECT_EQ(server.ownEnd(), "") << "the end of the test's own " << name << ", which nobody ended";
 }
 
 std::string pulseSocket(const std::string& address) { return address.substr(std::strlen("unix:")); }
@@ -114,6 +120,7 @@ PrivateSoundServer::PrivateSoundServer(Begin begin) : directory_(makeDirectory({
 }
 
 PrivateSoundServer::~PrivateSoundServer() {
+    if (server_) expectThatItRuns(*server_, "pulseaudio");
     server_.reset();
     removeDirectory(directory_);
 }
@@ -152,6 +159,7 @@ PrivatePipeWire::PrivatePipeWire(PrivateSoundServer::Begin begin)
 }
 
 PrivatePipeWire::~PrivatePipeWire() {
+    for (const auto& server : servers_) expectThatItRuns(*server, "sound servers");
     while (!servers_.empty()) servers_.pop_back();
     removeDirectory(directory_);
 }

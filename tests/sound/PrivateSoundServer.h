@@ -10,7 +10,8 @@
 namespace lumacast::test {
 
 /// A sound server with two outputs, "null0" (where everything goes) and "null1", that plays to nobody. Its sockets and
-/// files lie in a directory of its own; it has gone when this object has.
+/// files lie in a directory of its own; it has gone when this object has. One that has ended by itself by then fails the
+/// test that it was made in, and says how: what was silent since was not the daemon's doing.
 class SoundServer {
 public:
     virtual ~SoundServer() = default;

@@ -61,6 +61,13 @@ bool SoundProcess::hasEnded() const {
            ::waitid(P_PID, static_cast<id_t>(pid_), &info, WEXITED | WNOHANG | WNOWAIT) != 0 || info.si_pid != 0;
 }
 
+std::string SoundProcess::ownEnd() const {
+    siginfo_t info{};
+    if (pid_ <= 0 || ::waitid(P_PID, static_cast<id_t>(pid_), &info, WEXITED | WNOHANG | WNOWAIT) != 0 || info.si_pid == 0)
+        return {};
+    return (info.si_code == CLD_EXITED ? "exit " : "signal ") + std::to_string(info.si_status);
+}
+
 std::string SoundProcess::ask(const std::string& line) {
     const std::string text = line + "\n";
     if (::write(input_.get(), text.data(), text.size()) != static_cast<ssize_t>(text.size())) return {};

@@ -23,6 +23,8 @@ public:
 
     pid_t pid() const { return pid_; }
     bool hasEnded() const;
+    /// How it ended without having been told to: "exit 1", "signal 9"; empty while it runs, and after end() or kill().
+    std::string ownEnd() const;
     /// Writes a line and answers the one that comes back, or nothing within ten seconds.
     std::string ask(const std::string& line);
     std::string readLine(std::chrono::milliseconds patience = std::chrono::seconds(10));
