@@ -8,6 +8,7 @@
 #include <condition_variable>
 #include <cstdint>
 #include <mutex>
+#include <optional>
 #include <thread>
 #include <vector>
 
@@ -126,15 +127,17 @@ private:
             api_->io_new(api_, wake_.get(), PA_IO_EVENT_INPUT,
                          [](pa_mainloop_api*, pa_io_event*, int descriptor, pa_io_event_flags_t, void*) { drain(descriptor); },
                          nullptr);
-        ServerWatch watch(options_.server);
+        if (watch_)
+            watch_->resume();
+        else
+            watch_.emplace(options_.server);
         pa_io_event* const watched =
-            watch.descriptor() < 0 ? nullptr
-                                   : api_->io_new(api_, watch.descriptor(), PA_IO_EVENT_INPUT,
-                                                  [](pa_mainloop_api*, pa_io_event*, int, pa_io_event_flags_t, void* self) {
-                                                      static_cast<Core*>(self)->serverMayBeThere();
-                                                  },
-                                                  this);
-        watch_ = &watch;
+            watch_->descriptor() < 0 ? nullptr
+                                     : api_->io_new(api_, watch_->descriptor(), PA_IO_EVENT_INPUT,
+                                                    [](pa_mainloop_api*, pa_io_event*, int, pa_io_event_flags_t, void* self) {
+                                                        static_cast<Core*>(self)->serverMayBeThere();
+                                                    },
+                                                    this);
         {
             PulseTimer retry(*api_, [this] { connect(); });
             PulseTimer givesUp(*api_, [this] { lost_ = true; });
@@ -150,8 +153,8 @@ private:
             lose();
             retry_ = givesUp_ = nullptr;
         }
-        watch_ = nullptr;
         if (watched) api_->io_free(watched);
+        watch_->rest();
         api_->io_free(woken);
         loop_.reset();
         api_ = nullptr;
@@ -270,7 +273,9 @@ private:
     bool ready_ = false, lost_ = false;
     pa_subscription_mask_t interest_ = PA_SUBSCRIPTION_MASK_NULL;
     std::vector<std::shared_ptr<PulseUser>> users_;
-    ServerWatch* watch_ = nullptr;
+    /// From the first thread on: a thread that closed it could be kept from ending for seconds, and the next recording's
+    /// sound with it.
+    std::optional<ServerWatch> watch_;
     PulseTimer* retry_ = nullptr;
     PulseTimer* givesUp_ = nullptr;
     milliseconds delay_{0};

@@ -50,7 +50,27 @@ void ServerWatch::arm() {
     }
 }
 
+void ServerWatch::rest() {
+    if (watched_ >= 0) ::inotify_rm_watch(events_.get(), watched_);
+    watched_ = -1;
+}
+
+void ServerWatch::resume() {
+    if (!events_) return;
+    readEvents();
+    arm();
+}
+
 bool ServerWatch::take() {
+    if (!readEvents()) return false;
+    // The folder may have come, or gone.
+    const int before = watched_;
+    arm();
+    if (before != watched_ && before >= 0) ::inotify_rm_watch(events_.get(), before);
+    return true;
+}
+
+bool ServerWatch::readEvents() {
     alignas(inotify_event) std::array<char, 4096> buffer{};
     bool isOfInterest = false;
     ssize_t length = 0;
@@ -64,12 +84,7 @@ bool ServerWatch::take() {
             at += sizeof event + event.len;
         }
     }
-    if (!isOfInterest) return false;
-    // The folder may have come, or gone.
-    const int before = watched_;
-    arm();
-    if (before != watched_ && before >= 0) ::inotify_rm_watch(events_.get(), before);
-    return true;
+    return isOfInterest;
 }
 
 bool ServerWatch::waitsForServer() const { return watched_ >= 0 && ::access(socket_.c_str(), F_OK) != 0; }

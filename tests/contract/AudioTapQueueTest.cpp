@@ -1,11 +1,14 @@
 // What a tap costs, when its sound is stamped to have been, and how it ends.
 
 #include <sys/resource.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
 #include <filesystem>
+#include <fstream>
+#include <map>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -78,6 +81,40 @@ TEST_P(AudioTapTest, WithoutAQueueThereIsNoThread) {
         EXPECT_TRUE(connection_->hasThread());
     }
     EXPECT_TRUE(eventually([this] { return !connection_->hasThread(); }));
+}
+
+/// The inotify descriptors of this process, each with the number of places that it watches.
+std::map<std::string, int> watchesOfThisProcess() {
+    std::map<std::string, int> watches;
+    for (const auto& entry : std::filesystem::directory_iterator("/proc/self/fd")) {
+        std::error_code gone;
+        if (std::filesystem::read_symlink(entry, gone) != "anon_inode:inotify") continue;
+        std::ifstream info("/proc/self/fdinfo/" + entry.path().filename().string());
+        int& count = watches[entry.path().filename()];
+        for (std::string line; std::getline(info, line);) count += line.starts_with("inotify wd:") ? 1 : 0;
+    }
+    return watches;
+}
+
+// Closing it makes the kernel wait, for seconds when the machine is busy, and the next queue's thread with it.
+TEST_P(AudioTapTest, TheWatchForAServerIsNotClosedBetweenTwoQueuesAndRests) {
+    const auto before = watchesOfThisProcess();
+    std::map<std::string, int> first;
+    for (int time = 0; time < 3; ++time) {
+        auto heard = hear(ProcessID{::getpid()});
+        ASSERT_TRUE(eventually([&] { return watchesOfThisProcess().size() > before.size(); }));
+        const auto used = [&] {
+            const auto watches = watchesOfThisProcess();
+            return std::count_if(watches.begin(), watches.end(), [](const auto& watch) { return watch.second > 0; });
+        };
+        EXPECT_TRUE(eventually([&] { return used() == 1; }));
+        heard.reset();
+        ASSERT_TRUE(eventually([this] { return !connection_->hasThread(); }));
+        EXPECT_EQ(used(), 0) << "nobody would take what it tells";
+        if (time == 0) first = watchesOfThisProcess();
+        EXPECT_EQ(watchesOfThisProcess(), first);
+        EXPECT_EQ(first.size(), before.size() + 1);
+    }
 }
 
 TEST_P(AudioTapTest, ACallbackThatOwnsItsQueueEndsItWithoutATrace) {

@@ -63,6 +63,27 @@ TEST(ServerWatch, OtherNamesAreOfNoInterest) {
     EXPECT_FALSE(tells(watch, 0));
 }
 
+TEST(ServerWatch, ThatRestsTellsNothingUntilItResumes) {
+    const ScratchDirectory folder;
+    const std::filesystem::path socket = folder.path("native");
+    ServerWatch watch(socket.string());
+    make(socket);
+    watch.rest();
+    std::filesystem::remove(socket);
+    watch.resume();
+    EXPECT_TRUE(watch.waitsForServer());
+    EXPECT_FALSE(tells(watch, 0)) << "of before, or of the rest itself";
+    make(socket);
+    ASSERT_TRUE(tells(watch));
+    EXPECT_TRUE(watch.take());
+    watch.rest();
+    EXPECT_FALSE(watch.waitsForServer());
+    while (tells(watch, 0)) watch.take();
+    std::filesystem::remove(socket);
+    make(socket);
+    EXPECT_FALSE(tells(watch, 0));
+}
+
 TEST(ServerWatch, OfAServerElsewhereThereIsNothingToWaitFor) {
     for (const char* const server : {"tcp:example.org", "{0123}unix:/tmp/native", "example.org"}) {
         const ServerWatch watch(server);
