@@ -20,7 +20,8 @@ class SoundingMachine(machine.Machine):
         socket = self.folder / "pulse/native"
         socket.unlink(missing_ok=True)
         self.sound = self.start(["pulseaudio", "-n", "--daemonize=no", "--exit-idle-time=-1", "--disallow-exit",
-                                 "--use-pid-file=no", "-L", "module-null-sink sink_name=null0 rate=48000 norewinds=1",
+                                 "--use-pid-file=no", "--realtime=no",
+                                 "-L", "module-null-sink sink_name=null0 rate=48000 norewinds=1",
                                  "-L", "module-native-protocol-unix auth-cookie-enabled=0"], "sound.log")
         machine.wait_for("the sound server", socket.exists)
 

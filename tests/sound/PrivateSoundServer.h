@@ -30,7 +30,8 @@ public:
     virtual void goOn() = 0;
 };
 
-/// PulseAudio. Started by the constructor unless told otherwise.
+/// PulseAudio, without real-time priority, which root's would have: the kernel kills it when it then computes for 200 ms
+/// without a rest. Started by the constructor unless told otherwise.
 class PrivateSoundServer final : public SoundServer {
 public:
     enum class Begin { Now, Later };

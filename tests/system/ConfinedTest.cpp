@@ -96,7 +96,7 @@ protected:
     void startSound() {
         sound_ = std::make_unique<Child>(
             asUser({"pulseaudio", "-n", "--daemonize=no", "--exit-idle-time=-1", "--disallow-exit", "--use-pid-file=no",
-                    "-L", "module-native-protocol-unix auth-cookie-enabled=0 socket=" + world_.path("sound/native"),
+                    "--realtime=no", "-L", "module-native-protocol-unix auth-cookie-enabled=0 socket=" + world_.path("sound/native"),
                     "-L", "module-null-sink sink_name=null0 rate=48000 norewinds=1"}),
             std::vector<std::string>{"XDG_RUNTIME_DIR=" + world_.path("sound"),
                                      "PULSE_RUNTIME_PATH=" + world_.path("sound"), "HOME=" + world_.path("sound")},
