@@ -43,6 +43,17 @@ LinuxUserAlerts::Options alertOptions(const DesktopServices& services) {
     return options;
 }
 
+sound::PulseConnection::Options soundOptions(Log& log) {
+    sound::PulseConnection::Options options;
+    options.tell = [&log](bool isThere) {
+        if (isThere)
+            log.line("the sound server is there again");
+        else
+            log.error("no sound server can be reached: until one can, recordings have silence in place of sound");
+    };
+    return options;
+}
+
 class LinuxDesktop final : public DesktopRoles {
 public:
     explicit LinuxDesktop(const DesktopServices& services) : services_(services) {}
@@ -67,7 +78,8 @@ public:
 
 private:
     const DesktopServices services_;
-    const std::shared_ptr<sound::PulseConnection> soundServer_ = std::make_shared<sound::PulseConnection>();
+    const std::shared_ptr<sound::PulseConnection> soundServer_ = 
+        std::make_shared<sound::PulseConnection>(soundOptions(services_.log));
 };
 
 }  // namespace

@@ -141,8 +141,11 @@ private:
         {
             PulseTimer retry(*api_, [this] { connect(); });
             PulseTimer givesUp(*api_, [this] { lost_ = true; });
+            PulseTimer isMissed(*api_, [this] { tell(false); });
             retry_ = &retry;
             givesUp_ = &givesUp;
+            isMissed_ = &isMissed;
+            isMissed.start(options_.toldAfter);
             delay_ = options_.firstRetry;
             connect();
             while (true) {
@@ -151,7 +154,7 @@ private:
                 if (isUnused() || pa_mainloop_iterate(loop_.get(), 1, nullptr) < 0) break;
             }
             lose();
-            retry_ = givesUp_ = nullptr;
+            retry_ = givesUp_ = isMissed_ = nullptr;
         }
         if (watched) api_->io_free(watched);
         watch_->rest();
@@ -208,6 +211,8 @@ private:
         ready_ = true;
         delay_ = options_.firstRetry;
         givesUp_->cancel();
+        isMissed_->cancel();
+        tell(true);
         pa_context_set_subscribe_callback(
             context_.get(),
             [](pa_context*, pa_subscription_event_type_t event, std::uint32_t index, void* core) {
@@ -237,12 +242,20 @@ private:
         givesUp_->cancel();
         if (ready_) {
             ready_ = false;
+            isMissed_->start(options_.toldAfter);
             const auto users = users_;
             for (const auto& user : users) user->serverWent();
         }
         context_.reset();
         retry_->start(delay_);
         delay_ = std::min(delay_ * 2, watch_->waitsForServer() ? options_.slowestWithoutSocket : options_.slowestRetry);
+    }
+
+    /// Each once: one that was never missed has not come back.
+    void tell(bool isThere) {
+        if (isThere == !toldMissing_) return;
+        toldMissing_ = !isThere;
+        if (options_.tell) options_.tell(isThere);
     }
 
     void addUser(const std::shared_ptr<PulseUser>& user) {
@@ -270,7 +283,7 @@ private:
     MainLoopHandle loop_;
     pa_mainloop_api* api_ = nullptr;
     ContextHandle context_;
-    bool ready_ = false, lost_ = false;
+    bool ready_ = false, lost_ = false, toldMissing_ = false;
     pa_subscription_mask_t interest_ = PA_SUBSCRIPTION_MASK_NULL;
     std::vector<std::shared_ptr<PulseUser>> users_;
     /// From the first thread on: a thread that closed it could be kept from ending for seconds, and the next recording's
@@ -278,6 +291,7 @@ private:
     std::optional<ServerWatch> watch_;
     PulseTimer* retry_ = nullptr;
     PulseTimer* givesUp_ = nullptr;
+    PulseTimer* isMissed_ = nullptr;
     milliseconds delay_{0};
 };
 

@@ -50,6 +50,10 @@ public:
         std::chrono::milliseconds slowestWithoutSocket{10'000};
         /// A server that has not answered by then is given up and tried again.
         std::chrono::milliseconds patience{5000};
+        /// Told, on the sound thread, when no server has been there for so long although somebody uses it, once, and
+        /// when one is there after that. May be empty; must not wait.
+        std::function<void(bool isThere)> tell = nullptr;
+        std::chrono::milliseconds toldAfter{2000};
     };
 
     PulseConnection() : PulseConnection(Options{}) {}

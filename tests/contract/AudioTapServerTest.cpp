@@ -1,8 +1,12 @@
 // Taps of servers that die, hang or come later.
 
+#include <unistd.h>
+
 #include <chrono>
 #include <memory>
+#include <mutex>
 #include <string>
+#include <vector>
 
 #include "tests/contract/AudioTapFixture.h"
 
@@ -76,6 +80,41 @@ TEST_P(LateAudioTapTest, AServerThatComesLaterIsJoined) {
     ASSERT_TRUE(one.tell("play a 997 0.5 2"));
     EXPECT_TRUE(heard->waitForTone(kOwn));
     EXPECT_TRUE(test::holesIn(heard->pieces()).empty());
+}
+
+TEST_P(LateAudioTapTest, AServerThatIsMissedIsToldOnceAndSoIsItsReturn) {
+    struct Told {
+        std::mutex mutex;
+        std::vector<bool> isThere;
+    };
+    const auto told = std::make_shared<Told>();
+    const auto isTold = [&](const std::vector<bool>& expected) {
+        return eventually([&] {
+            const std::lock_guard lock(told->mutex);
+            return told->isThere == expected;
+        });
+    };
+    sound::PulseConnection::Options options;
+    options.server = server_->address();
+    options.toldAfter = std::chrono::milliseconds(20);
+    options.tell = [told](bool isThere) {
+        const std::lock_guard lock(told->mutex);
+        told->isThere.push_back(isThere);
+    };
+    const auto connection = std::make_shared<sound::PulseConnection>(options);
+    LinuxAudioInputQueues queues(std::make_shared<sound::PulseTaps>(connection, nullptr), clock_);
+    for (int time = 0; time < 2; ++time) {  // the second one's outage is the first one's
+        const HeardSound heard(queues, ProcessID{::getpid()});
+        EXPECT_TRUE(isTold({false}));
+        ASSERT_NE(heard.waitFor(0.3), SIZE_MAX);
+        EXPECT_TRUE(isTold({false}));
+    }
+    ASSERT_TRUE(eventually([&] { return !connection->hasThread(); }));
+    ASSERT_TRUE(server_->start());
+    const HeardSound heard(queues, ProcessID{::getpid()});
+    EXPECT_TRUE(isTold({false, true}));
+    server_->kill();
+    EXPECT_TRUE(isTold({false, true, false}));
 }
 
 std::string nameOfServer(const ::testing::TestParamInfo<SoundServerMaker>& info) { return info.index == 0 ? "PulseAudio" : "PipeWire"; }
