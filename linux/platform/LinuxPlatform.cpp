@@ -246,9 +246,8 @@ std::unique_ptr<PlatformOwner> makePlatformOn(const MakeDesktopRoles& makeDeskto
     blockTerminationSignals();
     ::signal(SIGXFSZ, SIG_IGN);  // a file that may not grow is an error to its writer, not the end of the process
     const LinuxEnvironment environment = LinuxEnvironment::ofThisProcess();
-    if (const auto error = environment.prepareDirectories()) {
-        std::fprintf(stderr, "lumacastd: the runtime and state directories can't be made: %s\n",
-                     describe(*error).c_str());
+    if (const auto bad = environment.prepareDirectories()) {
+        std::fprintf(stderr, "lumacastd: the directory %s can't be used: %s\n", bad->path.c_str(), bad->why.c_str());
         return nullptr;
     }
     auto platform = std::make_unique<LinuxPlatform>(environment, makeDesktop);

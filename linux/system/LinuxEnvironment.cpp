@@ -127,14 +127,19 @@ LinuxEnvironment LinuxEnvironment::from(const Variables& variables, uid_t user, 
     return result;
 }
 
-std::optional<Error> LinuxEnvironment::prepareDirectories() const {
+std::optional<LinuxEnvironment::BadDirectory> LinuxEnvironment::prepareDirectories() const {
     for (const std::string& path : {runtimeDirectory, stateDirectory, cacheDirectory}) {
-        if (auto error = makeDirectories(path)) return error;
+        const auto bad = [&](const Error& error) {
+            const std::string* text = error.localizedDescription();
+            return BadDirectory{path, text ? *text : describe(error)};
+        };
+        if (const auto error = makeDirectories(path)) return bad(*error);
         // An existing directory of somebody else's, or one that others may write to, is not for our sockets and files.
         const Fd directory(::open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC | O_NOFOLLOW));
         struct stat status = {};
-        if (!directory || ::fstat(directory.get(), &status) != 0) return systemError(errno);
-        if (status.st_uid != ::geteuid() || (status.st_mode & (S_IWGRP | S_IWOTH)) != 0) return systemError(EPERM);
+        if (!directory || ::fstat(directory.get(), &status) != 0) return bad(systemError(errno));
+        if (status.st_uid != ::geteuid() || (status.st_mode & (S_IWGRP | S_IWOTH)) != 0)
+            return BadDirectory{path, "it is not this user's own, or others may write to it"};
     }
     return std::nullopt;
 }

@@ -50,9 +50,14 @@ struct LinuxEnvironment {
     static LinuxEnvironment from(const Variables& variables, uid_t user, std::string executable,
                                  const std::string& systemDirectory = "/etc/lumacast");
 
-    /// Makes the runtime, state and cache directories, for this user alone (mode 0700). The error of the first that
-    /// could not be made, or that belongs to somebody else.
-    [[nodiscard]] std::optional<Error> prepareDirectories() const;
+    /// A directory that can't be had.
+    struct BadDirectory {
+        std::string path;
+        std::string why;  ///< the system's own words, or that it is somebody else's
+    };
+    /// Makes the runtime, state and cache directories, for this user alone (mode 0700). The first that could not be
+    /// made, or is not this user's own. Blocks as long as the disk does.
+    [[nodiscard]] std::optional<BadDirectory> prepareDirectories() const;
 
     /// `name` below each of `directories`, in their order.
     static std::vector<std::string> below(const std::vector<std::string>& directories, std::string_view name);

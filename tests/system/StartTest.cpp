@@ -87,6 +87,17 @@ TEST(Start, WithADirectoryInTheAdministratorsPlaceItEnds) {
     EXPECT_EQ(world.endDaemon(SIGTERM), 0);
 }
 
+TEST(Start, WithoutADirectoryOfItsOwnItSaysWhichAndEnds) {
+    World world;
+    std::filesystem::create_directories(world.path("run/lumacast"));
+    std::filesystem::permissions(world.path("run/lumacast"), std::filesystem::perms::all);
+    EXPECT_EQ(runDaemon(world).status, EXIT_FAILURE);
+    std::stringstream said;
+    said << std::ifstream(world.path("second.log")).rdbuf();
+    EXPECT_EQ(said.str(), "lumacastd: the directory " + world.path("run/lumacast") +
+                              " can't be used: it is not this user's own, or others may write to it\n");
+}
+
 TEST(Start, TheServiceManagerIsToldWhenClientsAreServedAndWhenItEnds) {
     World world;
     const std::string name = world.path("notify");

@@ -102,9 +102,21 @@ TEST(LinuxEnvironment, ADirectoryOthersMayWriteToIsRefused) {
     auto environment = from({{"HOME", scratch.path("home")}, {"XDG_RUNTIME_DIR", scratch.path("run")}});
     scratch.makeDirectory("run/lumacast");
     std::filesystem::permissions(scratch.path("run/lumacast"), std::filesystem::perms(0777));
-    const auto error = environment.prepareDirectories();
-    ASSERT_TRUE(error);
-    EXPECT_EQ(error->code(), EPERM);
+    const auto bad = environment.prepareDirectories();
+    ASSERT_TRUE(bad);
+    EXPECT_EQ(bad->path, scratch.path("run/lumacast"));
+    EXPECT_EQ(bad->why, "it is not this user's own, or others may write to it");
+}
+
+TEST(LinuxEnvironment, OfADirectoryThatCannotBeMadeItSaysWhichAndWhy) {
+    ScratchDirectory scratch;
+    scratch.makeDirectory("home");
+    scratch.write("home/.cache", "a file in its way");
+    const auto environment = from({{"HOME", scratch.path("home")}, {"XDG_RUNTIME_DIR", scratch.path("run")}});
+    const auto bad = environment.prepareDirectories();
+    ASSERT_TRUE(bad);
+    EXPECT_EQ(bad->path, scratch.path("home/.cache/lumacast"));
+    EXPECT_EQ(bad->why, std::generic_category().message(ENOTDIR));
 }
 
 TEST(LinuxEnvironment, ALinkInTheDirectorysPlaceIsRefused) {
