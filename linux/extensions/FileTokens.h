@@ -26,7 +26,8 @@ public:
     void handOver(std::optional<ExtensionRequestID> request, const std::vector<ExtensionItem>& items);
     /// The request is over, and so are its tokens.
     void end(ExtensionRequestID request);
-    /// The process is over: so are all tokens, and what was counted.
+    /// The process is over: so are the tokens of its requests, and what was counted. One that was issued and not handed
+    /// over yet stays: it is of a request that the next process will get.
     void endAll();
 
     /// Answers one exchange. A peer that guesses is refused after a few tries.

@@ -146,7 +146,8 @@ public:
     void layoutMonitorDidUpdateDisplayLayout(DisplayLayoutMonitor* monitor,
                                              const std::vector<DisplayLayoutElement>& layout) override;
 
-    /// `isMicrophoneRecording` and `isCameraRecording` — what the last start that got that far asked for.
+    /// `isMicrophoneRecording` and `isCameraRecording` — what the last start that got that far asked for; false once
+    /// the user has acknowledged it.
     bool isMicrophoneRecording() const { return microphoneRecording_; }
     bool isCameraRecording() const { return cameraRecording_; }
 
@@ -196,8 +197,9 @@ private:
     /// left alone, is a movie that is neither a temporary file nor one that the user may read and remove, and one that
     /// is still being recorded. Another user's own movie is not mixed.
     void saveVideoToCameraRoll(const std::optional<URL>& movie, UserID user, SaveHandler handler);
-    /// On a global queue.
+    /// Request lane: it reads the sessions.
     bool isBeingRecorded(const URL& movie) const;
+    /// On a global queue.
     void addToLibrary(const std::shared_ptr<MovieSave>& save, const std::optional<URL>& mixed, bool mixingFailed);
     void endSave(const std::shared_ptr<MovieSave>& save, const std::optional<URL>& savedAs, const std::string& problem);
     Array describeSaves() const;

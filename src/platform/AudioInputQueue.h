@@ -58,11 +58,12 @@ using AudioQueueBufferRef = std::shared_ptr<AudioQueueBuffer>;
 /// server has gone) it delivers silence, and it joins in when it can. So from the start on the sound has no hole.
 ///
 /// Buffers are filled in the order in which they were enqueued. One is handed over as soon as 20 ms are in it, however
-/// large it is; until the first of the queue's buffers has been enqueued a second time, the last five left are handed
-/// over only when they are full, so that an owner who drops some buffers at first does not lose them all.
-/// Sound is stamped with the capture clock that is current when the queue is started; what is heard while that clock
-/// stands still is thrown away, and so is what finds no buffer to be filled. A queue that has had no buffer to fill for
-/// a second gives its stream back to the server; the next buffer brings it back.
+/// large it is; after two seconds without a stream each 200 ms, or later (allowLateSilence), until one comes. Until the
+/// first of the queue's buffers has been enqueued a second time, the last five left are handed over only when they are
+/// full, so that an owner who drops some buffers at first does not lose them all. Sound is stamped with the capture
+/// clock that is current when the queue is started; what is heard while that clock stands still is thrown away, and so
+/// is what finds no buffer to be filled. A queue that has had no buffer to fill for a second gives its stream back to
+/// the server; the next buffer brings it back.
 ///
 /// Lanes: callbacks come on the queue's own thread, one at a time, never inline from an operation. All operations are
 /// callable from any lane, also from within a callback, and wait for nobody, least of all for the sound server. A
