@@ -1,8 +1,10 @@
 #pragma once
 // What an error says: where it comes from, which one it is, and a text for people.
 //
-// An Error in an answer or event comes from one of two places, told by its domain: the daemon (kRecordingErrorDomain,
-// the codes of RecordingErrorCode) or this library (kConnectionErrorDomain, the codes of ConnectionError).
+// Its domain tells where an Error in an answer or event comes from: the daemon (kRecordingErrorDomain, the codes of
+// RecordingErrorCode), this library (kConnectionErrorDomain, the codes of ConnectionError), a call of the
+// daemon's that failed (kSystemErrorDomain, numbers of errno: setUpBroadcast and broadcastExtensions), or a broadcast's
+// extension, which ends the broadcast with an error of any domain: it comes with `stopped`, or answers the start.
 
 #include <cstdint>
 #include <optional>
@@ -45,17 +47,17 @@ std::string_view connectionErrorKey(std::int64_t code);
 /// A connection error with its English description.
 Error connectionError(ConnectionError code);
 
-/// The code when the error is the daemon's; none when it is the connection's.
+/// The code when the error's domain is kRecordingErrorDomain; else none. An error may be of neither kind.
 std::optional<RecordingErrorCode> recordingCodeOf(const Error& error);
-/// The code when the error is the connection's; none when it is the daemon's.
+/// The code when the error's domain is kConnectionErrorDomain and the code is one of it; else none.
 std::optional<ConnectionError> connectionCodeOf(const Error& error);
 
 /// The error's key: "RECORDING_ERROR_..." (that of RECORDING_ERROR_UNKNOWN for a code outside the block) or
 /// "CONNECTION_ERROR_...". Empty for an error of any other domain. Static.
 std::string_view keyOf(const Error& error);
 
-/// A text to show: the daemon's description in the user's language where the error carries one (that of a broadcast
-/// without a set-up never does), else its key and code. Never empty.
+/// A text to show: the error's own description where it carries one (the daemon's are in the user's language; that of a
+/// broadcast without a set-up has none), else its key, or its domain, and its code. Never empty.
 std::string textOf(const Error& error);
 
 }  // namespace lumacast::client

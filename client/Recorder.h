@@ -44,7 +44,8 @@ inline constexpr std::chrono::milliseconds kPatience = std::chrono::seconds(60);
 /// discard() (not a clip), or a day has passed; or until the device runs out of space (below 100 MB free, or by the
 /// administrator's purge). Copy it, open it or have it saved before; an opened file stays readable.
 ///
-/// Destroying the recorder ends a running recording and throws it away, answers what is pending with Closed and waits
+/// Destroying the recorder ends a running recording and throws it away (one of the whole display goes on without its
+/// application, until the next start puts its movie into the library), answers what is pending with Closed and waits
 /// for the handler that is running. From within a handler it does all that but the waiting. No handler runs after it.
 class Recorder {
 public:
@@ -64,8 +65,9 @@ public:
     /// Stops and keeps the whole movie. Not answered when nothing is being recorded, nor when the extension that takes a
     /// broadcast's samples dies before it has taken note of the end.
     void stop(std::function<void(StopAnswer)> answered);
-    /// Stops and keeps the movie without its first `fromStart` and last `fromEnd` seconds (rounded to whole ones, both
-    /// above 0). Not answered when nothing is being recorded, or the clip can't be made.
+    /// Stops and keeps the movie without its first `fromStart` and last `fromEnd` seconds, rounded to whole ones. Only
+    /// with both above 0: else the whole movie is answered, uncut. Not answered when nothing is being recorded, or the
+    /// clip can't be made.
     void stopWithClip(double fromStart, double fromEnd, std::function<void(StopAnswer)> answered);
     /// Deletes the last movie, but not a clip of it. Not answered while recording.
     void discard(std::function<void(std::optional<Error>)> answered);
@@ -80,8 +82,10 @@ public:
     /// asked before.
     void state(std::function<void(StateAnswer)> answered);
 
-    /// Chooses the extension of the application's next broadcast, which its start consumes; a newer one replaces it. An
-    /// error (InvalidBroadcastSession, or why extensions can't be looked up) when there is no such extension.
+    /// Chooses the extension of the application's next broadcast, which its start consumes; a newer one replaces it.
+    /// How an extension is named, see BroadcastSetup::extension. Answered with an error, and nothing is chosen, when
+    /// there is no such extension (InvalidBroadcastSession), or when they can't be looked up (kSystemErrorDomain, a
+    /// number of errno). A configuration that can't be archived (more than 64 KiB) is left out without an error.
     void setUpBroadcast(const BroadcastSetup& setup, std::function<void(std::optional<Error>)> answered);
     /// The upload extensions that are installed.
     void broadcastExtensions(std::function<void(BroadcastExtensionsAnswer)> answered);
@@ -90,12 +94,13 @@ public:
 
     // Without an answer; ignored where they don't apply.
 
-    /// Pauses a running recording. What happens until the resume is not in the movie.
+    /// Pauses a running recording, but none of the whole display. What happens until the resume is not in the movie. A
+    /// broadcast that is paused stays so until it is stopped: no resume reaches it.
     void pause();
     /// Goes on, recording `window`. With a window that is not the application's own a paused recording is stopped:
-    /// `stopped` tells NoContextIDMatch and the movie.
+    /// `stopped` tells NoContextIDMatch and the movie. Does nothing to a broadcast.
     void resume(ContextID window);
-    /// Turns the microphone of a running recording on or off.
+    /// Turns the microphone of a running recording on or off: in its state alone, see StartOptions::microphone.
     void setMicrophoneEnabled(bool enabled);
     /// What the application wants to remember; it comes back with the state.
     void setMicrophoneEnabledPersistent(bool enabled);
@@ -104,9 +109,12 @@ public:
     void setBroadcastURL(const std::optional<URL>& url);
     /// Whose sound a running recording takes.
     void setProcessForAudioCapture(ProcessID pid);
-    /// The application came to the foreground: an interrupted recording that waits for it is told as `stopped`.
+    /// The application came to the foreground. When it records again, and an earlier recording of it was interrupted
+    /// and left a movie, `stopped` tells Interrupted and that movie. While it records nothing, nothing is told.
     void didBecomeActive();
-    /// The application left the foreground. The user may be asked anew when it comes back late.
+    /// The application left the foreground. Only this starts the clock of the user's grant: more than eight minutes
+    /// after the first time, the next connection or didBecomeActive ends the grant, and the user is asked anew. An
+    /// application that never says so keeps it until the daemon ends.
     void didResignActive();
     /// Accepted by the daemon, and ignored.
     void reportCameraUsage(std::int32_t usage);

@@ -52,8 +52,8 @@ private:
     std::optional<Error> error_;
 };
 
-/// A finished movie: ordinary MP4, H.264, up to two AAC tracks (the first the application's sound, the second the
-/// microphone), its times beginning at zero.
+/// A finished movie: ordinary MP4, H.264, up to two AAC tracks (the first the application's sound, the second kept for
+/// the microphone, which this version never records), its times beginning at zero.
 struct Clip {
     Fd movie;         ///< to read; stays readable when the daemon has removed the file. At the file's beginning
     std::string url;  ///< the file as the daemon names it; its last component is different for each clip of the device

@@ -56,11 +56,16 @@ public:
     virtual void started(std::optional<Dictionary> userInfo, Completion completion) {
         static_cast<void>(userInfo), static_cast<void>(completion);
     }
+    /// The application has paused, and no frame comes until it goes on. In this version none ever does.
     virtual void paused(Completion completion) { static_cast<void>(completion); }
+    /// It goes on. The time between is in no stamp.
     virtual void resumed(Completion completion) { static_cast<void>(completion); }
     /// Nothing follows. The daemon ends the process when this is processed.
     virtual void finished(Completion completion) { static_cast<void>(completion); }
+    /// A picture, in the order of their times. Some are left out while three are not processed; see Completion.
     virtual void frame(Frame frame) { static_cast<void>(frame); }
+    /// A stretch of sound, each source's in the order of their times, none left out. It may come later than a frame of
+    /// its time: only the times put them together.
     virtual void sound(Sound sound) { static_cast<void>(sound); }
     /// Whose sound a broadcast of the whole display takes since its first change of the application in front: told once a
     /// broadcast, and not again when another one comes to the front.

@@ -25,7 +25,8 @@ struct Frame {
     std::shared_ptr<const SharedPlane> plane;
     /// How the picture is to be turned for showing, as EXIF numbers it: 1 (as it is) to 8.
     std::uint32_t orientation = 1;
-    /// Presentation times rise from frame to frame, in the time that the sounds share.
+    /// Presentation times rise from frame to frame, in the time that the sounds share: of the recording's own clock,
+    /// zero at its first picture, 1,000,000,000 ticks a second, and standing in a pause.
     SampleTiming timing;
     Completion completion;
 };
@@ -33,11 +34,11 @@ struct Frame {
 /// A stretch of uncompressed sound.
 struct Sound {
     enum class Source { Application, Microphone };
-    Source source = Source::Application;
+    Source source = Source::Application;  ///< never the microphone in this version
     AudioFormat format;       ///< linear PCM; rate, channels and sizes make sense
     Data bytes;               ///< at least frames * format.bytesPerFrame
-    std::int64_t frames = 0;
-    SampleTiming timing;
+    std::int64_t frames = 0;  ///< one sample of each channel
+    SampleTiming timing;      ///< when the first frame was played, and how long they all last; the frames' clock
     Completion completion;
 };
 

@@ -286,7 +286,7 @@ void addDuration(CLI::App& command, DisplayOptions& options) {
 }
 
 void addMicrophone(CLI::App& command, DisplayOptions& options) {
-    command.add_flag("--microphone", options.wanted.microphone, "Ask for the microphone too");
+    command.add_flag("--microphone", options.wanted.microphone, "Ask for the microphone too; it is never recorded");
 }
 
 Command recordCommand(CLI::App& app) {

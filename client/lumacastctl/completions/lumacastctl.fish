@@ -15,7 +15,7 @@ complete -c lumacastctl -n __fish_use_subcommand -a broadcast -d 'Broadcast the 
 complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l display -d 'Record the whole display'
 complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l duration -x -d 'End after so many seconds'
 complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l output -r -F -d 'Where the movie goes'
-complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l microphone -d 'Ask for the microphone too'
+complete -c lumacastctl -n '__fish_seen_subcommand_from record' -l microphone -d 'Ask for the microphone too; it is never recorded'
 
 complete -c lumacastctl -n '__fish_seen_subcommand_from extensions' -l json -d 'Answer one line of JSON'
 
@@ -24,7 +24,7 @@ complete -c lumacastctl -n '__fish_seen_subcommand_from broadcast' -l extension 
 complete -c lumacastctl -n '__fish_seen_subcommand_from broadcast' -l set -x -d 'What the extension is to know'
 complete -c lumacastctl -n '__fish_seen_subcommand_from broadcast' -l clip -x -d 'How long a clip is'
 complete -c lumacastctl -n '__fish_seen_subcommand_from broadcast' -l duration -x -d 'End after so many seconds'
-complete -c lumacastctl -n '__fish_seen_subcommand_from broadcast' -l microphone -d 'Ask for the microphone too'
+complete -c lumacastctl -n '__fish_seen_subcommand_from broadcast' -l microphone -d 'Ask for the microphone too; it is never recorded'
 
 complete -c lumacastctl -n '__fish_seen_subcommand_from save' -F
 complete -c lumacastctl -n '__fish_seen_subcommand_from save' -l json -d 'Answer lines of JSON'
