@@ -141,7 +141,8 @@ TEST(DiskTrouble, AQuotaThatIsUsedUpLeavesAMovieThatPlaysAndTheNextOneWorks) {
             EXPECT_EQ(count, 10u) << "once a buffer of the tap";
         } else {
             EXPECT_EQ(count, 1u) << line;
-            EXPECT_FALSE(line.starts_with("error ")) << line;
+            // This world has no sound server, which the log says where the recording is long enough.
+            EXPECT_FALSE(line.starts_with("error ") && !line.starts_with("error no sound server")) << line;
         }
     }
     world.setDiskQuotaUsedUp(false);
