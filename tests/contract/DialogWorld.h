@@ -12,21 +12,12 @@
 #include <vector>
 
 #include "linux/desktop/LinuxUserAlerts.h"
+#include "tests/contract/Eventually.h"
 #include "tests/contract/PrivateDisplay.h"
 #include "tests/contract/ScratchDirectory.h"
 #include "tests/dialog/DialogUser.h"
 
 namespace lumacast::test {
-
-/// Polls the condition, generously.
-inline bool holdsSoon(const std::function<bool()>& condition, std::chrono::seconds limit = std::chrono::seconds(30)) {
-    const auto deadline = std::chrono::steady_clock::now() + limit;
-    while (!condition()) {
-        if (std::chrono::steady_clock::now() > deadline) return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
-    return true;
-}
 
 /// Takes an alert's answer. Thread-safe; may end before the alert does.
 class Answer final {

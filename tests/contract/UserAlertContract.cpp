@@ -12,7 +12,6 @@ namespace {
 
 using Response = UserAlert::Response;
 using test::Answer;
-using test::holdsSoon;
 using test::threeButtons;
 using test::twoButtons;
 
@@ -121,14 +120,14 @@ TEST_P(UserAlertContract, DismissingIsTheOtherButton) {
 TEST_P(UserAlertContract, AnAlertStandsUntilItIsAnsweredAndIsGoneThen) {
     const auto alert = world_->alerts().show(twoButtons());
     ASSERT_TRUE(alert);
-    EXPECT_TRUE(holdsSoon([this] { return world_->standing() == 1; }));
+    EXPECT_TRUE(eventually([this] { return world_->standing() == 1; }));
     const Answer answer;
     alert->receiveResponse(answer.handler());
     EXPECT_EQ(answer.count(), 0u);
     world_->press(Response::DefaultButton);
     EXPECT_EQ(answer.wait(), Response::DefaultButton);
     EXPECT_TRUE(alert->wasShown());
-    EXPECT_TRUE(holdsSoon([this] { return world_->standing() == 0; }));
+    EXPECT_TRUE(eventually([this] { return world_->standing() == 0; }));
 }
 
 TEST_P(UserAlertContract, CancellingTakesTheAlertDownAsTheOtherButton) {
@@ -136,10 +135,10 @@ TEST_P(UserAlertContract, CancellingTakesTheAlertDownAsTheOtherButton) {
     ASSERT_TRUE(alert);
     const Answer answer;
     alert->receiveResponse(answer.handler());
-    EXPECT_TRUE(holdsSoon([this] { return world_->standing() == 1; }));
+    EXPECT_TRUE(eventually([this] { return world_->standing() == 1; }));
     alert->cancel();
     EXPECT_EQ(answer.wait(), Response::OtherButton);
-    EXPECT_TRUE(holdsSoon([this] { return world_->standing() == 0; }));
+    EXPECT_TRUE(eventually([this] { return world_->standing() == 0; }));
     alert->cancel();
     EXPECT_EQ(answer.count(), 1u);
 }
@@ -149,10 +148,10 @@ TEST_P(UserAlertContract, AnAlertThatIsDestroyedIsTakenDownAndAnswersNobody) {
     ASSERT_TRUE(alert);
     const Answer answer;
     alert->receiveResponse(answer.handler());
-    EXPECT_TRUE(holdsSoon([this] { return world_->standing() == 1; }));
+    EXPECT_TRUE(eventually([this] { return world_->standing() == 1; }));
     alert.reset();
-    EXPECT_TRUE(holdsSoon([this] { return world_->standing() == 0; }));
-    EXPECT_TRUE(holdsSoon([&] { return answer.handlerIsGone(); }));
+    EXPECT_TRUE(eventually([this] { return world_->standing() == 0; }));
+    EXPECT_TRUE(eventually([&] { return answer.handlerIsGone(); }));
     EXPECT_EQ(answer.count(), 0u);
 }
 
@@ -160,7 +159,7 @@ TEST_P(UserAlertContract, AnAnswerThatCameBeforeItsHandlerIsKept) {
     const auto alert = world_->alerts().show(twoButtons());
     ASSERT_TRUE(alert);
     world_->press(Response::DefaultButton);
-    EXPECT_TRUE(holdsSoon([this] { return world_->standing() == 0; }));
+    EXPECT_TRUE(eventually([this] { return world_->standing() == 0; }));
     const Answer answer;
     alert->receiveResponse(answer.handler());
     EXPECT_EQ(answer.wait(), Response::DefaultButton);
@@ -174,7 +173,7 @@ TEST_P(UserAlertContract, TheHandlerIsCalledOnceFromAnotherLane) {
     alert->cancel();
     ASSERT_EQ(answer.wait(), Response::OtherButton);
     EXPECT_NE(answer.lane(), std::this_thread::get_id());
-    EXPECT_TRUE(holdsSoon([&] { return answer.handlerIsGone(); }));
+    EXPECT_TRUE(eventually([&] { return answer.handlerIsGone(); }));
     EXPECT_EQ(answer.count(), 1u);
 }
 
@@ -195,13 +194,13 @@ TEST_P(UserAlertContract, TwoAlertsAreTwo) {
     const auto first = world_->alerts().show(twoButtons());
     const auto second = world_->alerts().show(threeButtons());
     ASSERT_TRUE(first && second);
-    EXPECT_TRUE(holdsSoon([this] { return world_->standing() == 2; }));
+    EXPECT_TRUE(eventually([this] { return world_->standing() == 2; }));
     const Answer one, other;
     first->receiveResponse(one.handler());
     second->receiveResponse(other.handler());
     first->cancel();
     EXPECT_EQ(one.wait(), Response::OtherButton);
-    EXPECT_TRUE(holdsSoon([this] { return world_->standing() == 1; }));
+    EXPECT_TRUE(eventually([this] { return world_->standing() == 1; }));
     EXPECT_EQ(other.count(), 0u);
     world_->press(Response::AlternateButton);
     EXPECT_EQ(other.wait(), Response::AlternateButton);

@@ -17,7 +17,6 @@ using std::chrono::milliseconds;
 using test::Answer;
 using test::DialogUser;
 using test::DialogWorld;
-using test::holdsSoon;
 using test::threeButtons;
 using test::twoButtons;
 using Button = DialogUser::Button;
@@ -117,7 +116,7 @@ TEST_P(RealDialogTest, AWindowThatAnotherClientDestroysRefuses) {
     ASSERT_NO_FATAL_FAILURE(show(twoButtons()));
     user().destroy(dialog_);
     EXPECT_EQ(answer_.wait(), Response::OtherButton);
-    EXPECT_TRUE(holdsSoon([] { return children().size() == 1; }));  // the display
+    EXPECT_TRUE(eventually([] { return children().size() == 1; }));  // the display
 }
 
 TEST_P(RealDialogTest, AClientThatTheServerKillsRefuses) {
@@ -130,7 +129,7 @@ TEST_P(RealDialogTest, ADisplayThatDiesRefuses) {
     ASSERT_NO_FATAL_FAILURE(show(twoButtons()));
     world_.display().crash();
     EXPECT_EQ(answer_.wait(), Response::OtherButton);
-    EXPECT_TRUE(holdsSoon([] { return children().empty(); }));
+    EXPECT_TRUE(eventually([] { return children().empty(); }));
 }
 
 TEST_P(RealDialogTest, AnAlertOnADisplayThatHangsCanBeCancelled) {
@@ -138,7 +137,7 @@ TEST_P(RealDialogTest, AnAlertOnADisplayThatHangsCanBeCancelled) {
     world_.display().hang();
     alert_->cancel();
     EXPECT_EQ(answer_.wait(), Response::OtherButton);
-    EXPECT_TRUE(holdsSoon([] { return children().size() == 1; }));
+    EXPECT_TRUE(eventually([] { return children().size() == 1; }));
     world_.display().goOn();
 }
 
@@ -166,7 +165,7 @@ TEST_P(RealDialogTest, AGrantThatComesAtOnceIsAskedForAgain) {
     std::set<pid_t> seen{dialog_.pid};
     for (int again = 0; again < 4; ++again) {
         EXPECT_TRUE(user().click(dialog_, Button::Default));
-        ASSERT_TRUE(holdsSoon([&] {
+        ASSERT_TRUE(eventually([&] {
             const auto dialog = user().waitForDialog();
             if (!dialog || !seen.insert(dialog->pid).second) return false;
             dialog_ = *dialog;
@@ -241,10 +240,10 @@ TEST_P(RealDialogTest, FiftyAlertsLeaveNothingBehind) {
     const auto leftovers = [] { return openDescriptors() + threads() + children().size(); };
     ASSERT_NO_FATAL_FAILURE(show(twoButtons()));  // what is made once, is there after the first
     alert_.reset();
-    ASSERT_TRUE(holdsSoon([] { return children().size() == 1; }));
-    ASSERT_TRUE(holdsSoon([this] { return user().dialogs().empty(); }));
+    ASSERT_TRUE(eventually([] { return children().size() == 1; }));
+    ASSERT_TRUE(eventually([this] { return user().dialogs().empty(); }));
     std::size_t before = leftovers();
-    ASSERT_TRUE(holdsSoon([&] { return before == std::exchange(before, leftovers()); }));
+    ASSERT_TRUE(eventually([&] { return before == std::exchange(before, leftovers()); }));
     for (int i = 0; i < 50; ++i) {
         alert_ = world_.alerts().show(twoButtons());
         ASSERT_TRUE(alert_);
@@ -259,7 +258,7 @@ TEST_P(RealDialogTest, FiftyAlertsLeaveNothingBehind) {
         }
         alert_.reset();
     }
-    EXPECT_TRUE(holdsSoon([&] { return leftovers() <= before; })) << leftovers() << " after " << before;
+    EXPECT_TRUE(eventually([&] { return leftovers() <= before; })) << leftovers() << " after " << before;
     EXPECT_EQ(children().size(), 1u);
 }
 
@@ -292,13 +291,13 @@ TEST_F(PlayedDialogTest, OnlyTheExactAnswerOfAGrantingButtonGrants) {
 TEST_F(PlayedDialogTest, AProgramThatShowsNoWindowIsNotWaitedForWithoutEnd) {
     world_.options().windowPatience = milliseconds(300);
     EXPECT_EQ(answerOf("exec sleep 1000"), Response::OtherButton);
-    EXPECT_TRUE(holdsSoon([] { return children().size() == 1; }));
+    EXPECT_TRUE(eventually([] { return children().size() == 1; }));
 }
 
 TEST_F(PlayedDialogTest, AProgramThatPrintsWithoutEndIsEnded) {
     world_.options().windowPatience = std::chrono::hours(1);
     EXPECT_EQ(answerOf("while :; do echo y; done"), Response::OtherButton);
-    EXPECT_TRUE(holdsSoon([] { return children().size() == 1; }));
+    EXPECT_TRUE(eventually([] { return children().size() == 1; }));
 }
 
 TEST_F(PlayedDialogTest, AProgramThatCanNotBeRunIsTheOtherButton) {
@@ -337,7 +336,7 @@ TEST_F(PlayedDialogTest, WhatTheProgramHasStartedGoesWithIt) {
     const std::string report = world_.scratch().path("grandchild");
     EXPECT_EQ(answerOf("sleep 1000 & echo $! >" + report + "; exit 1"), Response::OtherButton);
     const pid_t grandchild = std::stoi(fileText(report));
-    EXPECT_TRUE(holdsSoon([&] {
+    EXPECT_TRUE(eventually([&] {
         const std::string status = fileText("/proc/" + std::to_string(grandchild) + "/status");
         return status.empty() || status.find("State:\tZ") != std::string::npos;
     }));
