@@ -1,5 +1,5 @@
 # What the checks share. A check is a command; what it prints is shown when it fails.
-passed=0 failed=0 pids=()
+passed=0 failed=0 skipped=0 pids=()
 results=$(mktemp)
 
 check() { # name, command…
@@ -15,18 +15,25 @@ check() { # name, command…
     tail -n 25 <<<"$output" | sed 's/^/      /'
     [ -n "$output" ] || output="failed, and said nothing"
   fi
-  printf '%s\0%s\0' "$name" "$output" >>"$results"
+  printf '%s\0%s\0%s\0' "$name" COMPLETED "$output" >>"$results"
+}
+skip() { # name, why
+  skipped=$((skipped + 1))
+  echo "SKIP  $1: $2"
+  printf '%s\0%s\0%s\0' "$1" SKIPPED "$2" >>"$results"
 }
 finish() { # report, seconds
   python3 - "$results" "$1" <<'PYTHON'
 import json, pathlib, sys
 words = pathlib.Path(sys.argv[1]).read_text(errors="replace").split("\0")[:-1]
-tests = [{"name": name, "result": "COMPLETED", **({"failures": [{"failure": output}]} if output else {})}
-         for name, output in zip(words[::2], words[1::2])]
+def test(name, result, output):
+    details = {"why_skipped": output} if result == "SKIPPED" else {"failures": [{"failure": output}]} if output else {}
+    return {"name": name, "result": result, **details}
+tests = [test(*check) for check in zip(words[::3], words[1::3], words[2::3])]
 pathlib.Path(sys.argv[2]).write_text(json.dumps({"testsuites": [{"name": "Packages", "testsuite": tests}]}))
 PYTHON
   rm -f "$results"
-  echo "packages: $passed passed, $failed failed, in $2 s"
+  echo "packages: $passed passed, $failed failed, $skipped skipped, in $2 s"
   exit $((failed > 0))
 }
 wait_for() { # seconds, command…

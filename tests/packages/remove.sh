@@ -34,3 +34,7 @@ unsaved_stays() { [ -e "$root/var/lib/lumacast/1000/root/movie.mp4" ] && rm -r "
 check "purge keeps a folder with an unsaved movie, and no other" eval 'purges && unsaved_stays'
 check "nothing else is left" leaves_nothing
 check "and the movies are there" movies_stay
+
+# The end of the session.
+for pid in "${pids[@]}"; do kill "$pid" 2>/dev/null; done
+for pid in "${pids[@]}"; do wait "$pid" 2>/dev/null; done
