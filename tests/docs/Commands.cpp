@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cctype>
 #include <filesystem>
+#include <regex>
 #include <set>
 #include <utility>
 
@@ -16,49 +17,10 @@ namespace fs = std::filesystem;
 
 namespace {
 
-/// What pages may tell people to run besides what is in the tree. A word that is neither is a mistake, or belongs here.
-const std::set<std::string> kOfTheSystem{"apt-get",
-                                         "cat",
-                                         "cd",
-                                         "chmod",
-                                         "chown",
-                                         "cmake",
-                                         "cp",
-                                         "ctest",
-                                         "echo",
-                                         "ffmpeg",
-                                         "ffprobe",
-                                         "gdb",
-                                         "git",
-                                         "grep",
-                                         "id",
-                                         "install",
-                                         "journalctl",
-                                         "ls",
-                                         "mkdir",
-                                         "ninja",
-                                         "nginx",
-                                         "printf",
-                                         "python3",
-                                         "sed",
-                                         "socat",
-                                         "systemctl",
-                                         "systemd-analyze",
-                                         "systemd-inhibit",
-                                         "tail",
-                                         "loginctl",
-                                         "dpkg",
-                                         "apt",
-                                         "pkg-config",
-                                         "g++",
-                                         "c++",
-                                         "make",
-                                         "dpkg-buildpackage",
-                                         "lintian",
-                                         "tar",
-                                         "man",
-                                         "rm",
-                                         "export"};
+/// What pages may tell people to run besides what is in the tree. A word that is neither is a mistake, or belongs here;
+/// then it is also to be run, as the page shows it, by tests/packages.
+const std::set<std::string> kOfTheSystem{"cmake", "echo",   "journalctl", "ls",       "mkdir",
+                                         "ninja", "printf", "socat",      "systemctl"};
 
 std::vector<std::string> wordsOf(const std::string& line) {
     std::vector<std::string> words;
@@ -125,11 +87,12 @@ bool isAssignment(const std::string& word) {
                        [](char c) { return (c >= 'A' && c <= 'Z') || c == '_'; });
 }
 
-/// The words without what only prepares the command: assignments, `sudo`, a limit of time.
+/// The words without what only prepares the command: assignments, `sudo`, a limit of time, a debugger.
 std::vector<std::string> stripped(std::vector<std::string> words) {
     while (!words.empty() && (words[0] == "$" || words[0] == "sudo" || words[0] == "exec" || isAssignment(words[0])))
         words.erase(words.begin());
-    if (words.size() > 2 && words[0] == "timeout") words.erase(words.begin(), words.begin() + 2);
+    if (words.size() > 2 && (words[0] == "timeout" || (words[0] == "gdb" && words[1] == "--args")))
+        words.erase(words.begin(), words.begin() + 2);
     return words;
 }
 
@@ -200,6 +163,10 @@ std::string faultOfBuild(const Command& command) {
         if (words[i] == "--preset" && i + 1 < words.size() &&
             presets.find("\"" + words[i + 1] + "\"") == std::string::npos)
             return "there is no preset " + words[i + 1];
+        const std::string option = words[i].substr(0, words[i].find('='));
+        if (option.starts_with("-D") &&
+            textBelow("", {"CMakeLists.txt", ".cmake"}).find(option.substr(2)) == std::string::npos)
+            return "the build has no option " + option;
         if (words[i - 1] == "-C" || words[i - 1] == "--preset" || words[i - 1] == "--build" || words[i - 1] == "-j")
             continue;
         if (words[i].starts_with("-"))
@@ -210,16 +177,39 @@ std::string faultOfBuild(const Command& command) {
     return {};
 }
 
-std::vector<Command> commandsIn(const std::string& line, const std::string& where, bool isProse, bool isShell) {
+enum class Shown { Sentence, Lines, Shell };  // a block that isn't marked as a shell's may be a drawing
+
+std::vector<Command> commandsIn(const std::string& text, const Page& page, int at, Shown shown) {
     std::vector<Command> commands;
-    for (const std::string& choice : choicesOf(withoutExplanation(line)))
+    std::string line = withoutExplanation(text);
+    if (line.starts_with("$ ")) line.erase(0, 2);
+    for (const std::string& choice : choicesOf(line))
         for (const std::string& part : partsOf(choice)) {
             std::vector<std::string> words = stripped(wordsOf(part));
             if (words.empty() || words[0].starts_with('#')) continue;
-            if (!isShell && !isOfTheTree(words[0])) continue;
-            commands.push_back({std::move(words), where, isProse});
+            const bool isCommand = shown == Shown::Shell || isOfTheTree(words[0]) ||
+                                   (shown == Shown::Lines && kOfTheSystem.contains(words[0]));
+            if (isCommand)
+                commands.push_back({std::move(words), line, page.path, docs::at(page, at), shown == Shown::Sentence});
         }
     return commands;
+}
+
+/// Whether the packages' checks take this line out of this page and run it: `ann_runs PAGE 'how it begins'`.
+bool isRunAsShown(const Command& command) {
+    static const std::string checks = textBelow("tests/packages", {".sh"});
+    static const std::regex kRuns("(?:ann_runs|root_runs|here_runs) ([\\w./-]+) '([^']+)'");
+    for (auto run = std::sregex_iterator(checks.begin(), checks.end(), kRuns); run != std::sregex_iterator(); ++run)
+        if ((*run)[1] == command.page && command.line.starts_with((*run)[2].str())) return true;
+    return false;
+}
+
+/// Presets, targets and options are those of the tree; what else these programs do has to be run.
+bool isBuildOfTheTree(const Command& command) {
+    const auto& words = command.words;
+    if (words[0] != "cmake" || words.size() < 3) return words[0] == "ninja";
+    return words[1] == "--preset" || (words[1] == "--build" && words[2].starts_with("build/")) ||
+           (words[1] == "-S" && words[2] == ".");
 }
 
 }  // namespace
@@ -238,12 +228,13 @@ std::vector<Command> commandsOf(const Page& page) {
                 continue;
             }
             // The rest of a line that was gone on with is indented, and no explanation.
-            add(commandsIn(line, at(page, block.line + static_cast<int>(i)), false, block.language == "sh"));
+            add(commandsIn(line, page, block.line + static_cast<int>(i),
+                           block.language == "sh" ? Shown::Shell : Shown::Lines));
             line.clear();
         }
     }
     for (const Span& span : page.spans)
-        if (span.text.find(' ') != std::string::npos) add(commandsIn(span.text, at(page, span.line), true, false));
+        if (span.text.find(' ') != std::string::npos) add(commandsIn(span.text, page, span.line, Shown::Sentence));
     return all;
 }
 
@@ -252,9 +243,10 @@ std::string faultOf(const Command& command) {
     if (program.starts_with("scripts/") || program.starts_with("bench/") || program.starts_with(".ci/"))
         return faultOfScript(command);
     if (program.starts_with("build/")) return faultOfProgram(command);
-    if (program == "cmake" || program == "ninja") return faultOfBuild(command);
-    if (program.starts_with('/') || program.starts_with('$')) return {};  // the reader's own
-    if (program == "lumacastctl" || kOfTheSystem.contains(program)) return {};
+    if (isBuildOfTheTree(command)) return faultOfBuild(command);
+    if (program == "lumacastctl") return {};
+    if (kOfTheSystem.contains(program) || program.starts_with('/') || program.starts_with('$'))
+        return isRunAsShown(command) ? "" : "no check of the packages runs: " + command.line;
     if (isOfTheTree(program)) return faultOfProgram(command);
     return program + " is no program that is known";
 }

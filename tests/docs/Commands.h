@@ -10,6 +10,8 @@ namespace lumacast::docs {
 
 struct Command {
     std::vector<std::string> words;
+    std::string line;  ///< all of the line that it is a part of, without what explains it
+    std::string page;
     std::string where;
     bool isProse = false;  ///< named in a sentence, where arguments may be left out
 };
@@ -19,7 +21,7 @@ struct Command {
 std::vector<Command> commandsOf(const Page& page);
 
 /// What is wrong with a command that names a script or a program of the tree, or in a block marked `sh` any; empty for
-/// a good one. What `lumacastctl` would say to its own line is asked of it, see `wrongUsageOf`.
+/// a good one. Of the system's programs a page shows only what a test runs as it stands. What `lumacastctl` would say to its own line is asked of it, see `wrongUsageOf`.
 std::string faultOf(const Command& command);
 
 }  // namespace lumacast::docs

@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <map>
+#include <regex>
 #include <set>
 
 #include "client/lumacastctl/ExitStatus.h"
@@ -83,6 +84,24 @@ TEST(Commands, OfCIAreTheOnesThatThePagesName) {
     EXPECT_NE(docs::page("README.md").text.find(option + " is what\nCI runs"), std::string::npos) << option;
 }
 
+/// "lumacastd@1000.service" and "lumacastd@<number>.service" are made of the unit lumacastd@.service.
+bool isInstalledUnit(const std::string& instance, const std::string& kind) {
+    const std::string name = (instance.empty() ? "lumacastd." : "lumacastd@.") + kind;
+    return isThere("packaging/systemd/" + name) || isThere("packaging/systemd/user/" + name);
+}
+
+TEST(Commands, NameUnitsThatAreInstalled) {
+    static const std::regex kUnit("lumacastd(@[\\w%]*)?\\.(service|socket|target|timer)\\b");
+    std::size_t units = 0;
+    for (const Page& page : allPages())
+        for (auto unit = std::sregex_iterator(page.text.begin(), page.text.end(), kUnit);
+             unit != std::sregex_iterator(); ++unit, ++units)
+            EXPECT_TRUE(isInstalledUnit((*unit)[1], (*unit)[2])) << page.path << ": " << unit->str();
+    EXPECT_GT(units, 6u);
+    EXPECT_FALSE(isInstalledUnit("", "timer"));
+    EXPECT_FALSE(isInstalledUnit("@1000", "socket"));
+}
+
 TEST(Commands, OfLumacastctlAreUnderstoodByIt) {
     LumacastCtl tool;
     std::set<std::vector<std::string>> tried;
@@ -95,29 +114,42 @@ TEST(Commands, OfLumacastctlAreUnderstoodByIt) {
 }
 
 /// All that is wrong with what a planted page shows.
-std::size_t faultsIn(const std::string& text) {
+std::size_t faultsIn(const std::string& text, const std::string& path = "docs/planted.md") {
     std::size_t faults = 0;
     LumacastCtl tool;
-    for (const Command& command : commandsOf(pageOf("docs/planted.md", text)))
+    for (const Command& command : commandsOf(pageOf(path, text)))
         if (!faultOf(command).empty() || (command.words[0] == "lumacastctl" && !tool.wrongUsageOf(command).empty()))
             ++faults;
     return faults;
 }
 
 TEST(Commands, ThatDoNotExistAreSeen) {
-    EXPECT_EQ(faultsIn("```sh\nscripts/test --asan\nLC_SEED=1 scripts/simulate --seeds 3 | cat\n```\n"), 0u);
+    EXPECT_EQ(faultsIn("```sh\nscripts/test --asan\nLC_SEED=1 scripts/simulate --seeds 3\n```\n"), 0u);
     EXPECT_EQ(faultsIn("```sh\nscripts/test --no-such-kind\n```\n"), 1u);
     EXPECT_EQ(faultsIn("```sh\nscripts/no-such-script\n```\n"), 1u);
     EXPECT_EQ(faultsIn("```sh\nno-such-program\n```\n"), 1u);
-    EXPECT_EQ(faultsIn("```sh\necho one && no-such-program\n```\n"), 1u);
+    EXPECT_EQ(faultsIn("```sh\nscripts/test && no-such-program\n```\n"), 1u);
+    EXPECT_EQ(faultsIn("```sh\ngdb --args build/release/bin/unit_tests --gtest_filter='NoSuchSuite.*'\n```\n"), 1u);
     EXPECT_EQ(faultsIn("```\nno command but a drawing\n```\n"), 0u);
     EXPECT_EQ(faultsIn("text\n\n    scripts/test --no-such-kind   with an explanation\n"), 1u);
     EXPECT_EQ(faultsIn("Say `scripts/test --no-such-kind`.\n"), 1u);
     EXPECT_EQ(faultsIn("```sh\ncmake --preset release\nninja -C build/release lumacastd\n```\n"), 0u);
     EXPECT_EQ(faultsIn("```sh\ncmake --preset no-such-preset\nninja -C build/release no_such_target\n```\n"), 2u);
+    EXPECT_EQ(faultsIn("```sh\ncmake -S . -B build/planted -DLC_NO_SUCH_OPTION=ON\n```\n"), 1u);
     EXPECT_EQ(faultsIn("```sh\nbuild/release/bin/unit_tests --gtest_filter='Texts.*'\n```\n"), 0u);
     EXPECT_EQ(faultsIn("```sh\nbuild/release/bin/unit_tests --gtest_filter='NoSuchSuite.*'\n```\n"), 1u);
     EXPECT_EQ(faultsIn("```sh\nbuild/release/bin/no_such_tests\n```\n"), 1u);
+}
+
+TEST(Commands, OfTheSystemThatNoCheckRunsAreSeen) {
+    const std::string shown = "```sh\nsystemctl --user status lumacastd.socket lumacastd.service\n```\n";
+    EXPECT_EQ(faultsIn(shown, "docs/on-a-device.md"), 0u);
+    EXPECT_EQ(faultsIn(shown, "docs/planted.md"), 1u) << "each page's own is to be run";
+    EXPECT_EQ(faultsIn("```sh\nsystemctl --user sing\n```\n", "docs/on-a-device.md"), 1u);
+    EXPECT_EQ(faultsIn("```sh\nscripts/demo && systemctl start lumacastd\n```\n"), 1u);
+    EXPECT_EQ(faultsIn("```sh\n$HOME/bin/recorder movie.mp4\n```\n"), 1u);
+    EXPECT_EQ(faultsIn("text\n\n    mkdir -p /etc/planted\n"), 1u);
+    EXPECT_EQ(faultsIn("text\n\n    $ cmake --install build/release\n"), 1u);
 }
 
 TEST(Commands, ThatLumacastctlDoesNotUnderstandAreSeen) {
