@@ -12,11 +12,13 @@ becomes() { wait_for 30 eval "is '$1' ${*:2} >/dev/null" || { is "$@"; daemon_sa
 
 installs_there() { rm "$root/usr/sbin/policy-rc.d" && in_root systemctl start user@1000 && installs; }
 begins_at_once() {
-  ann_runs debian/lumacastd.README.Debian 'systemctl --user daemon-reload' && is active as_ann systemctl --user is-active lumacastd.socket
+  ann_runs debian/lumacastd.README.Debian 'systemctl --user daemon-reload' &&
+    is active as_ann systemctl --user is-active lumacastd.socket
 }
 logs_in_anew() { in_root systemctl stop user@1000 && in_root systemctl start user@1000; }
 waits_behind_its_socket() {
-  logs_in_anew && is active as_ann systemctl --user is-active lumacastd.socket && is inactive of_user ActiveState && is 0 of_user MainPID
+  logs_in_anew && is active as_ann systemctl --user is-active lumacastd.socket && is inactive of_user ActiveState &&
+    is 0 of_user MainPID
 }
 starts_with_the_first_connection() {
   as_ann lumacastctl status && is active of_user ActiveState && is notify of_user Type && is Idle. of_user StatusText
@@ -36,8 +38,9 @@ has_a_session() { # what a desktop's session tells the user's manager
 }
 begins_anew() { ann_runs docs/on-a-device.md 'systemctl --user restart' && as_ann lumacastctl status; }
 ends_with_the_session() {
-  as_ann systemctl --user stop graphical-session.target session.target && becomes inactive of_user ActiveState &&
-    is success of_user Result && is 0 of_user ExecMainStatus && as_ann systemctl --user start session.target
+  is active of_user ActiveState && as_ann systemctl --user stop graphical-session.target session.target &&
+    becomes inactive of_user ActiveState && is success of_user Result && is 0 of_user ExecMainStatus &&
+    as_ann systemctl --user start session.target
 }
 starts_anew_when_killed() { # of_user | of_system
   local before
@@ -57,13 +60,13 @@ begins_a_long_recording() { # of_user | of_system
 }
 plays() { # movie: all of it
   local length
-  ffmpeg -v error -i "$1" -f null - && length=$(ffprobe -v error -show_entries format=duration -of csv=p=0 "$1") && echo "$1: $length s" &&
-    [[ $length =~ [1-9] ]]
+  ffmpeg -v error -i "$1" -f null - && length=$(ffprobe -v error -show_entries format=duration -of csv=p=0 "$1") &&
+    echo "$1: $length s" && [[ $length =~ [1-9] ]]
 }
 closes_its_movie_when_stopped() { # of_user | of_system, stopping…
-  local of=$1
+  local of=$1 movies=$root$state/root/private/var/mobile/Library/Lumacast
   begins_a_long_recording "$of" && "${@:2}" && is inactive "$of" ActiveState && is success "$of" Result &&
-    is 0 "$of" ExecMainStatus && ! wait "$recording" && plays "$(ls -t "$root$state"/root/private/var/mobile/Library/Lumacast/ScreenRecording_*.mp4 | head -n 1)"
+    is 0 "$of" ExecMainStatus && ! wait "$recording" && plays "$(ls -t "$movies"/ScreenRecording_*.mp4 | head -n 1)"
 }
 settles_the_system_form() { # as the page says
   printf 'DISPLAY=:7\nXDG_VIDEOS_DIR=/home/ann/Videos\n' >"$root/etc/lumacast/environment"
@@ -73,8 +76,9 @@ settles_the_system_form() { # as the page says
 }
 starts_the_system_form() {
   settles_the_system_form && root_runs docs/on-a-device.md 'systemctl enable' && is active of_system ActiveState &&
-    ann_runs debian/lumacastd.README.Debian 'systemctl --user stop' && root_runs debian/lumacastd.README.Debian 'systemctl enable' &&
-    is Idle. of_system StatusText && is user-1000.slice of_system Slice && as_ann lumacastctl status
+    ann_runs debian/lumacastd.README.Debian 'systemctl --user stop' &&
+    root_runs debian/lumacastd.README.Debian 'systemctl enable' && is Idle. of_system StatusText &&
+    is user-1000.slice of_system Slice && as_ann lumacastctl status
 }
 has_folders_of_its_own() {
   is '700 ann' in_root stat -c '%a %U' /var/lib/lumacast/1000 && is '700 ann' in_root stat -c '%a %U' /var/cache/lumacast/1000
@@ -83,30 +87,34 @@ shows_itself_in_the_system() {
   root_runs docs/on-a-device.md 'systemctl status' | tee /dev/stderr | grep -q 'Status: "Idle."' &&
     until_seen 'lumacastd Starting!' root_runs docs/on-a-device.md 'journalctl -u'
 }
-# What the kernel lets a process in the service's group open: here its own log, which is a device.
-opens_the_log() { in_root sh -c "echo \$\$ >/sys/fs/cgroup/$1/cgroup.procs && exec 3</dev/log-of-the-kernel"; }
+# What the kernel lets a process in the service's group open: not its own log, which is a device.
+opens() { in_root sh -c "echo \$\$ >/sys/fs/cgroup/$1/cgroup.procs && exec 3<$2"; }
 has_no_other_devices() {
-  local group
-  group=$(of_system ControlGroup) && in_root mknod /dev/log-of-the-kernel c 1 11 && opens_the_log init.scope && ! opens_the_log "$group"
+  local group log=/dev/log-of-the-kernel
+  group=$(of_system ControlGroup) && in_root mknod $log c 1 11 && opens init.scope $log && opens "$group" /dev/zero &&
+    ! opens "$group" $log
 }
 comes_and_goes_with_the_user() {
-  in_root systemctl stop user@1000 && is inactive of_system ActiveState && is 0 of_system ExecMainStatus &&
-    in_root systemctl start user@1000 && becomes active of_system ActiveState &&
+  is active of_system ActiveState && in_root systemctl stop user@1000 && is inactive of_system ActiveState &&
+    is 0 of_system ExecMainStatus && in_root systemctl start user@1000 && becomes active of_system ActiveState &&
     is inactive as_ann systemctl --user is-active lumacastd.socket && has_a_session
 }
 goes_on_while_upgraded() {
   local before
-  in_root systemctl start lumacastd@1000 && begins_a_long_recording of_system && before=$(of_system MainPID) && upgrades && is "$before" of_system MainPID &&
-    is Recording. of_system StatusText && as_ann systemctl --user kill -s INT recording.service && wait "$recording" &&
+  in_root systemctl start lumacastd@1000 && begins_a_long_recording of_system && before=$(of_system MainPID) && upgrades &&
+    is "$before" of_system MainPID && is Recording. of_system StatusText &&
+    as_ann systemctl --user kill -s INT recording.service && wait "$recording" &&
     plays "$root/home/ann/long.mp4"
 }
 is_stopped_by_removal() {
-  removes && is inactive of_system ActiveState && in_machine test ! -e /run/user/1000/lumacast/admin.sock
+  is active of_system ActiveState && removes && is inactive of_system ActiveState &&
+    ! in_root sh -c 'cat /proc/[0-9]*/comm' | grep -x lumacastd
 }
 is_gone_after_purge() {
   local kept="$root/var/lib/lumacast/1000/lumacast/root"
   rm -r "$root"/etc/systemd/system/lumacastd@1000.service.d "$root/etc/lumacast/environment"  # the administrator's own
-  purges && [ -n "$(find "$kept" -name '*.mp4')" ] && rm -r "$root/var/lib/lumacast" && in_root systemctl daemon-reload && logs_in_anew && ! in_root systemctl list-units --all --no-legend | grep lumacast &&
+  purges && [ -n "$(find "$kept" -name '*.mp4')" ] && rm -r "$root/var/lib/lumacast" && in_root systemctl daemon-reload &&
+    logs_in_anew && ! in_root systemctl list-units --all --no-legend | grep lumacast &&
     ! as_ann systemctl --user list-units --all --no-legend | grep lumacast && leaves_nothing
 }
 
