@@ -56,7 +56,11 @@ sound::PulseConnection::Options soundOptions(Log& log) {
 
 class LinuxDesktop final : public DesktopRoles {
 public:
-    explicit LinuxDesktop(const DesktopServices& services) : services_(services) {}
+    explicit LinuxDesktop(const DesktopServices& services) : services_(services) {
+        // A user's manager may start a daemon before the session has told it its display.
+        if (displayName().empty())
+            services_.log.error("DISPLAY is not set: no window can be recorded until the daemon is started anew with it");
+    }
 
     SoundRoles makeSound() override {
         auto taps = std::make_shared<sound::PulseTaps>(soundServer_, services_.applicationOf);

@@ -98,6 +98,23 @@ TEST(Start, WithoutADirectoryOfItsOwnItSaysWhichAndEnds) {
                               " can't be used: it is not this user's own, or others may write to it\n");
 }
 
+TEST(Start, WithoutADisplayItSaysSoAndServes) {
+    World world;
+    std::vector<std::string> variables = world.environment();
+    variables.insert(variables.begin(), "DISPLAY=");  // the first one counts
+    checkers::Child daemon({LC_DAEMON}, variables, world.path("second.log"));
+    const auto log = [&] {
+        std::stringstream text;
+        text << std::ifstream(world.path("second.log")).rdbuf();
+        return text.str();
+    };
+    ASSERT_TRUE(waitUntil([&] { return std::filesystem::exists(world.path("run/lumacast/com.orvane.lumacastd.sock")); }));
+    EXPECT_TRUE(waitUntil([&] { return log().find("error DISPLAY is not set: ") != std::string::npos; })) << log();
+    ASSERT_GT(daemon.pid(), 1);
+    ::kill(daemon.pid(), SIGTERM);
+    EXPECT_EQ(daemon.wait(), 0);
+}
+
 TEST(Start, TheServiceManagerIsToldWhenClientsAreServedAndWhenItEnds) {
     World world;
     const std::string name = world.path("notify");
