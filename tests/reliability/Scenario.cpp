@@ -199,6 +199,7 @@ private:
             const auto until = started_ + frames;
             waitUntil([&] { return app_->askForFrame("frame") >= until || !daemonLives(); }, kAnswers);
             stopped_ = app_->askForFrame("frame");
+            heard.isDisconnected = app_->wasTold("event disconnected");
             const std::string answer = app_->ask(stopCommand);
             heard.stop = answerOf(answer, "stopped frame");
             const auto at = answer.find(" /");

@@ -29,6 +29,7 @@ struct NotedCall {
 /// What the client heard of one recording.
 struct Heard {
     std::string start, stop;  ///< "ok", "error <code>", "no answer"; empty when it was not asked
+    bool isDisconnected = false;  ///< told so before it asked for the end, by an application with a window
     std::vector<std::string> events;
     std::optional<std::string> movie;
 };

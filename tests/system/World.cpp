@@ -77,6 +77,10 @@ bool Application::waitForFrame(std::uint32_t number) {
     return waitUntil([&] { return askForFrame("frame") >= number; }, std::chrono::seconds(60));
 }
 
+bool Application::wasTold(const std::string& event) const {
+    return std::find(events_.begin(), events_.end(), event) != events_.end();
+}
+
 std::string Application::nextEvent() {
     if (events_.empty()) return child_->readLine();
     std::string event = std::move(events_.front());

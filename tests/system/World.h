@@ -45,6 +45,8 @@ public:
     bool waitForFrame(std::uint32_t number);
     /// The next event line, waiting for it; empty when none comes.
     std::string nextEvent();
+    /// Whether this event came with the answers so far.
+    bool wasTold(const std::string& event) const;
     /// Passes over the events that came with the answers so far.
     void forgetEvents() { events_.clear(); }
     /// Stops the recording; the movie's path, empty after a failure.
