@@ -82,7 +82,7 @@ public:
 
 private:
     const DesktopServices services_;
-    const std::shared_ptr<sound::PulseConnection> soundServer_ = 
+    const std::shared_ptr<sound::PulseConnection> soundServer_ =
         std::make_shared<sound::PulseConnection>(soundOptions(services_.log));
 };
 

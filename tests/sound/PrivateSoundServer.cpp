@@ -137,7 +137,8 @@ bool PrivateSoundServer::start() {
     };
     server_ = std::make_unique<SoundProcess>(
         std::vector<std::string>{"pulseaudio", "-n", "--daemonize=no", "--exit-idle-time=-1", "--disallow-exit",
-                                 "--use-pid-file=no", "--realtime=no", "-L", sink("null0"), "-L", sink("null1"), "-L", native},
+                                 "--use-pid-file=no", "--realtime=no", "-L", sink("null0"), "-L", sink("null1"), "-L",
+                                 native},
         std::vector<std::string>{"XDG_RUNTIME_DIR=" + directory_ + "/run", "PULSE_RUNTIME_PATH=" + directory_ + "/pulse",
                                  "HOME=" + directory_ + "/home", "XDG_CONFIG_HOME", "DBUS_SESSION_BUS_ADDRESS", "DISPLAY"});
     return within(std::chrono::seconds(20), [this] { return isThere(); }) && plays(address());
